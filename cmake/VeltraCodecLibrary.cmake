@@ -1,0 +1,49 @@
+include(CMakePackageConfigHelpers)
+
+# veltra_codec_library(<name> SOURCES ... HEADERS ... [CODECS <name>...] [PLATFORM <target>...] [REQUIRES <pkg>...])
+#
+# One C-callable codec, compiled once and offered twice: the static library `<name>` and the shared library
+# `<name>-shared` (lib<name>.a, lib<name>.so). Both are installed with HEADERS, a pkg-config file and the CMake package
+# `veltra`. CODECS are other codecs that it stands on, PLATFORM the static libraries of the platform that go into it,
+# REQUIRES the pkg-config modules that a static link needs.
+function(veltra_codec_library name)
+    cmake_parse_arguments(ARG "" "" "SOURCES;HEADERS;CODECS;PLATFORM;REQUIRES" ${ARGN})
+    add_library(${name}-objects OBJECT ${ARG_SOURCES})
+    target_compile_options(${name}-objects PRIVATE
+        $<$<COMPILE_LANGUAGE:CXX>:-fno-exceptions -fno-rtti -fno-threadsafe-statics>)
+
+    add_library(${name} STATIC $<TARGET_OBJECTS:${name}-objects>)
+    add_library(${name}-shared SHARED $<TARGET_OBJECTS:${name}-objects>)
+    set_target_properties(${name}-shared PROPERTIES
+        OUTPUT_NAME ${name} VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR})
+    target_link_options(${name}-shared PRIVATE -Wl,--exclude-libs,ALL)
+    set(private_requires ${ARG_REQUIRES})
+    foreach(codec IN LISTS ARG_CODECS)
+        target_link_libraries(${name} PUBLIC ${codec})
+        target_link_libraries(${name}-shared PUBLIC ${codec}-shared)
+        list(APPEND private_requires ${codec})
+    endforeach()
+    set(private_libraries "")
+    foreach(library IN LISTS ARG_PLATFORM)
+        target_link_libraries(${name} PUBLIC ${library})
+        target_link_libraries(${name}-shared PRIVATE ${library})
+        string(APPEND private_libraries " -l${library}")
+    endforeach()
+
+    get_filename_component(room ${CMAKE_CURRENT_SOURCE_DIR} NAME)
+    install(FILES ${ARG_HEADERS} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/veltra/${room})
+    foreach(target ${name} ${name}-shared)
+        target_include_directories(${target} INTERFACE
+            $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}>
+            $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}/veltra>)
+    endforeach()
+    install(TARGETS ${name} ${name}-shared EXPORT veltra
+        ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR}
+        LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+
+    list(JOIN private_requires ", " VELTRA_PC_REQUIRES)
+    set(VELTRA_PC_NAME ${name})
+    set(VELTRA_PC_PRIVATE_LIBS "${private_libraries}")
+    configure_file(${PROJECT_SOURCE_DIR}/cmake/codec.pc.in ${CMAKE_CURRENT_BINARY_DIR}/${name}.pc @ONLY)
+    install(FILES ${CMAKE_CURRENT_BINARY_DIR}/${name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+endfunction()

@@ -1,0 +1,21 @@
+// Properties of the device by key: the device-answer service and the Tansu value service.
+//
+// On Linux the answers stand in the device description, /etc/veltra/device.json below the device root, which is read at
+// every query, so that a part swapped between two queries is seen by the second. A missing or malformed description is
+// a device without answers, and one line on the console says so. All operations may be called from any thread.
+#ifndef VELTRA_PLATFORM_DEVICE_ANSWERS_H
+#define VELTRA_PLATFORM_DEVICE_ANSWERS_H
+
+#include <string_view>
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+// The answer for `key`: text, number or data, depending on the key, or nothing when the device has no such property.
+// `options` is always nothing.
+Value KACopyAnswer(std::string_view key, const Value& options);
+
+// The same; *error, when `error` is given, says why there is no answer.
+Value KACopyAnswerWithError(std::string_view key, const Value& options, Error* error);
+
+#endif

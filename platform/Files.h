@@ -1,0 +1,33 @@
+// Files of the device. Every path is resolved below the device root and cannot leave it, neither through ".." nor
+// through a symbolic link; a relative path counts from the root. All operations may be called from any thread.
+#ifndef VELTRA_PLATFORM_FILES_H
+#define VELTRA_PLATFORM_FILES_H
+
+#include <cstddef>
+#include <optional>
+#include <string_view>
+
+#include "platform/Value.h"
+
+namespace files {
+
+// The largest file that readWhole reads.
+constexpr std::size_t maximumSize = std::size_t{256} << 20;
+
+// The whole contents of the regular file at `path`, or nothing when it is missing, unreadable, no regular file (a FIFO
+// or device is never waited for) or larger than maximumSize.
+std::optional<Value::Data> readWhole(std::string_view path);
+
+// Makes `contents` the whole contents of the file at `path`: a new file of mode 0600 in the same directory, flushed to
+// the disk and then renamed over the target. No symbolic link is followed on the way. Returns false, and leaves
+// everything as it was, when the directory is missing or the target exists and is no regular file.
+bool replace(std::string_view path, const Value::Data& contents);
+
+// Appends `text` to the file at `path` with one write; the file is created with mode 0640 when it is missing and closed
+// again at the end. A symbolic link or anything but a regular file is not opened. False when the text could not be
+// written.
+bool append(std::string_view path, std::string_view text);
+
+} // namespace files
+
+#endif

@@ -1,0 +1,79 @@
+// The host plug-in framework: delivers requests to the plug-in and takes its responses.
+#ifndef VELTRA_PLATFORM_HOST_FRAMEWORK_H
+#define VELTRA_PLATFORM_HOST_FRAMEWORK_H
+
+#include <cstdint>
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+// A request as the host sent it. Read only.
+struct HSMessageRequest {
+    Value messageStr;  // the command name; nothing when the host sent none
+    Value messageDict; // the command's arguments, a dictionary; nothing when the host sent none
+
+    // Command and dictionary on one line, for the log.
+    std::string description() const;
+};
+
+// A response. Its name is that of the request; statusCode is 0 or -1; response is a dictionary or nothing.
+class HSMessageResponse {
+public:
+    static HSMessageResponse initWithName(Value name, std::int64_t statusCode);
+    static HSMessageResponse initWithName(Value name, std::int64_t statusCode, Value response);
+    static HSMessageResponse initWithName(Value name, std::int64_t statusCode, Value response,
+                                          std::optional<Error> error);
+
+    const Value& name() const { return name_; }
+    std::int64_t statusCode() const { return statusCode_; }
+    const Value& response() const { return response_; }
+    const std::optional<Error>& error() const { return error_; }
+
+private:
+    Value name_;
+    std::int64_t statusCode_ = 0;
+    Value response_;
+    std::optional<Error> error_;
+};
+
+// Completes a request: whether it was completed, and the response object, if there is one.
+using HSCompletion = std::function<void(bool completed, const std::optional<HSMessageResponse>& response)>;
+
+// What a plug-in server offers to the framework.
+class VeltraPluginServerInterface {
+public:
+    virtual ~VeltraPluginServerInterface() = default;
+
+    // Serves one request. Calls `completion` exactly once, before it returns, on the calling thread.
+    virtual void handleMessage(const HSMessageRequest& request, const HSCompletion& completion) = 0;
+};
+
+// Base of a plug-in server. On Linux the framework is a D-Bus service: see docs in
+// platform/linux/services/HostFramework.cpp.
+class VeltraPluginServer : public VeltraPluginServerInterface {
+public:
+    VeltraPluginServer() = default;
+    VeltraPluginServer(const VeltraPluginServer&) = delete;
+    VeltraPluginServer& operator=(const VeltraPluginServer&) = delete;
+    ~VeltraPluginServer() override;
+
+    // Serves requests, one at a time and in order, on the calling thread. Ends the process with status 0 after the
+    // request in hand when SIGTERM or SIGINT arrives, and with status 1 and a line on standard error when the host is
+    // lost.
+    void resume();
+
+protected:
+    // Registers the server with the host under `serviceName`. False, after a line on standard error, when there is no
+    // host to reach or the name is taken.
+    bool initWithServiceName(std::string_view serviceName);
+
+private:
+    struct Connection;
+    Connection* connection_ = nullptr;
+};
+
+#endif

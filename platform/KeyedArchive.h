@@ -1,0 +1,38 @@
+// The keyed archive: one Value graph as bytes, under a root key. The encoding is CBOR (RFC 8949), one map with the root
+// key as its only entry. Only the five kinds of a Value that hold something stand in an archive: dictionary, array,
+// text, data and number.
+#ifndef VELTRA_PLATFORM_KEYED_ARCHIVE_H
+#define VELTRA_PLATFORM_KEYED_ARCHIVE_H
+
+#include <optional>
+#include <stdexcept>
+#include <string_view>
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+// Raised for an archive whose contents cannot be decoded, or a graph that cannot be encoded.
+class ArchiveFailure : public std::runtime_error {
+public:
+    using std::runtime_error::runtime_error;
+};
+
+// The bytes of `root` under `rootKey`. Raises ArchiveFailure when the graph holds a value of nothing.
+Value::Data archiveEncode(std::string_view rootKey, const Value& root);
+
+// A decoder over the bytes of one archive, which it only reads during create.
+class ArchiveDecoder {
+public:
+    // None, and *error filled, when `bytes` are no archive at all: empty, or not a map.
+    static std::optional<ArchiveDecoder> create(const Value::Data& bytes, Error* error);
+
+    // The object under `rootKey`, or nothing when the archive has no such key. Raises ArchiveFailure when the contents
+    // are malformed, hold another kind of object than the five, or nest deeper than 32.
+    Value decode(std::string_view rootKey) const;
+
+private:
+    explicit ArchiveDecoder(Value::Data bytes) : bytes_(std::move(bytes)) {}
+    Value::Data bytes_;
+};
+
+#endif
