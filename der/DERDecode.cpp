@@ -1,0 +1,344 @@
+#include "der/DERDecode.h"
+
+#include <cstring>
+
+namespace {
+
+constexpr uint8_t tagNumberBits = 0x1F;
+constexpr uint8_t moreBit = 0x80;
+constexpr unsigned classAndFormShift = 56;
+constexpr uint64_t unbounded = UINT64_MAX;
+
+// The octets of an item that are not read yet.
+struct Reader {
+    const uint8_t* next;
+    uint64_t left;
+};
+
+// Reads the digits of a high tag number (X.690 8.1.2.4). Every octet read leaves at least one for the length, so that
+// no check is needed before the first length octet.
+bool readHighTagNumber(Reader* reader, uint64_t* number) {
+    constexpr uint64_t roomForDigit = UINT64_C(1) << 57;
+    constexpr uint8_t leadingZeroDigit = moreBit;
+    constexpr uint8_t lowestHighNumber = 31;
+    if (*reader->next == leadingZeroDigit || *reader->next < lowestHighNumber)
+        return false;
+    uint64_t value = 0;
+    uint8_t digit = moreBit;
+    while ((digit & moreBit) != 0) {
+        if (reader->left < 2 || value >= roomForDigit)
+            return false;
+        digit = *reader->next++;
+        --reader->left;
+        value = value << 7 | (digit & 0x7FU);
+    }
+    *number = value;
+    return value <= DERTagNumberMask;
+}
+
+// Reads the identifier octets into a tag word. At least two octets are left.
+bool readTag(Reader* reader, DERTag* tag) {
+    const uint8_t first = *reader->next++;
+    --reader->left;
+    uint64_t number = first & tagNumberBits;
+    if (number == tagNumberBits && !readHighTagNumber(reader, &number))
+        return false;
+    *tag = number | static_cast<uint64_t>(first & ~tagNumberBits) << classAndFormShift;
+    return true;
+}
+
+// Reads the length octets: definite and as short as can be (X.690 10.1). At least one octet is left.
+bool readLength(Reader* reader, uint64_t* length) {
+    const uint8_t first = *reader->next++;
+    --reader->left;
+    if ((first & moreBit) == 0) {
+        *length = first;
+        return true;
+    }
+    const uint64_t count = first & 0x7FU;
+    if (count == 0 || count > sizeof(uint64_t) || count > reader->left || *reader->next == 0)
+        return false;
+    uint64_t value = 0;
+    for (uint64_t i = 0; i < count; ++i)
+        value = value << 8 | reader->next[i];
+    reader->next += count;
+    reader->left -= count;
+    *length = value;
+    return value > 0x7F;
+}
+
+// Decodes the header of the item at the start of `der`. The content in *decoded starts behind it and has the declared
+// length, which the caller compares with *left, the number of octets that are there.
+DERReturn decodeHeader(DERItem der, DERDecodedInfo* decoded, uint64_t* left) {
+    if (der.length < 2)
+        return DERDecodeError;
+    Reader reader = {der.data, der.length};
+    if (!readTag(&reader, &decoded->tag) || !readLength(&reader, &decoded->content.length))
+        return DERDecodeError;
+    decoded->content.data = reader.next;
+    *left = reader.left;
+    return DERSuccess;
+}
+
+// Out of line, so that the short path below is small enough to be inlined into every walk.
+[[gnu::noinline]] DERReturn decodeAnyItem(DERItem der, DERDecodedInfo* decoded) {
+    uint64_t left = 0;
+    if (const DERReturn result = decodeHeader(der, decoded, &left); result != DERSuccess)
+        return result;
+    return decoded->content.length > left ? DERDecodeError : DERSuccess;
+}
+
+// Decodes the item at the start of `der`, all of which must be there. Nearly every item has one identifier octet and
+// one length octet: those need no more than this.
+inline DERReturn decodeWholeItem(DERItem der, DERDecodedInfo* decoded) {
+    if (der.length < 2)
+        return DERDecodeError;
+    const uint8_t identifier = der.data[0];
+    const uint8_t length = der.data[1];
+    if ((identifier & tagNumberBits) == tagNumberBits || (length & moreBit) != 0)
+        return decodeAnyItem(der, decoded);
+    if (length > der.length - 2)
+        return DERDecodeError;
+    decoded->tag = (identifier & tagNumberBits) | static_cast<uint64_t>(identifier & ~tagNumberBits)
+                                                      << classAndFormShift;
+    decoded->content = {der.data + 2, length};
+    return DERSuccess;
+}
+
+inline DERReturn decodeNext(DERSequence* sequence, DERDecodedInfo* decoded) {
+    if (sequence->next >= sequence->end)
+        return DEREndOfSequence;
+    const DERItem rest = {sequence->next, static_cast<uint64_t>(sequence->end - sequence->next)};
+    const DERReturn result = decodeWholeItem(rest, decoded);
+    if (result == DERSuccess)
+        sequence->next = decoded->content.data + decoded->content.length;
+    return result;
+}
+
+inline DERSequence walkOf(DERItem content) {
+    return {content.data, content.data + content.length};
+}
+
+bool isSequenceOrSet(DERTag tag) {
+    return (tag & ~UINT64_C(1)) == DERTagSequence;
+}
+
+bool hasOption(const DERItemSpec& row, unsigned option) {
+    return (row.options & option) != 0;
+}
+
+bool allOptional(const DERItemSpec* row, const DERItemSpec* end) {
+    while (row != end && hasOption(*row, DEROptionOptional))
+        ++row;
+    return row == end;
+}
+
+// The first row from `row` on that takes an item of `tag`, or null when a row that is not optional stands before it or
+// there is none.
+const DERItemSpec* matchingRow(const DERItemSpec* row, const DERItemSpec* end, DERTag tag) {
+    for (; row != end; ++row) {
+        if (row->tag == tag || hasOption(*row, DEROptionAnyTag))
+            return row;
+        if (!hasOption(*row, DEROptionOptional))
+            return nullptr;
+    }
+    return nullptr;
+}
+
+// Stores the item of the given encoding and content at its row's place.
+DERReturn storeItem(const DERItemSpec& row, const uint8_t* encoding, DERItem item, void* dest, uint64_t destSize) {
+    if (destSize < sizeof item || row.offset > destSize - sizeof item)
+        return DERBufferOverflow;
+    if (hasOption(row, DEROptionSaveDER)) {
+        item.length += static_cast<uint64_t>(item.data - encoding);
+        item.data = encoding;
+    }
+    // Records are packed by the caller's will, not ours: nothing promises that the place is aligned.
+    std::memcpy(static_cast<uint8_t*>(dest) + row.offset, &item, sizeof item);
+    return DERSuccess;
+}
+
+} // namespace
+
+DERReturn DERDecodeItem(const DERItem* der, DERDecodedInfo* decoded) {
+    return decodeWholeItem(*der, decoded);
+}
+
+DERReturn DERDecodeItemPartialBufferGetLength(const DERItem* der, DERDecodedInfo* decoded, uint64_t* declaredLength) {
+    if (declaredLength == nullptr)
+        return decodeWholeItem(*der, decoded);
+    uint64_t left = 0;
+    if (const DERReturn result = decodeHeader(*der, decoded, &left); result != DERSuccess)
+        return result;
+    *declaredLength = decoded->content.length;
+    if (decoded->content.length > left)
+        decoded->content.length = left;
+    return DERSuccess;
+}
+
+DERReturn DERDecodeItemPartialBuffer(const DERItem* der, DERDecodedInfo* decoded, bool allowPartial) {
+    uint64_t left = 0;
+    if (const DERReturn result = decodeHeader(*der, decoded, &left); result != DERSuccess)
+        return result;
+    if (!allowPartial && decoded->content.length > left)
+        return DERDecodeError;
+    // A length that is handed out unclipped must at least be one that a pointer difference can hold.
+    const uint64_t toTopOfMemory = UINTPTR_MAX - reinterpret_cast<uintptr_t>(decoded->content.data);
+    const uint64_t largest = toTopOfMemory < INT64_MAX ? toTopOfMemory : INT64_MAX;
+    return decoded->content.length > largest ? DERBufferOverflow : DERSuccess;
+}
+
+DERReturn DERDecodeSeqInit(const DERItem* der, DERTag* tagOut, DERSequence* sequence) {
+    DERDecodedInfo decoded;
+    if (const DERReturn result = decodeWholeItem(*der, &decoded); result != DERSuccess)
+        return result;
+    *tagOut = decoded.tag;
+    if (!isSequenceOrSet(decoded.tag))
+        return DERUnexpectedTag;
+    *sequence = walkOf(decoded.content);
+    return DERSuccess;
+}
+
+DERReturn DERDecodeSeqContentInit(const DERItem* content, DERSequence* sequence) {
+    *sequence = walkOf(*content);
+    return DERSuccess;
+}
+
+DERReturn DERDecodeSeqNext(DERSequence* sequence, DERDecodedInfo* decoded) {
+    return decodeNext(sequence, decoded);
+}
+
+DERReturn DERDecodeSequenceWithBlock(const DERItem* der, DERDecodeSequenceCallback callback, void* context) {
+    DERDecodedInfo decoded;
+    if (const DERReturn result = decodeWholeItem(*der, &decoded); result != DERSuccess)
+        return result;
+    if (!isSequenceOrSet(decoded.tag))
+        return DERUnexpectedTag;
+    return DERDecodeSequenceContentWithBlock(&decoded.content, callback, context);
+}
+
+DERReturn DERDecodeSequenceContentWithBlock(const DERItem* content, DERDecodeSequenceCallback callback, void* context) {
+    DERSequence sequence = walkOf(*content);
+    DERDecodedInfo decoded;
+    bool stop = false;
+    DERReturn result = decodeNext(&sequence, &decoded);
+    while (result == DERSuccess) {
+        result = callback(&decoded, &stop, context);
+        if (result == DERSuccess && stop)
+            return DERSuccess;
+        if (result == DERSuccess)
+            result = decodeNext(&sequence, &decoded);
+    }
+    return result == DEREndOfSequence ? DERSuccess : result;
+}
+
+DERReturn DERParseSequenceToObject(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs, void* dest,
+                                   uint64_t destSize, uint64_t sizeToZero) {
+    DERDecodedInfo decoded;
+    if (const DERReturn result = decodeWholeItem(*der, &decoded); result != DERSuccess)
+        return result;
+    if (decoded.tag != DERTagSequence)
+        return DERUnexpectedTag;
+    return DERParseSequenceContentToObject(&decoded.content, numItems, itemSpecs, dest, destSize, sizeToZero);
+}
+
+DERReturn DERParseSequenceContentToObject(const DERItem* content, uint16_t numItems, const DERItemSpec* itemSpecs,
+                                          void* dest, uint64_t destSize, uint64_t sizeToZero) {
+    DERSequence sequence = walkOf(*content);
+    if (sizeToZero != 0)
+        std::memset(dest, 0, static_cast<size_t>(sizeToZero));
+    if (numItems == 0)
+        return sequence.next == sequence.end ? DERSuccess : DERDecodeError;
+    const DERItemSpec* const endOfRows = itemSpecs + numItems;
+    for (const DERItemSpec* row = itemSpecs; row != endOfRows; ++row) {
+        const uint8_t* const encoding = sequence.next;
+        DERDecodedInfo decoded;
+        const DERReturn result = decodeNext(&sequence, &decoded);
+        if (result == DEREndOfSequence)
+            return allOptional(row, endOfRows) ? DERSuccess : DERIncompleteSequence;
+        if (result != DERSuccess)
+            return result;
+        row = matchingRow(row, endOfRows, decoded.tag);
+        if (row == nullptr)
+            return DERUnexpectedTag;
+        if (hasOption(*row, DEROptionSkip))
+            continue;
+        if (const DERReturn stored = storeItem(*row, encoding, decoded.content, dest, destSize); stored != DERSuccess)
+            return stored;
+    }
+    return sequence.next == sequence.end ? DERSuccess : DERDecodeError;
+}
+
+DERReturn DERParseSequence(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs, void* dest,
+                           uint64_t sizeToZero) {
+    return DERParseSequenceToObject(der, numItems, itemSpecs, dest, unbounded, sizeToZero);
+}
+
+DERReturn DERParseSequenceContent(const DERItem* content, uint16_t numItems, const DERItemSpec* itemSpecs, void* dest,
+                                  uint64_t sizeToZero) {
+    return DERParseSequenceContentToObject(content, numItems, itemSpecs, dest, unbounded, sizeToZero);
+}
+
+DERReturn DERParseInteger64(const DERItem* item, uint64_t* value) {
+    const uint8_t* octets = item->data;
+    const uint64_t length = item->length;
+    if (length == 0 || (octets[0] & 0x80) != 0)
+        return DERDecodeError;
+    const bool leadingZero = octets[0] == 0 && length > 1;
+    // A zero octet in front only keeps the next one from reading as negative (X.690 8.3.2).
+    if (leadingZero && (octets[1] & 0x80) == 0)
+        return DERDecodeError;
+    if (length > sizeof *value + (leadingZero ? 1 : 0))
+        return DERBufferOverflow;
+    uint64_t number = 0;
+    for (uint64_t i = 0; i < length; ++i)
+        number = number << 8 | octets[i];
+    *value = number;
+    return DERSuccess;
+}
+
+DERReturn DERParseInteger(const DERItem* item, uint32_t* value) {
+    uint64_t number = 0;
+    if (const DERReturn result = DERParseInteger64(item, &number); result != DERSuccess)
+        return result;
+    if (number > UINT32_MAX)
+        return DERBufferOverflow;
+    *value = static_cast<uint32_t>(number);
+    return DERSuccess;
+}
+
+DERReturn DERParseBoolean(const DERItem* item, bool* value) {
+    if (item->length != 1 || (item->data[0] != 0x00 && item->data[0] != 0xFF))
+        return DERDecodeError;
+    *value = item->data[0] != 0;
+    return DERSuccess;
+}
+
+DERReturn DERParseBooleanWithDefault(const DERItem* item, bool defaultValue, bool* value) {
+    if (item->length != 0)
+        return DERParseBoolean(item, value);
+    *value = defaultValue;
+    return DERSuccess;
+}
+
+DERReturn DERParseBitString(const DERItem* item, DERItem* bits, uint8_t* unusedBits) {
+    const DERItem content = *item;
+    *unusedBits = 0;
+    *bits = {nullptr, 0};
+    if (content.length == 0)
+        return DERDecodeError;
+    const uint8_t unused = content.data[0];
+    *unusedBits = unused;
+    if (content.length == 1)
+        return unused == 0 ? DERSuccess : DERDecodeError;
+    if (unused > 7 || (content.data[content.length - 1] & (0xFF >> (8 - unused))) != 0)
+        return DERDecodeError;
+    *bits = {content.data + 1, content.length - 1};
+    return DERSuccess;
+}
+
+bool DEROidCompare(const DERItem* oid1, const DERItem* oid2) {
+    if (oid1 == nullptr || oid2 == nullptr || oid1->data == nullptr || oid2->data == nullptr)
+        return false;
+    return oid1->length == oid2->length && std::memcmp(oid1->data, oid2->data, static_cast<size_t>(oid1->length)) == 0;
+}
