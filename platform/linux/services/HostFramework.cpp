@@ -3,9 +3,9 @@
 //   HandleMessage(in a{sv} request, out b completed, out a{sv} response)
 //
 // The request has the keys "messageStr" (s) and "messageDict" (a{sv}), either of which may be absent. The response has
-// "name", "statusCode", "response" and "error" (with "domain", "code" and "description"), the last two only when there is
-// one, and is empty when the request was completed with no response object. The environment variable VELTRA_BUS chooses
-// the bus: "system" (the default), "session", or a D-Bus address.
+// "name", "statusCode", "response" and "error" (with "domain", "code" and "description"), the last two only when there
+// is one, and is empty when the request was completed with no response object. The environment variable VELTRA_BUS
+// chooses the bus: "system" (the default), "session", or a D-Bus address.
 #include "platform/HostFramework.h"
 
 #include <algorithm>
@@ -172,8 +172,8 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     if (result >= 0)
         result = sd_bus_request_name(connection_->bus, name.c_str(), 0);
     if (result < 0) {
-        consoleLog(name + ": cannot own this name on the bus \"" + which + "\": " +
-                   (result == -EEXIST ? "another process owns it already" : bus::Failure(result).what()));
+        consoleLog(name + ": cannot own this name on the bus \"" + which +
+                   "\": " + (result == -EEXIST ? "another process owns it already" : bus::Failure(result).what()));
         return false;
     }
     return true;
