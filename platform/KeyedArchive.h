@@ -30,7 +30,8 @@ public:
 
     // The object under `rootKey`, or nothing when the archive has no such key. Raises ArchiveFailure when the contents
     // are malformed, hold another kind of object than the five (a fraction, an integer beyond 64 signed bits, a tagged
-    // item, null), a key twice in one map or an item of indefinite length, or nest deeper than 32.
+    // item, null), a key twice in one map or an item of indefinite length, nest deeper than 32, or hold more than
+    // 1048576 items, keys included.
     Value decode(std::string_view rootKey) const;
 
 private:

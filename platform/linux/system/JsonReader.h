@@ -15,10 +15,12 @@
 
 // Builds a Value from the events of the library's parser. Refuses what a Value cannot hold or what no honest writer
 // sends: fractions, integers beyond 64 signed bits, texts that are no UTF-8, a key that stands twice in one dictionary,
-// and collections nested deeper than `maximumNesting`. Declared sizes are never believed.
+// collections nested deeper than `maximumNesting`, and more than `maximumValues` values, since the smallest of them
+// takes one byte of input but some fifty of memory. Declared sizes are never believed.
 class ValueBuilder : public nlohmann::json_sax<nlohmann::json> {
 public:
     static constexpr std::size_t maximumNesting = 32;
+    static constexpr std::size_t maximumValues = std::size_t{1} << 20;
 
     // `nothingAllowed`: whether null stands for a value of nothing or is refused.
     explicit ValueBuilder(bool nothingAllowed) : nothingAllowed_(nothingAllowed) {}
@@ -91,6 +93,8 @@ private:
     }
 
     bool add(Value value) {
+        if (++values_ > maximumValues)
+            return refuse("more than " + std::to_string(maximumValues) + " values");
         if (levels_.empty()) {
             root_ = std::move(value);
             return true;
@@ -105,6 +109,7 @@ private:
 
     const bool nothingAllowed_;
     std::vector<Level> levels_;
+    std::size_t values_ = 0;
     Value root_;
     std::string refusal_;
 };

@@ -45,6 +45,8 @@ public:
 
 private:
     void item(std::size_t nesting) {
+        if (++items_ > maximumItems)
+            throw ArchiveFailure("more than " + std::to_string(maximumItems) + " items");
         require(1);
         const std::uint8_t first = bytes_[at_++];
         const std::uint64_t number = argument(first & 0x1F);
@@ -98,8 +100,11 @@ private:
             throw ArchiveFailure("an archive that was cut off");
     }
 
+    static constexpr std::size_t maximumItems = ValueBuilder::maximumValues;
+
     const Value::Data& bytes_;
     std::size_t at_ = 0;
+    std::size_t items_ = 0;
 };
 
 std::string archiveText(const std::string& text) {
@@ -108,8 +113,7 @@ std::string archiveText(const std::string& text) {
     return text;
 }
 
-// `nesting` counts the collections around the value.
-nlohmann::json archiveItem(const Value& value, std::size_t nesting) {
+nlohmann::json archiveItem(const Value& value) {
     if (value.isBoolean())
         return *value.boolean();
     if (value.isNumber())
@@ -120,18 +124,16 @@ nlohmann::json archiveItem(const Value& value, std::size_t nesting) {
         return nlohmann::json::binary(*data);
     if (value.isNothing())
         throw ArchiveFailure("a value of nothing");
-    if (nesting == ValueBuilder::maximumNesting)
-        throw ArchiveFailure("a nesting of more than " + std::to_string(ValueBuilder::maximumNesting));
 
     if (const Value::Array* array = value.array()) {
         nlohmann::json items = nlohmann::json::array();
         for (const Value& element : *array)
-            items.push_back(archiveItem(element, nesting + 1));
+            items.push_back(archiveItem(element));
         return items;
     }
     nlohmann::json entries = nlohmann::json::object();
     for (const auto& [key, element] : *value.dictionary())
-        entries[archiveText(key)] = archiveItem(element, nesting + 1);
+        entries[archiveText(key)] = archiveItem(element);
     return entries;
 }
 
@@ -139,8 +141,10 @@ nlohmann::json archiveItem(const Value& value, std::size_t nesting) {
 
 Value::Data archiveEncode(std::string_view rootKey, const Value& root) {
     nlohmann::json archive = nlohmann::json::object();
-    archive[archiveText(std::string(rootKey))] = archiveItem(root, 1);
-    return nlohmann::json::to_cbor(archive);
+    archive[archiveText(std::string(rootKey))] = archiveItem(root);
+    Value::Data bytes = nlohmann::json::to_cbor(archive);
+    HeadCheck(bytes).run(); // what could not be decoded again is no archive
+    return bytes;
 }
 
 std::optional<ArchiveDecoder> ArchiveDecoder::create(const Value::Data& bytes, Error* error) {
