@@ -78,6 +78,20 @@ SysConfigData dataOf(const DERItem& item) {
     return {const_cast<std::uint8_t*>(item.data), static_cast<std::uint32_t>(item.length)};
 }
 
+// Ends the decoding of a list whose entries were walked with the given result.
+template <typename List>
+bool finishList(DERReturn walked, List* list, const HashSeed& seed) {
+    constexpr char operation[] = "struct __SysConfig3 *__singledecodeSysConfig3(const uint8_t *, uint32_t)";
+    if (walked != DERSuccess) {
+        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(walked));
+        return false;
+    }
+    if (list->indexAll(seed))
+        return true;
+    logHook()(messageLevel, "%s malloc failed.", operation);
+    return false;
+}
+
 bool decodePayload(const DERItem& element, __SysConfig3* object) {
     DERDecodedInfo set;
     if (const DERReturn result = DERDecodeItem(&element, &set); result != DERSuccess) {
@@ -90,9 +104,7 @@ bool decodePayload(const DERItem& element, __SysConfig3* object) {
     }
     const DERReturn result =
         DERDecodeSequenceContentWithBlock(&set.content, _DERDecodeSysConfig3ParseAndPopulatePayloadSequence, object);
-    if (result != DERSuccess)
-        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result));
-    return result == DERSuccess;
+    return finishList(result, &object->payload, object->seed);
 }
 
 bool decodeMetadata(const DERItem& element, __SysConfig3* object) {
@@ -107,9 +119,7 @@ bool decodeMetadata(const DERItem& element, __SysConfig3* object) {
     }
     const DERReturn result =
         DERDecodeSequenceContentWithBlock(&set.content, _DERDecodeSysConfig3ParseAndPopulateMetadataSequence, object);
-    if (result != DERSuccess)
-        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result));
-    return result == DERSuccess;
+    return finishList(result, &object->metadata, object->seed);
 }
 
 bool installManifest(const ManifestItems& items, __SysConfig3* object) {
@@ -174,10 +184,8 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedIn
     __SysConfig3PayloadEntry* const entry = makeEntry(content);
     if (entry == nullptr)
         return outOfMemory;
-    if (adoptEntry(object, entry))
-        return DERSuccess;
-    deallocSysConfig3PayloadEntry(entry);
-    return outOfMemory;
+    object->payload.appendWithoutIndex(entry);
+    return DERSuccess;
 }
 
 DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo* decoded, bool*, void* context) {
@@ -203,10 +211,9 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
     __SysConfig3MetadataEntry* const entry = makeEntry(content);
     if (entry == nullptr)
         return outOfMemory;
-    if (adoptEntry(object, entry))
-        return DERSuccess;
-    deallocSysConfig3MetadataEntry(entry);
-    return outOfMemory;
+    entry->hash = hashOf(object->seed, keyOf(*entry));
+    object->metadata.appendWithoutIndex(entry);
+    return DERSuccess;
 }
 
 __SysConfig3* decodeSysConfig3(const std::uint8_t* data, std::uint32_t length) {

@@ -219,25 +219,6 @@ Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, co
     return entry;
 }
 
-// Changing lists
-
-// Takes the entry into the object's list in place of those with the same key. False, after reporting it, when memory is
-// lacking; the entry then still belongs to the caller.
-bool adoptEntry(__SysConfig3* object, __SysConfig3PayloadEntry* entry);
-bool adoptEntry(__SysConfig3* object, __SysConfig3MetadataEntry* entry);
-
-template <typename Entry, typename Key>
-bool adoptInto(EntryList<Entry, Key>* list, const HashSeed& seed, Entry* entry, const char* operation) {
-    if (!list->reserve(seed, 1)) {
-        logHook()(messageLevel, "%s malloc failed.", operation);
-        return false;
-    }
-    const std::uint32_t hash = entry->indexHash(seed);
-    list->remove(hash, entry->indexKey());
-    list->append(entry, hash);
-    return true;
-}
-
 // HMACs
 
 // True when the object's version has no HMACs or they are valid. Otherwise reports it for `operation`.

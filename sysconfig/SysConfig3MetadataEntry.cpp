@@ -7,8 +7,6 @@ using namespace sysconfig;
 
 constexpr char allocation[] = "struct __SysConfig3MetadataEntry *__singleallocSysConfig3MetadataEntry(const char *, "
                               "const uint8_t *, uint32_t, const char *)";
-constexpr char addition[] =
-    "bool _sysConfig3AddMetadataEntry(struct __SysConfig3 *__single, const struct __SysConfig3MetadataEntry *__single)";
 
 } // namespace
 
@@ -33,11 +31,6 @@ __SysConfig3MetadataEntry* sysconfig::makeEntry(const MetadataContent& content) 
     if (entry != nullptr)
         entry->keyLength = static_cast<std::uint32_t>(content.key.size());
     return entry;
-}
-
-bool sysconfig::adoptEntry(__SysConfig3* object, __SysConfig3MetadataEntry* entry) {
-    entry->hash = hashOf(object->seed, keyOf(*entry));
-    return adoptInto(&object->metadata, object->seed, entry, addition);
 }
 
 __SysConfig3MetadataEntry* allocSysConfig3MetadataEntry(const char* key, const std::uint8_t* data,
@@ -81,15 +74,19 @@ const __SysConfig3MetadataEntry* sysConfig3MetadataEntryGetNextEntry(const __Sys
 }
 
 bool _sysConfig3AddMetadataEntry(__SysConfig3* object, const __SysConfig3MetadataEntry* entry) {
+    constexpr char operation[] = "bool _sysConfig3AddMetadataEntry(struct __SysConfig3 *__single, const struct "
+                                 "__SysConfig3MetadataEntry *__single)";
     if (object == nullptr || entry == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", addition);
+        logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", operation);
         return false;
     }
     __SysConfig3MetadataEntry* const copy = copySysConfig3MetadataEntry(entry);
     if (copy == nullptr)
         return false;
-    if (adoptEntry(object, copy))
+    copy->hash = hashOf(object->seed, keyOf(*copy));
+    if (object->metadata.add(copy, object->seed))
         return true;
+    logHook()(messageLevel, "%s malloc failed.", operation);
     deallocSysConfig3MetadataEntry(copy);
     return false;
 }

@@ -7,8 +7,6 @@ using namespace sysconfig;
 
 constexpr char allocation[] = "struct __SysConfig3PayloadEntry *__single_allocSysConfig3PayloadEntryInternal(uint32_t, "
                               "const char *, const uint8_t *, uint32_t, const char *, bool)";
-constexpr char addition[] =
-    "bool _sysConfig3AddPayloadEntry(struct __SysConfig3 *__single, const struct __SysConfig3PayloadEntry *__single)";
 
 } // namespace
 
@@ -40,10 +38,6 @@ __SysConfig3PayloadEntry* sysconfig::makeEntry(const PayloadContent& content) {
     entry->commentLength = static_cast<std::uint32_t>(comment.size());
     entry->deleted = content.deleted ? trueOctet : falseOctet;
     return entry;
-}
-
-bool sysconfig::adoptEntry(__SysConfig3* object, __SysConfig3PayloadEntry* entry) {
-    return adoptInto(&object->payload, object->seed, entry, addition);
 }
 
 __SysConfig3PayloadEntry* _allocSysConfig3PayloadEntryInternal(std::uint32_t key, const char* comment,
@@ -117,15 +111,18 @@ bool sysConfig3PayloadEntryGetData(const __SysConfig3PayloadEntry* entry, SysCon
 }
 
 bool _sysConfig3AddPayloadEntry(__SysConfig3* object, const __SysConfig3PayloadEntry* entry) {
+    constexpr char operation[] = "bool _sysConfig3AddPayloadEntry(struct __SysConfig3 *__single, const struct "
+                                 "__SysConfig3PayloadEntry *__single)";
     if (object == nullptr || entry == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and etnry cannot be NULL", addition);
+        logHook()(messageLevel, "%s invalid argument. sysconfig and etnry cannot be NULL", operation);
         return false;
     }
     __SysConfig3PayloadEntry* const copy = copySysConfig3PayloadEntry(entry);
     if (copy == nullptr)
         return false;
-    if (adoptEntry(object, copy))
+    if (object->payload.add(copy, object->seed))
         return true;
+    logHook()(messageLevel, "%s malloc failed.", operation);
     deallocSysConfig3PayloadEntry(copy);
     return false;
 }
