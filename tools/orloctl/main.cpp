@@ -107,15 +107,19 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
     if (answer.outcome != Outcome::Success)
         return report(options, answer);
     const auto result = files::readWhole(resultPath);
+    Remarks remarks;
     if (!result)
-        return fail(options, Outcome::Usage,
-                    std::string("The result, ") + resultPath + " below the device root, cannot be read");
-    if (!copyPath.empty())
-        writeLocalFile(copyPath, *result);
-    Remarks remarks{std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes", ""};
-    if (result->empty())
+        remarks.note = std::string("the result, ") + resultPath + " below the device root, cannot be read";
+    else
+        remarks.result = std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes";
+    if (result && result->empty())
         remarks.note = "the result is empty: " + devicePath +
                        " is missing on the device, or is no configuration blob that can be rewritten";
+    if (!copyPath.empty()) {
+        if (!result)
+            return fail(options, Outcome::Usage, remarks.note);
+        writeLocalFile(copyPath, *result);
+    }
     return report(options, answer, remarks);
 }
 
