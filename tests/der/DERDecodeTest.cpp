@@ -81,7 +81,7 @@ TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
         {"length that fits the short form", "02 81 05 00 00 00 00 00"},
         {"length 127 in the long form", "02 81 7F"},
         {"length with a leading zero", "04 82 00 90"},
-        {"nine length octets", "04 89 01 00 00 00 00 00 00 00 00"},
+        {"nine length octets", "04 89 01 00 00 00 00 00 00 00 81"},
         {"one length octet missing", "04 82 01"},
         {"all length octets missing", "04 81"},
         {"length octets missing after a high tag", "1F 1F 82 01"},
