@@ -1,0 +1,256 @@
+#include "der/DEREncode.h"
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "der/DEREncodeInternal.h"
+#include "tests/der/Bytes.h"
+
+namespace {
+
+// Runs `encode(buffer, &length)` on buffers of exactly every size up to that of `expected`: only the last one is large
+// enough, and a smaller one leaves the length as it was.
+template <typename Encode>
+void expectEncoding(const std::string& expected, const Encode& encode) {
+    const std::uint64_t size = bytes(expected).size();
+    for (std::uint64_t i = 0; i <= size; ++i) {
+        Bytes buffer(i);
+        std::uint64_t length = i;
+        ASSERT_EQ(encode(buffer.data(), &length), i < size ? DERBufferOverflow : DERSuccess) << "buffer of " << i;
+        ASSERT_EQ(length, i);
+        if (i == size) {
+            EXPECT_EQ(hexOf(buffer), expected);
+        }
+    }
+    Bytes large(size + 5);
+    std::uint64_t length = large.size();
+    EXPECT_EQ(encode(large.data(), &length), DERSuccess);
+    EXPECT_EQ(length, size);
+}
+
+TEST(DEREncode, lengthsAreAsShortAsCanBe) {
+    const struct {
+        std::uint64_t length;
+        const char* octets;
+    } rows[] = {
+        {0, "00"},
+        {127, "7F"},
+        {128, "81 80"},
+        {200, "81 C8"},
+        {255, "81 FF"},
+        {256, "82 01 00"},
+        {0x010000, "83 01 00 00"},
+        {UINT64_MAX, "88 FF FF FF FF FF FF FF FF"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.length);
+        EXPECT_EQ(DERLengthOfLength(row.length), bytes(row.octets).size());
+        expectEncoding(row.octets, [&](std::uint8_t* buffer, std::uint64_t* length) {
+            return DEREncodeLength(row.length, buffer, length);
+        });
+    }
+}
+
+TEST(DEREncode, identifiersTakeTheHighFormFrom31On) {
+    const struct {
+        DERTag tag;
+        const char* octets;
+    } rows[] = {
+        {DERTagSet, "31"},
+        {DERTagContextPrimitive(30), "9E"},
+        {31, "1F 1F"},
+        {127, "1F 7F"},
+        {128, "1F 81 00"},
+        {DERTagPrivateConstructed(0x53504159), "FF 85 9A C1 82 59"},
+        {UINT64_MAX, "FF 9F FF FF FF FF FF FF FF 7F"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.octets);
+        expectEncoding(row.octets, [&](std::uint8_t* buffer, std::uint64_t* length) {
+            return DEREncodeTag(row.tag, buffer, length);
+        });
+    }
+}
+
+TEST(DEREncode, itemsAreHeaderAndContent) {
+    const Bytes four = bytes("0A 0B 0C 0D");
+    const struct {
+        DERTag tag;
+        std::uint64_t length;
+        const char* octets;
+    } rows[] = {
+        {0x05, 0, "05 00"},
+        {DERTagInteger, 4, "02 04 0A 0B 0C 0D"},
+        {DERTagPrivateConstructed(0x53504159), 2, "FF 85 9A C1 82 59 02 0A 0B"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.octets);
+        EXPECT_EQ(DERLengthOfItem(row.tag, row.length), bytes(row.octets).size());
+        const std::uint8_t* content = row.length == 0 ? nullptr : four.data();
+        expectEncoding(row.octets, [&](std::uint8_t* buffer, std::uint64_t* length) {
+            return DEREncodeItem(row.tag, row.length, content, buffer, length);
+        });
+    }
+}
+
+TEST(DEREncode, itemThatExceeds64BitsHasNoSize) {
+    const std::uint64_t largest = UINT64_MAX - 10;
+    EXPECT_EQ(DERLengthOfItem(DERTagInteger, largest), UINT64_MAX);
+    for (const std::uint64_t length : {largest + 1, UINT64_MAX}) {
+        EXPECT_EQ(DERLengthOfItem(DERTagInteger, length), 0U);
+        std::uint8_t buffer[16];
+        std::uint64_t written = 7;
+        EXPECT_EQ(DEREncodeItemSized(DERTagInteger, length, buffer, buffer, sizeof buffer, &written),
+                  DERBufferOverflow);
+        EXPECT_EQ(written, 7U);
+    }
+}
+
+struct Row {
+    DERTag tag;
+    unsigned options;
+    const char* content;
+};
+
+// A record and its table, made from rows of a test table.
+struct Object {
+    explicit Object(const std::vector<Row>& rows) {
+        for (const Row& row : rows) {
+            contents.push_back(bytes(row.content));
+            items.push_back(row.content == absent ? DERItem{} : itemOf(contents.back()));
+            specs.push_back({(items.size() - 1) * sizeof(DERItem), row.tag, static_cast<std::uint16_t>(row.options)});
+        }
+    }
+    std::uint16_t count() const { return static_cast<std::uint16_t>(specs.size()); }
+
+    static constexpr const char* absent = "";
+    std::vector<Bytes> contents;
+    std::vector<DERItem> items;
+    std::vector<DERItemSpec> specs;
+};
+
+TEST(DEREncode, sequencesFollowTheirTable) {
+    const std::string long130 = [] {
+        std::string text = "5A";
+        for (int i = 1; i < 130; ++i)
+            text += " 5A";
+        return text;
+    }();
+    const struct {
+        const char* what;
+        DERTag tag;
+        std::vector<Row> rows;
+        std::string octets;
+    } rows[] = {
+        {"empty set", DERTagSet, {}, "31 00"},
+        {"signed integer with bit 7",
+         DERTagSequence,
+         {{DERTagInteger, DEROptionSignedInteger, "80"}},
+         "30 04 02 02 00 80"},
+        {"signed integer without", DERTagSequence, {{DERTagInteger, DEROptionSignedInteger, "7F"}}, "30 03 02 01 7F"},
+        {"signed integer, empty",
+         DERTagSequence,
+         {{DERTagInteger, DEROptionSignedInteger, Object::absent}},
+         "30 02 02 00"},
+        {"unsigned integer with bit 7", DERTagSequence, {{DERTagInteger, 0, "80"}}, "30 03 02 01 80"},
+        {"optional item left out",
+         DERTagSequence,
+         {{DERTagOctetString, DEROptionOptional, Object::absent}, {DERTagBoolean, DEROptionOptional, "FF"}},
+         "30 03 01 01 FF"},
+        {"required item, empty", DERTagSequence, {{DERTagOctetString, 0, Object::absent}}, "30 02 04 00"},
+        {"whole encodings",
+         DERTagSequence,
+         {{DERTagBoolean, DEROptionWriteDER, "30 03 02 01 05"},
+          {DERTagBoolean, DEROptionWriteDER, Object::absent},
+          {DERTagInteger, DEROptionWriteDER | DEROptionSignedInteger, "80"}},
+         "30 06 30 03 02 01 05 80"},
+        {"options of the decoder",
+         DERTagSequence,
+         {{0x13, DEROptionAnyTag | DEROptionSkip | DEROptionSaveDER, "41"}},
+         "30 03 13 01 41"},
+        {"set in table order", DERTagSet, {{0x13, 0, "42"}, {DERTagBoolean, 0, "00"}}, "31 06 13 01 42 01 01 00"},
+        {"long content, high tag",
+         DERTagPrivateConstructed(0x53504159),
+         {{DERTagOctetString, 0, long130.c_str()}},
+         "FF 85 9A C1 82 59 81 85 04 81 82 " + long130},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        const Object object(row.rows);
+        const std::uint64_t objectSize = object.items.size() * sizeof(DERItem);
+        const std::uint64_t size = bytes(row.octets).size();
+        std::uint64_t measured = 0;
+        EXPECT_EQ(DERLengthOfEncodedSequenceFromObject(row.tag, object.items.data(), objectSize, object.count(),
+                                                       object.specs.data(), &measured),
+                  DERSuccess);
+        EXPECT_EQ(measured, size);
+        EXPECT_EQ(DERLengthOfEncodedSequence(row.tag, object.items.data(), object.count(), object.specs.data()), size);
+        expectEncoding(row.octets, [&](std::uint8_t* buffer, std::uint64_t* length) {
+            return DEREncodeSequenceFromObject(row.tag, object.items.data(), objectSize, object.count(),
+                                               object.specs.data(), buffer, *length, length);
+        });
+        expectEncoding(row.octets, [&](std::uint8_t* buffer, std::uint64_t* length) {
+            return DEREncodeSequence(row.tag, object.items.data(), object.count(), object.specs.data(), buffer, length);
+        });
+    }
+}
+
+TEST(DEREncode, rowsOutsideTheRecordAreRefused) {
+    const DERItem items[5] = {};
+    const struct {
+        std::uint64_t offset;
+        std::uint64_t objectSize;
+        DERReturn code;
+    } rows[] = {
+        {0x40, 0x50, DERSuccess},
+        {0x40, 0x48, DERBufferOverflow},
+        {0, 8, DERBufferOverflow},
+        {UINT64_MAX - 15, 0x50, DERBufferOverflow},
+        {UINT64_MAX - 7, UINT64_MAX, DERBufferOverflow},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.offset);
+        const DERItemSpec specs[] = {{0, DERTagOctetString, 0}, {row.offset, DERTagOctetString, 0}};
+        const bool good = row.code == DERSuccess;
+        std::uint64_t size = 7;
+        EXPECT_EQ(DERLengthOfSequenceContent(items, row.objectSize, 2, specs, &size), row.code);
+        EXPECT_EQ(size, good ? 4 : 0);
+        size = 7;
+        EXPECT_EQ(DERLengthOfEncodedSequenceFromObject(DERTagSet, items, row.objectSize, 2, specs, &size), row.code);
+        EXPECT_EQ(size, good ? 6 : 7);
+        std::uint8_t buffer[64];
+        std::uint64_t written = 7;
+        EXPECT_EQ(
+            DEREncodeSequenceFromObject(DERTagSet, items, row.objectSize, 2, specs, buffer, sizeof buffer, &written),
+            row.code);
+        EXPECT_EQ(written, good ? 6 : 7);
+    }
+}
+
+TEST(DEREncode, sequenceThatExceeds64BitsHasNoSize) {
+    const std::uint8_t octet = 0x80;
+    const struct {
+        DERItem items[2];
+        unsigned options;
+    } rows[] = {
+        {{{&octet, UINT64_C(1) << 63}, {&octet, UINT64_C(1) << 63}}, DEROptionWriteDER},
+        {{{&octet, UINT64_C(1) << 63}, {&octet, UINT64_C(1) << 63}}, 0},
+        {{{&octet, 1}, {&octet, UINT64_MAX}}, 0},
+        {{{&octet, 1}, {&octet, UINT64_MAX}}, DEROptionSignedInteger},
+        {{{&octet, 1}, {&octet, UINT64_MAX - 5}}, DEROptionWriteDER},
+    };
+    for (const auto& row : rows) {
+        const auto options = static_cast<std::uint16_t>(row.options);
+        const DERItemSpec specs[] = {{0, DERTagInteger, options}, {sizeof(DERItem), DERTagInteger, options}};
+        EXPECT_EQ(DERLengthOfEncodedSequence(DERTagSequence, row.items, 2, specs), 0U);
+        std::uint8_t buffer[64];
+        std::uint64_t length = sizeof buffer;
+        EXPECT_EQ(DEREncodeSequence(DERTagSequence, row.items, 2, specs, buffer, &length), DERBufferOverflow);
+        EXPECT_EQ(length, sizeof buffer);
+    }
+}
+
+} // namespace

@@ -1,0 +1,194 @@
+// Records filled from item-spec tables.
+#include <cstring>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "der/DERDecode.h"
+#include "tests/der/Bytes.h"
+
+namespace {
+
+using Table = std::vector<DERItemSpec>;
+
+constexpr std::uint64_t place(std::uint64_t index) {
+    return index * sizeof(DERItem);
+}
+
+// A record whose items all view one known octet, so that "untouched" can be told from "absent".
+struct Record {
+    static constexpr std::uint8_t mark = 0x5A;
+    DERItem items[3] = {{&mark, 1}, {&mark, 1}, {&mark, 1}};
+};
+
+std::string textOf(const Record& record) {
+    std::string text;
+    for (const DERItem& item : record.items)
+        text += (text.empty() ? "" : " | ") + (item.data == &Record::mark ? "untouched" : hexOf(item));
+    return text;
+}
+
+const Table plain = {
+    {place(0), DERTagInteger, 0},
+    {place(1), DERTagContextPrimitive(0), DEROptionOptional},
+    {place(2), DERTagOctetString, 0},
+};
+const Table optionalEnd = {
+    {place(0), DERTagInteger, 0},
+    {place(1), DERTagBoolean, DEROptionOptional},
+    {place(2), DERTagOctetString, DEROptionOptional},
+};
+const Table anyTag = {
+    {place(0), DERTagObjectIdentifier, 0},
+    {place(1), 0, DEROptionOptional | DEROptionAnyTag | DEROptionSaveDER},
+};
+const Table skipping = {
+    {UINT64_MAX, DERTagInteger, DEROptionSkip},
+    {place(1), DERTagSequence, DEROptionSaveDER},
+    {UINT64_MAX, 0, DEROptionSkip | DEROptionAnyTag},
+};
+const Table encoderOptions = {{place(1), DERTagInteger, DEROptionSignedInteger | DEROptionWriteDER}};
+
+TEST(DERRecord, isFilledRowByRow) {
+    const struct {
+        const char* what;
+        const Table& table;
+        const char* content;
+        DERReturn code;
+        const char* record;
+    } rows[] = {
+        {"every row matched", plain, "02 01 05 80 01 AA 04 00", DERSuccess, "05 | AA | "},
+        {"optional row missing", plain, "02 01 05 04 01 BB", DERSuccess, "05 | absent | BB"},
+        {"required row missing at the end", plain, "02 01 05", DERIncompleteSequence, "05 | absent | absent"},
+        {"nothing at all", plain, "", DERIncompleteSequence, "absent | absent | absent"},
+        {"required row missing though a later one matches", plain, "04 01 BB", DERUnexpectedTag,
+         "absent | absent | absent"},
+        {"form differs", plain, "02 01 05 A0 00 04 00", DERUnexpectedTag, "05 | absent | absent"},
+        {"class differs", plain, "82 01 05", DERUnexpectedTag, "absent | absent | absent"},
+        {"item twice", plain, "02 01 05 80 00 80 00", DERUnexpectedTag, "05 |  | absent"},
+        {"item behind the last row", plain, "02 01 05 04 01 BB 05 00", DERDecodeError, "05 | absent | BB"},
+        {"octet behind the last row", plain, "02 01 05 04 01 BB 05", DERDecodeError, "05 | absent | BB"},
+        {"bad item", plain, "02 01 05 80 02 AA", DERDecodeError, "05 | absent | absent"},
+        {"optional rows missing at the end", optionalEnd, "02 01 05", DERSuccess, "05 | absent | absent"},
+        {"last of the optional rows", optionalEnd, "02 01 05 04 01 BB", DERSuccess, "05 | absent | BB"},
+        {"optional rows out of order", optionalEnd, "02 01 05 04 00 01 00", DERDecodeError, "05 | absent | "},
+        {"no row left that matches", optionalEnd, "02 01 05 05 00", DERUnexpectedTag, "05 | absent | absent"},
+        {"any tag, saved whole", anyTag, "06 01 2A FF 1F 81 80", DERDecodeError, "2A | absent | absent"},
+        {"any tag with a long header", anyTag, "06 01 2A FF 85 9A C1 82 59 01 EE", DERSuccess,
+         "2A | FF 85 9A C1 82 59 01 EE | absent"},
+        {"any tag missing", anyTag, "06 01 2A", DERSuccess, "2A | absent | absent"},
+        {"skipped rows are consumed", skipping, "02 01 05 30 02 05 00 13 00", DERSuccess,
+         "absent | 30 02 05 00 | absent"},
+        {"skipped row missing", skipping, "30 00", DERUnexpectedTag, "absent | absent | absent"},
+        {"octets behind a skipped last row", skipping, "02 01 05 30 00 13 00 13 00", DERDecodeError,
+         "absent | 30 00 | absent"},
+        {"options of the encoder", encoderOptions, "02 02 00 80", DERSuccess, "absent | 00 80 | absent"},
+        {"no rows, no content", {}, "", DERSuccess, "absent | absent | absent"},
+        {"no rows but content", {}, "05 00", DERDecodeError, "absent | absent | absent"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        const Bytes input = bytes(row.content);
+        const DERItem content = itemOf(input);
+        const auto count = static_cast<std::uint16_t>(row.table.size());
+        Record record;
+        EXPECT_EQ(
+            DERParseSequenceContentToObject(&content, count, row.table.data(), &record, sizeof record, sizeof record),
+            row.code);
+        EXPECT_EQ(textOf(record), row.record);
+
+        Record again;
+        EXPECT_EQ(DERParseSequenceContent(&content, count, row.table.data(), &again, sizeof again), row.code);
+        EXPECT_EQ(textOf(again), row.record);
+
+        Bytes sequence = {0x30, static_cast<std::uint8_t>(input.size())};
+        sequence.insert(sequence.end(), input.begin(), input.end());
+        const DERItem der = itemOf(sequence);
+        EXPECT_EQ(DERParseSequence(&der, count, row.table.data(), &again, sizeof again), row.code);
+        EXPECT_EQ(textOf(again), row.record);
+    }
+}
+
+TEST(DERRecord, isZeroedAsFarAsAskedWhateverFollows) {
+    const Bytes input = bytes("02 01 05 04 01 BB");
+    const DERItem content = itemOf(input);
+    const DERItem bad = {input.data(), 1};
+    const struct {
+        DERItem content;
+        std::uint64_t sizeToZero;
+        DERReturn code;
+        const char* record;
+    } rows[] = {
+        {content, 0, DERSuccess, "05 | untouched | BB"},
+        {content, place(2), DERSuccess, "05 | absent | BB"},
+        {bad, 0, DERDecodeError, "untouched | untouched | untouched"},
+        {bad, place(1), DERDecodeError, "absent | untouched | untouched"},
+    };
+    for (const auto& row : rows) {
+        Record record;
+        EXPECT_EQ(DERParseSequenceContent(&row.content, 3, plain.data(), &record, row.sizeToZero), row.code);
+        EXPECT_EQ(textOf(record), row.record);
+    }
+}
+
+TEST(DERRecord, isNeverWrittenBeyondItsSize) {
+    const struct {
+        std::uint64_t offset;
+        std::uint64_t destSize;
+        const char* content;
+        DERReturn code;
+    } rows[] = {
+        {16, 32, "02 01 05", DERSuccess},
+        {16, 31, "02 01 05", DERBufferOverflow},
+        {17, 32, "02 01 05", DERBufferOverflow},
+        {0, 15, "02 01 05", DERBufferOverflow},
+        {UINT64_MAX - 15, 48, "02 01 05", DERBufferOverflow},
+        {UINT64_MAX - 7, UINT64_MAX, "02 01 05", DERBufferOverflow},
+        {UINT64_MAX, 0, "", DERSuccess},
+    };
+    for (const auto& row : rows) {
+        const DERItemSpec spec = {row.offset, DERTagInteger, DEROptionOptional};
+        const Bytes input = bytes(row.content);
+        const DERItem content = itemOf(input);
+        Record record;
+        EXPECT_EQ(DERParseSequenceContentToObject(&content, 1, &spec, &record, row.destSize, 0), row.code)
+            << row.offset << " in " << row.destSize;
+        EXPECT_EQ(textOf(record), row.offset == 16 && row.code == DERSuccess ? "untouched | 05 | untouched"
+                                                                             : "untouched | untouched | untouched");
+    }
+}
+
+TEST(DERRecord, needNotBeAligned) {
+    const DERItemSpec spec = {3, DERTagInteger, 0};
+    const Bytes input = bytes("02 01 05");
+    const DERItem content = itemOf(input);
+    std::uint8_t record[3 + sizeof(DERItem)] = {};
+    ASSERT_EQ(DERParseSequenceContentToObject(&content, 1, &spec, record, sizeof record, 0), DERSuccess);
+    DERItem stored;
+    std::memcpy(&stored, record + 3, sizeof stored);
+    EXPECT_EQ(hexOf(stored), "05");
+}
+
+TEST(DERRecord, isLeftAloneUnlessTheItemIsASequence) {
+    const struct {
+        const char* der;
+        DERReturn code;
+        const char* record;
+    } rows[] = {
+        {"30 03 02 01 05 FF FF", DERSuccess, "05 | absent | absent"},
+        {"31 03 02 01 05", DERUnexpectedTag, "untouched | untouched | untouched"},
+        {"30 03 02 01", DERDecodeError, "untouched | untouched | untouched"},
+    };
+    for (const auto& row : rows) {
+        const Bytes input = bytes(row.der);
+        const DERItem der = itemOf(input);
+        Record record;
+        EXPECT_EQ(DERParseSequenceToObject(&der, 3, optionalEnd.data(), &record, sizeof record, sizeof record),
+                  row.code)
+            << row.der;
+        EXPECT_EQ(textOf(record), row.record) << row.der;
+    }
+}
+
+} // namespace
