@@ -9,6 +9,10 @@ constexpr uint8_t moreBit = 0x80;
 constexpr unsigned classAndFormShift = 56;
 constexpr uint64_t unbounded = UINT64_MAX;
 
+constexpr DERTag tagWord(uint8_t firstIdentifierOctet, uint64_t number) {
+    return number | static_cast<uint64_t>(firstIdentifierOctet & ~tagNumberBits) << classAndFormShift;
+}
+
 // The octets of an item that are not read yet.
 struct Reader {
     const uint8_t* next;
@@ -43,7 +47,7 @@ bool readTag(Reader* reader, DERTag* tag) {
     uint64_t number = first & tagNumberBits;
     if (number == tagNumberBits && !readHighTagNumber(reader, &number))
         return false;
-    *tag = number | static_cast<uint64_t>(first & ~tagNumberBits) << classAndFormShift;
+    *tag = tagWord(first, number);
     return true;
 }
 
@@ -80,39 +84,51 @@ DERReturn decodeHeader(DERItem der, DERDecodedInfo* decoded, uint64_t* left) {
     return DERSuccess;
 }
 
-// Out of line, so that the short path below is small enough to be inlined into every walk.
-[[gnu::noinline]] DERReturn decodeAnyItem(DERItem der, DERDecodedInfo* decoded) {
+// The short path: nearly every item has one identifier octet and one length octet and lies inside its surroundings.
+// Decodes such an item; says false, and refuses nothing, for any other.
+inline bool decodeShortItem(DERItem der, DERDecodedInfo* decoded) {
+    if (der.length < 2)
+        return false;
+    const uint8_t identifier = der.data[0];
+    const uint8_t length = der.data[1];
+    if ((identifier & tagNumberBits) == tagNumberBits || (length & moreBit) != 0 || length > der.length - 2)
+        return false;
+    decoded->tag = tagWord(identifier, identifier & tagNumberBits);
+    decoded->content = {der.data + 2, length};
+    return true;
+}
+
+// Out of line, as is the next but one, so that the short path is small enough to be inlined into every walk.
+[[gnu::noinline]] DERReturn decodeItemOfAnyForm(DERItem der, DERDecodedInfo* decoded) {
     uint64_t left = 0;
     if (const DERReturn result = decodeHeader(der, decoded, &left); result != DERSuccess)
         return result;
     return decoded->content.length > left ? DERDecodeError : DERSuccess;
 }
 
-// Decodes the item at the start of `der`, all of which must be there. Nearly every item has one identifier octet and
-// one length octet: those need no more than this.
+// Decodes the item at the start of `der`, all of which must be there.
 inline DERReturn decodeWholeItem(DERItem der, DERDecodedInfo* decoded) {
-    if (der.length < 2)
-        return DERDecodeError;
-    const uint8_t identifier = der.data[0];
-    const uint8_t length = der.data[1];
-    if ((identifier & tagNumberBits) == tagNumberBits || (length & moreBit) != 0)
-        return decodeAnyItem(der, decoded);
-    if (length > der.length - 2)
-        return DERDecodeError;
-    decoded->tag = (identifier & tagNumberBits) | static_cast<uint64_t>(identifier & ~tagNumberBits)
-                                                      << classAndFormShift;
-    decoded->content = {der.data + 2, length};
-    return DERSuccess;
+    return decodeShortItem(der, decoded) ? DERSuccess : decodeItemOfAnyForm(der, decoded);
+}
+
+inline DERItem restOf(const DERSequence& sequence) {
+    return {sequence.next, static_cast<uint64_t>(sequence.end - sequence.next)};
+}
+
+[[gnu::noinline]] DERReturn decodeNextOfAnyForm(DERSequence* sequence, DERDecodedInfo* decoded) {
+    const DERReturn result = decodeItemOfAnyForm(restOf(*sequence), decoded);
+    if (result == DERSuccess)
+        sequence->next = decoded->content.data + decoded->content.length;
+    return result;
 }
 
 inline DERReturn decodeNext(DERSequence* sequence, DERDecodedInfo* decoded) {
     if (sequence->next >= sequence->end)
         return DEREndOfSequence;
-    const DERItem rest = {sequence->next, static_cast<uint64_t>(sequence->end - sequence->next)};
-    const DERReturn result = decodeWholeItem(rest, decoded);
-    if (result == DERSuccess)
-        sequence->next = decoded->content.data + decoded->content.length;
-    return result;
+    if (!decodeShortItem(restOf(*sequence), decoded))
+        return decodeNextOfAnyForm(sequence, decoded);
+    sequence->next = decoded->content.data + decoded->content.length;
+    return DERSuccess;
 }
 
 inline DERSequence walkOf(DERItem content) {

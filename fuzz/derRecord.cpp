@@ -1,0 +1,141 @@
+// A record filled by a table, both made from the input, and written again.
+#include <algorithm>
+#include <memory>
+#include <vector>
+
+#include "der/DERDecode.h"
+#include "der/DEREncode.h"
+#include "fuzz/Fuzz.h"
+#include "fuzz/derRecordInput.h"
+
+namespace {
+
+using namespace recordInput;
+
+struct Case {
+    std::vector<DERItemSpec> specs;
+    std::uint64_t recordItems = 0;
+    DERItem content = {};
+
+    std::uint16_t count() const { return static_cast<std::uint16_t>(specs.size()); }
+};
+
+bool readCase(const std::uint8_t* data, std::size_t size, Case* out) {
+    if (size < 2)
+        return false;
+    const std::uint64_t rows = data[0] % (mostRows + 1U);
+    out->recordItems = data[1] % (mostRows + 1U);
+    const std::uint8_t* next = data + 2;
+    const std::uint8_t* const end = data + size;
+    if (static_cast<std::uint64_t>(end - next) < 2 * rows)
+        return false;
+    for (std::uint64_t row = 0; row < rows; ++row, next += 2) {
+        unsigned options = next[1] & decoderOptions;
+        options |= (next[1] & signedInteger) != 0 ? DEROptionSignedInteger : 0U;
+        options |= (next[1] & writeDER) != 0 ? DEROptionWriteDER : 0U;
+        const std::uint64_t offset = (next[1] & farAway) != 0 ? UINT64_MAX - row : row * sizeof(DERItem);
+        out->specs.push_back({offset, tags[next[0] % tags.size()], static_cast<std::uint16_t>(options)});
+    }
+    out->content = {next, static_cast<std::uint64_t>(end - next)};
+    return true;
+}
+
+bool isInside(const DERItem& item, const DERItem& outer) {
+    return item.data >= outer.data && item.data <= outer.data + outer.length &&
+           item.length <= static_cast<std::uint64_t>(outer.data + outer.length - item.data);
+}
+
+void checkStored(const Case& input, const std::vector<DERItem>& record) {
+    for (std::uint64_t i = 0; i < record.size(); ++i) {
+        const DERItem& item = record[i];
+        if (item.data == nullptr) {
+            FUZZ_REQUIRE(item.length == 0);
+            continue;
+        }
+        FUZZ_REQUIRE(i < input.specs.size() && isInside(item, input.content));
+        const unsigned options = input.specs[i].options;
+        FUZZ_REQUIRE((options & DEROptionSkip) == 0);
+        if ((options & DEROptionSaveDER) == 0)
+            continue;
+        DERDecodedInfo decoded;
+        FUZZ_REQUIRE(DERDecodeItem(&item, &decoded) == DERSuccess);
+        FUZZ_REQUIRE(decoded.content.data + decoded.content.length == item.data + item.length);
+        FUZZ_REQUIRE((options & DEROptionAnyTag) != 0 || decoded.tag == input.specs[i].tag);
+    }
+}
+
+// Writes the record into a buffer of exactly the measured size, and fails to with an octet less.
+std::vector<std::uint8_t> encode(const std::vector<DERItem>& record, const std::vector<DERItemSpec>& specs) {
+    const auto count = static_cast<std::uint16_t>(specs.size());
+    const std::uint64_t recordSize = record.size() * sizeof(DERItem);
+    std::uint64_t measured = 0;
+    const DERReturn result =
+        DERLengthOfEncodedSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(), &measured);
+    std::uint64_t written = 0;
+    if (result != DERSuccess) {
+        std::uint8_t scratch[4];
+        FUZZ_REQUIRE(result == DERBufferOverflow);
+        FUZZ_REQUIRE(DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(),
+                                                 scratch, sizeof scratch, &written) == DERBufferOverflow);
+        return {};
+    }
+    std::vector<std::uint8_t> encoded(measured);
+    FUZZ_REQUIRE(DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(),
+                                             encoded.data(), measured, &written) == DERSuccess);
+    FUZZ_REQUIRE(written == measured);
+    const auto shorter = std::make_unique<std::uint8_t[]>(measured - 1);
+    FUZZ_REQUIRE(DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(),
+                                             shorter.get(), measured - 1, &written) == DERBufferOverflow);
+    return encoded;
+}
+
+// True when a filled record holds all that its content held.
+bool keepsEverything(const Case& input, const std::vector<DERItem>& record) {
+    for (std::uint64_t i = 0; i < input.specs.size(); ++i) {
+        const unsigned options = input.specs[i].options;
+        const bool saved = (options & DEROptionSaveDER) != 0;
+        const bool emptyButThere = i < record.size() && record[i].data != nullptr && record[i].length == 0;
+        if ((options & DEROptionSkip) != 0 || ((options & DEROptionAnyTag) != 0 && !saved) ||
+            ((options & DEROptionOptional) != 0 && emptyButThere))
+            return false;
+    }
+    return true;
+}
+
+// What was parsed, written by the same table, is the content that it came from.
+void checkWrittenBack(const Case& input, const std::vector<DERItem>& record) {
+    std::vector<DERItemSpec> specs = input.specs;
+    for (DERItemSpec& spec : specs) {
+        const unsigned write = (spec.options & DEROptionSaveDER) != 0 ? DEROptionWriteDER : 0;
+        spec.options = static_cast<std::uint16_t>((spec.options & DEROptionOptional) | write);
+        // A row that matched nothing may lie anywhere; one with a place must have it for the writer.
+        if (spec.offset > record.size() * sizeof(DERItem) - sizeof(DERItem) || record.empty())
+            return;
+    }
+    const std::vector<std::uint8_t> encoded = encode(record, specs);
+    const DERItem der = {encoded.data(), encoded.size()};
+    DERDecodedInfo decoded;
+    FUZZ_REQUIRE(DERDecodeItem(&der, &decoded) == DERSuccess && decoded.tag == DERTagSequence);
+    FUZZ_REQUIRE(std::equal(decoded.content.data, decoded.content.data + decoded.content.length, input.content.data,
+                            input.content.data + input.content.length));
+}
+
+} // namespace
+
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    Case input;
+    if (!readCase(data, size, &input))
+        return 0;
+    // The record has no spare capacity, so that the address sanitizer sees a write beyond it.
+    std::vector<DERItem> record(input.recordItems, DERItem{data, size + 1});
+    const std::uint64_t recordSize = record.size() * sizeof(DERItem);
+    const DERReturn result = DERParseSequenceContentToObject(&input.content, input.count(), input.specs.data(),
+                                                             record.data(), recordSize, recordSize);
+    FUZZ_REQUIRE(result == DERSuccess || result == DERUnexpectedTag || result == DERDecodeError ||
+                 result == DERIncompleteSequence || result == DERBufferOverflow);
+    checkStored(input, record);
+    encode(record, input.specs);
+    if (result == DERSuccess && keepsEverything(input, record))
+        checkWrittenBack(input, record);
+    return 0;
+}
