@@ -2,7 +2,6 @@
 
 #include "der/DEREncode.h"
 
-#include <cstdio>
 #include <stdexcept>
 #include <string>
 
@@ -178,19 +177,22 @@ Bytes exampleContainer() {
                                   property("rbig", integer(0x100000000)), property("rdbg", boolean(true))}));
 }
 
+std::string largeObjectName(unsigned number) {
+    return {'o', static_cast<char>('0' + number / 100 % 10), static_cast<char>('0' + number / 10 % 10),
+            static_cast<char>('0' + number % 10)};
+}
+
 Bytes largeManifest(unsigned objects) {
     Manifest large;
     large.properties = {property("brdI", integer(12)), property("chpI", integer(0x1234)),
                         property("devI", integer(0x12345678ABCD))};
     for (unsigned i = 0; i < objects; ++i) {
-        char name[8];
-        std::snprintf(name, sizeof name, "o%03u", i % 1000);
         List properties = imageProperties(static_cast<std::uint8_t>(i));
         properties.push_back(property("digA", octets(filler(48, 4))));
-        properties.push_back(property("size", integer(i * 1000ULL)));
+        properties.push_back(property("size", integer(i * std::uint64_t{1000})));
         properties.push_back(property("digC", octets(filler(32, 5))));
         properties.push_back(property("eksp", boolean(true)));
-        large.objects.push_back(object(name, properties));
+        large.objects.push_back(object(largeObjectName(i), properties));
     }
     return manifest(large);
 }

@@ -7,6 +7,7 @@
 #include "der/DERTypes.h"
 
 #include <cstdint>
+#include <string>
 #include <string_view>
 #include <vector>
 
@@ -72,8 +73,11 @@ Bytes exampleTicket(bool entitled = true);
 // and restore information.
 Bytes exampleContainer();
 
-// A manifest of `objects` objects with eight properties each, named "o000", "o001" and so on.
+// A manifest of at most a thousand objects with equally many properties each, the last of them "eksp", and the name of
+// the object with the given number.
+constexpr unsigned propertiesOfLargeObject = 8;
 Bytes largeManifest(unsigned objects);
+std::string largeObjectName(unsigned number);
 
 } // namespace img4maker
 
