@@ -119,7 +119,7 @@ void run(benchmark::State& state, LookUp lookUp, unsigned objects) {
     const img4maker::Bytes manifest = img4maker::largeManifest(objects);
     const std::string last = img4maker::largeObjectName(objects - 1);
     const Wanted wanted = {img4maker::fourCC(last), img4maker::fourCC("eksp")};
-    for (auto _ : state) {
+    while (state.KeepRunning()) {
         bool value = false;
         if (!lookUp(manifest, wanted, &value) || !value) {
             state.SkipWithError("the property was not found");
