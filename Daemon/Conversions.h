@@ -22,7 +22,7 @@ private:
 };
 
 // The keyed archive of `dictionary` under the root key "HSArchiverKey", as data; nothing for nothing. Raises
-// ArchiveFailure (platform/KeyedArchive.h) for a dictionary that holds a value of nothing.
+// ArchiveFailure for a dictionary that archiveEncode (platform/KeyedArchive.h) refuses.
 Value convertDictionaryToData(const Value& dictionary);
 
 // The object under the root key "HSArchiverKey" of the archive in `data`; nothing for nothing, and when the bytes are
@@ -33,13 +33,14 @@ Value convertDataToDictionary(const Value& data);
 // Two lower-case hexadecimal digits a byte, as text; nothing for nothing and for empty data.
 Value DatatoHexString(const Value& data);
 
-// One character for each pair of hexadecimal digits, as text; nothing for an odd number of characters. A pair is read
-// as strtol reads base 16, so a pair without a digit is U+0000. Values from 0x80 on are the code points U+0080 to
-// U+00FF.
+// One character for each pair of hexadecimal digits, as text; nothing for an odd number of characters. White space at
+// the start of a pair is skipped and its digits are read as far as they go, so a pair without a digit is U+0000. Values
+// from 0x80 on are the code points U+0080 to U+00FF.
 Value stringFromHexString(std::string_view text);
 
 // The bytes that the pairs of hexadecimal digits in `text` name; "0x", "0X" and blanks are left out first. Raises
-// ConversionFailure "IllegalInput" for an odd number of characters and for a pair that does not start with a digit.
+// ConversionFailure "IllegalInput" for an odd number of characters and for a pair that does not start with a digit,
+// white space apart.
 Value::Data hexString2Binary(std::string_view text);
 
 // Base64 (RFC 4648, padded) in one line.

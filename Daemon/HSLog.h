@@ -4,7 +4,9 @@
 #ifndef VELTRA_DAEMON_HS_LOG_H
 #define VELTRA_DAEMON_HS_LOG_H
 
+#include <ctime>
 #include <initializer_list>
+#include <string>
 #include <string_view>
 
 #include "platform/Format.h"
@@ -23,6 +25,9 @@ void logInit(const char* name);
 // Formats the arguments and writes the line, prefixed with the local time (12-hour clock) and a hyphen. A level other
 // than 1 to 4 goes to the log file only. Never fails outward.
 void newLog(int level, std::string_view format, std::initializer_list<FormatArgument> arguments);
+
+// The local time `time` as it stands in front of a line: "yyyy-MM-dd hh:mm:ss" on a 12-hour clock without a marker.
+std::string logTimestamp(std::time_t time);
 
 // A format and the line of the source file where it stands.
 struct LineFormat {

@@ -11,11 +11,25 @@
 #include "platform/Error.h"
 #include "platform/Value.h"
 
-// The answer for `key`: text, number or data, depending on the key, or nothing when the device has no such property.
-// `options` is always nothing.
+// Opaque names of properties, as the device-answer service knows them: 22 characters of the base64 alphabet each. The
+// plug-in passes them on without reading them.
+extern const std::string_view MiravelSNKey;
+extern const std::string_view CoverGlassSNKey;
+extern const std::string_view ALSSNKey;
+extern const std::string_view FCAMModuleSNKey;
+extern const std::string_view VanterChipIDKey;
+extern const std::string_view VanterUIDKey;
+extern const std::string_view LoddenChipIDKey;
+extern const std::string_view LoddenUIDKey;
+
+// The device-answer service's answer for `key`: text, number or data, depending on the key, or nothing when the device
+// has no such property. `options` is always nothing.
 Value KACopyAnswer(std::string_view key, const Value& options);
 
 // The same; *error, when `error` is given, says why there is no answer.
 Value KACopyAnswerWithError(std::string_view key, const Value& options, Error* error);
+
+// The Tansu service's value for `key`, in the same way.
+Value TansuCopyValueWithError(std::string_view key, const Value& options, Error* error);
 
 #endif

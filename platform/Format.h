@@ -34,6 +34,7 @@ public:
 private:
     std::variant<std::monostate, std::string, std::uint64_t, const void*> content_;
     bool negative_ = false;
+    bool boolean_ = false;
 };
 
 // Replaces each conversion of `text` by its argument, in order:
@@ -43,8 +44,8 @@ private:
 //   %u %x %X      a number, unsigned, 32 bits, decimal or hexadecimal; with l, ll or z 64 bits
 //   %p            a pointer
 //   %%            a per cent sign
-// A width with or without a leading 0 pads numbers ("%02x"). An argument of another kind than the conversion asks for
-// is written as "%@" would; a missing one is "(null)"; an unknown conversion stands as it is.
+// A width with or without a leading 0 pads numbers ("%02x"), to 64 places at most. An argument of another kind than the
+// conversion asks for is written as "%@" would; a missing one is "(null)"; an unknown conversion stands as it is.
 std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments);
 
 template <class... Arguments>

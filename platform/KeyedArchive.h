@@ -17,7 +17,9 @@ public:
     using std::runtime_error::runtime_error;
 };
 
-// The bytes of `root` under `rootKey`. Raises ArchiveFailure when the graph holds a value of nothing.
+// The bytes of `root` under `rootKey`. Raises ArchiveFailure for a graph that could not be decoded again: one that
+// holds a value of nothing or a text that is no UTF-8, or in which more than 32 collections, the archive's own map
+// included, stand inside each other.
 Value::Data archiveEncode(std::string_view rootKey, const Value& root);
 
 // A decoder over the bytes of one archive, which it only reads during create.
@@ -27,7 +29,9 @@ public:
     static std::optional<ArchiveDecoder> create(const Value::Data& bytes, Error* error);
 
     // The object under `rootKey`, or nothing when the archive has no such key. Raises ArchiveFailure when the contents
-    // are malformed, hold another kind of object than the five, or nest deeper than 32.
+    // are malformed, hold another kind of object than the five (a fraction, an integer beyond 64 signed bits, a tagged
+    // item, null), a key twice in one map or an item of indefinite length, nest deeper than 32, or hold more than
+    // 1048576 items, keys included.
     Value decode(std::string_view rootKey) const;
 
 private:

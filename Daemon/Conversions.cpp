@@ -1,0 +1,142 @@
+#include "Daemon/Conversions.h"
+
+#include <optional>
+
+#include "platform/Base64.h"
+#include "platform/Format.h"
+#include "platform/KeyedArchive.h"
+#include "platform/SystemLog.h"
+#include "platform/Utf8.h"
+
+namespace {
+
+constexpr char rootKey[] = "HSArchiverKey";
+
+// One byte for each character of `text`, so that pairs can be counted: those beyond ASCII, none of which is a
+// hexadecimal digit or white space here, become 0xFF.
+std::string oneByteEach(std::string_view text) {
+    std::string characters;
+    characters.reserve(text.size());
+    while (!text.empty()) {
+        const utf8::Step step = utf8::next(text);
+        characters += step.kind == utf8::Step::Character && step.point < 0x80 ? static_cast<char>(step.point) : '\xFF';
+        text.remove_prefix(step.length);
+    }
+    return characters;
+}
+
+void removeEvery(std::string& text, std::string_view part) {
+    std::string kept;
+    kept.reserve(text.size());
+    std::size_t at = 0;
+    for (std::size_t found; (found = text.find(part, at)) != std::string::npos; at = found + part.size())
+        kept.append(text, at, found - at);
+    kept.append(text, at);
+    text = std::move(kept);
+}
+
+std::optional<unsigned> digit(char character) {
+    if (character >= '0' && character <= '9')
+        return static_cast<unsigned>(character - '0');
+    if (character >= 'a' && character <= 'f')
+        return static_cast<unsigned>(character - 'a' + 10);
+    if (character >= 'A' && character <= 'F')
+        return static_cast<unsigned>(character - 'A' + 10);
+    return std::nullopt;
+}
+
+// The number that the hexadecimal digits of a pair form, which white space may precede and anything may follow; none
+// without a digit. A "0x" is the digit 0 and what follows it.
+std::optional<std::uint8_t> scanPair(std::string_view pair) {
+    pair.remove_prefix(std::min(pair.find_first_not_of(" \t\n\v\f\r"), pair.size()));
+    std::optional<unsigned> number;
+    for (const char character : pair) {
+        const std::optional<unsigned> value = digit(character);
+        if (!value)
+            break;
+        number = number.value_or(0) << 4 | *value;
+    }
+    return number;
+}
+
+} // namespace
+
+Value convertDictionaryToData(const Value& dictionary) {
+    if (dictionary.isNothing())
+        return {};
+    return archiveEncode(rootKey, dictionary);
+}
+
+Value convertDataToDictionary(const Value& data) {
+    if (!data.data())
+        return {};
+    Error error;
+    const std::optional<ArchiveDecoder> decoder = ArchiveDecoder::create(*data.data(), &error);
+    const FormatArgument shownError = decoder ? FormatArgument(nullptr) : FormatArgument(error);
+    consoleLog(format("Unarchive Error : %@", {shownError}));
+    if (!decoder)
+        consoleLog(format("Error : %@", {shownError}));
+    Value object = decoder ? decoder->decode(rootKey) : Value();
+    consoleLog(format("recvDict : %@", object));
+    consoleLog(format("err : %@", {shownError}));
+    return object;
+}
+
+Value DatatoHexString(const Value& data) {
+    if (!data.data() || data.data()->empty())
+        return {};
+    constexpr char digits[] = "0123456789abcdef";
+    std::string text;
+    text.reserve(data.data()->size() * 2);
+    for (const std::uint8_t byte : *data.data()) {
+        text += digits[byte >> 4];
+        text += digits[byte & 0xF];
+    }
+    return text;
+}
+
+Value stringFromHexString(std::string_view text) {
+    const std::string characters = oneByteEach(text);
+    if (characters.size() % 2 != 0)
+        return {};
+    std::string out;
+    for (std::size_t at = 0; at < characters.size(); at += 2) {
+        const std::uint8_t code = scanPair(std::string_view(characters).substr(at, 2)).value_or(0);
+        if (code < 0x80) {
+            out += static_cast<char>(code);
+        } else {
+            out += static_cast<char>(0xC0 | code >> 6);
+            out += static_cast<char>(0x80 | (code & 0x3F));
+        }
+    }
+    return out;
+}
+
+Value::Data hexString2Binary(std::string_view text) {
+    std::string characters = oneByteEach(text);
+    for (const std::string_view part : {"0x", "0X", " "})
+        removeEvery(characters, part);
+    if (characters.size() % 2 != 0)
+        throw ConversionFailure("IllegalInput", "Text does not have 2-digit hex chars for every byte");
+    Value::Data bytes;
+    bytes.reserve(characters.size() / 2);
+    for (std::size_t at = 0; at < characters.size(); at += 2) {
+        const std::optional<std::uint8_t> byte = scanPair(std::string_view(characters).substr(at, 2));
+        if (!byte)
+            throw ConversionFailure("IllegalInput", "Text has illegal hexadecimal characters");
+        bytes.push_back(*byte);
+    }
+    return bytes;
+}
+
+std::string base64EncodedString(const Value::Data& data) {
+    return base64Encode(data);
+}
+
+std::string stringFromLXError(const Error& error) {
+    return format("LXError domain:%@, error code: %d. Description: %@", error.domain, error.code, error.text);
+}
+
+Value isLXNumber(const Value& value) {
+    return value.isNumber() ? value : Value();
+}

@@ -1,0 +1,81 @@
+#include "Daemon/HSLog.h"
+
+#include <atomic>
+#include <exception>
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "platform/Files.h"
+#include "platform/SystemLog.h"
+
+namespace {
+
+constexpr char defaultSubsystem[] = "com.tevari.veltrad";
+constexpr char category[] = "device";
+
+struct LogState {
+    std::optional<std::string> logFileName; // the name given to logInit; without one there is no log file
+    SystemLog* connObj = nullptr;
+};
+
+// Null until logInit has run. Never released, since any thread may log until the process is gone.
+std::atomic<const LogState*> logInitialized = nullptr;
+
+constexpr struct {
+    int level;
+    SystemLogType type;
+} types[] = {
+    {LogLevelDefault, SystemLogType::Default},
+    {LogLevelInfo, SystemLogType::Info},
+    {LogLevelDebug, SystemLogType::Debug},
+    {LogLevelError, SystemLogType::Error},
+};
+
+void initialize(const char* name) {
+    auto* const state = new LogState;
+    if (name)
+        state->logFileName = name;
+    state->connObj = systemLogCreate(name ? name : defaultSubsystem, category);
+    if (!state->connObj && systemLogTypeEnabled(systemLogDefault(), SystemLogType::Error))
+        systemLogWrite(systemLogDefault(), SystemLogType::Error, "Couldn't create tlog_t");
+    logInitialized = state;
+}
+
+void writeLine(const LogState& state, int level, const std::string& line) {
+    for (const auto& row : types) {
+        if (row.level == level && systemLogTypeEnabled(state.connObj, row.type))
+            systemLogWrite(state.connObj, row.type, line);
+    }
+    if (state.logFileName)
+        files::append(format("/private/var/log/%@.log", *state.logFileName), line);
+}
+
+} // namespace
+
+std::string logTimestamp(std::time_t time) {
+    std::tm local = {};
+    char text[64];
+    if (!::localtime_r(&time, &local) || std::strftime(text, sizeof text, "%Y-%m-%d %I:%M:%S", &local) == 0)
+        return {};
+    return text;
+}
+
+void logInit(const char* name) {
+    static std::once_flag once;
+    std::call_once(once, initialize, name);
+}
+
+void newLog(int level, std::string_view text, std::initializer_list<FormatArgument> arguments) try {
+    const LogState* const state = logInitialized;
+    if (!state)
+        return;
+    const std::string message = format(text, arguments);
+    writeLine(*state, level, format("%@-%@", logTimestamp(std::time(nullptr)), message));
+} catch (const std::exception&) {
+    return; // a line that memory does not suffice for is lost; the work it tells of goes on
+}
+
+void LogSource::write(LogLevel level, LineFormat format, std::initializer_list<FormatArgument> arguments) const {
+    newLog(level, "[%@:%d] %@\n", {file, format.line, ::format(format.text, arguments)});
+}

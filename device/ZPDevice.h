@@ -1,0 +1,63 @@
+// The device: who it and its replaceable components are.
+#ifndef VELTRA_DEVICE_ZPDEVICE_H
+#define VELTRA_DEVICE_ZPDEVICE_H
+
+#include <mutex>
+#include <string_view>
+
+#include "platform/Value.h"
+
+// The one place through which the plug-in asks about the device. Nothing is read at construction and nothing is cached:
+// every getter asks its service again, so a part that was swapped since the last call is seen. A missing identity is a
+// level-4 log line and a result of nothing, never an exception; the caller decides what it means. All operations may be
+// called from any thread.
+class ZPDevice {
+public:
+    // The shared instance, made at the first call; also when several threads ask first.
+    static ZPDevice& sharedSingleton();
+
+    ZPDevice(const ZPDevice&) = delete;
+    ZPDevice& operator=(const ZPDevice&) = delete;
+
+    // Identities that are handed back as the service answers them.
+    Value getMiravelSerialNumber() const;
+    Value getCoverGlassSerialNumber() const;
+    Value getAmbientLightSensorSerialNumber() const;
+    Value getFCAMModuleSerialNumber() const;
+    Value getProxSerialNumber() const;
+    Value getBackglassCompassSerialNumber() const;
+    Value getScreenSerialNumber() const;
+    Value getHardwareModel() const;
+
+    // Identities in the data store's text form (QDOrloCreateInstanceString).
+    Value getVanterSerialNumber() const;
+    Value getVanterChipId() const;
+    Value getVanterUID() const;
+    Value getLoddenChipID() const;
+    Value getLoddenUID() const;
+    Value getTopModuleChipID() const;
+
+    // The device's own identity, "<chip id>:<unique chip id>" in their text forms; nothing when either is missing.
+    static Value getUniqueChipId();
+
+    // The answer for `key` when it is a text, nothing otherwise. Nothing is logged.
+    static Value kaGetAnswerString(std::string_view key);
+
+    // Four of the identities under the names of properties.
+    Value coverGlassSerialNumber() const { return getCoverGlassSerialNumber(); }
+    Value ambientLightSensorSerialNumber() const { return getAmbientLightSensorSerialNumber(); }
+    Value frontFacingCameraModuleSerialNumber() const { return getFCAMModuleSerialNumber(); }
+    Value miravelSerialNumber() const { return getMiravelSerialNumber(); }
+
+    // A dictionary for the user of the class; nothing at first. Read and written atomically.
+    Value syscfgDict() const;
+    void setSyscfgDict(Value dictionary);
+
+private:
+    ZPDevice() = default;
+
+    mutable std::mutex syscfgMutex_;
+    Value syscfgDict_;
+};
+
+#endif

@@ -1,0 +1,155 @@
+#include <utility>
+
+#include "Daemon/HSLog.h"
+#include "device/ZPDevice.h"
+#include "platform/DeviceAnswers.h"
+#include "platform/Format.h"
+#include "platform/OrloDataStore.h"
+
+namespace {
+
+constexpr LogSource zplog{"ZPDevice"};
+
+Value answer(std::string_view key) {
+    return KACopyAnswer(key, {});
+}
+Value answerWithError(std::string_view key) {
+    return KACopyAnswerWithError(key, {}, nullptr);
+}
+Value tansuValue(std::string_view key) {
+    return TansuCopyValueWithError(key, {}, nullptr);
+}
+
+// What a getter makes of the service's answer.
+enum class Result {
+    Answer,                   // the answer as it is
+    InstanceString,           // its text form; a failed conversion is reported
+    InstanceStringIfAnswered, // its text form; only a missing answer is reported
+};
+
+struct Identity {
+    Value (*service)(std::string_view key);
+    const std::string_view& key; // the opaque keys are constants of another file, so they are read when they are used
+    Result result;
+    const char* identifier; // as the line about a missing identity names it
+};
+
+constexpr std::string_view proxKey = "ProxSerialNumber";
+constexpr std::string_view backglassCompassKey = "BackglassCompassSerialNumber";
+constexpr std::string_view screenKey = "ScreenSerialNumber";
+constexpr std::string_view vanterKey = "VanterSerialNumber";
+constexpr std::string_view topModuleKey = "TopModuleAuthChipID";
+constexpr std::string_view hardwareModelKey = "HWModelStr";
+
+constexpr Identity miravel{answer, MiravelSNKey, Result::Answer, "Miravel SN"};
+constexpr Identity coverGlass{answer, CoverGlassSNKey, Result::Answer, "CoverGlass SN"};
+constexpr Identity ambientLightSensor{answer, ALSSNKey, Result::Answer, "ALS SN"};
+constexpr Identity frontCamera{answer, FCAMModuleSNKey, Result::Answer, "FCAMModule SN"};
+constexpr Identity proximity{tansuValue, proxKey, Result::Answer, "Prox Serial Number"};
+constexpr Identity backglassCompass{tansuValue, backglassCompassKey, Result::Answer, "BG Serial Number"};
+constexpr Identity screen{answer, screenKey, Result::Answer, "Screen Serial Number"};
+constexpr Identity vanter{answer, vanterKey, Result::InstanceString, "Vanter Serial Number"};
+constexpr Identity vanterChip{answer, VanterChipIDKey, Result::InstanceString, "Vanter Chip id"};
+constexpr Identity vanterUID{answer, VanterUIDKey, Result::InstanceString, "Vanter UID"};
+constexpr Identity loddenChip{answer, LoddenChipIDKey, Result::InstanceString, "Lodden Chip id"};
+constexpr Identity loddenUID{answer, LoddenUIDKey, Result::InstanceString, "Lodden UID"};
+constexpr Identity topModule{answer, topModuleKey, Result::InstanceStringIfAnswered, "topModuleChipID"};
+constexpr Identity hardwareModel{answerWithError, hardwareModelKey, Result::Answer, "HWModelStr"};
+
+Value get(const Identity& identity) {
+    Value value = identity.service(identity.key);
+    const bool answered = !value.isNothing();
+    if (identity.result != Result::Answer)
+        value = QDOrloCreateInstanceString(value);
+    if (value.isNothing() && !(answered && identity.result == Result::InstanceStringIfAnswered))
+        zplog.error("Could not get data instance string for identifier %s", identity.identifier);
+    return value;
+}
+
+// One half of the device's own identity; `missing` is logged when the device does not answer.
+Value chipInstanceString(std::string_view key, const char* missing) {
+    const Value chip = answer(key);
+    if (chip.isNothing()) {
+        zplog.error(missing);
+        return {};
+    }
+    Value text = QDOrloCreateInstanceString(chip);
+    if (text.isNothing())
+        zplog.error("Could not get data instance string for identifier '%@'", chip);
+    return text;
+}
+
+} // namespace
+
+ZPDevice& ZPDevice::sharedSingleton() {
+    static ZPDevice shared;
+    return shared;
+}
+
+Value ZPDevice::getMiravelSerialNumber() const {
+    return get(miravel);
+}
+Value ZPDevice::getCoverGlassSerialNumber() const {
+    return get(coverGlass);
+}
+Value ZPDevice::getAmbientLightSensorSerialNumber() const {
+    return get(ambientLightSensor);
+}
+Value ZPDevice::getFCAMModuleSerialNumber() const {
+    return get(frontCamera);
+}
+Value ZPDevice::getProxSerialNumber() const {
+    return get(proximity);
+}
+Value ZPDevice::getBackglassCompassSerialNumber() const {
+    return get(backglassCompass);
+}
+Value ZPDevice::getScreenSerialNumber() const {
+    return get(screen);
+}
+Value ZPDevice::getHardwareModel() const {
+    return get(hardwareModel);
+}
+Value ZPDevice::getVanterSerialNumber() const {
+    return get(vanter);
+}
+Value ZPDevice::getVanterChipId() const {
+    return get(vanterChip);
+}
+Value ZPDevice::getVanterUID() const {
+    return get(vanterUID);
+}
+Value ZPDevice::getLoddenChipID() const {
+    return get(loddenChip);
+}
+Value ZPDevice::getLoddenUID() const {
+    return get(loddenUID);
+}
+Value ZPDevice::getTopModuleChipID() const {
+    return get(topModule);
+}
+
+Value ZPDevice::getUniqueChipId() {
+    const Value uniqueChip = chipInstanceString("UniqueChipID", "Failed to get the unique chip id");
+    if (uniqueChip.isNothing())
+        return {};
+    const Value chip = chipInstanceString("ChipID", "Failed to get the chip id");
+    if (chip.isNothing())
+        return {};
+    return format("%@:%@", chip, uniqueChip);
+}
+
+Value ZPDevice::kaGetAnswerString(std::string_view key) {
+    Value found = answer(key);
+    return found.text() ? found : Value();
+}
+
+Value ZPDevice::syscfgDict() const {
+    const std::lock_guard lock(syscfgMutex_);
+    return syscfgDict_;
+}
+
+void ZPDevice::setSyscfgDict(Value dictionary) {
+    const std::lock_guard lock(syscfgMutex_);
+    syscfgDict_ = std::move(dictionary);
+}

@@ -1,0 +1,45 @@
+// A hostile format reads nothing but its arguments and grows no further than they do. The input is the format; its
+// first byte chooses the arguments.
+#include <cstdint>
+#include <cstdlib>
+#include <string_view>
+
+#include "platform/Format.h"
+#include "platform/Utf8.h"
+
+namespace {
+
+const FormatArgument choices[] = {
+    nullptr,
+    "text",
+    Value(),
+    Value(true),
+    Value(Value::Data(100, 0xAB)),
+    Value(Value::Dictionary{{"a", Value::Array{1, "b\n"}}}),
+    Error{"D", 7, "text"},
+    std::int64_t{-1},
+    0xFFFFFFFFU,
+    static_cast<const void*>(choices),
+};
+constexpr std::size_t count = std::size(choices);
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    if (size == 0)
+        return 0;
+    const std::string_view text(reinterpret_cast<const char*>(data + 1), size - 1);
+    const std::size_t chosen = data[0];
+    const std::string out =
+        format(text, {choices[chosen % count], choices[chosen / 7 % count], choices[chosen / 31 % count]});
+    // Each argument is far below 512 characters, each missing one three times as long as the shortest conversion.
+    if (out.size() > 3 * 512 + 3 * text.size())
+        std::abort();
+    if (text.find('%') == std::string_view::npos && out != text)
+        std::abort();
+    std::string line;
+    utf8::appendQuoted(line, out);
+    if (line.find('\n') != std::string::npos || !utf8::isValid(line) || !utf8::isValid(utf8::repaired(out)))
+        std::abort();
+    return 0;
+}

@@ -1,0 +1,26 @@
+// The request and response objects of the host framework: plain values, the same whatever carries them.
+#include "platform/HostFramework.h"
+
+#include <utility>
+
+std::string HSMessageRequest::description() const {
+    return Value(Value::Dictionary{{"messageStr", messageStr}, {"messageDict", messageDict}}).description();
+}
+
+HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode) {
+    return initWithName(std::move(name), statusCode, {}, {});
+}
+
+HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode, Value response) {
+    return initWithName(std::move(name), statusCode, std::move(response), {});
+}
+
+HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode, Value response,
+                                                  std::optional<Error> error) {
+    HSMessageResponse result;
+    result.name_ = std::move(name);
+    result.statusCode_ = statusCode;
+    result.response_ = std::move(response);
+    result.error_ = std::move(error);
+    return result;
+}

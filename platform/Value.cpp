@@ -1,0 +1,119 @@
+#include "platform/Value.h"
+
+#include "platform/Utf8.h"
+
+namespace {
+
+constexpr std::size_t shownText = 256;        // bytes of one text or key inside a collection
+constexpr std::size_t wholeData = 64;         // bytes of data that is shown whole
+constexpr std::size_t shownData = 16;         // bytes at each end of longer data
+constexpr std::size_t shownCollection = 4096; // a collection takes up no further element from here on
+constexpr unsigned shownNesting = 32;
+
+void appendHex(std::string& out, const std::uint8_t* bytes, std::size_t length) {
+    constexpr char digits[] = "0123456789abcdef";
+    for (std::size_t i = 0; i < length; ++i) {
+        out += digits[bytes[i] >> 4];
+        out += digits[bytes[i] & 0xF];
+    }
+}
+
+void appendData(std::string& out, const Value::Data& data) {
+    out += '<';
+    if (data.size() <= wholeData) {
+        appendHex(out, data.data(), data.size());
+    } else {
+        out += std::to_string(data.size()) + " bytes: ";
+        appendHex(out, data.data(), shownData);
+        out += "...";
+        appendHex(out, data.data() + data.size() - shownData, shownData);
+    }
+    out += '>';
+}
+
+void appendText(std::string& out, std::string_view text) {
+    const std::string_view shown = utf8::beginning(text, shownText);
+    utf8::appendQuoted(out, shown);
+    if (shown.size() < text.size())
+        out += "... (" + std::to_string(text.size()) + " bytes)";
+}
+
+void append(std::string& out, const Value& value, unsigned nesting);
+
+void appendElement(std::string& out, const Value& element, unsigned nesting) {
+    append(out, element, nesting);
+}
+
+void appendElement(std::string& out, const Value::Dictionary::value_type& element, unsigned nesting) {
+    appendText(out, element.first);
+    out += ": ";
+    append(out, element.second, nesting);
+}
+
+template <class Collection>
+void appendCollection(std::string& out, const Collection& collection, const char (&brackets)[3], unsigned nesting) {
+    out += brackets[0];
+    std::size_t left = collection.size();
+    for (const auto& element : collection) {
+        if (left < collection.size())
+            out += ", ";
+        if (nesting == shownNesting || out.size() >= shownCollection) {
+            out += "... (" + std::to_string(left) + " more)";
+            break;
+        }
+        appendElement(out, element, nesting + 1);
+        --left;
+    }
+    out += brackets[1];
+}
+
+void append(std::string& out, const Value& value, unsigned nesting) {
+    if (const Value::Dictionary* dictionary = value.dictionary())
+        appendCollection(out, *dictionary, "{}", nesting);
+    else if (const Value::Array* array = value.array())
+        appendCollection(out, *array, "[]", nesting);
+    else if (const Value::Data* data = value.data())
+        appendData(out, *data);
+    else if (const std::string* text = value.text())
+        appendText(out, *text);
+    else if (value.isBoolean())
+        out += *value.boolean() ? "true" : "false";
+    else if (value.isNumber())
+        out += std::to_string(*value.integer());
+    else
+        out += "(null)";
+}
+
+} // namespace
+
+std::optional<std::int64_t> Value::integer() const {
+    if (const bool* value = std::get_if<bool>(&content_))
+        return *value ? 1 : 0;
+    if (const std::int64_t* value = std::get_if<std::int64_t>(&content_))
+        return *value;
+    return std::nullopt;
+}
+
+std::optional<bool> Value::boolean() const {
+    const std::optional<std::int64_t> number = integer();
+    if (!number)
+        return std::nullopt;
+    return *number != 0;
+}
+
+const Value& Value::operator[](std::string_view key) const {
+    static const Value nothing;
+    const Dictionary* entries = dictionary();
+    if (!entries)
+        return nothing;
+    const auto entry = entries->find(key);
+    return entry == entries->end() ? nothing : entry->second;
+}
+
+std::string Value::description() const {
+    if (const std::string* content = text())
+        return *content;
+    std::string out;
+    append(out, *this, 0);
+    return out;
+}

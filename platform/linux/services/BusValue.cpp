@@ -1,0 +1,273 @@
+#include "platform/linux/services/BusValue.h"
+
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+#include <limits>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "platform/Utf8.h"
+
+namespace bus {
+
+Failure::Failure(int failureCode)
+    : std::runtime_error(std::generic_category().message(-failureCode)), code(failureCode) {}
+
+namespace {
+
+// Passes a result of libsystemd on, or raises the failure that it reports.
+int check(int result) {
+    if (result < 0)
+        throw Failure(result);
+    return result;
+}
+
+// Reads the values of one message, and keeps the names of the keys that lead to the one in hand for a refusal.
+class Reader {
+public:
+    explicit Reader(sd_bus_message* message) : message_(message) {}
+
+    // The dictionary that stands next, with variants ("{sv}") or with texts ("{ss}") as its values.
+    Value::Dictionary dictionary(const char* contents) {
+        const Level level(*this);
+        const std::string entry(contents + 1, 2);
+        Value::Dictionary result;
+        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_ARRAY, contents));
+        while (check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_DICT_ENTRY, entry.c_str())) > 0) {
+            std::string key = string(SD_BUS_TYPE_STRING);
+            path_.push_back(key);
+            if (result.contains(key))
+                refuse("is given twice");
+            Value value = entry == "sv" ? variant() : text(SD_BUS_TYPE_STRING);
+            result.emplace(std::move(key), std::move(value));
+            path_.pop_back();
+            check(sd_bus_message_exit_container(message_));
+        }
+        check(sd_bus_message_exit_container(message_));
+        return result;
+    }
+
+private:
+    // One more array or dictionary around the value in hand.
+    class Level {
+    public:
+        explicit Level(Reader& reader) : reader_(reader) {
+            if (++reader_.nesting_ > maximumNesting)
+                reader_.refuse("nests more than " + std::to_string(maximumNesting) + " arrays and dictionaries");
+        }
+        ~Level() { --reader_.nesting_; }
+        Level(const Level&) = delete;
+        Level& operator=(const Level&) = delete;
+
+    private:
+        Reader& reader_;
+    };
+
+    [[noreturn]] void refuse(const std::string& why) const {
+        std::string key;
+        for (const std::string& step : path_)
+            key += (key.empty() ? "" : ".") + step;
+        throw Refusal(key.empty() ? "The request " + why + "." : "The value of key \"" + key + "\" " + why + ".");
+    }
+
+    void count() {
+        if (++values_ > maximumValues)
+            refuse("brings the message to more than " + std::to_string(maximumValues) + " values");
+    }
+
+    Value variant() {
+        char type = 0;
+        const char* contents = nullptr;
+        check(sd_bus_message_peek_type(message_, &type, &contents));
+        const std::string signature = contents ? contents : "";
+        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_VARIANT, signature.c_str()));
+        Value value = content(signature);
+        check(sd_bus_message_exit_container(message_));
+        return value;
+    }
+
+    Value content(const std::string& signature) {
+        if (signature.size() == 1)
+            return basic(signature[0]);
+        if (signature == "ay")
+            return bytes();
+        if (signature == "av" || signature == "as")
+            return array(signature[1]);
+        if (signature == "a{sv}" || signature == "a{ss}") {
+            count();
+            return dictionary(signature.c_str() + 1);
+        }
+        refuseType(signature);
+    }
+
+    [[noreturn]] void refuseType(const std::string& signature) const {
+        refuse("has the D-Bus type \"" + signature + "\", which a request cannot carry");
+    }
+
+    Value bytes() {
+        count();
+        const void* data = nullptr;
+        std::size_t length = 0;
+        check(sd_bus_message_read_array(message_, SD_BUS_TYPE_BYTE, &data, &length));
+        const auto* first = static_cast<const std::uint8_t*>(data);
+        return Value::Data(first, first + length);
+    }
+
+    Value array(char element) {
+        const Level level(*this);
+        count();
+        const char contents[] = {element, 0};
+        Value::Array result;
+        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_ARRAY, contents));
+        while (check(sd_bus_message_at_end(message_, 0)) == 0)
+            result.push_back(element == SD_BUS_TYPE_VARIANT ? variant() : text(element));
+        check(sd_bus_message_exit_container(message_));
+        return result;
+    }
+
+    Value basic(char type) {
+        switch (type) {
+        case SD_BUS_TYPE_STRING:
+        case SD_BUS_TYPE_OBJECT_PATH:
+        case SD_BUS_TYPE_SIGNATURE:
+            return text(type);
+        case SD_BUS_TYPE_BOOLEAN:
+            return number<int>(type) != 0;
+        case SD_BUS_TYPE_BYTE:
+            return number<std::uint8_t>(type);
+        case SD_BUS_TYPE_INT16:
+            return number<std::int16_t>(type);
+        case SD_BUS_TYPE_UINT16:
+            return number<std::uint16_t>(type);
+        case SD_BUS_TYPE_INT32:
+            return number<std::int32_t>(type);
+        case SD_BUS_TYPE_UINT32:
+            return number<std::uint32_t>(type);
+        case SD_BUS_TYPE_INT64:
+            return number<std::int64_t>(type);
+        case SD_BUS_TYPE_UINT64: {
+            const auto value = number<std::uint64_t>(type);
+            if (value > std::uint64_t{std::numeric_limits<std::int64_t>::max()})
+                refuse("does not fit a signed 64-bit integer");
+            return value;
+        }
+        default:
+            refuseType(std::string(1, type));
+        }
+    }
+
+    template <class Number>
+    Number number(char type) {
+        count();
+        Number value = 0;
+        check(sd_bus_message_read_basic(message_, type, &value));
+        return value;
+    }
+
+    Value text(char type) {
+        count();
+        return string(type);
+    }
+
+    std::string string(char type) {
+        const char* characters = nullptr;
+        check(sd_bus_message_read_basic(message_, type, &characters));
+        return characters;
+    }
+
+    sd_bus_message* message_;
+    std::vector<std::string> path_;
+    int nesting_ = 0;
+    std::size_t values_ = 0;
+};
+
+void appendText(sd_bus_message* message, const std::string& text) {
+    std::string carried;
+    for (const char character : utf8::repaired(text))
+        carried += character == '\0' ? "\uFFFD" : std::string(1, character);
+    check(sd_bus_message_append_basic(message, SD_BUS_TYPE_STRING, carried.c_str()));
+}
+
+void appendVariant(sd_bus_message* message, const Value& value);
+
+void appendArray(sd_bus_message* message, const Value::Array& array) {
+    check(sd_bus_message_open_container(message, SD_BUS_TYPE_ARRAY, "v"));
+    for (const Value& element : array)
+        if (!element.isNothing())
+            appendVariant(message, element);
+    check(sd_bus_message_close_container(message));
+}
+
+const char* signatureOf(const Value& value) {
+    if (value.text())
+        return "s";
+    if (value.data())
+        return "ay";
+    if (value.array())
+        return "av";
+    if (value.dictionary())
+        return "a{sv}";
+    return value.isBoolean() ? "b" : "x";
+}
+
+void appendVariant(sd_bus_message* message, const Value& value) {
+    check(sd_bus_message_open_container(message, SD_BUS_TYPE_VARIANT, signatureOf(value)));
+    if (const std::string* text = value.text()) {
+        appendText(message, *text);
+    } else if (const Value::Data* data = value.data()) {
+        check(sd_bus_message_append_array(message, SD_BUS_TYPE_BYTE, data->data(), data->size()));
+    } else if (const Value::Array* array = value.array()) {
+        appendArray(message, *array);
+    } else if (const Value::Dictionary* dictionary = value.dictionary()) {
+        appendDictionary(message, *dictionary);
+    } else if (value.isBoolean()) {
+        const int truth = *value.boolean();
+        check(sd_bus_message_append_basic(message, SD_BUS_TYPE_BOOLEAN, &truth));
+    } else {
+        const std::int64_t number = value.integer().value_or(0);
+        check(sd_bus_message_append_basic(message, SD_BUS_TYPE_INT64, &number));
+    }
+    check(sd_bus_message_close_container(message));
+}
+
+} // namespace
+
+Value::Dictionary readDictionary(sd_bus_message* message) {
+    return Reader(message).dictionary("{sv}");
+}
+
+void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary) {
+    check(sd_bus_message_open_container(message, SD_BUS_TYPE_ARRAY, "{sv}"));
+    for (const auto& [key, value] : dictionary) {
+        if (value.isNothing())
+            continue;
+        check(sd_bus_message_open_container(message, SD_BUS_TYPE_DICT_ENTRY, "sv"));
+        appendText(message, key);
+        appendVariant(message, value);
+        check(sd_bus_message_close_container(message));
+    }
+    check(sd_bus_message_close_container(message));
+}
+
+int open(std::string_view which, sd_bus** connection) {
+    if (which == "system")
+        return sd_bus_open_system(connection);
+    if (which == "session")
+        return sd_bus_open_user(connection);
+    sd_bus* opened = nullptr;
+    int result = sd_bus_new(&opened);
+    if (result >= 0)
+        result = sd_bus_set_address(opened, std::string(which).c_str());
+    if (result >= 0)
+        result = sd_bus_set_bus_client(opened, 1);
+    if (result >= 0)
+        result = sd_bus_start(opened);
+    if (result < 0)
+        opened = sd_bus_close_unref(opened);
+    *connection = opened;
+    return result;
+}
+
+} // namespace bus

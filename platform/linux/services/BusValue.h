@@ -1,0 +1,55 @@
+// Values on D-Bus: how a Value travels in a message, and which bus is meant.
+//
+//   text  s        data  ay       integer  x       boolean  b       array  av       dictionary  a{sv}
+//
+// On the way in every integer type that fits 64 signed bits is an integer, `o` and `g` are texts, `as` is an array and
+// `a{ss}` a dictionary. Nothing else is a Value.
+#ifndef VELTRA_PLATFORM_LINUX_BUS_VALUE_H
+#define VELTRA_PLATFORM_LINUX_BUS_VALUE_H
+
+#include <cstddef>
+#include <optional>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+
+#include <systemd/sd-bus.h>
+
+#include "platform/Value.h"
+
+namespace bus {
+
+// How deep arrays and dictionaries may nest in a message, its own dictionary included.
+constexpr int maximumNesting = 32;
+
+// How many values one message may hold in all. A Value takes more memory than it does in a message; this keeps the
+// growth in proportion while it is far above what any command needs.
+constexpr std::size_t maximumValues = 100'000;
+
+// Raised for a message that holds what no Value can. The sentence names the key.
+class Refusal : public std::runtime_error {
+public:
+    using std::runtime_error::runtime_error;
+};
+
+// Raised when libsystemd reports a failure; `code` is the negative errno.
+class Failure : public std::runtime_error {
+public:
+    explicit Failure(int failureCode);
+    int code;
+};
+
+// Reads the a{sv} that stands next in `message`. Raises Refusal or Failure.
+Value::Dictionary readDictionary(sd_bus_message* message);
+
+// Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
+// entries of nothing are left out. Raises Failure, with -E2BIG or -EMSGSIZE for what exceeds a message.
+void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary);
+
+// Opens the bus that `which` names: "system", "session" or a D-Bus address. Returns a negative errno on failure; on
+// success *connection belongs to the caller.
+int open(std::string_view which, sd_bus** connection);
+
+} // namespace bus
+
+#endif

@@ -1,0 +1,60 @@
+#include "platform/DeviceAnswers.h"
+
+#include <string>
+
+#include "platform/linux/system/DeviceDescription.h"
+
+constexpr std::string_view MiravelSNKey = "JlvBpIcyjzTcAplFQmGACg";
+constexpr std::string_view CoverGlassSNKey = "OhrmT+BS3mZKIKMk7BiWGg";
+constexpr std::string_view ALSSNKey = "xoNDTxUzjD2nhkaZSU365A";
+constexpr std::string_view FCAMModuleSNKey = "DWg23KH4RuU3qPfUd3q3qQ";
+constexpr std::string_view VanterChipIDKey = "4IRKeFl4kQazKfrPLqk3lw";
+constexpr std::string_view VanterUIDKey = "6sG7woifsZ4/lwoin2RMOQ";
+constexpr std::string_view LoddenChipIDKey = "/UmQZN9m7xv9ltmu0KoELA";
+constexpr std::string_view LoddenUIDKey = "wIE+IdqFckii+RoMBTR2Hw";
+
+namespace {
+
+// The opaque names and the readable ones under which the device description has their answers.
+constexpr struct {
+    std::string_view opaque;
+    std::string_view readable;
+} names[] = {
+    {MiravelSNKey, "MiravelSerialNumber"},
+    {CoverGlassSNKey, "CoverGlassSerialNumber"},
+    {ALSSNKey, "AmbientLightSensorSerialNumber"},
+    {FCAMModuleSNKey, "FrontCameraModuleSerialNumber"},
+    {VanterChipIDKey, "VanterChipID"},
+    {VanterUIDKey, "VanterUID"},
+    {LoddenChipIDKey, "LoddenChipID"},
+    {LoddenUIDKey, "LoddenUID"},
+};
+
+std::string_view readableName(std::string_view key) {
+    for (const auto& name : names)
+        if (name.opaque == key)
+            return name.readable;
+    return key;
+}
+
+// The value under `key` in the description's `section`. Only that value is resolved, so a query reads no other's file.
+Value query(std::string_view section, std::string_view key, Error* error) {
+    Value answer = resolveDescribed(deviceDescription()[section][key]);
+    if (answer.isNothing() && error)
+        *error = {"DeviceAnswerErrorDomain", 1, "The device has no answer for " + std::string(key)};
+    return answer;
+}
+
+} // namespace
+
+Value KACopyAnswer(std::string_view key, const Value& options) {
+    return KACopyAnswerWithError(key, options, nullptr);
+}
+
+Value KACopyAnswerWithError(std::string_view key, const Value&, Error* error) {
+    return query("answers", readableName(key), error);
+}
+
+Value TansuCopyValueWithError(std::string_view key, const Value&, Error* error) {
+    return query("tansu", key, error);
+}

@@ -1,0 +1,87 @@
+#include "platform/linux/system/DeviceDescription.h"
+
+#include <charconv>
+#include <string>
+
+#include "platform/Files.h"
+#include "platform/Format.h"
+#include "platform/SystemLog.h"
+#include "platform/Utf8.h"
+#include "platform/linux/system/Json.h"
+
+namespace {
+
+constexpr char descriptionPath[] = "/etc/veltra/device.json";
+constexpr char dataKey[] = "$data", fileKey[] = "$file", kindKey[] = "as";
+
+std::string_view characters(const Value::Data& bytes) {
+    return {reinterpret_cast<const char*>(bytes.data()), bytes.size()};
+}
+
+Value fromHex(const Value& text) {
+    if (!text.text() || text.text()->size() % 2 != 0)
+        return {};
+    Value::Data bytes(text.text()->size() / 2);
+    const char* pair = text.text()->data();
+    for (std::uint8_t& byte : bytes) {
+        if (std::from_chars(pair, pair + 2, byte, 16).ptr != pair + 2)
+            return {};
+        pair += 2;
+    }
+    return bytes;
+}
+
+Value fromFile(const Value& path, const Value& kind) {
+    const bool asText = kind == Value("text");
+    if (!path.text() || (!asText && !kind.isNothing() && kind != Value("data")))
+        return {};
+    std::optional<Value::Data> contents = files::readWhole(*path.text());
+    if (!contents)
+        return {};
+    if (!asText)
+        return std::move(*contents);
+    constexpr std::string_view atTheEnd(" \t\n\v\f\r\0", 7);
+    const std::string_view text = characters(*contents);
+    return utf8::repaired(text.substr(0, text.find_last_not_of(atTheEnd) + 1));
+}
+
+Value resolveDictionary(const Value& described) {
+    const Value::Dictionary& entries = *described.dictionary();
+    if (entries.contains(dataKey))
+        return entries.size() == 1 ? fromHex(described[dataKey]) : Value();
+    if (entries.contains(fileKey))
+        return entries.size() == 1 + entries.count(kindKey) ? fromFile(described[fileKey], described[kindKey])
+                                                            : Value();
+    Value::Dictionary resolved;
+    for (const auto& [key, value] : entries)
+        resolved.emplace_hint(resolved.end(), key, resolveDescribed(value));
+    return resolved;
+}
+
+} // namespace
+
+Value deviceDescription() {
+    const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
+    if (!contents) {
+        consoleLog(format("Device description %s is missing or cannot be read", descriptionPath));
+        return {};
+    }
+    std::string refusal;
+    std::optional<Value> description = jsonToValue(characters(*contents), &refusal);
+    if (description && description->dictionary())
+        return std::move(*description);
+    consoleLog(format("Device description %s is malformed: %s", descriptionPath,
+                      description ? std::string("it is no object") : refusal));
+    return {};
+}
+
+Value resolveDescribed(const Value& described) {
+    if (described.dictionary())
+        return resolveDictionary(described);
+    if (!described.array())
+        return described;
+    Value::Array resolved;
+    for (const Value& element : *described.array())
+        resolved.push_back(resolveDescribed(element));
+    return resolved;
+}

@@ -1,0 +1,244 @@
+#include "der/DERDecode.h"
+#include "sysconfig/SysConfig3Internal.h"
+#include "sysconfig/SysConfig3Wire.h"
+
+namespace {
+
+using namespace sysconfig;
+
+struct PayloadItems {
+    DERItem key;
+    DERItem comment;
+    DERItem data;
+    DERItem string;
+    DERItem deleted;
+};
+
+struct MetadataItems {
+    DERItem key;
+    DERItem data;
+    DERItem string;
+};
+
+constexpr DERItemSpec DERDecodeSysConfig3ItemSpecs[] = {
+    {offsetof(BlobItems, magic), DERTagInteger, 0},  {offsetof(BlobItems, version), DERTagInteger, 0},
+    {offsetof(BlobItems, payload), payloadTag, 0},   {offsetof(BlobItems, metadata), metadataTag, 0},
+    {offsetof(BlobItems, manifest), manifestTag, 0},
+};
+constexpr std::uint16_t DERDecodeSysConfig3ItemSpecs_count = std::size(DERDecodeSysConfig3ItemSpecs);
+
+constexpr DERItemSpec DERDecodeSysConfig3PayloadItemSpecs[] = {
+    {offsetof(PayloadItems, key), DERTagInteger, 0},
+    {offsetof(PayloadItems, comment), DERTagIA5String, 0},
+    {offsetof(PayloadItems, data), DERTagOctetString, DEROptionOptional},
+    {offsetof(PayloadItems, string), DERTagIA5String, DEROptionOptional},
+    {offsetof(PayloadItems, deleted), DERTagBoolean, DEROptionOptional},
+};
+constexpr std::uint16_t DERDecodeSysConfig3PayloadItemSpecs_count = std::size(DERDecodeSysConfig3PayloadItemSpecs);
+
+constexpr DERItemSpec DERDecodeSysConfig3MetadataItemSpecs[] = {
+    {offsetof(MetadataItems, key), DERTagIA5String, 0},
+    {offsetof(MetadataItems, data), DERTagOctetString, DEROptionOptional},
+    {offsetof(MetadataItems, string), DERTagIA5String, DEROptionOptional},
+};
+constexpr std::uint16_t DERDecodeSysConfig3MetadataItemSpecs_count = std::size(DERDecodeSysConfig3MetadataItemSpecs);
+
+constexpr DERItemSpec DERDecodeSysConfig3ManifestItemSpecs[] = {
+    {offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
+    {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
+    {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0},
+};
+constexpr std::uint16_t DERDecodeSysConfig3ManifestItemSpecs_count = std::size(DERDecodeSysConfig3ManifestItemSpecs);
+
+// What a callback returns when memory for an entry is lacking, so that the entry is not silently left out. The codec
+// has no code of its own for it.
+constexpr DERReturn outOfMemory = DERBufferOverflow;
+
+// The value of four octets, least significant first. Content of any other length gives 0.
+std::uint32_t valueOf(const DERItem& item) {
+    if (item.length != 4)
+        return 0;
+    return valueOf(Octets4{{item.data[0], item.data[1], item.data[2], item.data[3]}});
+}
+
+// The characters of a string item, up to its first NUL and at most `maximum` of them.
+std::string_view textOf(const DERItem& item, std::size_t maximum) {
+    if (item.data == nullptr)
+        return {};
+    const auto* const text = reinterpret_cast<const char*>(item.data);
+    return viewOf(text, std::min(static_cast<std::size_t>(item.length), maximum));
+}
+
+Bytes bytesOf(const DERItem& item) {
+    return {item.data, static_cast<std::uint32_t>(item.length)};
+}
+
+// The bytes for a new manifest, which copies them.
+SysConfigData dataOf(const DERItem& item) {
+    return {const_cast<std::uint8_t*>(item.data), static_cast<std::uint32_t>(item.length)};
+}
+
+// Ends the decoding of a list whose entries were walked with the given result.
+template <typename List>
+bool finishList(DERReturn walked, List* list, const HashSeed& seed) {
+    constexpr char operation[] = "struct __SysConfig3 *__singledecodeSysConfig3(const uint8_t *, uint32_t)";
+    if (walked != DERSuccess) {
+        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(walked));
+        return false;
+    }
+    if (list->indexAll(seed))
+        return true;
+    logHook()(messageLevel, "%s malloc failed.", operation);
+    return false;
+}
+
+bool decodePayload(const DERItem& element, __SysConfig3* object) {
+    DERDecodedInfo set;
+    if (const DERReturn result = DERDecodeItem(&element, &set); result != DERSuccess) {
+        logHook()(messageLevel, "Unable to decode payload with error %d", static_cast<int>(result));
+        return false;
+    }
+    if (set.tag != DERTagSet) {
+        logHook()(messageLevel, "Tag was not the expected Payload tag %llX", static_cast<unsigned long long>(set.tag));
+        return false;
+    }
+    const DERReturn result =
+        DERDecodeSequenceContentWithBlock(&set.content, _DERDecodeSysConfig3ParseAndPopulatePayloadSequence, object);
+    return finishList(result, &object->payload, object->seed);
+}
+
+bool decodeMetadata(const DERItem& element, __SysConfig3* object) {
+    DERDecodedInfo set;
+    if (const DERReturn result = DERDecodeItem(&element, &set); result != DERSuccess) {
+        logHook()(messageLevel, "Unable to decode metadata with error %d", static_cast<int>(result));
+        return false;
+    }
+    if (set.tag != DERTagSet) {
+        logHook()(messageLevel, "Tag was not the expected metadata tag %llX", static_cast<unsigned long long>(set.tag));
+        return false;
+    }
+    const DERReturn result =
+        DERDecodeSequenceContentWithBlock(&set.content, _DERDecodeSysConfig3ParseAndPopulateMetadataSequence, object);
+    return finishList(result, &object->metadata, object->seed);
+}
+
+bool installManifest(const ManifestItems& items, __SysConfig3* object) {
+    const SysConfigData payloadHMAC = dataOf(items.payloadHMAC);
+    const SysConfigData metadataHMAC = dataOf(items.metadataHMAC);
+    const SysConfigData fullHMAC = dataOf(items.fullHMAC);
+    __SysConfig3ManifestEntry* const manifest =
+        allocSysConfig3Manifest(object->version, &payloadHMAC, &metadataHMAC, &fullHMAC);
+    if (manifest == nullptr)
+        return false;
+    const bool installed = _sysConfig3SetManifest(object, manifest);
+    deallocSysConfig3Manifest(manifest);
+    return installed;
+}
+
+bool decodeManifest(const DERItem& element, __SysConfig3* object) {
+    DERDecodedInfo sequence;
+    if (const DERReturn result = DERDecodeItem(&element, &sequence); result != DERSuccess) {
+        logHook()(messageLevel, "Unable to decode manifest with error %d", static_cast<int>(result));
+        return false;
+    }
+    if (sequence.tag != DERTagSequence) {
+        logHook()(messageLevel, "Tag was not the expected manifest tag %llX",
+                  static_cast<unsigned long long>(sequence.tag));
+        return false;
+    }
+    ManifestItems items;
+    const DERReturn result =
+        DERParseSequenceContentToObject(&sequence.content, DERDecodeSysConfig3ManifestItemSpecs_count,
+                                        DERDecodeSysConfig3ManifestItemSpecs, &items, sizeof items, sizeof items);
+    if (result != DERSuccess) {
+        // A blob whose HMACs cannot be read is still worth having: the object keeps the manifest it was made with.
+        logHook()(messageLevel, "Decode manifest sequence error: %d", static_cast<int>(result));
+        return true;
+    }
+    const bool empty = items.payloadHMAC.length == 0 && items.metadataHMAC.length == 0 && items.fullHMAC.length == 0;
+    return empty || installManifest(items, object);
+}
+
+} // namespace
+
+DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedInfo* decoded, bool*, void* context) {
+    auto* const object = static_cast<__SysConfig3*>(context);
+    if (object == nullptr)
+        return DERParamError;
+    PayloadItems items;
+    DERReturn result =
+        DERParseSequenceContentToObject(&decoded->content, DERDecodeSysConfig3PayloadItemSpecs_count,
+                                        DERDecodeSysConfig3PayloadItemSpecs, &items, sizeof items, sizeof items);
+    if (result != DERSuccess)
+        return result;
+    bool deleted = false;
+    result = DERParseBooleanWithDefault(&items.deleted, false, &deleted);
+    if (result != DERSuccess)
+        return result;
+    const PayloadContent content = {valueOf(items.key), textOf(items.comment, maximumStringLength), bytesOf(items.data),
+                                    textOf(items.string, maximumStringLength), deleted};
+    if (!isValidContent(content)) {
+        _sysConfig3AddPayloadEntry(object, nullptr);
+        return DERSuccess;
+    }
+    __SysConfig3PayloadEntry* const entry = makeEntry(content);
+    if (entry == nullptr)
+        return outOfMemory;
+    object->payload.appendWithoutIndex(entry);
+    return DERSuccess;
+}
+
+DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo* decoded, bool*, void* context) {
+    constexpr char operation[] = "DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo "
+                                 "*__single, bool *__single, void *__single)";
+    auto* const object = static_cast<__SysConfig3*>(context);
+    if (object == nullptr) {
+        logHook()(messageLevel, "%s the refcon arg was NULL", operation);
+        return DERParamError;
+    }
+    MetadataItems items;
+    const DERReturn result =
+        DERParseSequenceContentToObject(&decoded->content, DERDecodeSysConfig3MetadataItemSpecs_count,
+                                        DERDecodeSysConfig3MetadataItemSpecs, &items, sizeof items, sizeof items);
+    if (result != DERSuccess)
+        return result;
+    const MetadataContent content = {textOf(items.key, maximumKeyLength), bytesOf(items.data),
+                                     textOf(items.string, maximumStringLength)};
+    if (!isValidContent(content)) {
+        _sysConfig3AddMetadataEntry(object, nullptr);
+        return DERSuccess;
+    }
+    __SysConfig3MetadataEntry* const entry = makeEntry(content);
+    if (entry == nullptr)
+        return outOfMemory;
+    entry->hash = hashOf(object->seed, keyOf(*entry));
+    object->metadata.appendWithoutIndex(entry);
+    return DERSuccess;
+}
+
+__SysConfig3* decodeSysConfig3(const std::uint8_t* data, std::uint32_t length) {
+    const DERItem blob = {data, data != nullptr ? length : 0};
+    BlobItems items;
+    const DERReturn result = DERParseSequenceToObject(&blob, DERDecodeSysConfig3ItemSpecs_count,
+                                                      DERDecodeSysConfig3ItemSpecs, &items, sizeof items, sizeof items);
+    if (result != DERSuccess)
+        return nullptr;
+    const SysConfig3Magic magic = valueOf(items.magic);
+    const SysConfig3Version version = valueOf(items.version);
+    if (!isSupportedSysConfig3Magic(magic)) {
+        logHook()(messageLevel, "Sysconfig magic 0x%X is not valid", magic);
+        return nullptr;
+    }
+    __SysConfig3* const object = allocSysConfig3(magic, version);
+    if (object == nullptr) {
+        logHook()(messageLevel,
+                  "Unable to allocate sysconfig3vX object. Likely due to an unsupported magic: 0x%X or version: 0x%X",
+                  magic, version);
+        return nullptr;
+    }
+    if (decodePayload(items.payload, object) && decodeMetadata(items.metadata, object) &&
+        decodeManifest(items.manifest, object))
+        return object;
+    deallocSysConfig3(object);
+    return nullptr;
+}

@@ -1,0 +1,262 @@
+// The key of an object and the three HMACs of its manifest.
+#include "sysconfig/SysConfig3Internal.h"
+#include "sysconfig/SysConfig3Wire.h"
+
+namespace {
+
+using namespace sysconfig;
+
+// Feeds one of the three streams of an object to an HMAC.
+using Stream = void (*)(const __SysConfig3* object, crypto::HMACSHA256* context);
+
+void payloadStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
+    _updatePayloadHMAC(object->payload.first, context);
+}
+
+void metadataStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
+    _updateMetadataHMAC(object->metadata.first, context);
+}
+
+void fullStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
+    payloadStream(object, context);
+    metadataStream(object, context);
+}
+
+bool hasKey(const __SysConfig3* object) {
+    return object->hmacKey.data != nullptr && object->hmacKey.length > 0;
+}
+
+const void* keyAddress(const __SysConfig3* object) {
+    return object->hmacKey.data;
+}
+
+// The common end of the create operations. On failure out->data is null and out->length the length that it would have.
+bool createHMAC(const __SysConfig3* object, Stream stream, SysConfigData* out, const char* operation) {
+    if (out == nullptr) {
+        logHook()(messageLevel, "%s hmac is NULL", operation);
+        return false;
+    }
+    crypto::HMACSHA256 context;
+    std::uint8_t result[crypto::sha256Size];
+    context.init(object->hmacKey.data, object->hmacKey.length);
+    stream(object, &context);
+    *out = {static_cast<std::uint8_t*>(std::malloc(sizeof result)), sizeof result};
+    if (out->data != nullptr && context.final(result)) {
+        std::memcpy(out->data, result, sizeof result);
+        return true;
+    }
+    std::free(out->data);
+    out->data = nullptr;
+    logHook()(messageLevel, "%s malloc failed.", operation);
+    return false;
+}
+
+// Replaces a stored HMAC by a newly computed one, unless that cannot be computed.
+bool replaceHMAC(const __SysConfig3* object, bool (*create)(const __SysConfig3*, SysConfigData*),
+                 SysConfigData* stored) {
+    SysConfigData computed = {};
+    if (!create(object, &computed))
+        return false;
+    std::free(stored->data);
+    *stored = computed;
+    return true;
+}
+
+bool matches(const __SysConfig3* object, bool (*create)(const __SysConfig3*, SysConfigData*),
+             const SysConfigData& stored) {
+    SysConfigData computed = {};
+    create(object, &computed);
+    const bool equal = _sysConfig3HMACsAreEqual(object->manifest->version, &stored, &computed);
+    std::free(computed.data);
+    return equal;
+}
+
+void feed(crypto::HMACSHA256* context, std::string_view text) {
+    if (!text.empty())
+        context->update(text.data(), text.size());
+}
+
+void feed(crypto::HMACSHA256* context, Bytes data) {
+    if (data.length > 0)
+        context->update(data.data, data.length);
+}
+
+} // namespace
+
+void sysconfig::releaseSecret(SysConfigData* secret) {
+    if (secret->data != nullptr) {
+        std::memset(secret->data, 0, secret->length);
+        // Keeps the compiler from leaving out the clearing of memory that is released next.
+        __asm__ __volatile__("" : : "r"(secret->data) : "memory");
+        std::free(secret->data);
+    }
+    *secret = {};
+}
+
+bool sysconfig::hasNoStaleHMAC(const __SysConfig3* object, const char* operation) {
+    if (!sysConfig3HMACIsSupported(object->version) || sysConfig3IsValidHMAC(object))
+        return true;
+    logHook()(messageLevel, "%s Failed to validate HMAC.", operation);
+    return false;
+}
+
+void sysconfig::payloadHasChanged(__SysConfig3* object) {
+    if (!sysConfig3HMACIsSupported(object->version))
+        return;
+    replaceHMAC(object, sysConfig3CreatePayloadHMAC, &object->manifest->payloadHMAC);
+    replaceHMAC(object, sysConfig3CreateFullHMAC, &object->manifest->fullHMAC);
+}
+
+void sysconfig::metadataHasChanged(__SysConfig3* object) {
+    if (!sysConfig3HMACIsSupported(object->version))
+        return;
+    replaceHMAC(object, sysConfig3CreateMetadataHMAC, &object->manifest->metadataHMAC);
+    replaceHMAC(object, sysConfig3CreateFullHMAC, &object->manifest->fullHMAC);
+}
+
+void _updatePayloadHMAC(const __SysConfig3PayloadEntry* first, crypto::HMACSHA256* context) {
+    for (const __SysConfig3PayloadEntry* entry = first; entry != nullptr; entry = entry->next) {
+        const Octets4 key = octetsOf(entry->key);
+        context->update(key.octets, sizeof key.octets);
+        feed(context, commentOf(*entry));
+        feed(context, stringOf(*entry));
+        feed(context, dataOf(*entry));
+    }
+}
+
+void _updateMetadataHMAC(const __SysConfig3MetadataEntry* first, crypto::HMACSHA256* context) {
+    for (const __SysConfig3MetadataEntry* entry = first; entry != nullptr; entry = entry->next) {
+        feed(context, keyOf(*entry));
+        feed(context, stringOf(*entry));
+        feed(context, dataOf(*entry));
+    }
+}
+
+bool sysConfig3HMACIsSupported(SysConfig3Version version) {
+    return version == hmacVersion;
+}
+
+bool sysConfig3SetHMACKey(__SysConfig3* object, SysConfigData key) {
+    constexpr char operation[] = "bool sysConfig3SetHMACKey(struct __SysConfig3 *__single, SysConfigData)";
+    if (object == nullptr) {
+        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
+        return false;
+    }
+    releaseSecret(&object->hmacKey);
+    if (key.data == nullptr || key.length == 0)
+        return true;
+    auto* const copy = static_cast<std::uint8_t*>(std::malloc(key.length));
+    if (copy == nullptr) {
+        logHook()(messageLevel, "%s malloc() returned NULL.", operation);
+        return false;
+    }
+    std::memcpy(copy, key.data, key.length);
+    object->hmacKey = {copy, key.length};
+    return true;
+}
+
+__SysConfig3* allocSysConfig3WithHMACKey(SysConfig3Magic magic, SysConfig3Version version, SysConfigData key) {
+    constexpr char operation[] =
+        "struct __SysConfig3 *__singleallocSysConfig3WithHMACKey(SysConfig3Magic, SysConfig3Version, SysConfigData)";
+    if (!sysConfig3HMACIsSupported(version)) {
+        logHook()(messageLevel, "%s Requested version (0x%X) does not support HMAC.", operation, version);
+        return nullptr;
+    }
+    __SysConfig3* const object = allocSysConfig3(magic, version);
+    if (object == nullptr) {
+        logHook()(messageLevel, "%s Failed to allocate sysconfig.", operation);
+        return nullptr;
+    }
+    if (!sysConfig3SetHMACKey(object, key))
+        logHook()(messageLevel, "%s Failed to set HMAC key.", operation);
+    else if (!sysConfig3UpdateHMAC(object))
+        logHook()(messageLevel, "%s Failed to update HMAC.", operation);
+    else
+        return object;
+    deallocSysConfig3(object);
+    return nullptr;
+}
+
+bool sysConfig3CreatePayloadHMAC(const __SysConfig3* object, SysConfigData* out) {
+    constexpr char operation[] =
+        "bool sysConfig3CreatePayloadHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)";
+    if (object == nullptr)
+        return false;
+    if (!hasKey(object)) {
+        logHook()(messageLevel, "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
+                  operation, keyAddress(object), object->hmacKey.length);
+        return false;
+    }
+    return createHMAC(object, payloadStream, out, operation);
+}
+
+bool sysConfig3CreateMetadataHMAC(const __SysConfig3* object, SysConfigData* out) {
+    constexpr char operation[] =
+        "bool sysConfig3CreateMetadataHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)";
+    if (object == nullptr)
+        return false;
+    if (!hasKey(object)) {
+        logHook()(messageLevel, "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
+                  operation, keyAddress(object), object->hmacKey.length);
+        return false;
+    }
+    return createHMAC(object, metadataStream, out, operation);
+}
+
+bool sysConfig3CreateFullHMAC(const __SysConfig3* object, SysConfigData* out) {
+    constexpr char operation[] =
+        "bool sysConfig3CreateFullHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)";
+    if (object == nullptr) {
+        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
+        return false;
+    }
+    if (!hasKey(object)) {
+        logHook()(messageLevel, "%s Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
+                  operation, keyAddress(object), object->hmacKey.length);
+        return false;
+    }
+    return createHMAC(object, fullStream, out, operation);
+}
+
+bool sysConfig3UpdateHMAC(__SysConfig3* object) {
+    constexpr char operation[] = "bool sysConfig3UpdateHMAC(struct __SysConfig3 *__single)";
+    if (object == nullptr) {
+        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
+        return false;
+    }
+    if (!sysConfig3HMACIsSupported(object->version)) {
+        logHook()(messageLevel, "%s This SysConfig version (0x%X) does not support HMAC.", operation, object->version);
+        return false;
+    }
+    __SysConfig3ManifestEntry* const manifest = object->manifest;
+    const bool payload = replaceHMAC(object, sysConfig3CreatePayloadHMAC, &manifest->payloadHMAC);
+    const bool metadata = replaceHMAC(object, sysConfig3CreateMetadataHMAC, &manifest->metadataHMAC);
+    const bool full = replaceHMAC(object, sysConfig3CreateFullHMAC, &manifest->fullHMAC);
+    return payload && metadata && full;
+}
+
+bool sysConfig3IsValidHMAC(const __SysConfig3* object) {
+    constexpr char operation[] = "bool sysConfig3IsValidHMAC(const struct __SysConfig3 *__single)";
+    if (object == nullptr) {
+        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
+        return false;
+    }
+    if (!hasKey(object)) {
+        logHook()(messageLevel,
+                  "Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %d. Did you register "
+                  "HMAC key?",
+                  keyAddress(object), static_cast<int>(object->hmacKey.length));
+        return false;
+    }
+    const __SysConfig3ManifestEntry& manifest = *object->manifest;
+    const bool payload = matches(object, sysConfig3CreatePayloadHMAC, manifest.payloadHMAC);
+    if (!payload)
+        logHook()(messageLevel, "%s Payload HMAC does not match.", operation);
+    const bool metadata = matches(object, sysConfig3CreateMetadataHMAC, manifest.metadataHMAC);
+    if (!metadata)
+        logHook()(messageLevel, "%s Metadata HMAC does not match.", operation);
+    const bool full = matches(object, sysConfig3CreateFullHMAC, manifest.fullHMAC);
+    if (!full)
+        logHook()(messageLevel, "%s Full HMAC does not match.", operation);
+    return payload && metadata && full;
+}

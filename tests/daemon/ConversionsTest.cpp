@@ -1,0 +1,160 @@
+#include "Daemon/Conversions.h"
+
+#include <optional>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "platform/KeyedArchive.h"
+
+namespace {
+
+using Data = Value::Data;
+using Array = Value::Array;
+using Dictionary = Value::Dictionary;
+
+Data bytes(std::string_view text) {
+    return {text.begin(), text.end()};
+}
+
+TEST(Conversions, bytesBecomeTwoLowerCaseDigitsEach) {
+    EXPECT_EQ(DatatoHexString(Data{0x00, 0xAB, 0x10, 0x0F}), Value("00ab100f"));
+    EXPECT_TRUE(DatatoHexString(Data{}).isNothing());
+    EXPECT_TRUE(DatatoHexString({}).isNothing());
+    EXPECT_TRUE(DatatoHexString("text").isNothing());
+}
+
+TEST(Conversions, pairsOfDigitsBecomeCharacters) {
+    const struct {
+        const char* text;
+        Value expected;
+    } rows[] = {
+        {"", ""},
+        {"4142", "AB"},
+        {"4a4B", "JK"},
+        {"414", {}},
+        {" 41", {}},
+        {" 4\t1", std::string("\x04\x01")},
+        {"4g", std::string("\x04")},
+        {"zz41", std::string("\0A", 2)},
+        {"0x41", std::string("\0A", 2)},
+        {"-1+1", std::string("\0\0", 2)},
+        {"80ffE9", "\u0080\u00FF\u00E9"},
+        {"é141", std::string("\0A", 2)}, // characters are counted, not bytes
+        {"é1", std::string("\0", 1)},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(stringFromHexString(row.text), row.expected) << row.text;
+}
+
+TEST(Conversions, pairsOfDigitsBecomeBytes) {
+    const struct {
+        const char* text;
+        Data expected;
+    } rows[] = {
+        {"0x1F 2a", {0x1F, 0x2A}}, {"0X1f0x2A", {0x1F, 0x2A}}, {" 0x ", {}}, {"1g", {0x01}},
+        {"\t1", {0x01}},           {"00xx", {0x00}}, // what the removal of "0x" brings together stays
+        {"00Xx", {0x00}},                            // "0x" goes before "0X"
+        {"0 x", {0x00}},                             // blanks go last
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(hexString2Binary(row.text), row.expected) << row.text;
+}
+
+TEST(Conversions, textThatIsNoPairsOfDigitsRaises) {
+    constexpr char oddReason[] = "Text does not have 2-digit hex chars for every byte";
+    constexpr char digitReason[] = "Text has illegal hexadecimal characters";
+    const struct {
+        const char* text;
+        const char* reason;
+    } rows[] = {
+        {"ABC", oddReason},    {"zzz", oddReason},    {"0x1", oddReason},  {"1 ", oddReason},   {"zz", digitReason},
+        {"12g1", digitReason}, {"\t\n", digitReason}, {"-1", digitReason}, {"éé", digitReason},
+    };
+    for (const auto& row : rows) {
+        try {
+            hexString2Binary(row.text);
+            ADD_FAILURE() << row.text;
+        } catch (const ConversionFailure& failure) {
+            EXPECT_EQ(failure.name(), "IllegalInput");
+            EXPECT_STREQ(failure.what(), row.reason) << row.text;
+        }
+    }
+}
+
+// The test vectors of RFC 4648, section 10.
+TEST(Conversions, base64IsPaddedAndInOneLine) {
+    const struct {
+        const char* text;
+        const char* expected;
+    } rows[] = {{"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foobar", "Zm9vYmFy"}, {"\xFB\xFF", "+/8="}};
+    for (const auto& row : rows)
+        EXPECT_EQ(base64EncodedString(bytes(row.text)), row.expected);
+    std::string expected;
+    for (int i = 0; i < (4 << 20) / 3; ++i)
+        expected += "AAAA";
+    EXPECT_TRUE(base64EncodedString(Data((4 << 20) / 3 * 3)) == expected);
+}
+
+TEST(Conversions, errorsBecomeOneText) {
+    EXPECT_EQ(stringFromLXError({"Orlo Error Domain", 0x100000001, "Gerät"}),
+              "LXError domain:Orlo Error Domain, error code: 1. Description: Gerät");
+}
+
+TEST(Conversions, onlyNumbersAreNumbers) {
+    for (const Value& number : {Value(0), Value(-7), Value(false)})
+        EXPECT_EQ(isLXNumber(number), number);
+    for (const Value& other : {Value(), Value("1"), Value(Data{1}), Value(Array{1}), Value(Dictionary{})})
+        EXPECT_TRUE(isLXNumber(other).isNothing());
+}
+
+// Decodes with the console caught; none when it raised.
+std::optional<Value> unarchive(const Value& data, std::string& console) {
+    testing::internal::CaptureStderr();
+    std::optional<Value> object;
+    try {
+        object = convertDataToDictionary(data);
+    } catch (const ArchiveFailure&) {
+    }
+    console = testing::internal::GetCapturedStderr();
+    return object;
+}
+
+TEST(Conversions, dictionariesComeBackFromTheirArchive) {
+    const Value dictionary = Dictionary{{"text", "x\ny"}, {"number", 7}, {"data", Data{1}}, {"texts", Array{"a", "b"}}};
+    std::string console;
+    EXPECT_EQ(unarchive(convertDictionaryToData(dictionary), console), dictionary);
+    EXPECT_EQ(console, "Unarchive Error : (null)\n"
+                       R"(recvDict : {"data": <01>, "number": 7, "text": "x\ny", "texts": ["a", "b"]})"
+                       "\nerr : (null)\n");
+    EXPECT_TRUE(convertDictionaryToData({}).isNothing());
+    EXPECT_EQ(*convertDictionaryToData(Dictionary{}).data(), bytes("\xA1\x6DHSArchiverKey\xA0"));
+    EXPECT_THROW(convertDictionaryToData(Dictionary{{"a", Value()}}), ArchiveFailure);
+}
+
+TEST(Conversions, theConsoleTellsWhatWasMet) {
+    const std::string notAnArchive = "KeyedArchiveErrorDomain (2): The data is not a keyed archive\n";
+    const struct {
+        const char* what;
+        Value data;
+        std::optional<Value> object;
+        std::string console;
+    } rows[] = {
+        {"nothing", {}, Value(), ""},
+        {"no archive", bytes("text"), Value(),
+         "Unarchive Error : " + notAnArchive + "Error : " + notAnArchive + "recvDict : (null)\nerr : " + notAnArchive},
+        {"another key", bytes("\xA1\x61k\x01"), Value(), "Unarchive Error : (null)\nrecvDict : (null)\nerr : (null)\n"},
+        {"another kind", bytes("\xA1\x6DHSArchiverKey\xF6"), std::nullopt, "Unarchive Error : (null)\n"},
+        {"a text that would forge lines",
+         bytes("\xA1\x6DHSArchiverKey\x66"
+               "a\nerr:"),
+         Value("a\nerr:"), "Unarchive Error : (null)\nrecvDict : a\\nerr:\nerr : (null)\n"},
+    };
+    for (const auto& row : rows) {
+        std::string console;
+        EXPECT_EQ(unarchive(row.data, console), row.object) << row.what;
+        EXPECT_EQ(console, row.console) << row.what;
+    }
+}
+
+} // namespace

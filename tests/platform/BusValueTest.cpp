@@ -1,0 +1,151 @@
+#include "platform/linux/services/BusValue.h"
+
+#include <cstdint>
+#include <functional>
+#include <limits>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "tests/support/LooseBus.h"
+
+namespace {
+
+using Dictionary = Value::Dictionary;
+
+// What a host may send under one key: the body of an a{sv} with the only key "k".
+struct Incoming {
+    const char* name;
+    std::function<int(sd_bus_message*)> write;
+    Value expected;
+};
+
+LooseBus::Message messageWith(LooseBus& bus, const std::function<int(sd_bus_message*)>& write) {
+    LooseBus::Message message = bus.message();
+    LooseBus::require(sd_bus_message_open_container(message.get(), 'a', "{sv}"));
+    LooseBus::require(write(message.get()));
+    LooseBus::require(sd_bus_message_close_container(message.get()));
+    LooseBus::finish(message);
+    return message;
+}
+
+template <class... Arguments>
+std::function<int(sd_bus_message*)> entry(const char* types, Arguments... arguments) {
+    return [=](sd_bus_message* message) { return sd_bus_message_append(message, "{sv}", "k", types, arguments...); };
+}
+
+TEST(BusValue, everyTypeThatAHostMaySendBecomesItsValue) {
+    const Incoming rows[] = {
+        {"text", entry("s", "Grüße"), "Grüße"},
+        {"object path", entry("o", "/a/b"), "/a/b"},
+        {"signature", entry("g", "a{sv}"), "a{sv}"},
+        {"boolean", entry("b", 1), true},
+        {"byte", entry("y", 255), 255},
+        {"int16", entry("n", -1), -1},
+        {"uint16", entry("q", 65535), 65535},
+        {"int32", entry("i", std::numeric_limits<std::int32_t>::min()), std::numeric_limits<std::int32_t>::min()},
+        {"uint32", entry("u", 4294967295U), 4294967295U},
+        {"int64", entry("x", std::numeric_limits<std::int64_t>::min()), std::numeric_limits<std::int64_t>::min()},
+        {"uint64", entry("t", std::uint64_t{1} << 62), std::int64_t{1} << 62},
+        {"data", entry("ay", 3, 1, 0, 255), Value::Data{1, 0, 255}},
+        {"no data", entry("ay", 0), Value::Data{}},
+        {"texts", entry("as", 2, "a", "b"), Value::Array{"a", "b"}},
+        {"array", entry("av", 2, "s", "a", "b", 0), Value::Array{"a", false}},
+        {"dictionary of texts", entry("a{ss}", 1, "a", "b"), Dictionary{{"a", "b"}}},
+        {"dictionary", entry("a{sv}", 1, "a", "av", 0), Dictionary{{"a", Value::Array{}}}},
+    };
+    LooseBus bus;
+    for (const Incoming& row : rows) {
+        const LooseBus::Message message = messageWith(bus, row.write);
+        EXPECT_EQ(Value(bus::readDictionary(message.get())), Value(Dictionary{{"k", row.expected}})) << row.name;
+    }
+}
+
+// An array inside an array, `depth` times.
+int nested(sd_bus_message* message, int depth) {
+    LooseBus::require(sd_bus_message_open_container(message, 'e', "sv"));
+    LooseBus::require(sd_bus_message_append_basic(message, 's', "k"));
+    for (int i = 0; i < depth; ++i) {
+        LooseBus::require(sd_bus_message_open_container(message, 'v', "av"));
+        LooseBus::require(sd_bus_message_open_container(message, 'a', "v"));
+    }
+    for (int i = 0; i < 2 * depth + 1; ++i)
+        LooseBus::require(sd_bus_message_close_container(message));
+    return 0;
+}
+
+TEST(BusValue, whatNoValueHoldsIsRefusedWithItsKey) {
+    struct Row {
+        const char* name;
+        std::function<int(sd_bus_message*)> write;
+        const char* says;
+    };
+    const Row rows[] = {
+        {"double", entry("d", 1.5), "\"k\" has the D-Bus type \"d\""},
+        {"file descriptor", entry("h", 0), "\"k\" has the D-Bus type \"h\""},
+        {"structure", entry("(ss)", "a", "b"), "\"k\" has the D-Bus type \"(ss)\""},
+        {"array of integers", entry("ai", 1, 1), "\"k\" has the D-Bus type \"ai\""},
+        {"variant in a variant", entry("v", "s", "a"), "\"k\" has the D-Bus type \"v\""},
+        {"other keys", entry("a{us}", 1, 1, "a"), "\"k\" has the D-Bus type \"a{us}\""},
+        {"unsigned beyond 63 bits", entry("t", ~std::uint64_t{0}), "\"k\" does not fit a signed 64-bit integer"},
+        {"deep key", entry("a{sv}", 1, "in", "a{sv}", 1, "side", "d", 1.5), "\"k.in.side\" has the D-Bus type \"d\""},
+        {"in an array", entry("av", 1, "d", 1.5), "\"k\" has the D-Bus type \"d\""},
+        {"too deep", [](sd_bus_message* message) { return nested(message, bus::maximumNesting); },
+         "\"k\" nests more than 32"},
+        {"twice", [](sd_bus_message* m) { return sd_bus_message_append(m, "{sv}{sv}", "k", "b", 0, "k", "b", 0); },
+         "\"k\" is given twice"},
+    };
+    LooseBus bus;
+    for (const Row& row : rows) {
+        const LooseBus::Message message = messageWith(bus, row.write);
+        try {
+            bus::readDictionary(message.get());
+            ADD_FAILURE() << row.name << " was accepted";
+        } catch (const bus::Refusal& refusal) {
+            EXPECT_NE(std::string(refusal.what()).find(row.says), std::string::npos)
+                << row.name << ": " << refusal.what();
+        }
+    }
+    const LooseBus::Message message =
+        messageWith(bus, [](sd_bus_message* m) { return nested(m, bus::maximumNesting - 1); });
+    EXPECT_NO_THROW(bus::readDictionary(message.get()));
+}
+
+TEST(BusValue, aMessageOfVeryManyValuesIsRefused) {
+    LooseBus bus;
+    const LooseBus::Message message = messageWith(bus, [](sd_bus_message* m) {
+        LooseBus::require(sd_bus_message_open_container(m, 'e', "sv"));
+        LooseBus::require(sd_bus_message_append_basic(m, 's', "many"));
+        LooseBus::require(sd_bus_message_open_container(m, 'v', "as"));
+        LooseBus::require(sd_bus_message_open_container(m, 'a', "s"));
+        for (std::size_t i = 0; i < bus::maximumValues; ++i)
+            LooseBus::require(sd_bus_message_append_basic(m, 's', ""));
+        for (int i = 0; i < 3; ++i)
+            LooseBus::require(sd_bus_message_close_container(m));
+        return 0;
+    });
+    EXPECT_THROW(bus::readDictionary(message.get()), bus::Refusal);
+}
+
+TEST(BusValue, aWrittenDictionaryReadsBackButForWhatDBusCannotCarry) {
+    LooseBus bus;
+    const LooseBus::Message message = bus.message();
+    bus::appendDictionary(message.get(), {{"text", "a"},
+                                          {"bad text", std::string("a\0b\xFF", 4)},
+                                          {"data", Value::Data{0}},
+                                          {"integer", -1},
+                                          {"boolean", true},
+                                          {"array", Value::Array{"a", Value(), Dictionary{{"k", 1}}}},
+                                          {"nothing", Value()}});
+    LooseBus::finish(message);
+    const Value expected(Dictionary{{"text", "a"},
+                                    {"bad text", "a\uFFFDb\uFFFD"},
+                                    {"data", Value::Data{0}},
+                                    {"integer", -1},
+                                    {"boolean", true},
+                                    {"array", Value::Array{"a", Dictionary{{"k", 1}}}}});
+    EXPECT_EQ(Value(bus::readDictionary(message.get())), expected);
+}
+
+} // namespace

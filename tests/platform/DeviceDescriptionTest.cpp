@@ -1,0 +1,115 @@
+#include "platform/linux/system/DeviceDescription.h"
+
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "platform/linux/system/Json.h"
+#include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+using Data = Value::Data;
+using Array = Value::Array;
+using Dictionary = Value::Dictionary;
+
+constexpr char path[] = "/etc/veltra/device.json";
+
+TEST(Json, textsBecomeValues) {
+    const struct {
+        std::string text;
+        std::optional<Value> value;
+    } rows[] = {
+        {R"({"a": [1, -2, true, null, "\u00e9"]})", Dictionary{{"a", Array{1, -2, true, Value(), "é"}}}},
+        {"9223372036854775807", std::numeric_limits<std::int64_t>::max()},
+        {std::string(32, '[') + std::string(32, ']'),
+         [] {
+             Value value = Array{};
+             for (int i = 1; i < 32; ++i)
+                 value = Array{std::move(value)};
+             return value;
+         }()},
+        {std::string(33, '[') + std::string(33, ']'), std::nullopt},
+        {std::string(1 << 20, '['), std::nullopt},
+        {"9223372036854775808", std::nullopt},
+        {"-9223372036854775809", std::nullopt},
+        {"[1.5]", std::nullopt},
+        {"[1.0]", std::nullopt},
+        {"[1e3]", std::nullopt},
+        {R"({"a": 1, "a": 2})", std::nullopt},
+        {"\"\xFF\"", std::nullopt},
+        {"[1] 2", std::nullopt},
+        {"[1", std::nullopt},
+        {"", std::nullopt},
+    };
+    for (const auto& row : rows) {
+        std::string refusal;
+        EXPECT_EQ(jsonToValue(row.text, &refusal), row.value) << row.text.substr(0, 80);
+        EXPECT_EQ(refusal.empty(), row.value.has_value()) << row.text.substr(0, 80);
+    }
+}
+
+TEST(DeviceDescription, isReadAtEveryCall) {
+    const TemporaryRoot root;
+    root.write(path, R"({"answers": {"ScreenSerialNumber": "SCR0001"}})");
+    EXPECT_EQ(deviceDescription()["answers"]["ScreenSerialNumber"], Value("SCR0001"));
+    root.write(path, R"({"answers": {"ScreenSerialNumber": "SCR0002"}})");
+    EXPECT_EQ(deviceDescription()["answers"]["ScreenSerialNumber"], Value("SCR0002"));
+}
+
+TEST(DeviceDescription, withoutOneTheConsoleSaysWhyInOneLine) {
+    const TemporaryRoot root;
+    const struct {
+        const char* contents; // null: no file
+        const char* line;
+    } rows[] = {
+        {nullptr, "Device description /etc/veltra/device.json is missing or cannot be read\n"},
+        {"[]", "Device description /etc/veltra/device.json is malformed: it is no object\n"},
+        {"{\"a\": }", "Device description /etc/veltra/device.json is malformed: a syntax error at byte 7\n"},
+        {"{\"a\": 1.5}", "Device description /etc/veltra/device.json is malformed: a number that is no integer of 64 "
+                         "signed bits\n"},
+    };
+    for (const auto& row : rows) {
+        if (row.contents)
+            root.write(path, row.contents);
+        testing::internal::CaptureStderr();
+        EXPECT_TRUE(deviceDescription().isNothing());
+        EXPECT_EQ(testing::internal::GetCapturedStderr(), row.line);
+    }
+}
+
+TEST(DeviceDescription, describedValuesStandForDataAndFiles) {
+    const TemporaryRoot root;
+    root.write("/sys/uid", std::string("\x0B\xAD\0 \n", 5));
+    root.write("/sys/model", std::string("M12\xFFx é \n\0\0", 12));
+    root.write("/sys/blank", std::string(" \0\n", 3));
+    const struct {
+        const char* described;
+        Value value;
+    } rows[] = {
+        {R"({"$data": "0bADcafe"})", Data{0x0B, 0xAD, 0xCA, 0xFE}},
+        {R"({"$data": ""})", Data{}},
+        {R"({"$data": "0bA"})", {}},
+        {R"({"$data": "0x12"})", {}},
+        {R"({"$data": "-1+1"})", {}},
+        {R"({"$data": 12})", {}},
+        {R"({"$data": "00", "as": "text"})", {}},
+        {R"({"$file": "/sys/uid"})", Data{0x0B, 0xAD, 0, ' ', '\n'}},
+        {R"({"$file": "/sys/uid", "as": "data"})", Data{0x0B, 0xAD, 0, ' ', '\n'}},
+        {R"({"$file": "/sys/model", "as": "text"})", "M12\uFFFDx é"},
+        {R"({"$file": "/../sys/blank", "as": "text"})", ""},
+        {R"({"$file": "/sys/uid", "as": "number"})", {}},
+        {R"({"$file": "/sys/uid", "offset": 1})", {}},
+        {R"({"$file": "/sys"})", {}},
+        {R"({"$file": "/missing"})", {}},
+        {R"({"$file": 1})", {}},
+        {R"([1, {"plain": {"$data": "01"}}])", Array{1, Dictionary{{"plain", Data{1}}}}},
+    };
+    for (const auto& row : rows) {
+        const std::optional<Value> described = jsonToValue(row.described);
+        ASSERT_TRUE(described) << row.described;
+        EXPECT_EQ(resolveDescribed(*described), row.value) << row.described;
+    }
+}
+
+} // namespace

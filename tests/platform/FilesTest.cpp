@@ -1,0 +1,199 @@
+#include "platform/Files.h"
+
+#include <csignal>
+#include <optional>
+#include <string>
+
+#include <fcntl.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+
+#include <gtest/gtest.h>
+
+#include "platform/linux/system/DeviceRoot.h"
+#include "tests/support/OwnProcess.h"
+#include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+Value::Data bytes(std::string_view text) {
+    return {text.begin(), text.end()};
+}
+
+std::optional<std::string> readText(std::string_view path) {
+    const std::optional<Value::Data> contents = files::readWhole(path);
+    if (!contents)
+        return std::nullopt;
+    return std::string(contents->begin(), contents->end());
+}
+
+unsigned mode(const std::filesystem::path& path) {
+    struct stat status = {};
+    EXPECT_EQ(::stat(path.c_str(), &status), 0);
+    return status.st_mode & 07777;
+}
+
+class Umask {
+public:
+    explicit Umask(mode_t mask) : previous_(::umask(mask)) {}
+    ~Umask() { ::umask(previous_); }
+
+private:
+    mode_t previous_;
+};
+
+TEST(Files, pathsAreResolvedInsideTheRoot) {
+    const TemporaryRoot root;
+    std::ofstream(root.around() / "secret") << "outside";
+    root.write("/secret", "inside");
+    root.write("/etc/real", "real");
+    root.link("/etc/absolute", "/etc/real");
+    root.link("/etc/relative", "../../../../secret");
+    root.link("/etc/toHost", root.around() / "secret");
+    root.link("/etc/up", "../..");
+    root.link("/etc/loop", "loop");
+    root.link("/etc/magic", "/proc/self/root/secret");
+
+    const struct {
+        std::string_view path;
+        std::optional<std::string> contents;
+    } rows[] = {
+        {"/etc/real", "real"},        {"etc/real", "real"},
+        {"/../secret", "inside"},     {"/etc/../../../secret", "inside"},
+        {"/etc/absolute", "real"},    {"/etc/relative", "inside"},
+        {"/etc/up/secret", "inside"}, {"/etc/toHost", std::nullopt},
+        {"/etc/loop", std::nullopt},  {"/etc/magic", std::nullopt},
+        {"", std::nullopt},           {std::string_view("/secret\0", 8), std::nullopt},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(readText(row.path), row.contents) << row.path;
+}
+
+TEST(Files, onlyRegularFilesAreReadAndNothingIsWaitedFor) {
+    const TemporaryRoot root;
+    root.makeDirectory("/directory");
+    ASSERT_EQ(::mkfifo(root.host("/fifo").c_str(), 0600), 0);
+    root.write("/empty", "");
+    EXPECT_EQ(readText("/directory"), std::nullopt);
+    EXPECT_EQ(readText("/fifo"), std::nullopt);
+    EXPECT_EQ(readText("/missing"), std::nullopt);
+    EXPECT_EQ(readText("/empty"), "");
+
+    ::setenv("VELTRA_DEVICE_ROOT", "/", 1);
+    EXPECT_EQ(readText("/dev/zero"), std::nullopt);
+}
+
+// The file systems of the kernel state a size of 0 or of a page for nodes that hold something else.
+TEST(Files, theBytesThatComeCountAndNotTheStatedSize) {
+    const TemporaryRoot root;
+    ::setenv("VELTRA_DEVICE_ROOT", "/", 1);
+    for (const char* path : {"/proc/version", "/proc/kallsyms", "/sys/devices/system/cpu/possible"}) {
+        std::ifstream file(path, std::ios::binary);
+        if (!file)
+            continue; // not every kernel has it
+        EXPECT_EQ(readText(path), std::string(std::istreambuf_iterator<char>(file), {})) << path;
+    }
+    EXPECT_FALSE(readRegularFile(openInRoot("/proc/version", O_RDONLY), 5));
+}
+
+TEST(Files, sizesAreBounded) {
+    const TemporaryRoot root;
+    root.write("/ten", "0123456789");
+    EXPECT_TRUE(readRegularFile(openInRoot("/ten", O_RDONLY), 10));
+    EXPECT_FALSE(readRegularFile(openInRoot("/ten", O_RDONLY), 9));
+    root.write("/sparse", "");
+    std::filesystem::resize_file(root.host("/sparse"), files::maximumSize + 1);
+    EXPECT_FALSE(files::readWhole("/sparse"));
+}
+
+TEST(Files, replaceMakesAPrivateFileOfTheWholeContents) {
+    const TemporaryRoot root;
+    root.makeDirectory("/tmp");
+    const Umask none(0);
+    for (const std::string& contents :
+         {std::string("first, which is longer"), std::string(3 << 20, 'x'), std::string()}) {
+        EXPECT_TRUE(files::replace("/tmp/blob", bytes(contents)));
+        EXPECT_TRUE(root.read("/tmp/blob") == contents);
+    }
+    root.write("/tmp/open", "readable by all");
+    EXPECT_TRUE(files::replace("tmp/../tmp/open", bytes("new")));
+    EXPECT_EQ(mode(root.host("/tmp/open")), 0600u);
+    const Umask all(0777);
+    EXPECT_TRUE(files::replace("/tmp/strict", bytes("new")));
+    EXPECT_EQ(mode(root.host("/tmp/strict")), 0600u);
+    EXPECT_TRUE(files::replace("top", bytes("at the root")));
+    EXPECT_EQ(root.read("/top"), "at the root");
+    EXPECT_EQ(root.contents().size(), 5u); // no file of another name is left
+}
+
+TEST(Files, replaceRefusesWhatIsNoRegularFileAndLeavesEverythingAsItWas) {
+    const TemporaryRoot root;
+    std::ofstream(root.around() / "secret") << "outside";
+    root.write("/tmp/file", "old");
+    root.makeDirectory("/tmp/directory");
+    ASSERT_EQ(::mkfifo(root.host("/tmp/fifo").c_str(), 0600), 0);
+    root.link("/tmp/link", "file");
+    root.link("/tmp/dangling", "missing");
+    root.link("/tmp/toHost", root.around() / "secret");
+    root.link("/linked", "tmp");
+    const auto before = root.contents();
+
+    const std::string longName = "/tmp/" + std::string(256, 'n');
+    const std::string_view paths[] = {
+        "/tmp/directory",
+        "/tmp/fifo",
+        "/tmp/link",
+        "/tmp/dangling",
+        "/tmp/toHost",
+        "/linked/file",
+        "/linked/new",
+        "/missing/file",
+        "/tmp/file/x",
+        "/tmp/",
+        "/tmp/..",
+        "/tmp/.",
+        "/",
+        "",
+        longName,
+        std::string_view("/tmp/new\0", 9),
+    };
+    for (const std::string_view path : paths)
+        EXPECT_FALSE(files::replace(path, bytes("new"))) << path;
+    EXPECT_EQ(root.contents(), before);
+}
+
+// A file-size limit stands in for a full disk: the write that crosses it is cut short and the next one fails.
+TEST(Files, replaceThatCannotWriteKeepsTheOldFileAndLeavesNoOther) {
+    const TemporaryRoot root;
+    root.write("/tmp/file", "old");
+    inOwnProcess([] {
+        std::signal(SIGXFSZ, SIG_IGN);
+        const rlimit limit = {10, 10};
+        ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &limit), 0);
+        EXPECT_FALSE(files::replace("/tmp/file", bytes("more than ten bytes")));
+    });
+    EXPECT_EQ(root.contents(), (std::map<std::string, std::string>{{"/tmp", "directory"}, {"/tmp/file", "old"}}));
+}
+
+TEST(Files, appendAddsToARegularFileOnly) {
+    const TemporaryRoot root;
+    root.makeDirectory("/log");
+    const Umask usual(022);
+    EXPECT_TRUE(files::append("/log/a", "one\n"));
+    EXPECT_TRUE(files::append("/log/a", "two\n"));
+    EXPECT_EQ(root.read("/log/a"), "one\ntwo\n");
+    EXPECT_EQ(mode(root.host("/log/a")), 0640u);
+
+    root.link("/log/link", "a");
+    root.link("/log/dangling", "b");
+    ASSERT_EQ(::mkfifo(root.host("/log/fifo").c_str(), 0600), 0);
+    const FileDescriptor reader = openInRoot("/log/fifo", O_RDONLY | O_NONBLOCK);
+    const auto before = root.contents();
+    for (const char* path : {"/log/link", "/log/dangling", "/log/fifo", "/log", "/missing/a"})
+        EXPECT_FALSE(files::append(path, "three\n")) << path;
+    EXPECT_EQ(root.contents(), before);
+    char byte;
+    EXPECT_EQ(::read(reader.get(), &byte, 1), 0);
+}
+
+} // namespace

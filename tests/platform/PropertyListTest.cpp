@@ -1,0 +1,71 @@
+#include "platform/linux/system/PropertyList.h"
+
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "platform/BundleInfo.h"
+
+namespace {
+
+using Data = Value::Data;
+using Array = Value::Array;
+using Dictionary = Value::Dictionary;
+
+std::optional<Value> read(const std::string& text) {
+    return propertyListToValue(Data(text.begin(), text.end()));
+}
+
+TEST(PropertyList, elementsBecomeValues) {
+    const std::string deep = "<array>";
+    const struct {
+        std::string element;
+        std::optional<Value> value;
+    } rows[] = {
+        {"<dict><key>a</key><string>x &amp; y</string><key>b</key><array><true/><false/></array></dict>",
+         Dictionary{{"a", "x & y"}, {"b", Array{true, false}}}},
+        {"<dict/>", Dictionary{}},
+        {"<integer>-9223372036854775808</integer>", std::numeric_limits<std::int64_t>::min()},
+        {"<data>\n\tAKs=\n\t</data>", Data{0x00, 0xAB}},
+        {"<data/>", Data{}},
+        {"<string/>", ""},
+        {"<array><real>1.5</real><date>2024-03-05T02:07:09Z</date></array>", Array{Value(), Value()}},
+        {"<integer>9223372036854775808</integer>", std::nullopt},
+        {"<integer>12x</integer>", std::nullopt},
+        {"<integer/>", std::nullopt},
+        {"<data>AKs</data>", std::nullopt},
+        {"<data>AK==AKs=</data>", std::nullopt},
+        {"<data>*Ks=</data>", std::nullopt},
+        {"<dict><key>a</key></dict>", std::nullopt},
+        {"<dict><string>a</string><key>a</key></dict>", std::nullopt},
+        {"<dict><key>a</key><true/><key>a</key><true/></dict>", std::nullopt},
+        {"<set/>", std::nullopt},
+        {"<true/><true/>", std::nullopt},
+        {"<string>\xFF</string>", std::nullopt},
+        {"<array>", std::nullopt},
+        {"", std::nullopt},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(read("<?xml version=\"1.0\"?><plist version=\"1.0\">" + row.element + "</plist>"), row.value)
+            << row.element;
+    EXPECT_FALSE(read("<dict/>"));
+}
+
+TEST(PropertyList, deepNestingAndEntitiesAreHarmless) {
+    std::string nested = "<plist>";
+    for (int i = 0; i < 100000; ++i)
+        nested += "<array>";
+    for (int i = 0; i < 100000; ++i)
+        nested += "</array>";
+    EXPECT_FALSE(read(nested + "</plist>"));
+    EXPECT_EQ(read("<!DOCTYPE plist [<!ENTITY file SYSTEM \"/etc/passwd\">]><plist><string>&file;</string></plist>"),
+              Value("&file;"));
+}
+
+// The build puts the list beside this test as it does beside the plug-in.
+TEST(BundleInfo, isTheListBesideTheExecutable) {
+    EXPECT_EQ(bundleInformationList(),
+              Value(Dictionary{{"KVBundleShortVersionString", VELTRA_TEST_VERSION}, {"KVBundleVersion", "1"}}));
+}
+
+} // namespace

@@ -1,0 +1,169 @@
+#include "platform/Error.h"
+#include "platform/Format.h"
+#include "platform/Utf8.h"
+#include "platform/Value.h"
+
+#include <limits>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using Data = Value::Data;
+using Array = Value::Array;
+using Dictionary = Value::Dictionary;
+
+Value nested(std::size_t levels) {
+    Value value = "core";
+    for (std::size_t i = 0; i < levels; ++i)
+        value = Array{std::move(value)};
+    return value;
+}
+
+TEST(Value, readingAnotherKindGivesNothing) {
+    const Value request = Dictionary{{"options", Dictionary{{"flag", true}}}, {"name", "x"}};
+    EXPECT_EQ(request["options"]["flag"].integer(), 1);
+    EXPECT_TRUE(request["name"]["flag"]["deeper"].isNothing());
+    EXPECT_FALSE(request["name"].integer());
+    EXPECT_EQ(Value(7).boolean(), true);
+    EXPECT_NE(Value(1), Value(true));
+}
+
+TEST(Value, descriptionsShowEveryKindOnOneLine) {
+    const struct {
+        Value value;
+        std::string expected;
+    } rows[] = {
+        {{}, "(null)"},
+        {false, "false"},
+        {std::numeric_limits<std::int64_t>::min(), "-9223372036854775808"},
+        {"as it\nstands \"\\", "as it\nstands \"\\"},
+        {Data{}, "<>"},
+        {Data(64, 0xAA), std::string("<").append(128, 'a') + ">"},
+        {Data(65, 0x01), "<65 bytes: 01010101010101010101010101010101...01010101010101010101010101010101>"},
+        {Array{}, "[]"},
+        {Dictionary{}, "{}"},
+        {Dictionary{{"b", Array{1, true, Value()}}, {"a", Data{0, 0xFF}}}, "{\"a\": <00ff>, \"b\": [1, true, (null)]}"},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(row.value.description(), row.expected);
+}
+
+TEST(Value, textsInsideCollectionsCannotLeaveTheirQuotesOrTheLine) {
+    const struct {
+        std::string text, expected;
+    } rows[] = {
+        {"\", \"forged\": \"\\", R"(["\", \"forged\": \"\\"])"},
+        {"a\n2024-03-05 02:07:09-[main:1] b\r\t", R"(["a\n2024-03-05 02:07:09-[main:1] b\r\t"])"},
+        {std::string("\0\x1B\x7F", 3), R"(["\u0000\u001b\u007f"])"},
+        {"\u0085\u2028\u202E\u2066", R"(["\u0085\u2028\u202e\u2066"])"},
+        {"Gerät 機", "[\"Gerät 機\"]"},
+        {"\xC3(\xE6\xA9", R"(["\xc3(\xe6\xa9"])"},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(Value(Array{row.text}).description(), row.expected);
+    EXPECT_EQ(Value(Dictionary{{"k\n", 1}}).description(), R"({"k\n": 1})");
+}
+
+TEST(Value, descriptionsAreBoundedAndSayWhatTheyLeftOut) {
+    EXPECT_EQ(Value(Array{std::string(255, 'a') + "é"}).description(),
+              std::string("[\"").append(255, 'a') + "\"... (257 bytes)]");
+    EXPECT_EQ(nested(33).description(), std::string(33, '[') + "... (1 more)" + std::string(33, ']'));
+
+    Dictionary wide;
+    for (int i = 0; i < 100; ++i)
+        wide.emplace("key" + std::to_string(i), Array(100, std::string(1000, '\x01')));
+    const std::string description = Value(wide).description();
+    EXPECT_LT(description.size(), 8192u);
+    EXPECT_TRUE(description.ends_with("... (99 more)}")) << description.substr(description.size() - 40);
+}
+
+TEST(Error, descriptionIsOneLineOfBoundedLength) {
+    const Error error{"Orlo Error Domain", -1012, "Unable to\ndownload"};
+    EXPECT_EQ(error.description(), R"(Orlo Error Domain (-1012): Unable to\ndownload)");
+    EXPECT_LT((Error{"d", 1, std::string(1 << 20, 'x')}.description().size()), 2048u);
+}
+
+TEST(Format, conversionsWriteTheirArgument) {
+    const void* const pointer = reinterpret_cast<const void*>(std::uintptr_t{0xBEEF});
+    const Error error{"D", 7, "text"};
+    const struct {
+        const char* text;
+        FormatArgument argument;
+        const char* expected;
+    } rows[] = {
+        {"<%@>", nullptr, "<(null)>"},
+        {"<%@>", Value(), "<(null)>"},
+        {"<%@>", Value(Array{"a"}), "<[\"a\"]>"},
+        {"<%@>", Value(true), "<true>"},
+        {"<%@>", -5, "<-5>"},
+        {"<%@>", std::numeric_limits<std::uint64_t>::max(), "<18446744073709551615>"},
+        {"<%@>", error, "<D (7): text>"},
+        {"<%@>", std::optional<Error>(), "<(null)>"},
+        {"<%s>", "text", "<text>"},
+        {"<%s>", static_cast<const char*>(nullptr), "<(null)>"},
+        {"<%d>", -5, "<-5>"},
+        {"<%d>", 0xFFFFFFFFU, "<-1>"},
+        {"<%d>", std::int64_t{0x180000000}, "<-2147483648>"},
+        {"<%d>", Value(true), "<1>"},
+        {"<%ld>", std::numeric_limits<std::int64_t>::min(), "<-9223372036854775808>"},
+        {"<%lld>", 0xFFFFFFFFU, "<4294967295>"},
+        {"<%u>", -1, "<4294967295>"},
+        {"<%llu>", -1, "<18446744073709551615>"},
+        {"<%zu>", std::size_t{12}, "<12>"},
+        {"<%x>", 0xABCU, "<abc>"},
+        {"<%X>", 0xABCU, "<ABC>"},
+        {"<%lx>", std::uint64_t{1} << 40, "<10000000000>"},
+        {"<%p>", pointer, "<0xbeef>"},
+        {"<%02x>", 0xF, "<0f>"},
+        {"<%5d>", -42, "<  -42>"},
+        {"<%05i>", -42, "<-0042>"},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(format(row.text, {row.argument}), row.expected) << row.text;
+}
+
+TEST(Format, hostileFormatsReadNothingThatTheArgumentsDoNotOwn) {
+    const struct {
+        const char* text;
+        FormatArgument argument;
+        std::string expected;
+    } rows[] = {
+        {"%s", 7, "7"},
+        {"%s", Value(Data{1}), "<01>"},
+        {"%d", "text", "text"},
+        {"%x", nullptr, "(null)"},
+        {"%p", 7, "7"},
+        {"%n %d", 7, "%n 7"},
+        {"%.2f%-5d%hd", 7, "%.2f%-5d%hd"},
+        {"%l%d", 7, "%l7"},
+        {"100%", 7, "100%"},
+        {"%5", 7, "%5"},
+        {"%%d%d%d", 7, "%d7(null)"},
+        {"%99999999999999999999d", 7, std::string(63, ' ') + "7"},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(format(row.text, {row.argument}), row.expected) << row.text;
+}
+
+TEST(Utf8, badSequencesBecomeOneReplacementEach) {
+    const struct {
+        std::string text, expected;
+    } rows[] = {
+        {"plain é 機 \U0001F527", "plain é 機 \U0001F527"},
+        {"\x80|\xFF|\xC0\xAF", "\uFFFD|\uFFFD|\uFFFD\uFFFD"},
+        {"\xE0\x80\xAF", "\uFFFD\uFFFD\uFFFD"},           // over-long
+        {"\xED\xA0\x80", "\uFFFD\uFFFD\uFFFD"},           // half of a surrogate pair
+        {"\xF4\x90\x80\x80", "\uFFFD\uFFFD\uFFFD\uFFFD"}, // beyond U+10FFFF
+        {"\xF0\x9F\x94x", "\uFFFDx"},
+        {"cut \xE6\xA9", "cut \uFFFD"},
+    };
+    for (const auto& row : rows) {
+        EXPECT_EQ(utf8::repaired(row.text), row.expected);
+        EXPECT_EQ(utf8::isValid(row.text), row.text == row.expected);
+    }
+    EXPECT_EQ(utf8::next("\xE6\xA9").kind, utf8::Step::Incomplete);
+    EXPECT_EQ(utf8::next("\xE6(").kind, utf8::Step::Bad);
+}
+
+} // namespace

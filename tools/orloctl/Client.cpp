@@ -1,0 +1,149 @@
+#include "tools/orloctl/Client.h"
+
+#include <cstdio>
+#include <memory>
+#include <optional>
+#include <string_view>
+
+#include <systemd/sd-bus.h>
+#include <unistd.h>
+
+#include "platform/linux/services/BusValue.h"
+
+namespace {
+
+constexpr const char* serviceName = "com.tevari.VeltraOrloServices";
+constexpr const char* servicePath = "/com/tevari/VeltraOrloServices";
+constexpr const char* serviceInterface = "com.tevari.VeltraPluginServer";
+
+using Clock = std::chrono::steady_clock;
+using BusPtr = std::unique_ptr<sd_bus, decltype(&sd_bus_flush_close_unref)>;
+using MessagePtr = std::unique_ptr<sd_bus_message, decltype(&sd_bus_message_unref)>;
+using SlotPtr = std::unique_ptr<sd_bus_slot, decltype(&sd_bus_slot_unref)>;
+
+int check(int result) {
+    if (result < 0)
+        throw bus::Failure(result);
+    return result;
+}
+
+// The time since the request was sent, on a terminal's standard error and nowhere else.
+class ElapsedTime {
+public:
+    ~ElapsedTime() {
+        if (shown_)
+            std::fputs("\r\033[K", stderr);
+    }
+
+    void show() {
+        const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - start_).count();
+        if (seconds < 1 || !terminal_)
+            return;
+        std::fprintf(stderr, "\r%lld s", static_cast<long long>(seconds));
+        shown_ = true;
+    }
+
+private:
+    const Clock::time_point start_ = Clock::now();
+    const bool terminal_ = isatty(STDERR_FILENO) == 1;
+    bool shown_ = false;
+};
+
+MessagePtr requestMessage(sd_bus* connection, const std::string& command, const Value::Dictionary& arguments) {
+    sd_bus_message* message = nullptr;
+    check(sd_bus_message_new_method_call(connection, &message, serviceName, servicePath, serviceInterface,
+                                         "HandleMessage"));
+    MessagePtr owner(message, sd_bus_message_unref);
+    bus::appendDictionary(message, {{"messageStr", command}, {"messageDict", arguments}});
+    return owner;
+}
+
+// Reads a reply into an answer. A reply without response object is one to an unknown command.
+Answer answerFrom(sd_bus_message* reply, const std::string& command) {
+    int completed = 0;
+    check(sd_bus_message_read_basic(reply, SD_BUS_TYPE_BOOLEAN, &completed));
+    Answer answer;
+    answer.response = bus::readDictionary(reply);
+    if (answer.response.empty()) {
+        answer.outcome = Outcome::UnknownCommand;
+        answer.problem = "The plug-in does not know the command \"" + command + "\".";
+        return answer;
+    }
+    const Value response(answer.response);
+    answer.outcome = response["statusCode"].integer() == 0 ? Outcome::Success : Outcome::Failure;
+    if (answer.outcome == Outcome::Failure)
+        answer.problem = "The plug-in answered \"" + command + "\" with a failure.";
+    return answer;
+}
+
+Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address) {
+    Answer answer;
+    const std::string text = error.message ? error.message : error.name;
+    if (std::string_view(error.name) == SD_BUS_ERROR_INVALID_ARGS) {
+        answer.outcome = Outcome::Usage;
+        answer.problem = "The service refused the request: " + text;
+        return answer;
+    }
+    const std::string where = " on the bus \"" + address.bus + "\"";
+    if (std::string_view(error.name) == SD_BUS_ERROR_NO_REPLY || std::string_view(error.name) == SD_BUS_ERROR_TIMEOUT)
+        answer.problem = "The service" + where + " did not answer within " + std::to_string(address.timeout.count()) +
+                         " s, or ended before it could.";
+    else if (std::string_view(error.name) == SD_BUS_ERROR_SERVICE_UNKNOWN)
+        answer.problem = "The service " + std::string(serviceName) + " is not running" + where + ".";
+    else
+        answer.problem = "The service" + where + " cannot be used: " + text;
+    return answer;
+}
+
+struct Pending {
+    const ServiceAddress& address;
+    const std::string& command;
+    std::optional<Answer> answer;
+};
+
+int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
+    auto& pending = *static_cast<Pending*>(context);
+    try {
+        const sd_bus_error* error = sd_bus_message_get_error(reply);
+        pending.answer = error ? answerFromError(*error, pending.address) : answerFrom(reply, pending.command);
+    } catch (const std::exception& failure) {
+        pending.answer = Answer{Outcome::Unreachable, {}, std::string("The answer cannot be read: ") + failure.what()};
+    }
+    return 0;
+}
+
+Answer converse(sd_bus* connection, const ServiceAddress& address, const std::string& command,
+                const Value::Dictionary& arguments) {
+    const MessagePtr message = requestMessage(connection, command, arguments);
+    const auto timeout = std::chrono::microseconds(address.timeout).count();
+    Pending pending{address, command, {}};
+    sd_bus_slot* slot = nullptr;
+    check(sd_bus_call_async(connection, &slot, message.get(), onReply, &pending, static_cast<std::uint64_t>(timeout)));
+    const SlotPtr slotOwner(slot, sd_bus_slot_unref);
+    constexpr std::uint64_t oneSecond = 1'000'000;
+    ElapsedTime elapsed;
+    while (!pending.answer) {
+        if (check(sd_bus_process(connection, nullptr)) > 0)
+            continue;
+        check(sd_bus_wait(connection, oneSecond));
+        elapsed.show();
+    }
+    return *pending.answer;
+}
+
+} // namespace
+
+Answer sendRequest(const ServiceAddress& address, const std::string& command, const Value::Dictionary& arguments) {
+    sd_bus* opened = nullptr;
+    if (const int result = bus::open(address.bus, &opened); result < 0)
+        return {
+            Outcome::Unreachable, {}, "Cannot reach the bus \"" + address.bus + "\": " + bus::Failure(result).what()};
+    const BusPtr connection(opened, sd_bus_flush_close_unref);
+    try {
+        return converse(connection.get(), address, command, arguments);
+    } catch (const bus::Failure& failure) {
+        if (failure.code == -E2BIG || failure.code == -EMSGSIZE || failure.code == -ENOBUFS)
+            return {Outcome::Usage, {}, std::string("The request is too large for a message: ") + failure.what()};
+        return {Outcome::Unreachable, {}, "Lost the bus \"" + address.bus + "\": " + failure.what()};
+    }
+}

@@ -1,0 +1,35 @@
+// One request to the plug-in over D-Bus.
+#ifndef VELTRA_TOOLS_ORLOCTL_CLIENT_H
+#define VELTRA_TOOLS_ORLOCTL_CLIENT_H
+
+#include <chrono>
+#include <string>
+
+#include "platform/Value.h"
+
+// What became of a request. The values are the exit statuses of orloctl.
+enum class Outcome {
+    Success = 0,        // the plug-in answered with status 0
+    Failure = 1,        // the plug-in answered with another status
+    Usage = 2,          // the arguments are wrong, or the request holds what the plug-in does not take
+    Unreachable = 3,    // there is no bus, no service on it, or no answer within the timeout
+    UnknownCommand = 4, // the request was completed with no response object
+    BadInput = 5,       // an offline reader met bad input
+};
+
+struct Answer {
+    Outcome outcome = Outcome::Unreachable;
+    Value::Dictionary response; // as the plug-in sent it; empty unless it answered
+    std::string problem;        // a sentence for a person; empty on success
+};
+
+struct ServiceAddress {
+    std::string bus = "system"; // "system", "session" or a D-Bus address
+    std::chrono::seconds timeout{600};
+};
+
+// Sends `command` with `arguments` and waits for the answer. On a terminal, standard error shows the time that has
+// passed.
+Answer sendRequest(const ServiceAddress& address, const std::string& command, const Value::Dictionary& arguments);
+
+#endif

@@ -1,0 +1,218 @@
+// orloctl: the host's side of the service, for people and scripts.
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+#include <functional>
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include <CLI/CLI.hpp>
+
+#include "platform/Files.h"
+#include "tools/orloctl/Arguments.h"
+#include "tools/orloctl/Client.h"
+#include "tools/orloctl/Json.h"
+#include "tools/orloctl/ShowBcfg.h"
+#include "tools/orloctl/Version.h"
+
+namespace {
+
+using nlohmann::ordered_json;
+
+constexpr const char* resultPath = "/tmp/new_bCfg";
+
+constexpr const char* exitStatuses = R"(Exit status:
+  0  success
+  1  the plug-in answered with a failure
+  2  wrong usage, or a local file that cannot be read or written
+  3  the service cannot be reached, or did not answer in time
+  4  the plug-in does not know the command
+  5  an offline reader met bad input
+
+The bus is the one in the environment variable VELTRA_BUS unless --bus names another. Paths of the device are seen below
+the device root (environment variable VELTRA_DEVICE_ROOT, default /).)";
+
+struct Options {
+    ServiceAddress address;
+    long long timeoutSeconds = 600;
+    bool json = false;
+};
+
+void printJson(const ordered_json& json) {
+    std::cout << json.dump(2, ' ', false, ordered_json::error_handler_t::replace) << '\n';
+}
+
+// Reports a failure that has no response: the one JSON object, or a sentence on standard error.
+int fail(const Options& options, Outcome outcome, const std::string& problem) {
+    const int status = static_cast<int>(outcome);
+    if (options.json)
+        printJson({{"exitStatus", status}, {"problem", problem}});
+    else
+        std::cerr << "orloctl: " << problem << '\n';
+    return status;
+}
+
+void printResponse(const Value::Dictionary& dictionary) {
+    const Value response(dictionary);
+    const char* verdict = response["statusCode"].integer() == 0 ? "success" : "failure";
+    std::cout << response["name"].description() << ": " << verdict << " (status "
+              << response["statusCode"].description() << ")\n";
+    if (const Value::Dictionary* entries = response["response"].dictionary())
+        for (const auto& [key, value] : *entries)
+            std::cout << "  " << key << " = " << jsonFromValue(value).dump() << '\n';
+    const Value& error = response["error"];
+    if (!error.isNothing())
+        std::cout << "  error: " << error["description"].description() << " (" << error["domain"].description() << " "
+                  << error["code"].description() << ")\n";
+}
+
+// What the client itself has to add to an answer.
+struct Remarks {
+    std::string result; // where the result is and how large
+    std::string note;   // what the answer does not say and the user should know
+};
+
+int report(const Options& options, const Answer& answer, const Remarks& remarks = {}) {
+    const int status = static_cast<int>(answer.outcome);
+    if (options.json) {
+        ordered_json json{{"exitStatus", status}};
+        if (!answer.response.empty())
+            json["response"] = jsonFromValue(answer.response);
+        if (!answer.problem.empty())
+            json["problem"] = answer.problem;
+        if (!remarks.result.empty())
+            json["result"] = remarks.result;
+        if (!remarks.note.empty())
+            json["note"] = remarks.note;
+        printJson(json);
+        return status;
+    }
+    if (answer.response.empty())
+        return fail(options, answer.outcome, answer.problem);
+    printResponse(answer.response);
+    if (!remarks.result.empty())
+        std::cout << "  result: " << remarks.result << '\n';
+    if (!remarks.note.empty())
+        std::cerr << "orloctl: " << remarks.note << '\n';
+    return status;
+}
+
+int call(const Options& options, const std::string& command, const std::vector<std::string>& words) {
+    return report(options, sendRequest(options.address, command, parseArguments(words)));
+}
+
+int setBcfg(const Options& options, const std::string& devicePath, const std::string& copyPath) {
+    const Answer answer = sendRequest(options.address, "setGlobalbCfg", {{"bcfgDataPath", devicePath}});
+    if (answer.outcome != Outcome::Success)
+        return report(options, answer);
+    const auto result = files::readWhole(resultPath);
+    if (!result)
+        return fail(options, Outcome::Usage,
+                    std::string("The result, ") + resultPath + " below the device root, cannot be read");
+    if (!copyPath.empty())
+        writeLocalFile(copyPath, *result);
+    Remarks remarks{std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes", ""};
+    if (result->empty())
+        remarks.note = "the result is empty: " + devicePath +
+                       " is missing on the device, or is no configuration blob that can be rewritten";
+    return report(options, answer, remarks);
+}
+
+int show(const Options& options, const Report& found) {
+    const int status = static_cast<int>(found.ok ? Outcome::Success : Outcome::BadInput);
+    if (options.json) {
+        ordered_json json{{"exitStatus", status}};
+        json.update(found.json);
+        if (!found.ok)
+            json["problem"] = found.problem;
+        printJson(json);
+        return status;
+    }
+    std::cout << found.text;
+    if (!found.ok)
+        std::cerr << "orloctl: " << found.problem << '\n';
+    return status;
+}
+
+class CommandLine {
+public:
+    CommandLine() {
+        app_.set_version_flag("--version", "orloctl " VELTRA_VERSION);
+        app_.add_option("--bus", options_.address.bus, "\"system\", \"session\" or a D-Bus address")
+            ->envname("VELTRA_BUS")
+            ->capture_default_str();
+        app_.add_option("--timeout", options_.timeoutSeconds, "Seconds to wait for an answer")
+            ->check(CLI::Range(1LL, 1'000'000LL))
+            ->capture_default_str();
+        app_.add_flag("--json", options_.json, "Print exactly one JSON object");
+        app_.require_subcommand(1);
+        app_.fallthrough();
+        app_.footer(exitStatuses);
+        addRequests();
+        addReaders();
+    }
+
+    int run(int argc, char** argv) {
+        try {
+            app_.parse(argc, argv);
+            options_.address.timeout = std::chrono::seconds(options_.timeoutSeconds);
+            return run_();
+        } catch (const CLI::Success& printed) {
+            return app_.exit(printed);
+        } catch (const CLI::ParseError& wrong) {
+            return fail(options_, Outcome::Usage, std::string(wrong.what()) + " (orloctl --help says more)");
+        } catch (const UsageError& wrong) {
+            return fail(options_, Outcome::Usage, wrong.what());
+        }
+    }
+
+private:
+    void addRequests() {
+        CLI::App* verb = app_.add_subcommand("call", "Send any request");
+        verb->add_option("COMMAND", command_, "The command's name")->required();
+        verb->add_option("ARGUMENTS", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
+        verb->callback([this] { run_ = [this] { return call(options_, command_, words_); }; });
+
+        verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
+        verb->add_option("FILE", path_, "The blob, a path on the device")->required();
+        verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file");
+        verb->callback([this] { run_ = [this] { return setBcfg(options_, path_, copyPath_); }; });
+    }
+
+    void addReaders() {
+        CLI::App* readers = app_.add_subcommand("show", "Show what a local file holds, without the service");
+        readers->require_subcommand(1);
+        readers->fallthrough();
+
+        CLI::App* verb = readers->add_subcommand("bcfg", "Entries and HMAC state of a configuration blob");
+        verb->add_option("FILE", path_, "A local file")->required();
+        verb->add_option("--hmac-key-file", keyPath_, "Check the HMACs with the key in this local file");
+        verb->callback([this] {
+            run_ = [this] {
+                const Value::Data key = keyPath_.empty() ? Value::Data{} : readLocalFile(keyPath_);
+                return show(options_, showBcfg(readLocalFile(path_), key));
+            };
+        });
+    }
+
+    CLI::App app_{"Sends requests to the Veltra Orlo services, and reads their file formats offline.", "orloctl"};
+    Options options_;
+    std::string command_;
+    std::string path_;
+    std::string copyPath_;
+    std::string keyPath_;
+    std::vector<std::string> words_;
+    std::function<int()> run_;
+};
+
+} // namespace
+
+int main(int argc, char** argv) {
+    try {
+        return CommandLine().run(argc, argv);
+    } catch (const std::exception& failure) {
+        std::cerr << "orloctl: " << failure.what() << '\n';
+        return static_cast<int>(Outcome::Usage);
+    }
+}
