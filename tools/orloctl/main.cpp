@@ -178,6 +178,10 @@ private:
         verb->add_option("ARGUMENTS", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
         verb->callback([this] { run_ = [this] { return call(options_, command_, words_); }; });
 
+        verb = app_.add_subcommand("check-entitlement",
+                                   "Ask whether the boot ticket entitles the device to swapped parts");
+        verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
+
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
         verb->add_option("FILE", path_, "The blob, a path on the device")->required();
         verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file");
