@@ -177,6 +177,7 @@ TEST(HSLog, linesOfDifferentThreadsStayWhole) {
     root.makeDirectory("/private/var/log");
     inOwnProcess([&] {
         std::vector<std::thread> writers;
+        writers.reserve(threads);
         for (int writer = 0; writer < threads; ++writer) {
             writers.emplace_back([writer] {
                 logInit("test");
