@@ -1,7 +1,6 @@
 #include "tests/support/RecordedLog.h"
 
 #include <mutex>
-#include <regex>
 #include <string_view>
 
 #include "Daemon/HSLog.h"
@@ -14,6 +13,14 @@ namespace {
 SystemLog onlyLog;
 std::mutex mutex;
 std::vector<std::string> lines;
+
+// "<time>-[<file>:<number>] <message>\n" as "[<file>] <message>".
+std::string withoutTimeAndNumber(std::string_view line) {
+    line.remove_prefix(line.find('['));
+    line.remove_suffix(1);
+    const std::size_t number = line.find(':');
+    return std::string(line.substr(0, number)) + std::string(line.substr(line.find(']', number)));
+}
 
 } // namespace
 
@@ -30,10 +37,9 @@ bool systemLogTypeEnabled(const SystemLog*, SystemLogType) {
 }
 
 void systemLogWrite(SystemLog*, SystemLogType type, std::string_view message) {
-    static const std::regex form("^[^\\[]*\\[(\\w+):\\d+\\] ([^]*)\n$");
-    const std::string line = std::regex_replace(std::string(message), form, "[$1] $2");
+    const std::string level = std::to_string(static_cast<int>(type) + 1);
     const std::lock_guard lock(mutex);
-    lines.push_back(std::to_string(static_cast<int>(type) + 1) + " " + line);
+    lines.push_back(level + " " + withoutTimeAndNumber(message));
 }
 
 void consoleLog(std::string_view) {}
