@@ -1,10 +1,10 @@
 // orloctl: the host's side of the service, for people and scripts.
-#include <cstdio>
-#include <cstdlib>
+#include <algorithm>
 #include <exception>
 #include <functional>
 #include <iostream>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <CLI/CLI.hpp>
@@ -27,7 +27,8 @@ constexpr const char* resultPath = "/tmp/new_bCfg";
 constexpr const char* exitStatuses = R"(Exit status:
   0  success
   1  the plug-in answered with a failure
-  2  wrong usage, or a local file that cannot be read or written
+  2  wrong usage, a request that the service refuses, or a local file that
+     cannot be read or written
   3  the service cannot be reached, or did not answer in time
   4  the plug-in does not know the command
   5  an offline reader met bad input
@@ -97,6 +98,8 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
         std::cout << "  result: " << remarks.result << '\n';
     if (!remarks.note.empty())
         std::cerr << "orloctl: " << remarks.note << '\n';
+    if (!answer.problem.empty() && answer.outcome == Outcome::Usage)
+        std::cerr << "orloctl: " << answer.problem << '\n';
     return status;
 }
 
@@ -117,12 +120,20 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
     if (result && result->empty())
         remarks.note = "the result is empty: " + devicePath +
                        " is missing on the device, or is no configuration blob that can be rewritten";
-    if (!copyPath.empty()) {
-        if (!result)
-            return fail(options, Outcome::Usage, remarks.note);
-        writeLocalFile(copyPath, *result);
+    if (copyPath.empty())
+        return report(options, answer, remarks);
+    if (result) {
+        try {
+            writeLocalFile(copyPath, *result);
+            return report(options, answer, remarks);
+        } catch (const UsageError& failure) {
+            remarks.note = failure.what();
+        }
     }
-    return report(options, answer, remarks);
+    Answer uncopied = answer;
+    uncopied.outcome = Outcome::Usage;
+    uncopied.problem = "The request was carried out, but its result was not copied.";
+    return report(options, uncopied, remarks);
 }
 
 int show(const Options& options, const Report& found) {
@@ -160,6 +171,8 @@ public:
     }
 
     int run(int argc, char** argv) {
+        // A failure to parse the command line may come before the flag is read.
+        options_.json = std::find(argv, argv + argc, std::string_view("--json")) != argv + argc;
         try {
             app_.parse(argc, argv);
             options_.address.timeout = std::chrono::seconds(options_.timeoutSeconds);
@@ -168,8 +181,8 @@ public:
             return app_.exit(printed);
         } catch (const CLI::ParseError& wrong) {
             return fail(options_, Outcome::Usage, std::string(wrong.what()) + " (orloctl --help says more)");
-        } catch (const UsageError& wrong) {
-            return fail(options_, Outcome::Usage, wrong.what());
+        } catch (const std::exception& failure) {
+            return fail(options_, Outcome::Usage, failure.what());
         }
     }
 
@@ -233,10 +246,5 @@ private:
 } // namespace
 
 int main(int argc, char** argv) {
-    try {
-        return CommandLine().run(argc, argv);
-    } catch (const std::exception& failure) {
-        std::cerr << "orloctl: " << failure.what() << '\n';
-        return static_cast<int>(Outcome::Usage);
-    }
+    return CommandLine().run(argc, argv);
 }
