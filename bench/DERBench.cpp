@@ -138,7 +138,7 @@ void walk(benchmark::State& state, const Contender& contender, std::uint64_t ent
     Bytes der = sequenceOf(entries);
     const std::uint64_t items = 1 + itemsOfEntry * entries;
     const std::uint64_t expected = items + (entrySize + (entrySize - 2) + 4 + 6 + 14) * entries;
-    for (auto _ : state) {
+    while (state.KeepRunning()) {
         std::uint64_t seen = 0;
         if (!contender.walk(der, &seen) || seen != expected) {
             state.SkipWithError("the walk went wrong");

@@ -52,7 +52,8 @@ DER_API DERReturn DERDecodeSeqContentInit(const DERItem* content, DERSequence* s
 DER_API DERReturn DERDecodeSeqNext(DERSequence* sequence, DERDecodedInfo* decoded);
 
 // Called by the walks below for each item. `context` is the pointer that was given to the walk. The walk ends with
-// success when the callback sets *stop or returns DEREndOfSequence, and with the callback's result when that is larger.
+// success when the callback sets *stop or returns DEREndOfSequence, and with the callback's result when that is larger,
+// whatever *stop says.
 typedef DERReturn (*DERDecodeSequenceCallback)(const DERDecodedInfo* decoded, bool* stop, void* context);
 
 // Calls `callback` for each item of the SEQUENCE or SET at *der, in order. Returns DERUnexpectedTag for any other item,
@@ -70,7 +71,8 @@ DER_API DERReturn DERDecodeSequenceContentWithBlock(const DERItem* content, DERD
 // alone, so callers pass the size of the record as `sizeToZero`.
 
 // Parses the SEQUENCE at *der, which must be one (a SET is DERUnexpectedTag), into `dest` as
-// DERParseSequenceContentToObject does. Octets after the SEQUENCE are ignored.
+// DERParseSequenceContentToObject does. Octets after the SEQUENCE are ignored. When *der is no SEQUENCE, or none that
+// can be decoded, `dest` is left alone, not even zeroed.
 DER_API DERReturn DERParseSequenceToObject(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs,
                                            void* dest, uint64_t destSize, uint64_t sizeToZero);
 

@@ -3,8 +3,8 @@
 //
 // Measure with a length operation, provide that many octets, and the encode cannot fail. In every operation with an
 // in/out length, *inOutLength is the buffer's size on entry and the number of octets written on success.
-// DERBufferOverflow is the only failure: the buffer is too small, or a row lies outside the record. Octets written
-// before a failure stay in the buffer.
+// DERBufferOverflow is the only failure: the buffer is too small, a row lies outside the record, or a size exceeds 64
+// bits. Octets written before a failure stay in the buffer.
 #ifndef VELTRA_DER_ENCODE_H
 #define VELTRA_DER_ENCODE_H
 
@@ -27,7 +27,8 @@ DER_API DERReturn DEREncodeLength(uint64_t length, uint8_t* buffer, uint64_t* in
 
 // Items
 
-// The number of octets of a whole item: identifier octets of `tag`, length octets and `length` content octets.
+// The number of octets of a whole item: identifier octets of `tag`, length octets and `length` content octets. 0 when
+// that exceeds 64 bits.
 DER_API uint64_t DERLengthOfItem(DERTag tag, uint64_t length);
 
 // Writes one item with the `length` octets at `content`. `content` may be null when `length` is 0. *written (and
@@ -43,7 +44,8 @@ DER_API DERReturn DEREncodeItem(DERTag tag, uint64_t length, const uint8_t* cont
 // `objectSize` take it as unbounded. `tag` is the tag of the whole: DERTagSequence, DERTagSet or any other constructed
 // one. Rows are written in table order; a SET is not sorted.
 
-// The size of the whole constructed item, into *length. DERBufferOverflow when a row lies outside the record.
+// The size of the whole constructed item, into *length. DERBufferOverflow, with *length as it was, when a row lies
+// outside the record or the size exceeds 64 bits.
 DER_API DERReturn DERLengthOfEncodedSequenceFromObject(DERTag tag, const void* object, uint64_t objectSize,
                                                        uint16_t numItems, const DERItemSpec* itemSpecs,
                                                        uint64_t* length);

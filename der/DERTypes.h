@@ -81,8 +81,13 @@ typedef struct DERItemSpec {
     uint16_t options;
 } DERItemSpec;
 
-// Result of the operations of the codec and of the decoders built on it. The values are fixed; 4 is not used.
+// Result of the operations of the codec and of the decoders built on it. The values are fixed; 4 is not used. Callbacks
+// and the decoders above may return any other 32-bit value too, which C++ allows only for a type of fixed width.
+#ifdef __cplusplus
+typedef enum DERReturn : uint32_t {
+#else
 typedef enum DERReturn {
+#endif
     DERSuccess = 0,
     // No further item in the sequence. The regular end of a walk, not an error.
     DEREndOfSequence = 1,

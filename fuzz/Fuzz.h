@@ -4,13 +4,13 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
+#include <iostream>
 
 #define FUZZ_REQUIRE(condition)                                                                                        \
     do {                                                                                                               \
         if (!(condition)) {                                                                                            \
-            std::fprintf(stderr, "%s:%d: does not hold: %s\n", __FILE__, __LINE__, #condition);                        \
+            std::cerr << __FILE__ << ":" << __LINE__ << ": does not hold: " << #condition << "\n";                     \
             std::abort();                                                                                              \
         }                                                                                                              \
     } while (false)

@@ -3,8 +3,8 @@
 #define VELTRA_FUZZ_SEED_FILE_H
 
 #include <cstdint>
-#include <cstdio>
 #include <fstream>
+#include <iostream>
 #include <string>
 #include <vector>
 
@@ -16,7 +16,7 @@ inline bool writeSeed(const std::string& folder, const std::string& name, const 
     file.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
     file.close();
     if (!file)
-        std::fprintf(stderr, "cannot write %s\n", path.c_str());
+        std::cerr << "cannot write " << path << '\n';
     return static_cast<bool>(file);
 }
 

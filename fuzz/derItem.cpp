@@ -67,6 +67,7 @@ void checkInteger(const DERItem& content) {
     }
     FUZZ_REQUIRE(smallResult == (value > UINT32_MAX ? DERBufferOverflow : DERSuccess));
     FUZZ_REQUIRE(smallResult != DERSuccess || small == value);
+    FUZZ_REQUIRE(content.length >= 1 && content.length <= 9);
     // The shortest form of the value, from its last octet to its first.
     std::uint64_t rest = value;
     for (std::uint64_t i = content.length; i-- > 0; rest >>= 8)

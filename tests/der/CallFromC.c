@@ -25,7 +25,7 @@ static DERReturn sumLengths(const DERDecodedInfo* decoded, bool* stop, void* con
 
 static int check(bool good, const char* what) {
     if (!good)
-        fprintf(stderr, "failed: %s\n", what);
+        (void)fprintf(stderr, "failed: %s\n", what);
     return good ? 0 : 1;
 }
 

@@ -103,6 +103,15 @@ Bytes encodingOf(const Object* object, int (*encode)(const Object*, unsigned cha
     return der;
 }
 
+void addExtension(X509* certificate, int nid, bool critical) {
+    ASN1_OCTET_STRING* value = ASN1_OCTET_STRING_new();
+    ASN1_OCTET_STRING_set(value, reinterpret_cast<const unsigned char*>("\x03\x02\x02\x04"), 4);
+    X509_EXTENSION* extension = X509_EXTENSION_create_by_NID(nullptr, nid, critical ? 1 : 0, value);
+    X509_add_ext(certificate, extension, -1);
+    X509_EXTENSION_free(extension);
+    ASN1_OCTET_STRING_free(value);
+}
+
 Certificate selfSigned(EVP_PKEY* key) {
     Certificate certificate(X509_new());
     X509_set_version(certificate.get(), X509_VERSION_3);
@@ -113,12 +122,8 @@ Certificate selfSigned(EVP_PKEY* key) {
     X509_NAME_add_entry_by_txt(X509_get_subject_name(certificate.get()), "CN", MBSTRING_ASC,
                                reinterpret_cast<const unsigned char*>("Bench"), -1, -1, 0);
     X509_set_issuer_name(certificate.get(), X509_get_subject_name(certificate.get()));
-    ASN1_OCTET_STRING* usage = ASN1_OCTET_STRING_new();
-    ASN1_OCTET_STRING_set(usage, reinterpret_cast<const unsigned char*>("\x03\x02\x02\x04"), 4);
-    X509_EXTENSION* extension = X509_EXTENSION_create_by_NID(nullptr, NID_key_usage, 1, usage);
-    X509_add_ext(certificate.get(), extension, -1);
-    X509_EXTENSION_free(extension);
-    ASN1_OCTET_STRING_free(usage);
+    addExtension(certificate.get(), NID_key_usage, true);
+    addExtension(certificate.get(), NID_subject_key_identifier, false);
     X509_sign(certificate.get(), key, EVP_sha256());
     return certificate;
 }
@@ -163,13 +168,24 @@ TEST(DERAgainstOpenSSL, certificateIsTakenApartByTheTables) {
     EXPECT_EQ(hexOf(algorithm.algorithm), "2A 86 48 86 F7 0D 01 01 0B");
     EXPECT_EQ(hexOf(algorithm.parameters), "05 00");
 
-    DERDecodedInfo extensions;
-    ASSERT_EQ(DERDecodeItem(&tbs.extensions, &extensions), DERSuccess);
-    DERExtension extension;
-    ASSERT_EQ(parseInner(extensions.content, DERNumExtensionItemSpecs, DERExtensionItemSpecs, &extension), DERSuccess);
-    EXPECT_EQ(hexOf(extension.extensionID), "55 1D 0F");
-    EXPECT_EQ(hexOf(extension.critical), "FF");
-    EXPECT_EQ(hexOf(extension.value), "03 02 02 04");
+    DERTag tag = 0;
+    DERSequence extensions;
+    ASSERT_EQ(DERDecodeSeqInit(&tbs.extensions, &tag, &extensions), DERSuccess);
+    const struct {
+        const char* id;
+        const char* critical;
+    } expected[] = {{"55 1D 0F", "FF"}, {"55 1D 0E", "absent"}};
+    for (const auto& row : expected) {
+        DERDecodedInfo item;
+        ASSERT_EQ(DERDecodeSeqNext(&extensions, &item), DERSuccess);
+        DERExtension extension;
+        ASSERT_EQ(DERParseSequenceContent(&item.content, DERNumExtensionItemSpecs, DERExtensionItemSpecs, &extension,
+                                          sizeof extension),
+                  DERSuccess);
+        EXPECT_EQ(hexOf(extension.extensionID), row.id);
+        EXPECT_EQ(hexOf(extension.critical), row.critical);
+        EXPECT_EQ(hexOf(extension.value), "03 02 02 04");
+    }
 }
 
 TEST(DERAgainstOpenSSL, publicKeyIsReadAndWrittenAlike) {

@@ -31,7 +31,7 @@ TEST(DERItem, isDecodedAlikeByAllThreeDecoders) {
         {"1F 7F 03", 3, 127},
         {"1F 81 00 00", 0, 128},
         {"FF 85 9A C1 82 59 02", 2, DERTagPrivateConstructed(0x53504159)},
-        {"DF 9F FF FF FF FF FF FF FF 7F 81 80", 128, privatePrimitive + (DERTagNumberMask)},
+        {"DF 9F FF FF FF FF FF FF FF 7F 81 80", 128, privatePrimitive + DERTagNumberMask},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.header);
@@ -81,7 +81,7 @@ TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
         {"length that fits the short form", "02 81 05 00 00 00 00 00"},
         {"length 127 in the long form", "02 81 7F"},
         {"length with a leading zero", "04 82 00 90"},
-        {"nine length octets", "04 89 01 00 00 00 00 00 00 00 00"},
+        {"nine length octets", "04 89 01 00 00 00 00 00 00 00 81"},
         {"one length octet missing", "04 82 01"},
         {"all length octets missing", "04 81"},
         {"length octets missing after a high tag", "1F 1F 82 01"},
@@ -347,7 +347,7 @@ TEST(DERPrimitive, bitStringsKeepTheirUnusedBitsZero) {
 
 TEST(DERPrimitive, objectIdentifiersAreEqualOnlyWhenBothArePresentAndAlike) {
     const Bytes sha256 = bytes("60 86 48 01 65 03 04 02 01");
-    const Bytes copy = sha256;
+    const Bytes copy = bytes("60 86 48 01 65 03 04 02 01");
     const DERItem whole = itemOf(sha256);
     const DERItem same = itemOf(copy);
     const DERItem shorter = {sha256.data(), sha256.size() - 1};

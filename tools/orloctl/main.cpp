@@ -107,15 +107,19 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
     if (answer.outcome != Outcome::Success)
         return report(options, answer);
     const auto result = files::readWhole(resultPath);
+    Remarks remarks;
     if (!result)
-        return fail(options, Outcome::Usage,
-                    std::string("The result, ") + resultPath + " below the device root, cannot be read");
-    if (!copyPath.empty())
-        writeLocalFile(copyPath, *result);
-    Remarks remarks{std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes", ""};
-    if (result->empty())
+        remarks.note = std::string("the result, ") + resultPath + " below the device root, cannot be read";
+    else
+        remarks.result = std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes";
+    if (result && result->empty())
         remarks.note = "the result is empty: " + devicePath +
                        " is missing on the device, or is no configuration blob that can be rewritten";
+    if (!copyPath.empty()) {
+        if (!result)
+            return fail(options, Outcome::Usage, remarks.note);
+        writeLocalFile(copyPath, *result);
+    }
     return report(options, answer, remarks);
 }
 
@@ -173,6 +177,10 @@ private:
         verb->add_option("COMMAND", command_, "The command's name")->required();
         verb->add_option("ARGUMENTS", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
         verb->callback([this] { run_ = [this] { return call(options_, command_, words_); }; });
+
+        verb = app_.add_subcommand("check-entitlement",
+                                   "Ask whether the boot ticket entitles the device to swapped parts");
+        verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
 
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
         verb->add_option("FILE", path_, "The blob, a path on the device")->required();

@@ -1,0 +1,214 @@
+#include "img4/Img4Internal.h"
+
+using namespace img4;
+
+namespace {
+
+DERReturn findObject(const Img4Record& record, uint32_t object, DERItem* properties) {
+    DERItem manb;
+    DERItem manp;
+    Img4Property found;
+    if (const DERReturn result = findManifestDictionaries(record, &manb, &manp); result != DERSuccess)
+        return result;
+    if (const DERReturn result = DERImg4DecodeFindProperty(&manb, Img4PropertyTag(object), DERTagSet, &found);
+        result != DERSuccess)
+        return result;
+    *properties = found.value;
+    return DERSuccess;
+}
+
+DERReturn findObjectProperty(const Img4Record* record, uint32_t object, DERTag tag, DERTag valueType,
+                             Img4Property* property) {
+    DERItem properties;
+    if (record == nullptr || property == nullptr)
+        return DERParamError;
+    if (const DERReturn result = findObject(*record, object, &properties); result != DERSuccess)
+        return result;
+    return DERImg4DecodeFindProperty(&properties, tag, valueType, property);
+}
+
+template <typename T>
+DERReturn getObjectValue(const Img4Record* record, uint32_t object, uint32_t name, DERTag type, Parser<T> parse,
+                         T* value) {
+    Img4Property property;
+    if (value == nullptr)
+        return DERParamError;
+    if (const DERReturn result = findObjectProperty(record, object, Img4PropertyTag(name), type, &property);
+        result != DERSuccess)
+        return result;
+    return parse(&property.value, value);
+}
+
+// The octets that hold the properties of a section; absent when the section is.
+const DERItem* sectionItem(const Img4Record& record, uint32_t section) {
+    switch (section) {
+    case Img4SectionManifest:
+        return &record.manifest.body;
+    case Img4SectionRestoreInfo:
+        return &record.restoreInfo.properties;
+    default:
+        return nullptr;
+    }
+}
+
+DERReturn findSectionProperty(const Img4Record* record, uint32_t section, DERTag tag, DERTag valueType,
+                              Img4Property* property) {
+    if (record == nullptr || property == nullptr)
+        return DERParamError;
+    const DERItem* item = sectionItem(*record, section);
+    if (item == nullptr)
+        return DERParamError;
+    if (!isPresent(*item))
+        return DEREndOfSequence;
+    if (section == Img4SectionRestoreInfo)
+        return DERImg4DecodeFindProperty(item, tag, valueType, property);
+    DERItem manb;
+    DERItem manp;
+    if (const DERReturn result = findManifestDictionaries(*record, &manb, &manp); result != DERSuccess)
+        return result;
+    return DERImg4DecodeFindProperty(&manp, tag, valueType, property);
+}
+
+template <typename T>
+DERReturn getSectionValue(const Img4Record* record, uint32_t section, uint32_t name, DERTag type, Parser<T> parse,
+                          T* value) {
+    Img4Property property;
+    if (value == nullptr)
+        return DERParamError;
+    if (const DERReturn result = findSectionProperty(record, section, Img4PropertyTag(name), type, &property);
+        result != DERSuccess)
+        return result;
+    return parse(&property.value, value);
+}
+
+// Unlike those of an object, the getters of a section touch a number only once its property was found.
+DERReturn parseNumber(const DERItem* item, uint32_t* value) {
+    return clearOnFailure(DERParseInteger(item, value), value);
+}
+
+DERReturn parseNumber64(const DERItem* item, uint64_t* value) {
+    return clearOnFailure(DERParseInteger64(item, value), value);
+}
+
+} // namespace
+
+DERReturn img4::findManifestDictionaries(const Img4Record& record, DERItem* manb, DERItem* manp) {
+    DERDecodedInfo body;
+    uint32_t version = 0;
+    Img4Property found;
+    if (const DERReturn result = DERDecodeItem(&record.manifest.body, &body); result != DERSuccess)
+        return result;
+    if (const DERReturn result = DERParseInteger(&record.manifest.version, &version); result != DERSuccess)
+        return result;
+    const DERTag type = version == highestManifestVersion ? DERTagSequence : DERTagSet;
+    if (const DERReturn result = DERImg4DecodeFindProperty(&body.content, manifestBodyTag, type, &found);
+        result != DERSuccess)
+        return result;
+    *manb = found.value;
+    if (const DERReturn result = DERImg4DecodeFindProperty(manb, manifestPropertiesTag, DERTagSet, &found);
+        result != DERSuccess)
+        return result;
+    *manp = found.value;
+    return DERSuccess;
+}
+
+DERReturn Img4DecodeManifestExists(const Img4Record* record, bool* exists) {
+    if (record == nullptr || exists == nullptr)
+        return clearOnFailure(DERParamError, exists);
+    *exists = isPresent(record->manifestRaw);
+    return DERSuccess;
+}
+
+DERReturn Img4DecodeGetManifest(const Img4Record* record, const uint8_t** start, uint32_t* length) {
+    DERReturn result = DERSuccess;
+    if (record == nullptr || start == nullptr || length == nullptr)
+        result = DERParamError;
+    else if (!hasContent(record->manifestRaw))
+        result = Img4Failure;
+    else if (record->manifestRaw.length > UINT32_MAX)
+        result = DERBufferOverflow;
+    if (result != DERSuccess) {
+        clearOnFailure(result, start);
+        return clearOnFailure(result, length);
+    }
+    *start = record->manifestRaw.data;
+    *length = static_cast<uint32_t>(record->manifestRaw.length);
+    return DERSuccess;
+}
+
+DERReturn Img4DecodeSectionExists(const Img4Record* record, uint32_t section, bool* exists) {
+    const DERItem* item = record != nullptr ? sectionItem(*record, section) : nullptr;
+    if (item == nullptr || exists == nullptr)
+        return clearOnFailure(DERParamError, exists);
+    *exists = isPresent(*item);
+    return DERSuccess;
+}
+
+DERReturn Img4DecodeRestoreInfoExists(const Img4Record* record, bool* exists) {
+    return Img4DecodeSectionExists(record, Img4SectionRestoreInfo, exists);
+}
+
+DERReturn Img4DecodeGetPropertyFromSection(const Img4Record* record, uint32_t section, DERTag tag, DERTag valueType,
+                                           Img4Property* property) {
+    return clearOnFailure(findSectionProperty(record, section, tag, valueType, property), property);
+}
+
+DERReturn Img4DecodeGetBooleanFromSection(const Img4Record* record, uint32_t section, uint32_t name, bool* value) {
+    return getSectionValue(record, section, name, DERTagBoolean, DERParseBoolean, value);
+}
+
+DERReturn Img4DecodeGetIntegerFromSection(const Img4Record* record, uint32_t section, uint32_t name, uint32_t* value) {
+    return getSectionValue(record, section, name, DERTagInteger, parseNumber, value);
+}
+
+DERReturn Img4DecodeGetInteger64FromSection(const Img4Record* record, uint32_t section, uint32_t name,
+                                            uint64_t* value) {
+    return getSectionValue(record, section, name, DERTagInteger, parseNumber64, value);
+}
+
+DERReturn Img4DecodeGetDataFromSection(const Img4Record* record, uint32_t section, uint32_t name, DERItem* value) {
+    return clearOnFailure(getSectionValue(record, section, name, DERTagOctetString, parseData, value), value);
+}
+
+DERReturn Img4DecodeGetRestoreInfoBoolean(const Img4Record* record, uint32_t name, bool* value) {
+    return Img4DecodeGetBooleanFromSection(record, Img4SectionRestoreInfo, name, value);
+}
+
+DERReturn Img4DecodeGetRestoreInfoInteger(const Img4Record* record, uint32_t name, uint32_t* value) {
+    return Img4DecodeGetIntegerFromSection(record, Img4SectionRestoreInfo, name, value);
+}
+
+DERReturn Img4DecodeGetRestoreInfoInteger64(const Img4Record* record, uint32_t name, uint64_t* value) {
+    return Img4DecodeGetInteger64FromSection(record, Img4SectionRestoreInfo, name, value);
+}
+
+DERReturn Img4DecodeGetRestoreInfoData(const Img4Record* record, uint32_t name, DERItem* value) {
+    return Img4DecodeGetDataFromSection(record, Img4SectionRestoreInfo, name, value);
+}
+
+DERReturn Img4DecodeGetObjectProperty(const Img4Record* record, uint32_t object, DERTag tag, DERTag valueType,
+                                      Img4Property* property) {
+    return clearOnFailure(findObjectProperty(record, object, tag, valueType, property), property);
+}
+
+DERReturn Img4DecodeGetObjectPropertyBoolean(const Img4Record* record, uint32_t object, uint32_t name, bool* value) {
+    return getObjectValue(record, object, name, DERTagBoolean, DERParseBoolean, value);
+}
+
+DERReturn Img4DecodeGetObjectPropertyInteger(const Img4Record* record, uint32_t object, uint32_t name,
+                                             uint32_t* value) {
+    return clearOnFailure(getObjectValue(record, object, name, DERTagInteger, DERParseInteger, value), value);
+}
+
+DERReturn Img4DecodeGetObjectPropertyInteger64(const Img4Record* record, uint32_t object, uint32_t name,
+                                               uint64_t* value) {
+    return clearOnFailure(getObjectValue(record, object, name, DERTagInteger, DERParseInteger64, value), value);
+}
+
+DERReturn Img4DecodeGetObjectPropertyData(const Img4Record* record, uint32_t object, uint32_t name, DERItem* value) {
+    return clearOnFailure(getObjectValue(record, object, name, DERTagOctetString, parseData, value), value);
+}
+
+DERReturn Img4DecodeGetObjectPropertyString(const Img4Record* record, uint32_t object, uint32_t name, DERItem* value) {
+    return clearOnFailure(getObjectValue(record, object, name, DERTagIA5String, parseData, value), value);
+}

@@ -1,0 +1,177 @@
+#include "img4/Img4.h"
+#include "tests/support/Img4Maker.h"
+
+#include <cstring>
+#include <string>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace img4maker;
+
+using Initialise = DERReturn (*)(const std::uint8_t*, std::uint64_t, Img4Record*);
+
+const Bytes soundPayload = payload({});
+const Bytes soundManifest = manifest({});
+const Bytes soundRestoreInfo = restoreInfo({property("nonV", integer(1))});
+const Bytes emptySequence = sequence({});
+
+Bytes with(Bytes encoding, const Bytes& tail) {
+    encoding.insert(encoding.end(), tail.begin(), tail.end());
+    return encoding;
+}
+
+Bytes payloadWith(const List& tail) {
+    return sequence({ia5("IM4P"), ia5("sepi"), ia5("1"), octets(filler(8)), join(tail)});
+}
+
+Bytes containerWith(const Bytes& oddPayload) {
+    return container(oddPayload, {}, {});
+}
+
+Bytes manifestOf(const Bytes& magic, const Bytes& version, const Bytes& body) {
+    return sequence({magic, version, body, octets(filler(8)), emptySequence});
+}
+
+struct Case {
+    const char* name;
+    Initialise initialise;
+    Bytes buffer;
+    DERReturn expected;
+};
+
+const Bytes body = manifestBody({});
+
+const Case cases[] = {
+    {"payload only", Img4DecodeInit, containerWith(soundPayload), DERSuccess},
+    {"everything", Img4DecodeInit, exampleContainer(), DERSuccess},
+    {"restore information without manifest", Img4DecodeInit, container(soundPayload, {}, soundRestoreInfo), DERSuccess},
+    {"trailing octet", Img4DecodeInit, with(containerWith(soundPayload), {0}), DERBufferOverflow},
+    {"SET for a container", Img4DecodeInit, set({ia5("IMG4"), soundPayload}), DERUnexpectedTag},
+    {"wrong magic", Img4DecodeInit, sequence({ia5("IMG5"), soundPayload}), DERUnexpectedTag},
+    {"magic of five characters", Img4DecodeInit, sequence({ia5("IMG44"), soundPayload}), DERUnexpectedTag},
+    {"no payload", Img4DecodeInit, sequence({ia5("IMG4")}), DERIncompleteSequence},
+    {"manifest instead of payload", Img4DecodeInit, sequence({ia5("IMG4"), context(0, soundManifest)}),
+     DERUnexpectedTag},
+    {"unknown entry at the end", Img4DecodeInit, sequence({ia5("IMG4"), soundPayload, context(2, {})}),
+     DERUnexpectedTag},
+    {"entry after the last", Img4DecodeInit,
+     sequence({ia5("IMG4"), soundPayload, context(1, soundRestoreInfo), integer(1)}), DERDecodeError},
+    {"empty manifest entry", Img4DecodeInit, sequence({ia5("IMG4"), soundPayload, context(0, {})}), DERDecodeError},
+    {"unsigned manifest in a container", Img4DecodeInit, container(soundPayload, unsignedManifest({}), {}),
+     DERIncompleteSequence},
+    {"wrong magic of the restore information", Img4DecodeInit,
+     container(soundPayload, {}, sequence({ia5("IM4S"), set({})})), DERUnexpectedTag},
+    {"restore information in a SEQUENCE", Img4DecodeInit,
+     container(soundPayload, {}, sequence({ia5("IM4R"), emptySequence})), DERUnexpectedTag},
+
+    {"wrong magic of the payload", Img4DecodeInitPayload, sequence({ia5("IM4Q"), ia5("sepi"), ia5("1"), octets({1})}),
+     DERUnexpectedTag},
+    {"payload without data", Img4DecodeInitPayload, sequence({ia5("IM4P"), ia5("sepi"), ia5("1")}),
+     DERIncompleteSequence},
+    {"octets after a bare payload", Img4DecodeInitPayload, with(soundPayload, {1, 2}), DERSuccess},
+    {"algorithm 1", Img4DecodeInit, containerWith(payloadWith({compression(1, 5)})), DERSuccess},
+    {"algorithm 2", Img4DecodeInit, containerWith(payloadWith({compression(2, 5)})), DERParamError},
+    {"size that no 32 bits hold", Img4DecodeInitPayload, payloadWith({compression(0, 0x100000000)}), DERSuccess},
+    {"negative algorithm", Img4DecodeInitPayload, payloadWith({sequence({item(DERTagInteger, {0x80}), integer(1)})}),
+     DERParamError},
+    {"compression without size", Img4DecodeInitPayload, payloadWith({sequence({integer(1)})}), DERParamError},
+    {"empty compression", Img4DecodeInitPayload, payloadWith({emptySequence}), DERParamError},
+    {"payload properties", Img4DecodeInitPayload, payloadWith({context(0, payloadProperties({}))}), DERSuccess},
+    {"payload properties with a wrong magic", Img4DecodeInitPayload,
+     payloadWith({context(0, sequence({ia5("PAYQ"), set({})}))}), DERUnexpectedTag},
+    {"payload properties without a SET", Img4DecodeInitPayload, payloadWith({context(0, sequence({ia5("PAYP")}))}),
+     DERUnexpectedTag},
+    {"empty payload properties", Img4DecodeInitPayload, payloadWith({context(0, {})}), DERUnexpectedTag},
+    {"compression is looked at before the properties", Img4DecodeInitPayload,
+     payloadWith({compression(2, 1), context(0, {})}), DERParamError},
+    // Neither table fits; the status is that of the table without properties.
+    {"entry after the payload properties", Img4DecodeInitPayload,
+     payloadWith({context(0, payloadProperties({})), integer(1)}), DERUnexpectedTag},
+    {"entry after compression and properties", Img4DecodeInitPayload,
+     payloadWith({compression(1, 1), context(0, payloadProperties({})), integer(1)}), DERDecodeError},
+
+    {"bare manifest", Img4DecodeInitManifest, soundManifest, DERSuccess},
+    {"manifest with a trailing octet", Img4DecodeInitManifest, with(soundManifest, {0}), DERBufferOverflow},
+    {"container for a manifest", Img4DecodeInitManifest, exampleContainer(), DERUnexpectedTag},
+    {"wrong magic of the manifest", Img4DecodeInitManifest, manifestOf(ia5("IM4N"), integer(0), body),
+     DERUnexpectedTag},
+    {"version 2", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(2), body), DERSuccess},
+    {"version 3", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(3), body), DERUnexpectedTag},
+    {"negative version", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), item(DERTagInteger, {0x80}), body),
+     DERDecodeError},
+    {"version of 33 bits", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(0x100000000), body),
+     DERBufferOverflow},
+    {"the magic is looked at before the version", Img4DecodeInitManifest,
+     manifestOf(ia5("IM4N"), item(DERTagInteger, {0x80}), body), DERUnexpectedTag},
+    {"body in a SEQUENCE", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(0), emptySequence),
+     DERUnexpectedTag},
+    {"unsigned for a signed manifest", Img4DecodeInitManifest, unsignedManifest({}), DERIncompleteSequence},
+    {"signed for an unsigned manifest", Img4DecodeInitUnsignedManifest, soundManifest, DERDecodeError},
+    {"unsigned manifest", Img4DecodeInitUnsignedManifest, unsignedManifest({}), DERSuccess},
+    {"unsigned manifest with a trailing octet", Img4DecodeInitUnsignedManifest, with(unsignedManifest({}), {0}),
+     DERBufferOverflow},
+    {"no octets", Img4DecodeInit, {}, DERDecodeError},
+};
+
+TEST(Img4Init, reportsTheFirstCheckThatFails) {
+    for (const Case& row : cases) {
+        Img4Record record;
+        // A vector's data may be null when it is empty; the buffer must not be.
+        const std::uint8_t none = 0;
+        const std::uint8_t* buffer = row.buffer.empty() ? &none : row.buffer.data();
+        EXPECT_EQ(row.initialise(buffer, row.buffer.size(), &record), row.expected) << row.name;
+    }
+}
+
+TEST(Img4Init, missingArgumentsAreRefusedAndTheRecordIsZeroedAllTheSame) {
+    const Img4Record zero = {};
+    for (const Initialise initialise :
+         {Img4DecodeInit, Img4DecodeInitPayload, Img4DecodeInitManifest, Img4DecodeInitUnsignedManifest}) {
+        Img4Record record;
+        std::memset(&record, 0xA5, sizeof record);
+        EXPECT_EQ(initialise(nullptr, 4, &record), DERParamError);
+        EXPECT_EQ(record.manifestHashed | record.payloadHashed, 0);
+        EXPECT_EQ(std::memcmp(&record.payloadRaw, &zero.payloadRaw, sizeof record - offsetof(Img4Record, payloadRaw)),
+                  0);
+        EXPECT_EQ(initialise(soundPayload.data(), soundPayload.size(), nullptr), DERParamError);
+    }
+}
+
+Bytes bytesOf(const DERItem& item) {
+    return {item.data, item.data + item.length};
+}
+
+TEST(Img4Init, fieldsLieWhereTheyWereWritten) {
+    const Bytes buffer = exampleContainer();
+    const Bytes ticket = exampleTicket();
+    Img4Record record;
+    ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess);
+    EXPECT_EQ(bytesOf(record.manifestRaw), ticket);
+    EXPECT_EQ(record.payloadRaw.data[0], 0x30);
+    EXPECT_EQ(record.payloadRaw.data + record.payloadRaw.length + 4 /* header of [0] */, record.manifestRaw.data);
+    EXPECT_EQ(bytesOf(record.payload.type), Bytes({'s', 'e', 'p', 'i'}));
+    EXPECT_EQ(bytesOf(record.payload.data), filler(200, 8));
+    EXPECT_EQ(bytesOf(record.payload.keybag), filler(40, 9));
+    EXPECT_EQ(bytesOf(record.manifest.version), Bytes({0}));
+    EXPECT_EQ(bytesOf(record.manifest.body).front(), 0x31) << "the body is recorded with its header";
+    EXPECT_EQ(bytesOf(record.manifest.signature), filler(48));
+    EXPECT_EQ(bytesOf(record.restoreInfo.magic), Bytes({'I', 'M', '4', 'R'}));
+    EXPECT_EQ(record.manifest.certProperties.data, nullptr);
+    EXPECT_EQ(record.manb.data, nullptr);
+
+    Img4Record bare;
+    ASSERT_EQ(Img4DecodeInitManifest(ticket.data(), ticket.size(), &bare), DERSuccess);
+    EXPECT_EQ(bare.manifestRaw.data, ticket.data());
+    EXPECT_EQ(bare.manifestRaw.length, ticket.size());
+    EXPECT_EQ(bare.payloadRaw.data, nullptr);
+
+    const Bytes tailed = with(soundPayload, {7});
+    ASSERT_EQ(Img4DecodeInitPayload(tailed.data(), tailed.size(), &bare), DERSuccess);
+    EXPECT_EQ(bare.payloadRaw.data, tailed.data());
+    EXPECT_EQ(bare.payloadRaw.length, tailed.size()) << "the buffer as it was given";
+    EXPECT_EQ(bare.manifestRaw.data, nullptr) << "nothing is left of the earlier use";
+}
+
+} // namespace

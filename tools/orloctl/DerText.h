@@ -1,0 +1,43 @@
+// Words for DER: what an item is called, what its content says, and in which octet and by which rule an encoding is
+// refused. Offsets here are relative to the item at hand.
+#ifndef VELTRA_TOOLS_ORLOCTL_DERTEXT_H
+#define VELTRA_TOOLS_ORLOCTL_DERTEXT_H
+
+#include "der/DERTypes.h"
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+struct DerFault {
+    std::uint64_t offset;
+    std::string reason; // a clause without a full stop
+};
+
+// Why DERDecodeItem refuses the item at the start of `der`; nothing when it does not.
+std::optional<DerFault> derHeaderFault(const DERItem& der);
+
+// Why the content of an item with the given tag is not DER, as far as its universal type tells; nothing when it is, and
+// for types without rules of their own. The items inside a constructed content are not looked at.
+std::optional<DerFault> derContentFault(DERTag tag, const DERItem& content);
+
+bool isConstructed(DERTag tag);
+
+// "SEQUENCE", "context [0]", "private \"MANB\"": a private tag whose number spells four characters is spelled out. A
+// form other than the usual one is named: "constructed OCTET STRING", "context [0] primitive".
+std::string derTagName(DERTag tag);
+
+// The four characters that the number spells when all of them can be shown, else the number in hexadecimal; the second
+// form puts characters in quotes.
+std::string codeText(std::uint64_t number);
+std::string quotedCode(std::uint64_t number);
+
+// The octets as text, those that are no printable ASCII and the backslash as \xNN; at most `most` of them, then an
+// ellipsis. The second form puts the text in quotes.
+std::string escapedText(const DERItem& text, std::uint64_t most);
+std::string quotedText(const DERItem& text, std::uint64_t most);
+
+// Two lower-case digits an octet; at most `most` octets, then an ellipsis.
+std::string hexText(const DERItem& data, std::uint64_t most);
+
+#endif
