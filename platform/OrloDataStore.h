@@ -7,7 +7,7 @@
 // A session is made from options (QDOrloCreateWithOptions), is given a permission and the store's trust object as
 // further options, and then serves operations. It holds the caller to its word: put, get and export are refused unless
 //   - the option "Permissions" has the exact grant for the action, the class and the instance, and
-//   - the option "TrustObjectDigest" is the SHA-256 of the store's trust object.
+//   - the option "TrustObjectDigest" is the SHA-256 of the store's trust object, as the session last fetched it.
 // A grant is the text "<action>:<class>:<instance>"; grants are joined by ";".
 //
 // Every operation is synchronous. A session serves one thread at a time; sessions are independent of each other, also

@@ -182,9 +182,12 @@ TEST_F(OrloDataStore, refusesWhatTheSessionHasNoGrantForOrDoesNotTrust) {
     EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{'r'}));
     EXPECT_EQ(sql("SELECT count(*) FROM exports"), std::vector<std::string>{"0"});
 
-    // Another trust object, also in the middle of a session, ends the trust.
+    // Another trust object ends the trust of a session that has the digest of the one before.
     const Session before = openFor("psd2", "S1");
     root_.write(trustPath, "another");
+    Data object;
+    ASSERT_TRUE(QDOrloDataCopyTrustObject(before.get(), "", &object, nullptr));
+    EXPECT_EQ(object, (Data{'a', 'n', 'o', 't', 'h', 'e', 'r'}));
     EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 2);
     trust(before);
     EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 0);

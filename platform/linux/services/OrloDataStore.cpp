@@ -7,7 +7,6 @@
 #include <limits>
 #include <memory>
 #include <set>
-#include <span>
 #include <utility>
 #include <vector>
 
@@ -18,6 +17,8 @@
 
 struct __QDOrlo {
     OrloOptions options;
+    std::set<std::string, std::less<>> grants; // those of the option "Permissions"
+    const char* lack = nullptr;                // what the options lack, if anything
     std::unique_ptr<OrloStoreBackend> backend;
 };
 
@@ -56,13 +57,12 @@ bool isDataVersion(const Value& value) {
     return number && !value.isBoolean() && *number >= 0 && *number <= largestDataVersion;
 }
 
-// What a session cannot do without; the backend's own needs come on top.
-void checkOptions(const OrloOptions& options) {
+// What a session cannot do without and these options do not have, or null; the backend's own needs come on top.
+const char* lackOf(const OrloOptions& options) {
     const Value::Data* ticket = optionOf(options, "APTicket").data();
     if (!ticket || ticket->empty())
-        throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no AP ticket");
-    if (!isDataVersion(optionOf(options, "DataVersion")))
-        throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no data version");
+        return "There is no AP ticket";
+    return isDataVersion(optionOf(options, "DataVersion")) ? nullptr : "There is no data version";
 }
 
 std::unique_ptr<OrloStoreBackend> openBackend() {
@@ -82,45 +82,34 @@ const std::string* grantable(const Value& name, std::string_view separators) {
     return text && !text->empty() && text->find_first_of(separators) == std::string::npos ? text : nullptr;
 }
 
-bool hasGrant(const std::set<std::string_view>& granted, std::int32_t action, const Value& dataClass,
-              const Value& instance) {
-    std::string grant;
-    return QDOrloAppendPermissionsString(action, dataClass, instance, grant) && granted.contains(grant);
-}
-
-std::set<std::string_view> grantsIn(const Value& permissions) {
-    std::set<std::string_view> grants;
+std::set<std::string, std::less<>> grantsIn(const Value& permissions) {
+    std::set<std::string, std::less<>> grants;
     std::string_view rest = permissions.text() ? std::string_view(*permissions.text()) : std::string_view();
     while (!rest.empty()) {
         const std::size_t end = std::min(rest.find(';'), rest.size());
-        grants.insert(rest.substr(0, end));
+        grants.emplace(rest.substr(0, end));
         rest.remove_prefix(std::min(end + 1, rest.size()));
     }
     return grants;
 }
 
-// Holds the session to its permissions and its trust object, for one operation on all of the records. What is returned
-// are views of the arguments.
-std::vector<OrloRecordName> authorize(const __QDOrlo& session, std::int32_t action, std::span<const Value> classes,
-                                      std::span<const Value> instances) {
-    const std::set<std::string_view> granted = grantsIn(optionOf(session.options, "Permissions"));
-    std::vector<OrloRecordName> names;
-    for (std::size_t i = 0; i < classes.size(); ++i) {
-        if (!hasGrant(granted, action, classes[i], instances[i]))
-            throw OrloStoreFailure(QDOrloErrorNotPermitted, format("The session has no grant for action %d on %@ of %@",
-                                                                   action, classes[i], instances[i]));
-        names.push_back({*classes[i].text(), *instances[i].text()});
-    }
+// Holds the session to its permissions. What is returned are views of the arguments.
+OrloRecordName requireGrant(const __QDOrlo& session, std::int32_t action, const Value& dataClass,
+                            const Value& instance) {
+    std::string grant;
+    if (!QDOrloAppendPermissionsString(action, dataClass, instance, grant) || !session.grants.contains(grant))
+        throw OrloStoreFailure(QDOrloErrorNotPermitted, format("The session has no grant for action %d on %@ of %@",
+                                                               action, dataClass, instance));
+    return {*dataClass.text(), *instance.text()};
+}
+
+// Holds the session to the store's trust object.
+void requireTrust(const __QDOrlo& session) {
     const OrloStoreBackend::Digest digest = session.backend->trustObjectDigest(session.options);
     const Value::Data* held = optionOf(session.options, "TrustObjectDigest").data();
     if (!held || !std::equal(held->begin(), held->end(), digest.begin(), digest.end()))
         throw OrloStoreFailure(QDOrloErrorTrustObjectMismatch,
                                "The session's trust object digest is not that of the store's trust object");
-    return names;
-}
-
-OrloRecordName authorize(const __QDOrlo& session, std::int32_t action, const Value& dataClass, const Value& instance) {
-    return authorize(session, action, std::span(&dataClass, 1), std::span(&instance, 1)).front();
 }
 
 // Does the work of an operation on a session and reports its failure. Out of memory is a failure without an error.
@@ -129,7 +118,8 @@ bool perform(const char* operation, const __QDOrlo* session, std::optional<Error
     try {
         if (!session)
             throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no session");
-        checkOptions(session->options);
+        if (session->lack)
+            throw OrloStoreFailure(QDOrloErrorNotPermitted, session->lack);
         work();
         return true;
     } catch (const OrloStoreFailure& failure) {
@@ -152,8 +142,11 @@ __QDOrlo* QDOrloCreateWithOptions(const Value& options) try {
     auto session = std::make_unique<__QDOrlo>();
     if (options.dictionary())
         session->options = *options.dictionary();
+    session->grants = grantsIn(options["Permissions"]);
+    session->lack = lackOf(session->options);
     try {
-        checkOptions(session->options);
+        if (session->lack)
+            throw OrloStoreFailure(QDOrloErrorNotPermitted, session->lack);
         session->backend = openBackend();
     } catch (const OrloStoreFailure& failure) {
         libraryLog(format("Session: %s", failure.what()));
@@ -165,8 +158,12 @@ __QDOrlo* QDOrloCreateWithOptions(const Value& options) try {
 }
 
 void QDOrloSetOption(__QDOrlo* session, std::string_view key, Value value) {
-    if (session)
-        session->options.insert_or_assign(std::string(key), std::move(value));
+    if (!session)
+        return;
+    if (key == "Permissions")
+        session->grants = grantsIn(value);
+    session->options.insert_or_assign(std::string(key), std::move(value));
+    session->lack = lackOf(session->options);
 }
 
 Value QDOrloDataCreatePermissionsString(__QDOrlo* session, std::int32_t action, const Value& dataClass,
@@ -183,7 +180,11 @@ bool QDOrloAppendPermissionsString(std::int32_t action, const Value& dataClass, 
     const std::string* const instanceText = grantable(dataInstance, ";");
     if (!classText || !instanceText)
         return false;
-    permissions += format(permissions.empty() ? "%d:%s:%s" : ";%d:%s:%s", action, *classText, *instanceText);
+    if (!permissions.empty())
+        permissions += ';';
+    permissions += std::to_string(action);
+    (permissions += ':') += *classText;
+    (permissions += ':') += *instanceText;
     return true;
 }
 
@@ -196,7 +197,8 @@ bool QDOrloDataCopyTrustObject(__QDOrlo* session, std::string_view url, Value::D
 bool QDOrloDataPut(__QDOrlo* session, const Value& dataClass, const Value& dataInstance, const Value::Data& data,
                    std::optional<Error>* error) {
     return perform("Put", session, error, [&] {
-        const OrloRecordName name = authorize(*session, OrloActionPut, dataClass, dataInstance);
+        const OrloRecordName name = requireGrant(*session, OrloActionPut, dataClass, dataInstance);
+        requireTrust(*session);
         session->backend->put(session->options, name, data);
     });
 }
@@ -205,7 +207,8 @@ std::optional<Value::Data> QDOrloDataCopy(__QDOrlo* session, const Value& dataCl
                                           std::optional<Error>* error) {
     std::optional<Value::Data> data;
     perform("Get", session, error, [&] {
-        const OrloRecordName name = authorize(*session, OrloActionGet, dataClass, dataInstance);
+        const OrloRecordName name = requireGrant(*session, OrloActionGet, dataClass, dataInstance);
+        requireTrust(*session);
         data = session->backend->copy(session->options, name);
     });
     return data;
@@ -216,8 +219,11 @@ bool QDOrloDataMultiExport(__QDOrlo* session, const Value::Array& classes, const
     return perform("Export", session, error, [&] {
         if (classes.size() != instances.size())
             throw OrloStoreFailure(QDOrloErrorNotPermitted, "There are not as many instances as classes");
-        session->backend->multiExport(session->options,
-                                      authorize(*session, OrloActionExport, std::span(classes), std::span(instances)));
+        std::vector<OrloRecordName> names;
+        for (std::size_t i = 0; i < classes.size(); ++i)
+            names.push_back(requireGrant(*session, OrloActionExport, classes[i], instances[i]));
+        requireTrust(*session);
+        session->backend->multiExport(session->options, names);
     });
 }
 

@@ -43,7 +43,8 @@ public:
     // The store's trust object, from `url` when the store is a server.
     virtual Value::Data trustObject(const OrloOptions& options, std::string_view url) = 0;
 
-    // The SHA-256 of the store's trust object, against which the session's is checked before each operation.
+    // The SHA-256 of the trust object as trustObject last had it, against which the session's is checked before each
+    // operation; the store is asked when trustObject has not been called.
     virtual Digest trustObjectDigest(const OrloOptions& options) = 0;
 
     virtual void put(const OrloOptions& options, const OrloRecordName& name, const Value::Data& data) = 0;

@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <optional>
 #include <utility>
 
 #include <fcntl.h>
@@ -22,15 +23,6 @@ constexpr std::size_t maximumSize = std::size_t{1} << 20;
     fail(what + ": " + std::strerror(errno));
 }
 
-bool isSame(const timespec& one, const timespec& other) {
-    return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
-}
-
-bool isSame(const struct stat& one, const struct stat& other) {
-    return one.st_dev == other.st_dev && one.st_ino == other.st_ino && one.st_size == other.st_size &&
-           isSame(one.st_mtim, other.st_mtim) && isSame(one.st_ctim, other.st_ctim);
-}
-
 void make(const FileDescriptor& directory, const std::string& name) {
     Value::Data contents(newSize);
     if (!crypto::randomBytes(contents.data(), contents.size()))
@@ -43,31 +35,20 @@ void make(const FileDescriptor& directory, const std::string& name) {
 } // namespace
 
 Value::Data OrloTrustObject::read() {
-    struct stat file;
-    return read(&file);
-}
-
-OrloStoreBackend::Digest OrloTrustObject::digest() {
-    struct stat now;
-    if (known_ && ::fstatat(directory_.get(), name_.c_str(), &now, AT_SYMLINK_NOFOLLOW) == 0 &&
-        isSame(now, known_->file))
-        return known_->digest;
-    Known found;
-    const Value::Data contents = read(&found.file);
-    if (!crypto::sha256(contents.data(), contents.size(), found.digest.data()))
-        fail("cannot be digested");
-    known_ = found;
-    return found.digest;
-}
-
-Value::Data OrloTrustObject::read(struct stat* file) {
-    const FileDescriptor opened = open();
-    if (::fstat(opened.get(), file) != 0)
-        failWithErrno("cannot be read");
-    std::optional<Value::Data> contents = readRegularFile(opened, maximumSize);
+    std::optional<Value::Data> contents = readRegularFile(open(), maximumSize);
     if (!contents || contents->empty())
         fail("is damaged: it is empty, no regular file, or larger than 1 MiB");
+    OrloStoreBackend::Digest digest;
+    if (!crypto::sha256(contents->data(), contents->size(), digest.data()))
+        fail("cannot be digested");
+    digest_ = digest;
     return std::move(*contents);
+}
+
+const OrloStoreBackend::Digest& OrloTrustObject::digest() {
+    if (!digest_)
+        read();
+    return *digest_;
 }
 
 FileDescriptor OrloTrustObject::open() {

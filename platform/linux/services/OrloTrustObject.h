@@ -4,8 +4,7 @@
 
 #include <optional>
 #include <string>
-
-#include <sys/stat.h>
+#include <utility>
 
 #include "platform/linux/services/OrloStoreBackend.h"
 #include "platform/linux/system/FileDescriptor.h"
@@ -21,21 +20,15 @@ public:
     // The contents, read now.
     Value::Data read();
 
-    // Their SHA-256. The file is read again only when it is another one, or changed, since the last time.
-    OrloStoreBackend::Digest digest();
+    // The SHA-256 of the contents as they were last read; they are read when they have not been.
+    const OrloStoreBackend::Digest& digest();
 
 private:
-    struct Known {
-        struct stat file;
-        OrloStoreBackend::Digest digest;
-    };
-
-    Value::Data read(struct stat* file);
     FileDescriptor open();
 
     const FileDescriptor& directory_;
     std::string name_;
-    std::optional<Known> known_;
+    std::optional<OrloStoreBackend::Digest> digest_;
 };
 
 #endif
