@@ -7,6 +7,7 @@
 #include <optional>
 #include <string_view>
 
+#include "platform/Error.h"
 #include "platform/Value.h"
 
 namespace files {
@@ -18,10 +19,15 @@ constexpr std::size_t maximumSize = std::size_t{256} << 20;
 // or device is never waited for) or larger than maximumSize.
 std::optional<Value::Data> readWhole(std::string_view path);
 
+// Whether there is anything at `path`, whatever its kind; a symbolic link counts as what it leads to.
+bool exists(std::string_view path);
+
 // Makes `contents` the whole contents of the file at `path`: a new file of mode 0600 in the same directory, flushed to
 // the disk and then renamed over the target. No symbolic link is followed on the way. Returns false, and leaves
-// everything as it was, when the directory is missing or the target exists and is no regular file.
-bool replace(std::string_view path, const Value::Data& contents);
+// everything as it was, when the directory is missing or the target exists and is no regular file. The same goes for a
+// new file that was made but could not be filled or moved to its place; *writeError, when given, is then set and says
+// why.
+bool replace(std::string_view path, const Value::Data& contents, std::optional<Error>* writeError = nullptr);
 
 // Appends `text` to the file at `path` with one write; the file is created with mode 0640 when it is missing and closed
 // again at the end. A symbolic link or anything but a regular file is not opened. False when the text could not be

@@ -4,6 +4,7 @@ import os
 import pathlib
 import select
 import shutil
+import signal
 import subprocess
 import tempfile
 
@@ -28,15 +29,14 @@ class PrivateBus:
 
 
 class Service:
-    """A running service. `description` replaces the example device's description; None leaves it as it is."""
+    """A running service on a bus of its own. `answers` replaces the example device's answers; None leaves its whole
+    description as it is. With the `root` of another service it shares that one's device."""
 
-    def __init__(self, description=None):
-        self.root = pathlib.Path(tempfile.mkdtemp(prefix="veltra-"))
-        shutil.copytree(SOURCE / "examples/device", self.root, dirs_exist_ok=True)
-        for folder in ("tmp", "private/var/log"):
-            (self.root / folder).mkdir(parents=True)
-        if description is not None:
-            self.describe(description)
+    def __init__(self, answers=None, root=None):
+        self.owns_root = root is None
+        self.root = root or self.make_root()
+        if answers is not None:
+            self.describe(answers)
         self.bus = PrivateBus()
         self.environment = {
             **os.environ,
@@ -44,17 +44,34 @@ class Service:
             "VELTRA_BUS": self.bus.address,
             "DBUS_SESSION_BUS_ADDRESS": self.bus.address,
         }
+        self.start()
+
+    @staticmethod
+    def make_root():
+        root = pathlib.Path(tempfile.mkdtemp(prefix="veltra-"))
+        shutil.copytree(SOURCE / "examples/device", root, dirs_exist_ok=True)
+        for folder in ("tmp", "private/var/log"):
+            (root / folder).mkdir(parents=True)
+        return root
+
+    def start(self):
         self.pid = int(self.run(SOURCE / "scripts/start-service", BIN / "VeltraOrloServices").stdout)
         self.ended = os.pidfd_open(self.pid)
 
-    def close(self):
+    def kill(self):
+        """Ends the service at once, unless it has ended."""
         try:
-            os.kill(self.pid, 9)
+            os.kill(self.pid, signal.SIGKILL)
         except ProcessLookupError:
             pass
+        self.wait_end()
         os.close(self.ended)
+
+    def close(self):
+        self.kill()
         self.bus.close()
-        shutil.rmtree(self.root)
+        if self.owns_root:
+            shutil.rmtree(self.root)
 
     def describe(self, answers):
         (self.root / "etc/veltra/device.json").write_text(json.dumps({"answers": answers}))
@@ -80,10 +97,11 @@ class Service:
         return path.read_text().splitlines() if path.exists() else []
 
     def messages_of(self, act):
-        """The messages, without time and line number, that the log gains while `act` runs."""
+        """The messages, without time and line number, that the log gains while `act` runs. A message may end in a line
+        break; the empty line that follows is left out."""
         before = len(self.log())
         act()
-        return [line.split("] ", 1)[1] for line in self.log()[before:]]
+        return [line.split("] ", 1)[1] for line in self.log()[before:] if line]
 
     def resident_kilobytes(self):
         for line in pathlib.Path(f"/proc/{self.pid}/status").read_text().splitlines():

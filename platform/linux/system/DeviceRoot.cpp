@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <new>
+#include <utility>
 
 #include <fcntl.h>
 #include <linux/openat2.h>
@@ -47,6 +48,30 @@ FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode, std::ui
 
 FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve) {
     return openInRoot(path, O_RDONLY | O_DIRECTORY, 0, resolve);
+}
+
+FileDescriptor makeDirectoryInRoot(std::string_view path, mode_t mode) {
+    while (path.size() > 1 && path.ends_with('/'))
+        path.remove_suffix(1);
+    FileDescriptor directory = openDirectoryInRoot(path);
+    if (directory || errno != ENOENT)
+        return directory;
+    const std::optional<DevicePath> parts = splitDevicePath(path);
+    if (!parts)
+        return {};
+    const FileDescriptor above = makeDirectoryInRoot(parts->parent, 0755);
+    if (!above || (::mkdirat(above.get(), parts->name.c_str(), mode) != 0 && errno != EEXIST))
+        return {};
+    ::fsync(above.get());
+    return openDirectoryInRoot(path);
+}
+
+std::optional<DevicePath> splitDevicePath(std::string_view path) {
+    const std::size_t slash = path.rfind('/');
+    std::string name(slash == std::string_view::npos ? path : path.substr(slash + 1));
+    if (name.empty() || name == "." || name == ".." || name.find('\0') != std::string::npos)
+        return std::nullopt;
+    return DevicePath{slash == std::string_view::npos ? "/" : path.substr(0, slash + 1), std::move(name)};
 }
 
 std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size_t maximum) try {

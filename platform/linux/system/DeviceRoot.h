@@ -29,6 +29,19 @@ FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode = 0, std
 // Opens the directory at the device path `path` for reading and for the *at system calls.
 FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve = 0);
 
+// Opens the directory at the device path `path`, which is made first when it is missing: with mode `mode`, and those above
+// it with mode 0755. What is made outlasts a power cut.
+FileDescriptor makeDirectoryInRoot(std::string_view path, mode_t mode);
+
+// A device path taken apart at its last slash.
+struct DevicePath {
+    std::string_view parent; // "/" when the path has no other slash
+    std::string name;        // neither empty nor "." or ".."; without slash and NUL
+};
+
+// The parts of `path`, or none when it does not end in a name.
+std::optional<DevicePath> splitDevicePath(std::string_view path);
+
 // The rest of the open file from its position on; nothing when it is no regular file, cannot be read, or holds more
 // than `maximum` bytes. What counts are the bytes that come, not the size that the file system states: the nodes of
 // /sys and /proc state one that is not theirs, and a file may grow while it is read.

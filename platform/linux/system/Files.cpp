@@ -1,82 +1,21 @@
 #include "platform/Files.h"
 
 #include <cerrno>
-#include <cstdint>
-#include <cstdio>
+#include <cstring>
 #include <string>
 
 #include <fcntl.h>
 #include <linux/openat2.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 
 #include "platform/linux/system/DeviceRoot.h"
+#include "platform/linux/system/NewFile.h"
 
 namespace files {
 
 namespace {
 
-constexpr mode_t privateMode = 0600;
 constexpr mode_t logMode = 0640;
-
-bool writeAll(const FileDescriptor& file, const Value::Data& contents) {
-    std::size_t written = 0;
-    while (written < contents.size()) {
-        const ssize_t count = ::write(file.get(), contents.data() + written, contents.size() - written);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count <= 0)
-            return false;
-        written += static_cast<std::size_t>(count);
-    }
-    return true;
-}
-
-bool flush(const FileDescriptor& file) {
-    int result;
-    do
-        result = ::fsync(file.get());
-    while (result != 0 && errno == EINTR);
-    return result == 0;
-}
-
-// A new file of a random name in a directory. It is removed again unless it was moved to its place.
-class NewFile {
-public:
-    explicit NewFile(const FileDescriptor& directory) : directory_(directory) {
-        std::uint64_t random;
-        if (::getrandom(&random, sizeof random, 0) != static_cast<ssize_t>(sizeof random))
-            return;
-        name_ = ".new-" + std::to_string(random);
-        file_ = FileDescriptor(::openat(directory.get(), name_.c_str(),
-                                        O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, privateMode));
-        remove_ = static_cast<bool>(file_);
-    }
-    NewFile(const NewFile&) = delete;
-    NewFile& operator=(const NewFile&) = delete;
-    ~NewFile() {
-        if (remove_)
-            ::unlinkat(directory_.get(), name_.c_str(), 0);
-    }
-
-    // The mode is set once more, since the umask may have taken bits from it.
-    bool fill(const Value::Data& contents) const {
-        return file_ && ::fchmod(file_.get(), privateMode) == 0 && writeAll(file_, contents) && flush(file_);
-    }
-
-    bool moveTo(const std::string& name) {
-        if (::renameat(directory_.get(), name_.c_str(), directory_.get(), name.c_str()) != 0)
-            return false;
-        remove_ = false;
-        return true;
-    }
-
-private:
-    const FileDescriptor& directory_;
-    std::string name_;
-    FileDescriptor file_;
-    bool remove_ = false;
-};
 
 // Whether `name` is free or a regular file.
 bool mayBeReplaced(const FileDescriptor& directory, const std::string& name) {
@@ -93,20 +32,25 @@ std::optional<Value::Data> readWhole(std::string_view path) {
     return file ? readRegularFile(file, maximumSize) : std::nullopt;
 }
 
-bool replace(std::string_view path, const Value::Data& contents) {
-    const std::size_t slash = path.rfind('/');
-    const std::string name(slash == std::string_view::npos ? path : path.substr(slash + 1));
-    if (name.empty() || name == "." || name == ".." || name.find('\0') != std::string::npos)
+bool exists(std::string_view path) {
+    return static_cast<bool>(openInRoot(path, O_PATH));
+}
+
+bool replace(std::string_view path, const Value::Data& contents, std::optional<Error>* writeError) {
+    const std::optional<DevicePath> parts = splitDevicePath(path);
+    if (!parts)
         return false;
-    const std::string_view parent = slash == std::string_view::npos ? "/" : path.substr(0, slash + 1);
-    const FileDescriptor directory = openDirectoryInRoot(parent, RESOLVE_NO_SYMLINKS);
-    if (!directory || !mayBeReplaced(directory, name))
+    const FileDescriptor directory = openDirectoryInRoot(parts->parent, RESOLVE_NO_SYMLINKS);
+    if (!directory || !mayBeReplaced(directory, parts->name))
         return false;
     NewFile file(directory);
-    if (!file.fill(contents) || !file.moveTo(name))
+    if (!file)
         return false;
-    // The new contents are in place whatever this says; it only makes the rename itself outlast a power cut.
-    flush(directory);
+    if (!file.fill(contents) || !file.replace(parts->name)) {
+        if (writeError)
+            *writeError = Error{"FileErrorDomain", errno, std::strerror(errno)};
+        return false;
+    }
     return true;
 }
 

@@ -1,0 +1,34 @@
+#include "orlo/OrloSession.h"
+
+#include "platform/Crypto.h"
+#include "platform/Files.h"
+
+std::optional<Value::Data> readApTicket(const LogSource& log) {
+    std::optional<Error> error;
+    const Value path =
+        KelvoDataAccessor::sharedDataAccessor().copyPathForPersonalizedData(KelvoDataAccessor::apTicketKind, &error);
+    if (error)
+        log.info("KelvoDataAccessor error: %@", error);
+    log.info("Getting Apticket Path from KelvoDataAccessor : %@", path);
+    std::optional<Value::Data> ticket;
+    if (path.text())
+        ticket = files::readWhole(*path.text());
+    if (!ticket)
+        log.error("Could not read AP ticket: %@", path);
+    return ticket;
+}
+
+OrloTrustResult setTrustObjectOptions(__QDOrlo* session, const Value::Data& trustObject) {
+    QDOrloSetOption(session, "TrustObject", trustObject);
+    std::uint8_t digest[crypto::sha256Size];
+    const std::int32_t status =
+        QDSupportDigestSha256(trustObject.data(), static_cast<std::uint32_t>(trustObject.size()), digest);
+    if (status != 0)
+        return {OrloTrustResult::DigestFailed, status};
+    std::optional<Value::Data> value =
+        madeIfMemorySuffices([&] { return Value::Data(std::begin(digest), std::end(digest)); });
+    if (!value)
+        return {OrloTrustResult::NoMemoryForData, status};
+    QDOrloSetOption(session, "TrustObjectDigest", std::move(*value));
+    return {OrloTrustResult::Trusted, status};
+}

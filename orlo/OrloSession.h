@@ -1,0 +1,69 @@
+// What the client of single records and the export have in common: the device's boot ticket, the store's trust object,
+// and errors that stand in tables.
+#ifndef VELTRA_ORLO_ORLO_SESSION_H
+#define VELTRA_ORLO_ORLO_SESSION_H
+
+#include <cstdint>
+#include <memory>
+#include <new>
+#include <optional>
+#include <string_view>
+
+#include "Daemon/HSLog.h"
+#include "platform/OrloDataStore.h"
+
+// A session that is released at the end.
+struct OrloSessionRelease {
+    void operator()(__QDOrlo* session) const { QDSupportSafeRelease(session); }
+};
+using OrloSessionPtr = std::unique_ptr<__QDOrlo, OrloSessionRelease>;
+
+// A row of a table of errors.
+struct OrloErrorRow {
+    std::int64_t code;
+    const char* description; // a format
+    const char* logLine;     // the line about it, of level 4; null for none
+};
+
+// The row and the line of the source file where its error is made.
+struct OrloErrorHere {
+    OrloErrorHere(const OrloErrorRow& errorRow, int sourceLine = __builtin_LINE()) : row(errorRow), line(sourceLine) {}
+    const OrloErrorRow& row;
+    int line;
+};
+
+// Makes an error from a row and logs the row's line.
+template <class... Arguments>
+Error makeOrloError(const LogSource& log, std::string_view domain, OrloErrorHere here, const Arguments&... arguments) {
+    Error error{std::string(domain), here.row.code, format(here.row.description, arguments...)};
+    if (here.row.logLine)
+        log.error(LineFormat(here.row.logLine, here.line));
+    return error;
+}
+
+// What `make` makes, or none when memory does not suffice for it.
+template <class Make>
+auto madeIfMemorySuffices(Make make) -> std::optional<decltype(make())> try {
+    return make();
+} catch (const std::bad_alloc&) {
+    return std::nullopt;
+}
+
+// The bytes of the device's boot ticket, or none. Writes to `log` where it is, and at level 4 when it cannot be read.
+std::optional<Value::Data> readApTicket(const LogSource& log);
+
+// What became of the trust object that a session was given.
+struct OrloTrustResult {
+    enum Outcome {
+        Trusted,
+        DigestFailed,   // `status` says how; the session has the trust object
+        NoMemoryForData // the digest cannot be made a value; the session has the trust object
+    };
+    Outcome outcome;
+    std::int32_t status;
+};
+
+// Sets the options "TrustObject" and "TrustObjectDigest" (its SHA-256) on the session.
+OrloTrustResult setTrustObjectOptions(__QDOrlo* session, const Value::Data& trustObject);
+
+#endif

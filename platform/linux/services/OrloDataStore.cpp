@@ -1,0 +1,254 @@
+// The data-store client library: sessions, permissions and the check of the trust object, the same on every backend.
+#include "platform/OrloDataStore.h"
+
+#include <algorithm>
+#include <atomic>
+#include <exception>
+#include <limits>
+#include <memory>
+#include <set>
+#include <utility>
+#include <vector>
+
+#include "platform/Format.h"
+#include "platform/Utf8.h"
+#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/system/DeviceDescription.h"
+
+struct __QDOrlo {
+    OrloOptions options;
+    std::set<std::string, std::less<>> grants; // those of the option "Permissions"
+    const char* lack = nullptr;                // what the options lack, if anything
+    std::unique_ptr<OrloStoreBackend> backend;
+};
+
+namespace {
+
+constexpr const char* errorDomain = "QDOrloErrorDomain";
+constexpr std::int64_t usualDataVersion = 2;
+constexpr std::int64_t largestDataVersion = std::numeric_limits<std::uint32_t>::max();
+
+std::atomic<QDOrloLogHandler> logHandler = nullptr;
+
+constexpr struct {
+    std::string_view name;
+    std::unique_ptr<OrloStoreBackend> (*open)(const Value& store);
+} backends[] = {
+    {"embedded", openEmbeddedStore},
+};
+
+void libraryLog(std::string_view text) {
+    const QDOrloLogHandler handler = logHandler;
+    if (!handler)
+        return;
+    std::string line;
+    utf8::appendOnOneLine(line, text);
+    handler(nullptr, line.c_str());
+}
+
+const Value& optionOf(const OrloOptions& options, std::string_view key) {
+    static const Value nothing;
+    const auto found = options.find(key);
+    return found == options.end() ? nothing : found->second;
+}
+
+bool isDataVersion(const Value& value) {
+    const auto number = value.integer();
+    return number && !value.isBoolean() && *number >= 0 && *number <= largestDataVersion;
+}
+
+// What a session cannot do without and these options do not have, or null; the backend's own needs come on top.
+const char* lackOf(const OrloOptions& options) {
+    const Value::Data* ticket = optionOf(options, "APTicket").data();
+    if (!ticket || ticket->empty())
+        return "There is no AP ticket";
+    return isDataVersion(optionOf(options, "DataVersion")) ? nullptr : "There is no data version";
+}
+
+std::unique_ptr<OrloStoreBackend> openBackend() {
+    const Value store = resolveDescribed(deviceDescription()["store"]);
+    const Value& chosen = store["backend"];
+    if (chosen.isNothing())
+        return backends[0].open(store);
+    for (const auto& backend : backends)
+        if (chosen == Value(backend.name))
+            return backend.open(store);
+    throw OrloStoreFailure(QDOrloErrorStorage, "There is no backend " + chosen.description());
+}
+
+// The text of a class or an instance, or null when it names no record or would change the meaning of a grant.
+const std::string* grantable(const Value& name, std::string_view separators) {
+    const std::string* text = name.text();
+    return text && !text->empty() && text->find_first_of(separators) == std::string::npos ? text : nullptr;
+}
+
+std::set<std::string, std::less<>> grantsIn(const Value& permissions) {
+    std::set<std::string, std::less<>> grants;
+    std::string_view rest = permissions.text() ? std::string_view(*permissions.text()) : std::string_view();
+    while (!rest.empty()) {
+        const std::size_t end = std::min(rest.find(';'), rest.size());
+        grants.emplace(rest.substr(0, end));
+        rest.remove_prefix(std::min(end + 1, rest.size()));
+    }
+    return grants;
+}
+
+// Holds the session to its permissions. What is returned are views of the arguments.
+OrloRecordName requireGrant(const __QDOrlo& session, std::int32_t action, const Value& dataClass,
+                            const Value& instance) {
+    std::string grant;
+    if (!QDOrloAppendPermissionsString(action, dataClass, instance, grant) || !session.grants.contains(grant))
+        throw OrloStoreFailure(QDOrloErrorNotPermitted, format("The session has no grant for action %d on %@ of %@",
+                                                               action, dataClass, instance));
+    return {*dataClass.text(), *instance.text()};
+}
+
+// Holds the session to the store's trust object.
+void requireTrust(const __QDOrlo& session) {
+    const OrloStoreBackend::Digest digest = session.backend->trustObjectDigest(session.options);
+    const Value::Data* held = optionOf(session.options, "TrustObjectDigest").data();
+    if (!held || !std::equal(held->begin(), held->end(), digest.begin(), digest.end()))
+        throw OrloStoreFailure(QDOrloErrorTrustObjectMismatch,
+                               "The session's trust object digest is not that of the store's trust object");
+}
+
+// Does the work of an operation on a session and reports its failure. Out of memory is a failure without an error.
+template <class Work>
+bool perform(const char* operation, const __QDOrlo* session, std::optional<Error>* error, Work work) try {
+    try {
+        if (!session)
+            throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no session");
+        if (session->lack)
+            throw OrloStoreFailure(QDOrloErrorNotPermitted, session->lack);
+        work();
+        return true;
+    } catch (const OrloStoreFailure& failure) {
+        libraryLog(format("%s: %s", operation, failure.what()));
+        if (error)
+            *error = Error{errorDomain, failure.code(), failure.what()};
+        return false;
+    }
+} catch (const std::exception&) {
+    return false;
+}
+
+} // namespace
+
+void QDOrloLogSetHandler(QDOrloLogHandler handler) {
+    logHandler = handler;
+}
+
+__QDOrlo* QDOrloCreateWithOptions(const Value& options) try {
+    auto session = std::make_unique<__QDOrlo>();
+    if (options.dictionary())
+        session->options = *options.dictionary();
+    session->grants = grantsIn(options["Permissions"]);
+    session->lack = lackOf(session->options);
+    try {
+        if (session->lack)
+            throw OrloStoreFailure(QDOrloErrorNotPermitted, session->lack);
+        session->backend = openBackend();
+    } catch (const OrloStoreFailure& failure) {
+        libraryLog(format("Session: %s", failure.what()));
+        return nullptr;
+    }
+    return session.release();
+} catch (const std::exception&) {
+    return nullptr;
+}
+
+void QDOrloSetOption(__QDOrlo* session, std::string_view key, Value value) {
+    if (!session)
+        return;
+    if (key == "Permissions")
+        session->grants = grantsIn(value);
+    session->options.insert_or_assign(std::string(key), std::move(value));
+    session->lack = lackOf(session->options);
+}
+
+Value QDOrloDataCreatePermissionsString(__QDOrlo* session, std::int32_t action, const Value& dataClass,
+                                        const Value& dataInstance) {
+    std::string permissions;
+    if (!session || !QDOrloAppendPermissionsString(action, dataClass, dataInstance, permissions))
+        return {};
+    return permissions;
+}
+
+bool QDOrloAppendPermissionsString(std::int32_t action, const Value& dataClass, const Value& dataInstance,
+                                   std::string& permissions) {
+    const std::string* const classText = grantable(dataClass, ":;");
+    const std::string* const instanceText = grantable(dataInstance, ";");
+    if (!classText || !instanceText)
+        return false;
+    if (!permissions.empty())
+        permissions += ';';
+    permissions += std::to_string(action);
+    (permissions += ':') += *classText;
+    (permissions += ':') += *instanceText;
+    return true;
+}
+
+bool QDOrloDataCopyTrustObject(__QDOrlo* session, std::string_view url, Value::Data* trustObject,
+                               std::optional<Error>* error) {
+    return perform("Trust object", session, error,
+                   [&] { *trustObject = session->backend->trustObject(session->options, url); });
+}
+
+bool QDOrloDataPut(__QDOrlo* session, const Value& dataClass, const Value& dataInstance, const Value::Data& data,
+                   std::optional<Error>* error) {
+    return perform("Put", session, error, [&] {
+        const OrloRecordName name = requireGrant(*session, OrloActionPut, dataClass, dataInstance);
+        requireTrust(*session);
+        session->backend->put(session->options, name, data);
+    });
+}
+
+std::optional<Value::Data> QDOrloDataCopy(__QDOrlo* session, const Value& dataClass, const Value& dataInstance,
+                                          std::optional<Error>* error) {
+    std::optional<Value::Data> data;
+    perform("Get", session, error, [&] {
+        const OrloRecordName name = requireGrant(*session, OrloActionGet, dataClass, dataInstance);
+        requireTrust(*session);
+        data = session->backend->copy(session->options, name);
+    });
+    return data;
+}
+
+bool QDOrloDataMultiExport(__QDOrlo* session, const Value::Array& classes, const Value::Array& instances,
+                           std::optional<Error>* error) {
+    return perform("Export", session, error, [&] {
+        if (classes.size() != instances.size())
+            throw OrloStoreFailure(QDOrloErrorNotPermitted, "There are not as many instances as classes");
+        std::vector<OrloRecordName> names;
+        for (std::size_t i = 0; i < classes.size(); ++i)
+            names.push_back(requireGrant(*session, OrloActionExport, classes[i], instances[i]));
+        requireTrust(*session);
+        session->backend->multiExport(session->options, names);
+    });
+}
+
+std::uint32_t QDOrloSealingMapGetOrloDataVersionForDevice(const Value::Data&) {
+    const Value version = resolveDescribed(deviceDescription()["store"]["dataVersion"]);
+    return static_cast<std::uint32_t>(isDataVersion(version) ? *version.integer() : usualDataVersion);
+}
+
+std::int32_t QDSupportDigestSha256(const void* bytes, std::uint32_t length, std::uint8_t* digest) {
+    return crypto::sha256(bytes, length, digest) ? 0 : 1;
+}
+
+void QDSupportSafeRelease(__QDOrlo* session) {
+    delete session;
+}
+
+const KelvoDataAccessor& KelvoDataAccessor::sharedDataAccessor() {
+    static const KelvoDataAccessor shared;
+    return shared;
+}
+
+Value KelvoDataAccessor::copyPathForPersonalizedData(std::int64_t kind, std::optional<Error>* error) const {
+    if (kind == apTicketKind)
+        return "/System/Library/Caches/apticket.der";
+    if (error)
+        *error = Error{"KelvoErrorDomain", 1, format("The device keeps no personalised data of kind %ld", kind)};
+    return {};
+}

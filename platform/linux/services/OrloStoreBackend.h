@@ -1,0 +1,58 @@
+// What the data-store client library asks of a place where records are kept. Permissions and the trust object's digest
+// are the library's own to check, before it calls a backend.
+#ifndef VELTRA_PLATFORM_LINUX_ORLO_STORE_BACKEND_H
+#define VELTRA_PLATFORM_LINUX_ORLO_STORE_BACKEND_H
+
+#include <array>
+#include <cstdint>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Crypto.h"
+#include "platform/OrloDataStore.h"
+
+// Why an operation of a backend failed.
+class OrloStoreFailure : public std::runtime_error {
+public:
+    OrloStoreFailure(QDOrloErrorCode code, const std::string& reason) : std::runtime_error(reason), code_(code) {}
+    QDOrloErrorCode code() const { return code_; }
+
+private:
+    QDOrloErrorCode code_;
+};
+
+// The names of a record; neither is empty.
+struct OrloRecordName {
+    std::string_view dataClass;
+    std::string_view instance;
+};
+
+// The options of a session as they are when an operation is called.
+using OrloOptions = Value::Dictionary;
+
+// Belongs to one session. Every operation raises OrloStoreFailure on failure and then has changed nothing.
+class OrloStoreBackend {
+public:
+    using Digest = std::array<std::uint8_t, crypto::sha256Size>;
+
+    virtual ~OrloStoreBackend() = default;
+
+    // The store's trust object, from `url` when the store is a server.
+    virtual Value::Data trustObject(const OrloOptions& options, std::string_view url) = 0;
+
+    // The SHA-256 of the trust object as trustObject last had it, against which the session's is checked before each
+    // operation; the store is asked when trustObject has not been called.
+    virtual Digest trustObjectDigest(const OrloOptions& options) = 0;
+
+    virtual void put(const OrloOptions& options, const OrloRecordName& name, const Value::Data& data) = 0;
+    virtual Value::Data copy(const OrloOptions& options, const OrloRecordName& name) = 0;
+    virtual void multiExport(const OrloOptions& options, const std::vector<OrloRecordName>& names) = 0;
+};
+
+// A backend on the database that "path" of the description's "store" names.
+std::unique_ptr<OrloStoreBackend> openEmbeddedStore(const Value& store);
+
+#endif

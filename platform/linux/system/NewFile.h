@@ -1,0 +1,39 @@
+// A file that comes into being as a whole: it is filled under a random name and then moved to its place.
+#ifndef VELTRA_PLATFORM_LINUX_NEW_FILE_H
+#define VELTRA_PLATFORM_LINUX_NEW_FILE_H
+
+#include <string>
+
+#include "platform/Value.h"
+#include "platform/linux/system/FileDescriptor.h"
+
+// Every operation returns false, with errno set, on failure. The file is removed again unless it was moved.
+class NewFile {
+public:
+    // Makes an empty file of mode 0600 in `directory`, which must outlive this. False as a whole when that failed.
+    explicit NewFile(const FileDescriptor& directory);
+    NewFile(const NewFile&) = delete;
+    NewFile& operator=(const NewFile&) = delete;
+    ~NewFile();
+
+    explicit operator bool() const { return static_cast<bool>(file_); }
+
+    // Writes the contents and flushes them to the disk.
+    bool fill(const Value::Data& contents) const;
+
+    // Moves the file to `name`, in place of what is there.
+    bool replace(const std::string& name) { return moveTo(name, 0); }
+
+    // Moves the file to `name` unless something is there; errno is then EEXIST.
+    bool placeAt(const std::string& name);
+
+private:
+    bool moveTo(const std::string& name, unsigned flags);
+
+    const FileDescriptor& directory_;
+    std::string name_;
+    FileDescriptor file_;
+    bool remove_ = false;
+};
+
+#endif
