@@ -14,6 +14,16 @@ constexpr const char* handlerName = "-[ZPOrloServices handleMessage:completion:]
 // `hardwareModel` is the device's answer to "HWModelStr" at the start of the request, or nothing.
 using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Value& hardwareModel);
 
+// "getTCRT": answers with the top module's certificate as hexadecimal text under "CertData" (left out when it is empty)
+// and its serial number under "CertSerialNumber", "DummyCertificateSerialNumber" when that cannot be read. A model whose
+// top module has no certificate is a failure without error; otherwise the error is that of the hardware registry.
+HSMessageResponse getTCRT(const HSMessageRequest& request, const Value& hardwareModel);
+
+// "putTCRT": has the display authenticated and then stores the top module's certificate as the "tcrt" record of the
+// screen and the top module's chip. The error is "TcrtAuthErrorDomain" 401 for a display that fails, or that of the
+// hardware registry or of the data store.
+HSMessageResponse putTCRT(const HSMessageRequest& request, const Value& hardwareModel);
+
 // "checkCorvoPostSwapEntitlement": answers under "IsPostSwapEntitled" whether the boot ticket holds the entitlement
 // "eksp". Always succeeds; a ticket that cannot be read or decoded holds none.
 HSMessageResponse checkCorvoPostSwapEntitlement(const HSMessageRequest& request, const Value& hardwareModel);

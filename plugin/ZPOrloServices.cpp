@@ -16,6 +16,8 @@ struct CommandRow {
 
 // In the order in which a request's command is compared with them.
 constexpr CommandRow commands[] = {
+    {"getTCRT", getTCRT},
+    {"putTCRT", putTCRT},
     {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement},
     {"setGlobalbCfg", setGlobalbCfg},
 };
