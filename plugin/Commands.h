@@ -14,6 +14,11 @@ constexpr const char* handlerName = "-[ZPOrloServices handleMessage:completion:]
 // `hardwareModel` is the device's answer to "HWModelStr" at the start of the request, or nothing.
 using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Value& hardwareModel);
 
+// "OrloExport": exports the identities of the device's components, of the classes in the array "ExportList" or, when
+// the request has none and the model is neither of the M8 nor of the M9 family, of seven usual ones. The error is that
+// of the export, or one of "OrloExport" 2002 that says which identity could not be gathered.
+HSMessageResponse OrloExport(const HSMessageRequest& request, const Value& hardwareModel);
+
 // "getTCRT": answers with the top module's certificate as hexadecimal text under "CertData" (left out when it is empty)
 // and its serial number under "CertSerialNumber", "DummyCertificateSerialNumber" when that cannot be read. A model whose
 // top module has no certificate is a failure without error; otherwise the error is that of the hardware registry.
@@ -23,6 +28,14 @@ HSMessageResponse getTCRT(const HSMessageRequest& request, const Value& hardware
 // screen and the top module's chip. The error is "TcrtAuthErrorDomain" 401 for a display that fails, or that of the
 // hardware registry or of the data store.
 HSMessageResponse putTCRT(const HSMessageRequest& request, const Value& hardwareModel);
+
+// "putPSD2": stores the contents of the file named by "psd2DataPath" as the secure face sensor's "psd2" record. A
+// failure has a reason under "psd2 put error".
+HSMessageResponse putPSD2(const HSMessageRequest& request, const Value& hardwareModel);
+
+// "getPSD2": writes the secure face sensor's "psd2" record to the file named by "psd2V4DataPath", in place of what is
+// there; the file has mode 0600. Without a record the file stays as it is, and the reason is under "psd2 get error".
+HSMessageResponse getPSD2(const HSMessageRequest& request, const Value& hardwareModel);
 
 // "checkCorvoPostSwapEntitlement": answers under "IsPostSwapEntitled" whether the boot ticket holds the entitlement
 // "eksp". Always succeeds; a ticket that cannot be read or decoded holds none.

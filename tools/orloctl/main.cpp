@@ -101,8 +101,20 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
     return status;
 }
 
+int send(const Options& options, const std::string& command, const Value::Dictionary& arguments) {
+    return report(options, sendRequest(options.address, command, arguments));
+}
+
 int call(const Options& options, const std::string& command, const std::vector<std::string>& words) {
-    return report(options, sendRequest(options.address, command, parseArguments(words)));
+    return send(options, command, parseArguments(words));
+}
+
+// Without classes the choice is the plug-in's.
+int exportClasses(const Options& options, const std::vector<std::string>& classes) {
+    Value::Dictionary arguments;
+    if (!classes.empty())
+        arguments["ExportList"] = Value::Array(classes.begin(), classes.end());
+    return send(options, "OrloExport", arguments);
 }
 
 int getTcrt(const Options& options, const std::string& copyPath) {
@@ -176,6 +188,7 @@ public:
         app_.fallthrough();
         app_.footer(exitStatuses);
         addRequests();
+        addRecords();
         addReaders();
     }
 
@@ -215,6 +228,27 @@ private:
         verb->add_option("FILE", path_, "The blob, a path on the device")->required();
         verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file");
         verb->callback([this] { run_ = [this] { return setBcfg(options_, path_, copyPath_); }; });
+    }
+
+    void addRecords() {
+        CLI::App* verb = app_.add_subcommand("export", "Export the identities of components to the Orlo store");
+        verb->add_option("CLASSES", words_, "Data classes, such as tcrt; the plug-in's own list without any");
+        verb->callback([this] { run_ = [this] { return exportClasses(options_, words_); }; });
+
+        addFileRequest("put-psd2", "Put the secure face sensor's record into the Orlo store",
+                       "The file with the record, a path on the device", "putPSD2", "psd2DataPath");
+        addFileRequest("get-psd2", "Get the secure face sensor's record from the Orlo store",
+                       "The file to write, a path on the device", "getPSD2", "psd2V4DataPath");
+    }
+
+    // A verb whose command takes one path.
+    void addFileRequest(const char* name, const char* says, const char* saysOfFile, const char* command,
+                        const char* key) {
+        CLI::App* verb = app_.add_subcommand(name, says);
+        verb->add_option("FILE", path_, saysOfFile)->required();
+        verb->callback([this, command, key] {
+            run_ = [this, command, key] { return send(options_, command, {{key, path_}}); };
+        });
     }
 
     void addReaders() {

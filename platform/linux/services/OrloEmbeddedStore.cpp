@@ -97,7 +97,7 @@ std::unique_ptr<OrloStoreBackend> openEmbeddedStore(const Value& store) {
     const auto parts = path.text() ? splitDevicePath(*path.text()) : std::nullopt;
     if (!parts)
         throw OrloStoreFailure(QDOrloErrorStorage, "The store's path " + path.description() + " names no file");
-    FileDescriptor directory = makeDirectoryInRoot(parts->parent);
+    FileDescriptor directory = makeDirectoryInRoot(parts->parent, 0700);
     if (!directory)
         throw OrloStoreFailure(QDOrloErrorStorage,
                                "The store's folder cannot be opened: " + std::string(std::strerror(errno)));

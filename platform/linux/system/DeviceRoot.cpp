@@ -50,7 +50,7 @@ FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve)
     return openInRoot(path, O_RDONLY | O_DIRECTORY, 0, resolve);
 }
 
-FileDescriptor makeDirectoryInRoot(std::string_view path) {
+FileDescriptor makeDirectoryInRoot(std::string_view path, mode_t mode) {
     while (path.size() > 1 && path.ends_with('/'))
         path.remove_suffix(1);
     FileDescriptor directory = openDirectoryInRoot(path);
@@ -59,8 +59,8 @@ FileDescriptor makeDirectoryInRoot(std::string_view path) {
     const std::optional<DevicePath> parts = splitDevicePath(path);
     if (!parts)
         return {};
-    const FileDescriptor above = makeDirectoryInRoot(parts->parent);
-    if (!above || (::mkdirat(above.get(), parts->name.c_str(), 0700) != 0 && errno != EEXIST))
+    const FileDescriptor above = makeDirectoryInRoot(parts->parent, 0755);
+    if (!above || (::mkdirat(above.get(), parts->name.c_str(), mode) != 0 && errno != EEXIST))
         return {};
     ::fsync(above.get());
     return openDirectoryInRoot(path);
