@@ -29,6 +29,12 @@ Object* decodeWhole(Object* (*decode)(Object**, const unsigned char**, long), vo
     return nullptr;
 }
 
+CertificateRef wrap(Owner<X509, X509_free> x509) {
+    const auto made = std::make_shared<Certificate>();
+    made->x509 = std::move(x509);
+    return made;
+}
+
 struct FreeCertificates {
     void operator()(STACK_OF(X509) * certificates) const { sk_X509_pop_free(certificates, X509_free); }
 };
@@ -53,7 +59,7 @@ std::optional<std::vector<CertificateRef>> copyCertificatesFromCertsOnlyMessage(
     for (int i = 0; found && i < sk_X509_num(found.get()); ++i) {
         X509* x509 = sk_X509_value(found.get(), i);
         X509_up_ref(x509);
-        certificates.push_back(std::make_shared<const Certificate>(Owner<X509, X509_free>(x509)));
+        certificates.push_back(wrap(Owner<X509, X509_free>(x509)));
     }
     return certificates;
 }
@@ -61,7 +67,7 @@ std::optional<std::vector<CertificateRef>> copyCertificatesFromCertsOnlyMessage(
 CertificateRef createCertificateWithBytes(const std::uint8_t* bytes, std::size_t length) {
     const openssl::QuietErrors quiet;
     Owner<X509, X509_free> x509(decodeWhole(d2i_X509, X509_free, bytes, length));
-    return x509 ? std::make_shared<const Certificate>(std::move(x509)) : nullptr;
+    return x509 ? wrap(std::move(x509)) : nullptr;
 }
 
 std::optional<Value::Data> copySerialNumberData(const CertificateRef& certificate, Error* error) {
