@@ -1,7 +1,11 @@
 #include "tests/platform/ServicesDouble.h"
 
+#include <utility>
+
+#include "platform/CertificateService.h"
 #include "platform/DeviceAnswers.h"
 #include "platform/Error.h"
+#include "platform/HardwareRegistry.h"
 
 namespace {
 
@@ -37,4 +41,74 @@ Value KACopyAnswerWithError(std::string_view key, const Value&, Error*) {
 
 Value TansuCopyValueWithError(std::string_view key, const Value&, Error*) {
     return look(servicesDouble().tansu, "TansuCopyValueWithError", key);
+}
+
+Value HardwareRegistry::serviceMatching(std::string_view className) {
+    servicesDouble().calls.push_back("serviceMatching " + std::string(className));
+    return servicesDouble().unmatchableClasses.contains(className) ? Value() : Value(className);
+}
+
+HardwareRegistry::Service HardwareRegistry::getMatchingService(Value matching) {
+    ServicesDouble& services = servicesDouble();
+    services.calls.push_back("getMatchingService " + *matching.text());
+    if (!services.registry.contains(*matching.text()))
+        return 0;
+    const Service handle = services.heldServices.empty() ? 7 : services.heldServices.rbegin()->first + 1;
+    services.heldServices[handle] = *matching.text();
+    return handle;
+}
+
+Value HardwareRegistry::searchProperty(Service service, std::string_view plane, std::string_view key,
+                                       std::uint32_t options) {
+    ServicesDouble& services = servicesDouble();
+    services.calls.push_back("searchProperty " + std::string(plane) + " " + std::string(key) + " " +
+                             std::to_string(options));
+    return services.registry.at(services.heldServices.at(service))[std::string(key)];
+}
+
+void HardwareRegistry::releaseService(Service service) {
+    servicesDouble().heldServices.erase(service);
+}
+
+std::size_t HardwareRegistry::heldServices() {
+    return servicesDouble().heldServices.size();
+}
+
+struct CertificateService::Certificate {
+    Value::Data bytes;
+};
+
+std::optional<std::vector<CertificateService::CertificateRef>>
+CertificateService::copyCertificatesFromCertsOnlyMessage(const Value::Data& message) {
+    const auto found = servicesDouble().messages.find(message);
+    if (found == servicesDouble().messages.end())
+        return std::nullopt;
+    std::vector<CertificateRef> certificates;
+    for (const Value::Data& bytes : found->second)
+        certificates.push_back(std::make_shared<const Certificate>(Certificate{bytes}));
+    return certificates;
+}
+
+CertificateService::CertificateRef CertificateService::createCertificateWithBytes(const std::uint8_t* bytes,
+                                                                                  std::size_t length) {
+    const Value::Data data(bytes, bytes + length);
+    return servicesDouble().serialNumbers.contains(data) ? std::make_shared<const Certificate>(Certificate{data})
+                                                         : nullptr;
+}
+
+std::optional<Value::Data> CertificateService::copySerialNumberData(const CertificateRef& certificate, Error*) {
+    if (!certificate)
+        return std::nullopt;
+    const auto found = servicesDouble().serialNumbers.find(certificate->bytes);
+    return found == servicesDouble().serialNumbers.end() ? std::nullopt : std::optional(found->second);
+}
+
+ComponentAuthService& ComponentAuthService::sharedManager() {
+    static ComponentAuthService shared;
+    return shared;
+}
+
+void ComponentAuthService::authenticateTouchControllerWithChallenge(const Value& challenge, Completion completion) {
+    servicesDouble().calls.push_back("authenticateTouchControllerWithChallenge");
+    servicesDouble().authenticate(challenge, std::move(completion));
 }

@@ -9,6 +9,7 @@
 
 #include <CLI/CLI.hpp>
 
+#include "Daemon/Conversions.h"
 #include "platform/Files.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
@@ -119,6 +120,25 @@ int exportClasses(const Options& options, const std::vector<std::string>& classe
     return send(options, "OrloExport", arguments);
 }
 
+int getTcrt(const Options& options, const std::string& copyPath) {
+    const Answer answer = sendRequest(options.address, "getTCRT", {});
+    if (answer.outcome != Outcome::Success)
+        return report(options, answer);
+    const Value response(answer.response);
+    const std::string* text = response["response"]["CertData"].text();
+    Remarks remarks;
+    if (response["response"]["CertSerialNumber"] == Value("DummyCertificateSerialNumber"))
+        remarks.note = "the serial number cannot be read: the hardware registry holds no certificate but other bytes";
+    if (!text)
+        remarks.note = "the certificate in the hardware registry is empty";
+    if (!copyPath.empty()) {
+        const Value::Data certificate = text ? hexString2Binary(*text) : Value::Data{};
+        writeLocalFile(copyPath, certificate);
+        remarks.result = copyPath + ", " + std::to_string(certificate.size()) + " bytes";
+    }
+    return report(options, answer, remarks);
+}
+
 int setBcfg(const Options& options, const std::string& devicePath, const std::string& copyPath) {
     const Answer answer = sendRequest(options.address, "setGlobalbCfg", {{"bcfgDataPath", devicePath}});
     if (answer.outcome != Outcome::Success)
@@ -209,6 +229,13 @@ private:
         verb = app_.add_subcommand("check-entitlement",
                                    "Ask whether the boot ticket entitles the device to swapped parts");
         verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
+
+        verb = app_.add_subcommand("get-tcrt", "Read the top module's certificate and its serial number");
+        verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file");
+        verb->callback([this] { run_ = [this] { return getTcrt(options_, copyPath_); }; });
+
+        verb = app_.add_subcommand("put-tcrt", "Authenticate the display and store the top module's certificate");
+        verb->callback([this] { run_ = [this] { return call(options_, "putTCRT", {}); }; });
 
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
         verb->add_option("FILE", path_, "The blob, a path on the device")->required();
