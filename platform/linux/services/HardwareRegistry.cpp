@@ -86,7 +86,8 @@ Value serviceMatching(std::string_view className) {
 }
 
 Service getMatchingService(Value matching) {
-    const Value& className = matching[classKey];
+    const Value consumed = std::move(matching);
+    const Value& className = consumed[classKey];
     if (!className.text())
         return 0;
     const Value description = deviceDescription();
