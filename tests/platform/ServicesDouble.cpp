@@ -15,6 +15,15 @@ Value look(const std::map<std::string, Value, std::less<>>& answers, const char*
     return found == answers.end() ? Value() : found->second;
 }
 
+// What is prepared for these bytes, or null.
+template <class Prepared>
+const Prepared* lookUp(const std::vector<std::pair<Value::Data, Prepared>>& prepared, const Value::Data& bytes) {
+    for (const auto& [key, value] : prepared)
+        if (key == bytes)
+            return &value;
+    return nullptr;
+}
+
 } // namespace
 
 ServicesDouble& servicesDouble() {
@@ -80,27 +89,26 @@ struct CertificateService::Certificate {
 
 std::optional<std::vector<CertificateService::CertificateRef>>
 CertificateService::copyCertificatesFromCertsOnlyMessage(const Value::Data& message) {
-    const auto found = servicesDouble().messages.find(message);
-    if (found == servicesDouble().messages.end())
+    const auto* found = lookUp(servicesDouble().messages, message);
+    if (!found)
         return std::nullopt;
     std::vector<CertificateRef> certificates;
-    for (const Value::Data& bytes : found->second)
+    for (const Value::Data& bytes : *found)
         certificates.push_back(std::make_shared<const Certificate>(Certificate{bytes}));
     return certificates;
 }
 
 CertificateService::CertificateRef CertificateService::createCertificateWithBytes(const std::uint8_t* bytes,
                                                                                   std::size_t length) {
-    const Value::Data data(bytes, bytes + length);
-    return servicesDouble().serialNumbers.contains(data) ? std::make_shared<const Certificate>(Certificate{data})
-                                                         : nullptr;
+    Certificate certificate{{bytes, bytes + length}};
+    if (!lookUp(servicesDouble().serialNumbers, certificate.bytes))
+        return nullptr;
+    return std::make_shared<const Certificate>(std::move(certificate));
 }
 
 std::optional<Value::Data> CertificateService::copySerialNumberData(const CertificateRef& certificate, Error*) {
-    if (!certificate)
-        return std::nullopt;
-    const auto found = servicesDouble().serialNumbers.find(certificate->bytes);
-    return found == servicesDouble().serialNumbers.end() ? std::nullopt : std::optional(found->second);
+    const auto* found = certificate ? lookUp(servicesDouble().serialNumbers, certificate->bytes) : nullptr;
+    return found ? std::optional(*found) : std::nullopt;
 }
 
 ComponentAuthService& ComponentAuthService::sharedManager() {

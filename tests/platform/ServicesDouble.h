@@ -8,6 +8,7 @@
 #include <map>
 #include <set>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/ComponentAuth.h"
@@ -25,8 +26,8 @@ struct ServicesDouble {
 
     // Of the certificate service: the certificates of each certificates-only message, and what is a certificate with
     // which serial number.
-    std::map<Value::Data, std::vector<Value::Data>> messages;
-    std::map<Value::Data, Value::Data> serialNumbers;
+    std::vector<std::pair<Value::Data, std::vector<Value::Data>>> messages;
+    std::vector<std::pair<Value::Data, Value::Data>> serialNumbers;
 
     // Of the component authentication service: what it does with a challenge and the completion.
     std::function<void(const Value& challenge, ComponentAuthService::Completion completion)> authenticate;
