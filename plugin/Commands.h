@@ -20,8 +20,8 @@ using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Val
 HSMessageResponse OrloExport(const HSMessageRequest& request, const Value& hardwareModel);
 
 // "getTCRT": answers with the top module's certificate as hexadecimal text under "CertData" (left out when it is empty)
-// and its serial number under "CertSerialNumber", "DummyCertificateSerialNumber" when that cannot be read. A model whose
-// top module has no certificate is a failure without error; otherwise the error is that of the hardware registry.
+// and its serial number under "CertSerialNumber", "DummyCertificateSerialNumber" when that cannot be read. A model
+// whose top module has no certificate is a failure without error; otherwise the error is that of the hardware registry.
 HSMessageResponse getTCRT(const HSMessageRequest& request, const Value& hardwareModel);
 
 // "putTCRT": has the display authenticated and then stores the top module's certificate as the "tcrt" record of the
