@@ -48,9 +48,10 @@ ordered_json dataJson(const DERItem& data) {
 // Reads a file from the outside in, keeps what it finds as JSON, and the first thing that is wrong.
 class Reader {
 public:
-    Reader(const std::uint8_t* data, std::size_t length) : whole_{data, length} {}
+    // The findings go into `report`.
+    Reader(const std::uint8_t* data, std::size_t length, Report& report) : whole_{data, length}, report_(report) {}
 
-    Report read();
+    void read();
 
 private:
     void readContainer(const DERItem& content);
@@ -86,7 +87,7 @@ private:
     DERItem whole_;
     ordered_json notes_ = ordered_json::array();
     std::uint64_t properties_ = 0;
-    Report report_;
+    Report& report_;
 };
 
 void Reader::fault(const std::uint8_t* place, const std::string& reason) {
@@ -122,9 +123,7 @@ bool Reader::readFields(const DERItem& content, const char* what, std::initializ
     DERSequence sequence;
     DERDecodedInfo item;
     DERDecodeSeqContentInit(&content, &sequence);
-    const Field* last = nullptr;
     for (Field* field : fields) {
-        last = field;
         const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
         const std::string name = std::string(what) + "'s " + field->name;
         const DERSequence before = sequence;
@@ -151,7 +150,7 @@ bool Reader::readFields(const DERItem& content, const char* what, std::initializ
     }
     if (sequence.next == sequence.end)
         return true;
-    fault(sequence.next, std::string(what) + " goes on behind its " + last->name);
+    fault(sequence.next, std::string(what) + " goes on behind its " + (*std::prev(fields.end()))->name);
     return false;
 }
 
@@ -541,7 +540,7 @@ DERReturn Reader::readAll(const DERItem& content) {
     }
 }
 
-Report Reader::read() {
+void Reader::read() {
     DERItem content;
     report_.json["length"] = whole_.length;
     if (whole_.length == 0)
@@ -554,11 +553,12 @@ Report Reader::read() {
         note(std::to_string(properties_ - mostProperties) + " further properties are not shown");
     report_.json["notes"] = std::move(notes_);
     report_.text = img4Text(report_.json);
-    return std::move(report_);
 }
 
 } // namespace
 
 Report showImg4(const std::uint8_t* data, std::size_t length) {
-    return Reader(data, length).read();
+    Report report;
+    Reader(data, length, report).read();
+    return report;
 }
