@@ -2,6 +2,7 @@
 #ifndef VELTRA_DEVICE_ZPDEVICE_H
 #define VELTRA_DEVICE_ZPDEVICE_H
 
+#include <cstdint>
 #include <mutex>
 #include <string_view>
 
@@ -42,6 +43,11 @@ public:
 
     // The answer for `key` when it is a text, nothing otherwise. Nothing is logged.
     static Value kaGetAnswerString(std::string_view key);
+
+    // Whether the boot ticket entitles the device to use a swapped part: true only when the boolean property with the
+    // four-character code `tag` (the first character in the most significant byte) in the ticket's "sepi" object is
+    // true. A ticket that is missing or cannot be decoded, and a missing property, are a level-2 log line and false.
+    bool getPostSwapEntitlement(std::uint32_t tag) const;
 
     // Four of the identities under the names of properties.
     Value coverGlassSerialNumber() const { return getCoverGlassSerialNumber(); }

@@ -11,11 +11,11 @@ inline bool writeImg4Seeds(const std::string& folder) {
     using namespace img4maker;
     Manifest second;
     second.version = 2;
-    second.properties = {property("BORD", integer(12)), property("CPRO", boolean(false))};
-    second.objects = {object("sepi", {property("eksp", boolean(true)), property("love", ia5("1.2"))})};
+    second.properties = {property("brdI", integer(12)), property("proC", boolean(false))};
+    second.objects = {object("sepi", {property("eksp", boolean(true)), property("osvr", ia5("1.2"))})};
     Payload packed;
     packed.compression = compression(0, 512);
-    packed.properties = payloadProperties({property("kcep", integer(1)), property("kcuu", octets(filler(4)))});
+    packed.properties = payloadProperties({property("entP", integer(1)), property("uuiD", octets(filler(4)))});
     return writeSeed(folder, "container", exampleContainer()) && writeSeed(folder, "ticket", exampleTicket()) &&
            writeSeed(folder, "second-version", manifest(second)) &&
            writeSeed(folder, "unsigned", unsignedManifest(second)) && writeSeed(folder, "payload", payload(packed)) &&

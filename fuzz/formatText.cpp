@@ -33,7 +33,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     const std::string out =
         format(text, {choices[chosen % count], choices[chosen / 7 % count], choices[chosen / 31 % count]});
     // Each argument is far below 512 characters, each missing one three times as long as the shortest conversion.
-    if (out.size() > 3 * 512 + 3 * text.size())
+    if (out.size() > 3 * (512 + text.size()))
         std::abort();
     if (text.find('%') == std::string_view::npos && out != text)
         std::abort();

@@ -14,6 +14,10 @@ constexpr const char* handlerName = "-[ZPOrloServices handleMessage:completion:]
 // `hardwareModel` is the device's answer to "HWModelStr" at the start of the request, or nothing.
 using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Value& hardwareModel);
 
+// "checkCorvoPostSwapEntitlement": answers under "IsPostSwapEntitled" whether the boot ticket holds the entitlement
+// "eksp". Always succeeds; a ticket that cannot be read or decoded holds none.
+HSMessageResponse checkCorvoPostSwapEntitlement(const HSMessageRequest& request, const Value& hardwareModel);
+
 // "setGlobalbCfg": puts the model's "WCh0" entry and the "MiGB" entry into the configuration blob in the file named by
 // "bcfgDataPath" and writes the result to /tmp/new_bCfg. Always succeeds; a blob that cannot be read or decoded leaves
 // an empty result.

@@ -16,6 +16,7 @@ struct CommandRow {
 
 // In the order in which a request's command is compared with them.
 constexpr CommandRow commands[] = {
+    {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement},
     {"setGlobalbCfg", setGlobalbCfg},
 };
 

@@ -183,6 +183,11 @@ struct MetadataContent {
 // At most the first `maximum` characters of `text`, up to its NUL. Null gives an absent view.
 std::string_view viewOf(const char* text, std::size_t maximum);
 
+// The `length` bytes at `data`. Null gives an absent view, whatever the length.
+inline Bytes viewOf(const std::uint8_t* data, std::uint32_t length) {
+    return {data, data != nullptr ? length : 0};
+}
+
 // False, after reporting why, when no entry can be made of the content.
 bool isValidContent(const PayloadContent& content);
 bool isValidContent(const MetadataContent& content);

@@ -35,8 +35,8 @@ __SysConfig3MetadataEntry* sysconfig::makeEntry(const MetadataContent& content) 
 
 __SysConfig3MetadataEntry* allocSysConfig3MetadataEntry(const char* key, const std::uint8_t* data,
                                                         std::uint32_t dataLength, const char* string) {
-    const MetadataContent content = {
-        viewOf(key, maximumKeyLength), {data, dataLength}, viewOf(string, maximumStringLength)};
+    const MetadataContent content = {viewOf(key, maximumKeyLength), viewOf(data, dataLength),
+                                     viewOf(string, maximumStringLength)};
     return isValidContent(content) ? makeEntry(content) : nullptr;
 }
 

@@ -43,8 +43,8 @@ __SysConfig3PayloadEntry* sysconfig::makeEntry(const PayloadContent& content) {
 __SysConfig3PayloadEntry* _allocSysConfig3PayloadEntryInternal(std::uint32_t key, const char* comment,
                                                                const std::uint8_t* data, std::uint32_t dataLength,
                                                                const char* string, bool deleted) {
-    const PayloadContent content = {
-        key, viewOf(comment, maximumStringLength), {data, dataLength}, viewOf(string, maximumStringLength), deleted};
+    const PayloadContent content = {key, viewOf(comment, maximumStringLength), viewOf(data, dataLength),
+                                    viewOf(string, maximumStringLength), deleted};
     return isValidContent(content) ? makeEntry(content) : nullptr;
 }
 

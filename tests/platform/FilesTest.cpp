@@ -167,7 +167,7 @@ TEST(Files, replaceThatCannotWriteKeepsTheOldFileAndLeavesNoOther) {
     const TemporaryRoot root;
     root.write("/tmp/file", "old");
     inOwnProcess([] {
-        std::signal(SIGXFSZ, SIG_IGN);
+        ASSERT_NE(std::signal(SIGXFSZ, SIG_IGN), SIG_ERR);
         const rlimit limit = {10, 10};
         ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &limit), 0);
         EXPECT_FALSE(files::replace("/tmp/file", bytes("more than ten bytes")));

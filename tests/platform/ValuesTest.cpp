@@ -4,6 +4,7 @@
 #include "platform/Value.h"
 
 #include <limits>
+#include <sstream>
 
 #include <gtest/gtest.h>
 
@@ -85,7 +86,6 @@ TEST(Error, descriptionIsOneLineOfBoundedLength) {
 }
 
 TEST(Format, conversionsWriteTheirArgument) {
-    const void* const pointer = reinterpret_cast<const void*>(std::uintptr_t{0xBEEF});
     const Error error{"D", 7, "text"};
     const struct {
         const char* text;
@@ -114,13 +114,17 @@ TEST(Format, conversionsWriteTheirArgument) {
         {"<%x>", 0xABCU, "<abc>"},
         {"<%X>", 0xABCU, "<ABC>"},
         {"<%lx>", std::uint64_t{1} << 40, "<10000000000>"},
-        {"<%p>", pointer, "<0xbeef>"},
+        {"<%p>", static_cast<const void*>(nullptr), "<0x0>"},
         {"<%02x>", 0xF, "<0f>"},
         {"<%5d>", -42, "<  -42>"},
         {"<%05i>", -42, "<-0042>"},
     };
     for (const auto& row : rows)
         EXPECT_EQ(format(row.text, {row.argument}), row.expected) << row.text;
+
+    std::ostringstream address;
+    address << static_cast<const void*>(rows);
+    EXPECT_EQ(format("%p", static_cast<const void*>(rows)), address.str());
 }
 
 TEST(Format, hostileFormatsReadNothingThatTheArgumentsDoNotOwn) {

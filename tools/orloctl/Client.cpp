@@ -86,8 +86,8 @@ Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address)
     }
     const std::string where = " on the bus \"" + address.bus + "\"";
     if (std::string_view(error.name) == SD_BUS_ERROR_NO_REPLY || std::string_view(error.name) == SD_BUS_ERROR_TIMEOUT)
-        answer.problem = "The service" + where + " did not answer within " + std::to_string(address.timeout.count()) +
-                         " s, or ended before it could.";
+        answer.problem = "The service" + where + " did not answer: " + text + " (the timeout is " +
+                         std::to_string(address.timeout.count()) + " s)";
     else if (std::string_view(error.name) == SD_BUS_ERROR_SERVICE_UNKNOWN)
         answer.problem = "The service " + std::string(serviceName) + " is not running" + where + ".";
     else
@@ -141,6 +141,8 @@ Answer sendRequest(const ServiceAddress& address, const std::string& command, co
     const BusPtr connection(opened, sd_bus_flush_close_unref);
     try {
         return converse(connection.get(), address, command, arguments);
+    } catch (const bus::Refusal& refusal) {
+        return {Outcome::Usage, {}, refusal.what()};
     } catch (const bus::Failure& failure) {
         if (failure.code == -E2BIG || failure.code == -EMSGSIZE || failure.code == -ENOBUFS)
             return {Outcome::Usage, {}, std::string("The request is too large for a message: ") + failure.what()};

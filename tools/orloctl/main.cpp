@@ -14,6 +14,8 @@
 #include "tools/orloctl/Client.h"
 #include "tools/orloctl/Json.h"
 #include "tools/orloctl/ShowBcfg.h"
+#include "tools/orloctl/ShowDer.h"
+#include "tools/orloctl/ShowImg4.h"
 #include "tools/orloctl/Version.h"
 
 namespace {
@@ -107,15 +109,19 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
     if (answer.outcome != Outcome::Success)
         return report(options, answer);
     const auto result = files::readWhole(resultPath);
+    Remarks remarks;
     if (!result)
-        return fail(options, Outcome::Usage,
-                    std::string("The result, ") + resultPath + " below the device root, cannot be read");
-    if (!copyPath.empty())
-        writeLocalFile(copyPath, *result);
-    Remarks remarks{std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes", ""};
-    if (result->empty())
+        remarks.note = std::string("the result, ") + resultPath + " below the device root, cannot be read";
+    else
+        remarks.result = std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes";
+    if (result && result->empty())
         remarks.note = "the result is empty: " + devicePath +
                        " is missing on the device, or is no configuration blob that can be rewritten";
+    if (!copyPath.empty()) {
+        if (!result)
+            return fail(options, Outcome::Usage, remarks.note);
+        writeLocalFile(copyPath, *result);
+    }
     return report(options, answer, remarks);
 }
 
@@ -129,7 +135,7 @@ int show(const Options& options, const Report& found) {
         printJson(json);
         return status;
     }
-    std::cout << found.text;
+    std::cout << found.text << (found.text.empty() || found.text.ends_with('\n') ? "" : "\n");
     if (!found.ok)
         std::cerr << "orloctl: " << found.problem << '\n';
     return status;
@@ -174,6 +180,10 @@ private:
         verb->add_option("ARGUMENTS", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
         verb->callback([this] { run_ = [this] { return call(options_, command_, words_); }; });
 
+        verb = app_.add_subcommand("check-entitlement",
+                                   "Ask whether the boot ticket entitles the device to swapped parts");
+        verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
+
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
         verb->add_option("FILE", path_, "The blob, a path on the device")->required();
         verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file");
@@ -192,6 +202,20 @@ private:
             run_ = [this] {
                 const Value::Data key = keyPath_.empty() ? Value::Data{} : readLocalFile(keyPath_);
                 return show(options_, showBcfg(readLocalFile(path_), key));
+            };
+        });
+        addReader(readers, "img4", "A container, bare payload or bare manifest: properties and digests", showImg4);
+        addReader(readers, "der", "The items of a DER file as a tree, and where strict DER ends", showDer);
+    }
+
+    void addReader(CLI::App* readers, const char* name, const char* help,
+                   Report (*read)(const std::uint8_t*, std::size_t)) {
+        CLI::App* verb = readers->add_subcommand(name, help);
+        verb->add_option("FILE", path_, "A local file")->required();
+        verb->callback([this, read] {
+            run_ = [this, read] {
+                const Value::Data file = readLocalFile(path_);
+                return show(options_, read(file.data(), file.size()));
             };
         });
     }

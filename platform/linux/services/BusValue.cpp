@@ -183,23 +183,6 @@ private:
     std::size_t values_ = 0;
 };
 
-void appendText(sd_bus_message* message, const std::string& text) {
-    std::string carried;
-    for (const char character : utf8::repaired(text))
-        carried += character == '\0' ? "\uFFFD" : std::string(1, character);
-    check(sd_bus_message_append_basic(message, SD_BUS_TYPE_STRING, carried.c_str()));
-}
-
-void appendVariant(sd_bus_message* message, const Value& value);
-
-void appendArray(sd_bus_message* message, const Value::Array& array) {
-    check(sd_bus_message_open_container(message, SD_BUS_TYPE_ARRAY, "v"));
-    for (const Value& element : array)
-        if (!element.isNothing())
-            appendVariant(message, element);
-    check(sd_bus_message_close_container(message));
-}
-
 const char* signatureOf(const Value& value) {
     if (value.text())
         return "s";
@@ -212,25 +195,79 @@ const char* signatureOf(const Value& value) {
     return value.isBoolean() ? "b" : "x";
 }
 
-void appendVariant(sd_bus_message* message, const Value& value) {
-    check(sd_bus_message_open_container(message, SD_BUS_TYPE_VARIANT, signatureOf(value)));
-    if (const std::string* text = value.text()) {
-        appendText(message, *text);
-    } else if (const Value::Data* data = value.data()) {
-        check(sd_bus_message_append_array(message, SD_BUS_TYPE_BYTE, data->data(), data->size()));
-    } else if (const Value::Array* array = value.array()) {
-        appendArray(message, *array);
-    } else if (const Value::Dictionary* dictionary = value.dictionary()) {
-        appendDictionary(message, *dictionary);
-    } else if (value.isBoolean()) {
-        const int truth = *value.boolean();
-        check(sd_bus_message_append_basic(message, SD_BUS_TYPE_BOOLEAN, &truth));
-    } else {
-        const std::int64_t number = value.integer().value_or(0);
-        check(sd_bus_message_append_basic(message, SD_BUS_TYPE_INT64, &number));
+// Writes values to one message.
+class Writer {
+public:
+    explicit Writer(sd_bus_message* message) : message_(message) {}
+
+    void dictionary(const Value::Dictionary& dictionary) {
+        open(SD_BUS_TYPE_ARRAY, "{sv}");
+        for (const auto& [key, value] : dictionary) {
+            if (value.isNothing())
+                continue;
+            open(SD_BUS_TYPE_DICT_ENTRY, "sv");
+            text(key);
+            variant(value);
+            close();
+        }
+        close();
     }
-    check(sd_bus_message_close_container(message));
-}
+
+private:
+    void open(char type, const char* contents) {
+        if (++containers_ > maximumContainers)
+            throw Refusal("The values nest deeper than a D-Bus message can.");
+        check(sd_bus_message_open_container(message_, type, contents));
+    }
+
+    void close() {
+        check(sd_bus_message_close_container(message_));
+        --containers_;
+    }
+
+    void text(const std::string& text) {
+        std::string carried;
+        for (const char character : utf8::repaired(text))
+            carried += character == '\0' ? "\uFFFD" : std::string(1, character);
+        check(sd_bus_message_append_basic(message_, SD_BUS_TYPE_STRING, carried.c_str()));
+    }
+
+    void array(const Value::Array& array) {
+        open(SD_BUS_TYPE_ARRAY, "v");
+        for (const Value& element : array)
+            if (!element.isNothing())
+                variant(element);
+        close();
+    }
+
+    void variant(const Value& value) {
+        open(SD_BUS_TYPE_VARIANT, signatureOf(value));
+        if (value.text())
+            text(*value.text());
+        else if (const Value::Data* data = value.data())
+            check(sd_bus_message_append_array(message_, SD_BUS_TYPE_BYTE, data->data(), data->size()));
+        else if (value.array())
+            array(*value.array());
+        else if (value.dictionary())
+            dictionary(*value.dictionary());
+        else if (value.isBoolean())
+            number<int>(SD_BUS_TYPE_BOOLEAN, *value.boolean());
+        else
+            number<std::int64_t>(SD_BUS_TYPE_INT64, *value.integer());
+        close();
+    }
+
+    template <class Number>
+    void number(char type, Number number) {
+        check(sd_bus_message_append_basic(message_, type, &number));
+    }
+
+    // What the reference implementation of the bus lets through; it drops a client that sends more.
+    static constexpr int maximumContainers = 64;
+
+    sd_bus_message* message_;
+    int containers_ = 0;
+};
 
 } // namespace
 
@@ -239,16 +276,7 @@ Value::Dictionary readDictionary(sd_bus_message* message) {
 }
 
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary) {
-    check(sd_bus_message_open_container(message, SD_BUS_TYPE_ARRAY, "{sv}"));
-    for (const auto& [key, value] : dictionary) {
-        if (value.isNothing())
-            continue;
-        check(sd_bus_message_open_container(message, SD_BUS_TYPE_DICT_ENTRY, "sv"));
-        appendText(message, key);
-        appendVariant(message, value);
-        check(sd_bus_message_close_container(message));
-    }
-    check(sd_bus_message_close_container(message));
+    Writer(message).dictionary(dictionary);
 }
 
 int open(std::string_view which, sd_bus** connection) {

@@ -43,7 +43,7 @@ public:
 Value::Dictionary readDictionary(sd_bus_message* message);
 
 // Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
-// entries of nothing are left out. Raises Failure, with -E2BIG or -EMSGSIZE for what exceeds a message.
+// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and Failure.
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary);
 
 // Opens the bus that `which` names: "system", "session" or a D-Bus address. Returns a negative errno on failure; on

@@ -1,0 +1,302 @@
+"""The service as its host sees it: requests, refusals, the configuration blob, and what it survives."""
+import json
+import os
+import re
+import signal
+import subprocess
+import unittest
+
+from harness import BIN, NAME, Service
+
+RESULT = "tmp/new_bCfg"
+SUCCESS = {"name": "setGlobalbCfg", "statusCode": 0}
+
+
+class ServiceTest(unittest.TestCase):
+    model = "M12x"
+
+    def setUp(self):
+        self.service = Service({"HWModelStr": self.model})
+        self.addCleanup(self.service.close)
+
+    def write(self, path, contents):
+        (self.service.root / path).write_bytes(contents)
+
+    def read(self, path):
+        return (self.service.root / path).read_bytes()
+
+    def set_bcfg(self, path):
+        return self.service.orloctl("call", "setGlobalbCfg", f"bcfgDataPath={path}")
+
+    def payload(self):
+        """The result's payload entries, in order, as (key, data)."""
+        status, shown = self.service.orloctl("show", "bcfg", self.service.root / RESULT)
+        self.assertEqual(status, 0, shown)
+        return [(entry["key"], entry.get("data", "")) for entry in shown["payload"]]
+
+
+class ConfigurationBlob(ServiceTest):
+    def test_entries_are_replaced_and_stand_at_the_end(self):
+        self.assertEqual(self.set_bcfg("/blobs/holds-WCh0.bin"), (0, {"exitStatus": 0, "response": SUCCESS}))
+        keys = [key for key, _ in self.payload()]
+        self.assertEqual(keys.count("WCh0"), 1)
+        self.assertEqual(keys[-2:], ["WCh0", "MiGB"])
+        entries = dict(self.payload())
+        self.assertTrue(entries["WCh0"].startswith("240023105c00a2af5e000500600054016200"))
+        self.assertTrue(entries["WCh0"].endswith("a200e16a9a6c0000"))
+        self.assertEqual(len(entries["WCh0"]), 2 * 152)
+        self.assertEqual(entries["MiGB"], "02000601000063696d6658fe")
+
+    def test_the_same_input_gives_the_same_result_with_busctl(self):
+        self.set_bcfg("/blobs/every-kind.bin")
+        first = self.read(RESULT)
+        words = "2 messageStr s setGlobalbCfg messageDict a{sv} 1 bcfgDataPath s /blobs/every-kind.bin".split()
+        self.assertEqual(self.service.busctl(*words), 'ba{sv} true 2 "name" s "setGlobalbCfg" "statusCode" x 0')
+        self.assertEqual(self.read(RESULT), first)
+
+    def test_the_model_chooses_the_payload_and_is_asked_each_time(self):
+        for model, start in (("xM11y", "dd9e"), ("M12M11", "dd9e"), ("aM12", "a2af"), ("M1", None), (None, None)):
+            with self.subTest(model):
+                self.service.describe({} if model is None else {"HWModelStr": model})
+                self.set_bcfg("/blobs/bCfg-30003.bin")
+                entries = dict(self.payload())
+                self.assertEqual(entries.get("WCh0", "")[12:16] or None, start)
+                self.assertIn("MiGB", entries)
+
+    def test_bad_input_leaves_an_empty_result_and_a_success(self):
+        good = self.read("blobs/bCfg-30003.bin")
+        self.write("empty", b"")
+        self.write("truncated", good[:-1])
+        self.write("noise", bytes(range(256)) * 64)
+        self.write("huge-length", b"\x30\x88" + b"\x7f" * 8 + good)
+        os.mkfifo(self.service.root / "fifo")
+        os.symlink("/etc/hostname", self.service.root / "outside")
+        os.symlink("/outside-chain/../../../../../../etc/hostname", self.service.root / "dots")
+        paths = ["/missing", "/empty", "/truncated", "/noise", "/huge-length", "/fifo", "/blobs", "/outside", "/dots"]
+        paths += ["/../../../../../../../../../../etc/hostname", "/blobs/bCfg-30002.bin", "x" * 70000, ""]
+        for path in paths:
+            with self.subTest(path[:40]):
+                self.write(RESULT, b"earlier")
+                self.assertEqual(self.set_bcfg(path), (0, {"exitStatus": 0, "response": SUCCESS}))
+                self.assertEqual(self.read(RESULT), b"")
+        for words in ([], ["bcfgDataPath:=7"], ["bcfgDataPath:=[]"]):
+            with self.subTest(words):
+                self.write(RESULT, b"earlier")
+                self.assertEqual(self.service.orloctl("call", "setGlobalbCfg", *words)[0], 0)
+                self.assertEqual(self.read(RESULT), b"")
+
+    def test_the_result_never_goes_through_a_link_and_replaces_only_a_file(self):
+        target = self.service.root / RESULT
+        self.write("victim", b"untouched")
+        for name, make in (
+            ("link", lambda: os.symlink("/victim", target)),
+            ("directory", lambda: os.mkdir(target)),
+            ("fifo", lambda: os.mkfifo(target)),
+        ):
+            with self.subTest(name):
+                make()
+                before = os.lstat(target)
+                self.assertEqual(self.set_bcfg("/blobs/every-kind.bin")[0], 0)
+                self.assertEqual(os.lstat(target).st_ino, before.st_ino)
+                self.assertEqual(os.listdir(target.parent), [target.name])
+                os.rmdir(target) if name == "directory" else os.unlink(target)
+        self.assertEqual(self.read("victim"), b"untouched")
+        self.set_bcfg("/blobs/every-kind.bin")
+        self.assertEqual(os.lstat(target).st_mode & 0o7777, 0o600)
+
+    def test_the_log_tells_every_step_in_order(self):
+        lines = self.service.messages_of(lambda: self.set_bcfg("/blobs/every-kind.bin"))
+        request = '{"bcfgDataPath": "/blobs/every-kind.bin"}'
+        self.assertEqual(lines[0], "Plugin  - version 1.0.0.1")
+        self.assertTrue(lines[1].startswith("Received Request : ") and "setGlobalbCfg" in lines[1], lines[1])
+        self.assertEqual(lines[2], f"request.messageDict : {request}")
+        self.assertEqual(lines[3], "Hardware Model : M12x")
+        self.assertRegex(lines[4], r"^-\[ZPOrloServices handleMessage:completion:\]:\d+ - Received setGlobalbCfg$")
+        self.assertEqual(
+            lines[5:10],
+            ["Decoded recieved data ", "Writing WCh0 data ", "Writing MiGB data ", "Encoding new data",
+             "Printing the LXData: "],
+        )
+        self.assertTrue(lines[10].startswith("New data "))
+        self.assertEqual(lines[11:], ["Writting new data to file"])
+
+    def test_a_device_without_model_is_an_error_line_in_between(self):
+        self.service.describe({})
+        lines = self.service.messages_of(lambda: self.set_bcfg("/blobs/every-kind.bin"))
+        self.assertEqual(lines[3], "Hardware Model : (null)")
+        self.assertIn("HWModelStr", lines[7])
+        self.assertEqual(lines[8], "Writing MiGB data ")
+
+
+class Entitlement(ServiceTest):
+    ticket = "System/Library/Caches/apticket.der"
+
+    @staticmethod
+    def tag(code):
+        """The identifier octets of a private, constructed item whose number the four characters spell."""
+        number = int.from_bytes(code.encode(), "big")
+        digits = [number >> shift & 0x7F for shift in range(28, -1, -7)]
+        return bytes([0xFF] + [digit | 0x80 for digit in digits[:-1]] + digits[-1:])
+
+    def renamed(self, ticket, code, other):
+        return ticket.replace(self.tag(code), self.tag(other)).replace(code.encode(), other.encode())
+
+    def test_the_ticket_decides_and_the_log_says_why_not(self):
+        good = self.read(self.ticket)
+        value = b"\x16\x04eksp\x01\x01\xff"
+        self.assertEqual(good.count(value), 1)
+        unparsed = "failed to parse AP ticket as Img4 manifest"
+        result = "the result of Img4 decode is %d"
+        for name, ticket, entitled, line in (
+            ("no ticket", None, False, "failed to find apticket"),
+            ("empty", b"", False, unparsed),
+            ("container", self.read("images/container.img4"), False, unparsed),
+            ("truncated", good[:-1], False, unparsed),
+            ("true", good, True, "success for 1701540720"),
+            ("false", good.replace(value, value[:-1] + b"\x00"), False, None),
+            ("odd boolean", good.replace(value, value[:-1] + b"\x01"), False, result % 3),
+            ("integer", good.replace(value, value[:-3] + b"\x02\x01\x01"), False, result % 2),
+            ("no eksp", self.renamed(good, "eksp", "ekso"), False, result % 1),
+            ("no sepi", self.renamed(good, "sepi", "sepj"), False, result % 1),
+            ("wrong inner name", good.replace(b"eksp", b"ekso"), False, result % 2),
+        ):
+            with self.subTest(name):
+                path = self.service.root / self.ticket
+                path.unlink(missing_ok=True)
+                if ticket is not None:
+                    path.write_bytes(ticket)
+                answers = []
+                lines = self.service.messages_of(lambda: answers.append(self.service.orloctl("check-entitlement")))
+                response = {"name": "checkCorvoPostSwapEntitlement", "statusCode": 0,
+                            "response": {"IsPostSwapEntitled": entitled}}
+                self.assertEqual(answers, [(0, {"exitStatus": 0, "response": response})])
+                checking = "Checking entitlement for eksp     , tag 1701540720"
+                self.assertEqual(lines[4:], [checking, line] if line else [checking])
+
+
+class Frame(ServiceTest):
+    def test_unknown_commands_are_completed_without_response_object(self):
+        self.assertEqual(self.service.busctl("0"), "ba{sv} true 0")
+        self.assertEqual(self.service.busctl("1", "messageStr", "s", "setglobalbcfg"), "ba{sv} true 0")
+        status, answer = self.service.orloctl("call", "noSuchCommand")
+        self.assertEqual((status, answer["exitStatus"]), (4, 4))
+        lines = self.service.messages_of(lambda: self.service.busctl("0"))
+        self.assertEqual(lines[0], "Plugin  - version 1.0.0.1")
+        self.assertEqual(lines[2:], ["request.messageDict : (null)", "Hardware Model : M12x"])
+
+    def test_start_up_is_logged(self):
+        messages = [line.split("] ", 1)[1] for line in self.service.log()[:2]]
+        self.assertEqual(messages, [f"{NAME}  - version 1.0.0.1", f"Launching  Plugin - {NAME}"])
+        self.assertRegex(self.service.log()[0], r"^\d{4}-\d\d-\d\d (0[1-9]|1[0-2]):\d\d:\d\d-\[main:\d+\] ")
+
+    def test_malformed_arguments_are_refused_with_the_key(self):
+        for body, says in (
+            (["1", "messageDict", "a{sv}", "1", "depth", "d", "1.5"], '"messageDict.depth" has the D-Bus type "d"'),
+            (["1", "messageStr", "x", "1"], '"messageStr" is no text'),
+            (["1", "messageDict", "s", "x"], '"messageDict" is no dictionary'),
+            (["1", "message", "s", "x"], 'no key "message"'),
+        ):
+            with self.subTest(says):
+                self.assertIn(says, self.service.busctl(*body))
+        for depth, expected in ((29, 4), (30, 2)):
+            status, answer = self.service.orloctl("call", "x", f"deep:={'[' * depth}1{']' * depth}")
+            self.assertEqual(status, expected, answer)
+
+    def test_a_request_cannot_forge_a_log_line(self):
+        self.service.orloctl("call", "x\n2026-01-01 01:01:01-[main:1] forged", "a=b\nc")
+        self.assertFalse([line for line in self.service.log() if line.startswith("2026-01-01 01:01:01-")])
+
+    def test_the_device_description_may_be_missing_or_malformed(self):
+        description = self.service.root / "etc/veltra/device.json"
+        for make in (lambda: description.write_text("{"), description.unlink):
+            make()
+            lines = self.service.messages_of(lambda: self.service.busctl("0"))
+            self.assertEqual(lines[3], "Hardware Model : (null)")
+
+
+class Survival(ServiceTest):
+    def flood(self, calls, command):
+        done = self.service.run(BIN / "flood", self.service.bus.address, "8", calls, command)
+        self.assertEqual(done.stdout, f"{calls} completed, 0 failed\n")
+
+    def test_a_flood_is_served_in_flat_memory(self):
+        self.flood(1000, "setGlobalbCfg")
+        before = self.service.resident_kilobytes()
+        self.flood(10000, "noSuchCommand")
+        self.flood(1000, "setGlobalbCfg")
+        # A sanitizer keeps freed memory for a while, so the bound is wide; a leak of a request would be far beyond it.
+        self.assertLess(self.service.resident_kilobytes() - before, 32 * 1024)
+
+    def test_a_client_that_dies_and_calls_during_a_call_leave_the_service_serving(self):
+        clients = [
+            subprocess.Popen([BIN / "flood", self.service.bus.address, "2", "3000", "setGlobalbCfg"],
+                             stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+            for _ in range(3)
+        ]
+        self.assertEqual(self.set_bcfg("/blobs/every-kind.bin")[0], 0)
+        for client in clients:
+            client.kill()
+            client.wait()
+        self.assertEqual(self.set_bcfg("/blobs/every-kind.bin")[0], 0)
+
+    def test_sigterm_ends_it_cleanly_after_the_request_in_hand(self):
+        flood = subprocess.Popen([BIN / "flood", self.service.bus.address, "1", "3000", "setGlobalbCfg"],
+                                 stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+        self.assertEqual(self.set_bcfg("/blobs/every-kind.bin")[0], 0)
+        os.kill(self.service.pid, signal.SIGTERM)
+        self.service.wait_end()
+        flood.kill()
+        flood.wait()
+        self.assertTrue(self.service.log()[-1].endswith("Writting new data to file"), self.service.log()[-1])
+        self.assertEqual(self.service.orloctl("call", "x")[0], 3)
+
+    def test_a_second_service_and_one_without_bus_say_so_and_end_with_1(self):
+        program = BIN / "VeltraOrloServices"
+        second = self.service.run(program, stderr=subprocess.PIPE)
+        self.assertEqual(second.returncode, 1)
+        self.assertRegex(second.stderr, re.escape(NAME) + ": cannot own this name .* another process owns it already")
+        environment = {**self.service.environment, "VELTRA_BUS": "unix:path=/nonexistent"}
+        lost = subprocess.run([program], env=environment, stderr=subprocess.PIPE, text=True)
+        self.assertEqual(lost.returncode, 1)
+        self.assertIn('cannot reach the bus "unix:path=/nonexistent"', lost.stderr)
+
+
+class Client(ServiceTest):
+    def test_exit_statuses_and_one_json_object_for_every_outcome(self):
+        for status, words in (
+            (0, ["set-bcfg", "/blobs/every-kind.bin"]),
+            (2, ["call", "x", "word"]),
+            (2, ["call", "x", "a:={"]),
+            (2, ["call", "x", "a:=1.5"]),
+            (2, ["call", "x", "a@=/nonexistent"]),
+            (2, ["call", "x", "a=1", "a=2"]),
+            (2, ["call"]),
+            (2, ["no-such-verb"]),
+            (3, ["--bus", "unix:path=/nonexistent", "call", "x"]),
+            (4, ["call", "x"]),
+            (5, ["show", "bcfg", "/dev/null"]),
+        ):
+            with self.subTest(words):
+                exit_status, answer = self.service.orloctl(*words)
+                self.assertEqual((exit_status, answer["exitStatus"]), (status, status), answer)
+                self.assertEqual("problem" in answer, status != 0)
+
+    def test_words_become_texts_json_values_and_file_contents(self):
+        self.write("bytes", b"\x00\xff")
+        words = ["t=a=b", 'j:={"d": {"$data": "0badcafe"}, "n": [1, true]}', f"f@={self.service.root}/bytes"]
+        lines = self.service.messages_of(lambda: self.service.orloctl("call", "x", *words))
+        self.assertEqual(
+            lines[2], 'request.messageDict : {"f": <00ff>, "j": {"d": <0badcafe>, "n": [1, true]}, "t": "a=b"}'
+        )
+
+    def test_a_copy_of_the_result_and_a_note_when_it_is_empty(self):
+        copy = self.service.root / "copy"
+        self.assertEqual(self.service.orloctl("set-bcfg", "/blobs/every-kind.bin", "-o", copy)[0], 0)
+        self.assertEqual(copy.read_bytes(), self.read(RESULT))
+        status, answer = self.service.orloctl("set-bcfg", "/missing")
+        self.assertEqual(status, 0)
+        self.assertIn("is empty", answer["note"])
+
+
+if __name__ == "__main__":
+    unittest.main()

@@ -1,0 +1,15 @@
+// A system log that keeps what is written to it, for tests of what is logged and at which level. A test that links the
+// object library recorded-log gets it in place of the real one.
+#ifndef VELTRA_TESTS_RECORDED_LOG_H
+#define VELTRA_TESTS_RECORDED_LOG_H
+
+#include <string>
+#include <vector>
+
+// Starts recording; earlier lines are forgotten.
+void recordLog();
+
+// The lines since recordLog, as "<level> [<file>] <message>", without time and line number.
+std::vector<std::string> recordedLog();
+
+#endif

@@ -1,0 +1,104 @@
+// The index of the lists: its hash functions, and what keys of an adversary do to it.
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "sysconfig/SysConfig3Internal.h"
+#include "tests/sysconfig/Blob.h"
+
+namespace {
+
+using sysconfig::SysConfig3Ptr;
+
+TEST(SipHash, givesThePublishedValues) {
+    // Of the algorithm's reference vectors: key octets 00 to 0F, message octets 00, 01, 02 and so on.
+    constexpr std::uint64_t key[2] = {0x0706050403020100, 0x0F0E0D0C0B0A0908};
+    const struct {
+        std::size_t length;
+        std::uint64_t hash;
+    } rows[] = {{0, 0x726FDB47DD0E0E31},
+                {1, 0x74F839C593DC67FD},
+                {7, 0xAB0200F58B01D137},
+                {8, 0x93F5F5799A932462},
+                {15, 0xA129CA6149BE45E5}};
+    std::string message;
+    for (char octet = 0; octet < 15; ++octet)
+        message += octet;
+    for (const auto& row : rows)
+        EXPECT_EQ(sysconfig::sipHash(key, std::string_view(message).substr(0, row.length)), row.hash) << row.length;
+}
+
+// The number of entries that looking up every key once would pass.
+template <typename List>
+std::uint64_t costOfAllLookups(const List& list) {
+    std::uint64_t cost = 0;
+    for (std::uint64_t bucket = 0; bucket < list.bucketCount(); ++bucket) {
+        std::uint64_t length = 0;
+        for (const auto* entry = list.buckets[bucket]; entry != nullptr; entry = entry->bucketNext)
+            cost += ++length;
+    }
+    return cost;
+}
+
+BlobParts withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint32_t)) {
+    Bytes entries;
+    for (std::uint32_t i = 0; i < count; ++i) {
+        const std::uint32_t key = keyOf(i);
+        entries.insert(entries.end(), {0x30, 0x0B, 0x02, 0x04, static_cast<std::uint8_t>(key),
+                                       static_cast<std::uint8_t>(key >> 8), static_cast<std::uint8_t>(key >> 16),
+                                       static_cast<std::uint8_t>(key >> 24), 0x16, 0x00, 0x01, 0x01, 0xFF});
+    }
+    BlobParts parts;
+    parts.payload = item("31", entries);
+    return parts;
+}
+
+TEST(Index, standsAMillionKeysOfAnAdversary) {
+    constexpr std::uint32_t count = 1000000;
+    const struct {
+        const char* what;
+        std::uint32_t (*keyOf)(std::uint32_t);
+    } rows[] = {
+        {"consecutive", [](std::uint32_t i) { return i + 1; }},
+        {"equal in the low bits", [](std::uint32_t i) { return (i + 1) << 12; }},
+        {"evenly spaced", [](std::uint32_t i) { return (i + 1) * 4095; }},
+        {"equal in the middle", [](std::uint32_t i) { return (i & 0xFFF) | (i >> 12 | 0x100) << 22; }},
+    };
+    for (const auto& row : rows) {
+        const SysConfig3Ptr object = decode(withPayloadKeys(count, row.keyOf).whole());
+        ASSERT_EQ(sysConfig3GetPayloadEntryCount(object.get()), count) << row.what;
+        // An entry costs 1, and chance collisions add a half to that.
+        EXPECT_LT(costOfAllLookups(object->payload), 2 * count) << row.what;
+    }
+}
+
+TEST(Index, keepsOneOfAMillionEntriesWithOneKey) {
+    const SysConfig3Ptr object = decode(withPayloadKeys(1000000, [](std::uint32_t) { return keyWCh0; }).whole());
+    EXPECT_EQ(payloadOf(object.get()), "WCh0=deleted");
+    EXPECT_EQ(costOfAllLookups(object->payload), 1U);
+}
+
+TEST(Index, spreadsMetadataKeysToo) {
+    constexpr std::uint32_t count = 100000;
+    Bytes entries;
+    for (std::uint32_t i = 0; i < count; ++i) {
+        const Bytes entry = item("30", joined({item("16", text(std::to_string(i << 8))), bytes("16 00")}));
+        entries.insert(entries.end(), entry.begin(), entry.end());
+    }
+    BlobParts parts;
+    parts.metadata = item("31", entries);
+    const SysConfig3Ptr object = decode(parts.whole());
+    ASSERT_EQ(sysConfig3GetMetadataEntryCount(object.get()), count);
+    EXPECT_LT(costOfAllLookups(object->metadata), 2 * count);
+}
+
+TEST(Index, isSeededForEachObject) {
+    const SysConfig3Ptr a = newObject();
+    const SysConfig3Ptr b = newObject();
+    EXPECT_NE(sysconfig::hashOf(a->seed, keyWCh0), sysconfig::hashOf(b->seed, keyWCh0));
+    EXPECT_NE(sysconfig::hashOf(a->seed, "key"), sysconfig::hashOf(b->seed, "key"));
+}
+
+} // namespace
