@@ -29,9 +29,9 @@ FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode = 0, std
 // Opens the directory at the device path `path` for reading and for the *at system calls.
 FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve = 0);
 
-// The rest of the open file from its position on; nothing when it is no regular file, cannot be read, or holds more
-// than `maximum` bytes. What counts are the bytes that come, not the size that the file system states: the nodes of
-// /sys and /proc state one that is not theirs, and a file may grow while it is read.
+// The rest of the open file from its position on; nothing, with errno set, when it is no regular file, cannot be read,
+// or holds more than `maximum` bytes. What counts are the bytes that come, not the size that the file system states:
+// the nodes of /sys and /proc state one that is not theirs, and a file may grow while it is read.
 std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size_t maximum);
 
 #endif
