@@ -14,6 +14,12 @@ constexpr const char* handlerName = "-[ZPOrloServices handleMessage:completion:]
 // `hardwareModel` is the device's answer to "HWModelStr" at the start of the request, or nothing.
 using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Value& hardwareModel);
 
+// "corvoSCProv" and "corvoSCPair": provision and pair the secure face sensor with the pairing server at the URL under
+// "waftonUrl", through the reverse proxy. Pairing loads the Vanter chip's firmware patch, which takes at least 10
+// seconds, and then runs the ISP calibration load. Both block for the whole exchange.
+HSMessageResponse corvoSCProv(const HSMessageRequest& request, const Value& hardwareModel);
+HSMessageResponse corvoSCPair(const HSMessageRequest& request, const Value& hardwareModel);
+
 // "checkCorvoPostSwapEntitlement": answers under "IsPostSwapEntitled" whether the boot ticket holds the entitlement
 // "eksp". Always succeeds; a ticket that cannot be read or decoded holds none.
 HSMessageResponse checkCorvoPostSwapEntitlement(const HSMessageRequest& request, const Value& hardwareModel);

@@ -2,6 +2,7 @@
 
 #include <optional>
 
+#include "Daemon/Common/HSPipeUtil.h"
 #include "platform/BundleInfo.h"
 #include "platform/DeviceAnswers.h"
 #include "platform/Format.h"
@@ -16,6 +17,8 @@ struct CommandRow {
 
 // In the order in which a request's command is compared with them.
 constexpr CommandRow commands[] = {
+    {"corvoSCProv", corvoSCProv},
+    {"corvoSCPair", corvoSCPair},
     {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement},
     {"setGlobalbCfg", setGlobalbCfg},
 };
@@ -39,6 +42,13 @@ std::unique_ptr<ZPOrloServices> ZPOrloServices::initWithServiceName(std::string_
 
 void ZPOrloServices::printPluginVersion() const {
     serviceLog.info("Plugin  - version %@", pluginVersion());
+}
+
+void ZPOrloServices::q21isp_loadDAT() {
+    Value response;
+    Error error;
+    HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
+    serviceLog.info("Output: %@", response["Output"]);
 }
 
 void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSCompletion& completion) {

@@ -3,16 +3,63 @@
 #ifndef VELTRA_TESTS_SERVICES_DOUBLE_H
 #define VELTRA_TESTS_SERVICES_DOUBLE_H
 
+#include <chrono>
+#include <cstdint>
+#include <functional>
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "platform/Error.h"
 #include "platform/Value.h"
+
+// The reverse proxy. `events` are delivered on a thread of their own from resume on, the others while the registration
+// is being invalidated.
+struct ReverseProxyDouble {
+    struct Event {
+        std::int32_t status;
+        std::chrono::milliseconds after{0}; // resume
+    };
+    bool refusesRegistration = false;
+    std::vector<Event> events = {};
+    std::vector<std::int32_t> eventsAtInvalidation = {};
+    Value proxy = {};
+    std::function<void(std::int32_t)> callback = {}; // the one registered last, to be called at any later time
+};
+
+// What a step of the updater answers.
+struct UpdaterStep {
+    bool result = true;
+    Value output = {};
+    std::optional<Error> error = {};
+};
+
+// The updater. It answers as scripted; a step that takes options keeps them.
+struct UpdaterDouble {
+    UpdaterStep create, isDone{.result = false}, queryInfo, performNextStage;
+    Value createOptions, nextStageOptions;
+};
+
+// The pairing library. Pairing calls the callback once for each ticket and keeps the results.
+struct PairingDouble {
+    struct Ticket {
+        std::string bytes;
+        std::optional<std::size_t> length = {}; // of the bytes unless it says otherwise
+    };
+    bool result = true;
+    std::optional<Error> error;
+    std::vector<Ticket> tickets;
+    std::vector<std::int32_t> loadResults;
+};
 
 struct ServicesDouble {
     std::map<std::string, Value, std::less<>> answers; // of the device-answer service, by key
     std::map<std::string, Value, std::less<>> tansu;   // of the Tansu service, by key
-    std::vector<std::string> calls;                    // "<operation> <argument>", in order
+    ReverseProxyDouble reverseProxy;
+    UpdaterDouble updater;
+    PairingDouble pairing;
+    std::vector<std::string> calls; // "<operation> <argument>", in order
 };
 
 // The one that the services use. Assign a fresh one at the start of a test.
