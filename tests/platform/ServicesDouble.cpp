@@ -187,3 +187,16 @@ void VanterUpdaterRelease(VanterUpdater* updater) {
     record("VanterUpdaterRelease");
     delete updater;
 }
+
+struct VeltraPluginServer::Connection {};
+
+VeltraPluginServer::~VeltraPluginServer() = default;
+
+bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
+    record("initWithServiceName " + std::string(serviceName));
+    return true;
+}
+
+void VeltraPluginServer::resume() {
+    record("resume");
+}

@@ -48,9 +48,9 @@ struct PairingDouble {
         std::optional<std::size_t> length = {}; // of the bytes unless it says otherwise
     };
     bool result = true;
-    std::optional<Error> error;
-    std::vector<Ticket> tickets;
-    std::vector<std::int32_t> loadResults;
+    std::optional<Error> error = {};
+    std::vector<Ticket> tickets = {};
+    std::vector<std::int32_t> loadResults = {};
 };
 
 struct ServicesDouble {

@@ -9,7 +9,8 @@
 // Starts recording; earlier lines are forgotten.
 void recordLog();
 
-// The lines since recordLog, as "<level> [<file>] <message>", without time and line number.
+// The lines since recordLog, as "<level> [<file>] <message>", without time and line number; those that were written to
+// the system log's default handle as "<level> <message>".
 std::vector<std::string> recordedLog();
 
 #endif
