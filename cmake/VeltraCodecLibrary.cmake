@@ -15,7 +15,9 @@ function(veltra_codec_library name)
     add_library(${name} STATIC $<TARGET_OBJECTS:${name}-objects>)
     add_library(${name}-shared SHARED $<TARGET_OBJECTS:${name}-objects>)
     set_target_properties(${name}-shared PROPERTIES
-        OUTPUT_NAME ${name} VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR})
+        OUTPUT_NAME ${name} VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
+        # The codecs that it stands on are installed beside it.
+        INSTALL_RPATH "$ORIGIN")
     target_link_options(${name}-shared PRIVATE -Wl,--exclude-libs,ALL)
     set(private_requires ${ARG_REQUIRES})
     foreach(codec IN LISTS ARG_CODECS)

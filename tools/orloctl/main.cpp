@@ -15,6 +15,8 @@
 #include "tools/orloctl/CrashLogReport.h"
 #include "tools/orloctl/Json.h"
 #include "tools/orloctl/ShowBcfg.h"
+#include "tools/orloctl/ShowDer.h"
+#include "tools/orloctl/ShowImg4.h"
 #include "tools/orloctl/Version.h"
 
 namespace {
@@ -138,7 +140,7 @@ int show(const Options& options, const Report& found) {
         printJson(json);
         return status;
     }
-    std::cout << found.text;
+    std::cout << found.text << (found.text.empty() || found.text.ends_with('\n') ? "" : "\n");
     if (!found.ok)
         std::cerr << "orloctl: " << found.problem << '\n';
     return status;
@@ -219,6 +221,20 @@ private:
             run_ = [this] {
                 const Value::Data key = keyPath_.empty() ? Value::Data{} : readLocalFile(keyPath_);
                 return show(options_, showBcfg(readLocalFile(path_), key));
+            };
+        });
+        addReader(readers, "img4", "A container, bare payload or bare manifest: properties and digests", showImg4);
+        addReader(readers, "der", "The items of a DER file as a tree, and where strict DER ends", showDer);
+    }
+
+    void addReader(CLI::App* readers, const char* name, const char* help,
+                   Report (*read)(const std::uint8_t*, std::size_t)) {
+        CLI::App* verb = readers->add_subcommand(name, help);
+        verb->add_option("FILE", path_, "A local file")->required();
+        verb->callback([this, read] {
+            run_ = [this, read] {
+                const Value::Data file = readLocalFile(path_);
+                return show(options_, read(file.data(), file.size()));
             };
         });
     }

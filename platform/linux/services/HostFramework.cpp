@@ -117,8 +117,10 @@ const sd_bus_vtable methods[] = {
     SD_BUS_VTABLE_END,
 };
 
-// SIGTERM and SIGINT arrive through the event loop, between two requests. The mask is inherited by every thread.
+// SIGTERM and SIGINT arrive through the event loop, between two requests. The mask is inherited by every thread. A
+// reader of standard error that is gone must not end the service.
 int watchSignals(sd_event* event) {
+    std::signal(SIGPIPE, SIG_IGN);
     sigset_t signals;
     sigemptyset(&signals);
     sigaddset(&signals, SIGTERM);
