@@ -228,7 +228,7 @@ class CrashLogs(unittest.TestCase):
         varrow.mkdir(parents=True)
         version = self.service.root / "System/Library/Quennel/SystemVersion.plist"
         version.parent.mkdir(parents=True)
-        version.write_text('<plist version="1.0"><dict><key>ProductBuildVersion</key><string>21A55</string></dict></plist>')
+        version.write_text("<plist><dict><key>ProductBuildVersion</key><string>21A55</string></dict></plist>")
         panic = b'{"os_version": "Quennel 3.1 (21A55)"}\npanic\n'
         (self.logs / "panic-full-1.ips").write_bytes(panic)
         (varrow / "a.log").write_bytes(b"second")
