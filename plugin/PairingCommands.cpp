@@ -51,30 +51,27 @@ void vanterUpdaterLog(const std::string& context, const std::string& message) {
     serviceLog.info("%s: %s", context, message);
 }
 
-// The updater's options, at first with nothing but a ticket that is not empty; none when memory does not suffice.
-struct UpdaterOptions {
-    Value::Dictionary updater;
-    Value ticket;
-};
-
-std::optional<UpdaterOptions> createOptions(const std::uint8_t* ticket, std::size_t length) try {
+// A copy of the ticket; none when memory does not suffice.
+std::optional<Value::Data> copyTicket(const std::uint8_t* ticket, std::size_t length) try {
     Value::Data copy(length);
     if (length > 0)
         std::memcpy(copy.data(), ticket, length);
-    return UpdaterOptions{{}, std::move(copy)};
+    return copy;
 } catch (const std::exception&) { // the length is beyond memory, or beyond what any memory could hold
     return std::nullopt;
 }
 
-void fillOptions(UpdaterOptions& options) {
-    if (!options.ticket.data()->empty()) {
-        options.updater["Vanter,Ticket"] = options.ticket;
+Value::Dictionary updaterOptions(const Value& ticket) {
+    Value::Dictionary options;
+    if (!ticket.data()->empty()) {
+        options["Vanter,Ticket"] = ticket;
         serviceLog.error("added ticket");
     }
-    options.updater["Options"] = Value::Dictionary{{"WaftonPairingOption", true},
-                                                   {"PersonalizedFirmwareRootPath", "/usr/local/share/firmware/isp/"},
-                                                   {"RestoreSystemPartition", "/private/var/mobile/"},
-                                                   {"RestoreInternal", true}};
+    options["Options"] = Value::Dictionary{{"WaftonPairingOption", true},
+                                           {"PersonalizedFirmwareRootPath", "/usr/local/share/firmware/isp/"},
+                                           {"RestoreSystemPartition", "/private/var/mobile/"},
+                                           {"RestoreInternal", true}};
+    return options;
 }
 
 // Whether the chip told about itself; what it told is only logged.
@@ -90,17 +87,17 @@ bool logDeviceInformation(const Value& information) {
     return true;
 }
 
-std::optional<Error> installPatch(VanterUpdater* updater, UpdaterOptions& options) {
+std::optional<Error> installPatch(VanterUpdater* updater, Value::Dictionary options) {
     std::optional<Value::Data> patch = files::readWhole(patchPath);
     if (!patch || patch->empty()) {
         trace("Files not found");
         return std::nullopt;
     }
     trace("Patch found successfully");
-    options.updater["FirmwareData"] = std::move(*patch);
+    options["FirmwareData"] = std::move(*patch);
     std::optional<Error> error;
     Value output;
-    if (!VanterUpdaterExecCommand(updater, "performNextStage", std::move(options.updater), &output, &error) || error)
+    if (!VanterUpdaterExecCommand(updater, "performNextStage", std::move(options), &output, &error) || error)
         traceError("VanterUpdaterExecCommand failed: %@:%@", error, output);
     else
         trace("Vanter Firmware Update Successful");
@@ -110,18 +107,18 @@ std::optional<Error> installPatch(VanterUpdater* updater, UpdaterOptions& option
 // Brings the chip's firmware up to the patch. Only an Error of the updater library is a failure; whatever else keeps
 // the patch from being installed is a line in the log.
 std::optional<Error> updateVanter(const std::uint8_t* ticket, std::size_t length) {
-    std::optional<UpdaterOptions> options = createOptions(ticket, length);
-    if (!options) {
+    std::optional<Value::Data> copy = copyTicket(ticket, length);
+    if (!copy) {
         traceError("updaterOptions failed to allocate");
         return std::nullopt;
     }
     traceError("updaterOptions created successfully");
-    traceError("value of ticket is:%@", options->ticket);
-    fillOptions(*options);
+    const Value ticketData = std::move(*copy);
+    traceError("value of ticket is:%@", ticketData);
+    Value::Dictionary options = updaterOptions(ticketData);
 
     std::optional<Error> error;
-    const UpdaterPtr updater(VanterUpdaterCreate(options->updater, vanterUpdaterLog, updaterName, &error),
-                             VanterUpdaterRelease);
+    const UpdaterPtr updater(VanterUpdaterCreate(options, vanterUpdaterLog, updaterName, &error), VanterUpdaterRelease);
     if (!updater || error) {
         serviceLog.error("Failed to create %s obj::error:%@", updaterName, error);
         return error;
@@ -136,7 +133,7 @@ std::optional<Error> updateVanter(const std::uint8_t* ticket, std::size_t length
     }
     if (!logDeviceInformation(information))
         return std::nullopt;
-    return installPatch(updater.get(), *options);
+    return installPatch(updater.get(), std::move(options));
 }
 
 std::int32_t loadVanterPatch(const std::uint8_t* ticket, std::size_t length) {

@@ -194,9 +194,11 @@ TEST_F(CrashLogs, aLargeLogIsCollectedWhole) {
     EXPECT_EQ(entry["LogFileSize"], Value(size));
     EXPECT_EQ(entry["LogFileData"].data()->size(), size);
 
+#ifndef __SANITIZE_ADDRESS__ // which ends the process where an allocation would fail
     fs::resize_file(root_.host(logs + "large.log"), std::size_t{1} << 42); // more than memory holds
     EXPECT_EQ(get_ramdisk_logs(&response_), 45);
     EXPECT_TRUE(logged("Failed to load " + logs + "large.log: "));
+#endif
 }
 
 TEST_F(CrashLogs, aFileNameCannotForgeALineOfTheLogNorBreakTheResponse) {

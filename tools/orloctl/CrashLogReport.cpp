@@ -31,7 +31,7 @@ public:
         std::string unused = name;
         for (int number = 2; !names_.insert(unused).second; ++number)
             unused = std::to_string(number) + "-" + name;
-        const std::string target = path_ / unused;
+        std::string target = path_ / unused;
         writeLocalFile(target, contents);
         return target;
     }

@@ -91,7 +91,7 @@ public:
         : curl_(curl_easy_init(), curl_easy_cleanup), headers_(nullptr, curl_slist_free_all) {
         for (const char* header : {"Content-Type: application/octet-stream", "Expect:"})
             if (curl_slist* longer = curl_slist_append(headers_.get(), header)) {
-                headers_.release();
+                static_cast<void>(headers_.release()); // it is the head of the longer one
                 headers_.reset(longer);
             }
         set(CURLOPT_CURLU, url);

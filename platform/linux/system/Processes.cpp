@@ -101,6 +101,7 @@ int spawn(const std::vector<std::string>& argv, const StandardDescriptors& stand
         return actions.error() != 0 ? actions.error() : attributes.error();
 
     std::vector<char*> arguments;
+    arguments.reserve(argv.size() + 1);
     for (const std::string& argument : argv)
         arguments.push_back(const_cast<char*>(argument.c_str()));
     arguments.push_back(nullptr);
