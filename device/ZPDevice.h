@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <mutex>
 #include <optional>
+#include <string>
 #include <string_view>
 
 #include "platform/Error.h"
@@ -42,6 +43,11 @@ public:
 
     // The device's own identity, "<chip id>:<unique chip id>" in their text forms; nothing when either is missing.
     static Value getUniqueChipId();
+
+    // The proxy settings through which the server at `url` is reached, or nothing. Waits for the reverse proxy to
+    // become available, 5 seconds at most. Nothing means that it did not, or has no settings for this server; that is
+    // no error here.
+    Value setupReverseProxy(const std::string& url) const;
 
     // The answer for `key` when it is a text, nothing otherwise. Nothing is logged.
     static Value kaGetAnswerString(std::string_view key);

@@ -5,19 +5,37 @@
 
 #include <cstddef>
 #include <optional>
+#include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/Error.h"
 #include "platform/Value.h"
 
 namespace files {
 
-// The largest file that readWhole reads.
+// The largest file that readWhole reads unless the caller says otherwise.
 constexpr std::size_t maximumSize = std::size_t{256} << 20;
 
 // The whole contents of the regular file at `path`, or nothing when it is missing, unreadable, no regular file (a FIFO
-// or device is never waited for) or larger than maximumSize.
-std::optional<Value::Data> readWhole(std::string_view path);
+// or device is never waited for) or larger than `maximum`. *error, when `error` is given, then says why.
+std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum = maximumSize, Error* error = nullptr);
+
+// What there is at `path`; a symbolic link counts as what it leads to.
+enum class Kind {
+    Nothing,
+    Directory,
+    Other,
+};
+Kind kindOf(std::string_view path);
+
+// The names of the entries of the directory at `path`, in the file system's order and without "." and ".."; none when
+// it cannot be listed.
+std::vector<std::string> list(std::string_view path);
+
+// A dictionary of the attributes of what is at `path`, or nothing; *error, when `error` is given, then says why. A file
+// and a directory have "Size", a number of bytes; what holds no bytes (a FIFO, a socket, a device) has no size.
+Value attributes(std::string_view path, Error* error = nullptr);
 
 // Whether there is anything at `path`, whatever its kind; a symbolic link counts as what it leads to.
 bool exists(std::string_view path);

@@ -9,6 +9,7 @@
 #include <string_view>
 
 #include "platform/Error.h"
+#include "platform/SystemLog.h"
 #include "platform/Value.h"
 
 // A request as the host sent it. Read only.
@@ -42,6 +43,10 @@ private:
 
 // Completes a request: whether it was completed, and the response object, if there is one.
 using HSCompletion = std::function<void(bool completed, const std::optional<HSMessageResponse>& response)>;
+
+// The framework's own handle of the system log, for lines that do not belong in the plug-in's log. It has one handle,
+// number 1; null for every other number. Any thread.
+SystemLog* getLogHandle(int number);
 
 // What a plug-in server offers to the framework.
 class VeltraPluginServerInterface {

@@ -37,6 +37,12 @@ HSMessageResponse putPSD2(const HSMessageRequest& request, const Value& hardware
 // there; the file has mode 0600. Without a record the file stays as it is, and the reason is under "psd2 get error".
 HSMessageResponse getPSD2(const HSMessageRequest& request, const Value& hardwareModel);
 
+// "corvoSCProv" and "corvoSCPair": provision and pair the secure face sensor with the pairing server at the URL under
+// "waftonUrl", through the reverse proxy. Pairing loads the Vanter chip's firmware patch, which takes at least 10
+// seconds, and then runs the ISP calibration load. Both block for the whole exchange.
+HSMessageResponse corvoSCProv(const HSMessageRequest& request, const Value& hardwareModel);
+HSMessageResponse corvoSCPair(const HSMessageRequest& request, const Value& hardwareModel);
+
 // "checkCorvoPostSwapEntitlement": answers under "IsPostSwapEntitled" whether the boot ticket holds the entitlement
 // "eksp". Always succeeds; a ticket that cannot be read or decoded holds none.
 HSMessageResponse checkCorvoPostSwapEntitlement(const HSMessageRequest& request, const Value& hardwareModel);

@@ -2,6 +2,7 @@
 
 #include <optional>
 
+#include "Daemon/Common/HSPipeUtil.h"
 #include "platform/BundleInfo.h"
 #include "platform/DeviceAnswers.h"
 #include "platform/Format.h"
@@ -21,6 +22,8 @@ constexpr CommandRow commands[] = {
     {"putTCRT", putTCRT},
     {"putPSD2", putPSD2},
     {"getPSD2", getPSD2},
+    {"corvoSCProv", corvoSCProv},
+    {"corvoSCPair", corvoSCPair},
     {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement},
     {"setGlobalbCfg", setGlobalbCfg},
 };
@@ -44,6 +47,13 @@ std::unique_ptr<ZPOrloServices> ZPOrloServices::initWithServiceName(std::string_
 
 void ZPOrloServices::printPluginVersion() const {
     serviceLog.info("Plugin  - version %@", pluginVersion());
+}
+
+void ZPOrloServices::q21isp_loadDAT() {
+    Value response;
+    Error error;
+    HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
+    serviceLog.info("Output: %@", response["Output"]);
 }
 
 void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSCompletion& completion) {

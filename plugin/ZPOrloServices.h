@@ -20,6 +20,10 @@ public:
 
     // Logs the plug-in version.
     void printPluginVersion() const;
+
+    // Runs the device's image-signal-processor tool, which loads its calibration data, and waits for it to end, however
+    // long that takes. What it writes and how it fails is only logged.
+    static void q21isp_loadDAT();
 };
 
 // "<short version>.<version>" from the bundle's information list, read afresh.

@@ -1,13 +1,25 @@
 #include "tests/platform/ServicesDouble.h"
 
+#include <condition_variable>
+#include <mutex>
+#include <thread>
 #include <utility>
 
 #include "platform/CertificateService.h"
 #include "platform/DeviceAnswers.h"
 #include "platform/Error.h"
 #include "platform/HardwareRegistry.h"
+#include "platform/HostFramework.h"
+#include "platform/Pairing.h"
+#include "platform/Pause.h"
+#include "platform/ReverseProxy.h"
+#include "platform/VanterUpdater.h"
 
 namespace {
+
+void record(const std::string& call) {
+    servicesDouble().calls.push_back(call);
+}
 
 Value look(const std::map<std::string, Value, std::less<>>& answers, const char* operation, std::string_view key) {
     servicesDouble().calls.push_back(operation + std::string(" ") + std::string(key));
@@ -119,4 +131,152 @@ ComponentAuthService& ComponentAuthService::sharedManager() {
 void ComponentAuthService::authenticateTouchControllerWithChallenge(const Value& challenge, Completion completion) {
     servicesDouble().calls.push_back("authenticateTouchControllerWithChallenge");
     servicesDouble().authenticate(challenge, std::move(completion));
+}
+
+class RPRegistration {
+public:
+    explicit RPRegistration(RPAvailabilityCallback callback) : callback_(std::move(callback)) {}
+    ~RPRegistration() {
+        if (deliverer_.joinable())
+            deliverer_.join();
+    }
+
+    void resume() {
+        deliverer_ = std::thread([this, events = servicesDouble().reverseProxy.events] {
+            const auto start = std::chrono::steady_clock::now();
+            for (const auto& event : events) {
+                std::unique_lock lock(mutex_);
+                if (changed_.wait_until(lock, start + event.after, [this] { return invalid_; }))
+                    return;
+                lock.unlock();
+                callback_(event.status);
+            }
+        });
+    }
+
+    void invalidate() {
+        {
+            const std::lock_guard lock(mutex_);
+            invalid_ = true;
+            changed_.notify_all();
+        }
+        for (const std::int32_t status : servicesDouble().reverseProxy.eventsAtInvalidation)
+            callback_(status);
+    }
+
+private:
+    const RPAvailabilityCallback callback_;
+    std::mutex mutex_;
+    std::condition_variable changed_;
+    bool invalid_ = false;
+    std::thread deliverer_;
+};
+
+RPRegistration* RPRegisterForAvailability(RPAvailabilityCallback callback) {
+    record("RPRegisterForAvailability");
+    servicesDouble().reverseProxy.callback = callback;
+    return servicesDouble().reverseProxy.refusesRegistration ? nullptr : new RPRegistration(std::move(callback));
+}
+
+void RPRegistrationResume(RPRegistration* registration) {
+    record("RPRegistrationResume");
+    registration->resume();
+}
+
+void RPRegistrationInvalidate(RPRegistration* registration) {
+    record("RPRegistrationInvalidate");
+    registration->invalidate();
+}
+
+void RPRelease(RPRegistration* registration) {
+    record("RPRelease");
+    delete registration;
+}
+
+Value RPCopyProxyDictionaryWithOptions(const std::string& url, const Value& options) {
+    record("RPCopyProxyDictionaryWithOptions " + url + " " + options.description());
+    return servicesDouble().reverseProxy.proxy;
+}
+
+SystemLog* getLogHandle(int number) {
+    return number == 1 ? systemLogDefault() : nullptr;
+}
+
+void pauseFor(std::chrono::seconds duration) {
+    record("pauseFor " + std::to_string(duration.count()));
+}
+
+namespace {
+
+bool answer(const PairingDouble& pairing, std::optional<Error>* error) {
+    *error = pairing.error;
+    return pairing.result;
+}
+
+bool answer(const UpdaterStep& step, Value* output, std::optional<Error>* error) {
+    if (output)
+        *output = step.output;
+    *error = step.error;
+    return step.result;
+}
+
+} // namespace
+
+bool BWCProvisionCorvoWithProxy(const std::string& url, const Value& proxy, std::optional<Error>* error) {
+    record("BWCProvisionCorvoWithProxy " + url + " " + proxy.description());
+    return answer(servicesDouble().pairing, error);
+}
+
+bool BWCPairCorvoWithProxy(const std::string& url, const Value& proxy, std::optional<Error>* error,
+                           const BWCPatchLoad& loadPatch) {
+    record("BWCPairCorvoWithProxy " + url + " " + proxy.description());
+    PairingDouble& pairing = servicesDouble().pairing;
+    for (const PairingDouble::Ticket& ticket : pairing.tickets)
+        pairing.loadResults.push_back(loadPatch(reinterpret_cast<const std::uint8_t*>(ticket.bytes.data()),
+                                                ticket.length.value_or(ticket.bytes.size())));
+    return answer(pairing, error);
+}
+
+class VanterUpdater {};
+
+VanterUpdater* VanterUpdaterCreate(const Value& options, VanterUpdaterLog log, std::string_view name,
+                                   std::optional<Error>* error) {
+    record("VanterUpdaterCreate " + std::string(name));
+    UpdaterDouble& updater = servicesDouble().updater;
+    updater.createOptions = options;
+    log("first", "second");
+    return answer(updater.create, nullptr, error) ? new VanterUpdater : nullptr;
+}
+
+bool VanterUpdaterIsDone(VanterUpdater*, std::optional<Error>* error) {
+    record("VanterUpdaterIsDone");
+    return answer(servicesDouble().updater.isDone, nullptr, error);
+}
+
+bool VanterUpdaterExecCommand(VanterUpdater*, std::string_view step, const Value& options, Value* output,
+                              std::optional<Error>* error) {
+    record("VanterUpdaterExecCommand " + std::string(step));
+    UpdaterDouble& updater = servicesDouble().updater;
+    if (step == "queryInfo")
+        return answer(updater.queryInfo, output, error);
+    updater.nextStageOptions = options;
+    return answer(updater.performNextStage, output, error);
+}
+
+void VanterUpdaterRelease(VanterUpdater* updater) {
+    record("VanterUpdaterRelease");
+    delete updater;
+}
+
+struct VeltraPluginServer::Connection {};
+
+VeltraPluginServer::~VeltraPluginServer() = default;
+
+bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
+    record("initWithServiceName " + std::string(serviceName));
+    return true;
+}
+
+void VeltraPluginServer::resume() {
+    record("resume");
 }

@@ -3,16 +3,58 @@
 #ifndef VELTRA_TESTS_SERVICES_DOUBLE_H
 #define VELTRA_TESTS_SERVICES_DOUBLE_H
 
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <map>
+#include <optional>
 #include <set>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "platform/ComponentAuth.h"
+#include "platform/Error.h"
 #include "platform/Value.h"
+
+// The reverse proxy. `events` are delivered on a thread of their own from resume on, the others while the registration
+// is being invalidated.
+struct ReverseProxyDouble {
+    struct Event {
+        std::int32_t status;
+        std::chrono::milliseconds after{0}; // resume
+    };
+    bool refusesRegistration = false;
+    std::vector<Event> events = {};
+    std::vector<std::int32_t> eventsAtInvalidation = {};
+    Value proxy = {};
+    std::function<void(std::int32_t)> callback = {}; // the one registered last, to be called at any later time
+};
+
+// What a step of the updater answers.
+struct UpdaterStep {
+    bool result = true;
+    Value output = {};
+    std::optional<Error> error = {};
+};
+
+// The updater. It answers as scripted; a step that takes options keeps them.
+struct UpdaterDouble {
+    UpdaterStep create, isDone{.result = false}, queryInfo, performNextStage;
+    Value createOptions, nextStageOptions;
+};
+
+// The pairing library. Pairing calls the callback once for each ticket and keeps the results.
+struct PairingDouble {
+    struct Ticket {
+        std::string bytes;
+        std::optional<std::size_t> length = {}; // of the bytes unless it says otherwise
+    };
+    bool result = true;
+    std::optional<Error> error = {};
+    std::vector<Ticket> tickets = {};
+    std::vector<std::int32_t> loadResults = {};
+};
 
 struct ServicesDouble {
     std::map<std::string, Value, std::less<>> answers; // of the device-answer service, by key
@@ -32,6 +74,9 @@ struct ServicesDouble {
     // Of the component authentication service: what it does with a challenge and the completion.
     std::function<void(const Value& challenge, ComponentAuthService::Completion completion)> authenticate;
 
+    ReverseProxyDouble reverseProxy;
+    UpdaterDouble updater;
+    PairingDouble pairing;
     std::vector<std::string> calls; // "<operation> <argument>", in order
 };
 

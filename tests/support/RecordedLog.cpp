@@ -11,7 +11,7 @@ class SystemLog {};
 
 namespace {
 
-SystemLog onlyLog;
+SystemLog pluginLog, defaultLog;
 std::mutex mutex;
 std::vector<std::string> lines;
 std::vector<std::string> consoleLines;
@@ -27,21 +27,21 @@ std::string withoutTimeAndNumber(std::string_view line) {
 } // namespace
 
 SystemLog* systemLogCreate(std::string_view, std::string_view) {
-    return &onlyLog;
+    return &pluginLog;
 }
 
 SystemLog* systemLogDefault() {
-    return &onlyLog;
+    return &defaultLog;
 }
 
 bool systemLogTypeEnabled(const SystemLog*, SystemLogType) {
     return true;
 }
 
-void systemLogWrite(SystemLog*, SystemLogType type, std::string_view message) {
+void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message) {
     const std::string level = std::to_string(static_cast<int>(type) + 1);
     const std::lock_guard lock(mutex);
-    lines.push_back(level + " " + withoutTimeAndNumber(message));
+    lines.push_back(level + " " + (log == &pluginLog ? withoutTimeAndNumber(message) : std::string(message)));
 }
 
 // "<operation>:<number> - <message>" loses its number; every other line stays as it is.

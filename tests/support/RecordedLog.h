@@ -12,7 +12,8 @@ void recordLog();
 // The console lines since recordLog, with the line number of an operation's line left out: "<operation> - <message>".
 std::vector<std::string> recordedConsole();
 
-// The lines since recordLog, as "<level> [<file>] <message>", without time and line number.
+// The lines since recordLog, as "<level> [<file>] <message>", without time and line number; those that were written to
+// the system log's default handle as "<level> <message>".
 std::vector<std::string> recordedLog();
 
 #endif

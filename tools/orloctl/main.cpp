@@ -13,6 +13,7 @@
 #include "platform/Files.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
+#include "tools/orloctl/CrashLogReport.h"
 #include "tools/orloctl/Json.h"
 #include "tools/orloctl/ShowBcfg.h"
 #include "tools/orloctl/ShowDer.h"
@@ -139,6 +140,10 @@ int getTcrt(const Options& options, const std::string& copyPath) {
     return report(options, answer, remarks);
 }
 
+int callServer(const Options& options, const char* command, const std::string& url) {
+    return report(options, sendRequest(options.address, command, {{"waftonUrl", url}}));
+}
+
 int setBcfg(const Options& options, const std::string& devicePath, const std::string& copyPath) {
     const Answer answer = sendRequest(options.address, "setGlobalbCfg", {{"bcfgDataPath", devicePath}});
     if (answer.outcome != Outcome::Success)
@@ -226,6 +231,10 @@ private:
         verb->add_option("ARGUMENTS", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
         verb->callback([this] { run_ = [this] { return call(options_, command_, words_); }; });
 
+        addPairing("provision", "corvoSCProv", "Provision the secure face sensor with a pairing server");
+        addPairing("pair", "corvoSCPair",
+                   "Pair the secure face sensor with a pairing server and load its firmware patch");
+
         verb = app_.add_subcommand("check-entitlement",
                                    "Ask whether the boot ticket entitles the device to swapped parts");
         verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
@@ -264,7 +273,17 @@ private:
         });
     }
 
+    void addPairing(const char* name, const char* command, const char* purpose) {
+        CLI::App* verb = app_.add_subcommand(name, purpose);
+        verb->add_option("URL", url_, "The pairing server")->required();
+        verb->callback([this, command] { run_ = [this, command] { return callServer(options_, command, url_); }; });
+    }
+
     void addReaders() {
+        CLI::App* crashLogs = app_.add_subcommand("crash-logs", "List the device's crash and panic logs, offline");
+        crashLogs->add_option("-o,--output", copyPath_, "Copy them into this local directory");
+        crashLogs->callback([this] { run_ = [this] { return show(options_, collectCrashLogs(copyPath_)); }; });
+
         CLI::App* readers = app_.add_subcommand("show", "Show what a local file holds, without the service");
         readers->require_subcommand(1);
         readers->fallthrough();
@@ -300,6 +319,7 @@ private:
     std::string path_;
     std::string copyPath_;
     std::string keyPath_;
+    std::string url_;
     std::vector<std::string> words_;
     std::function<int()> run_;
 };

@@ -142,6 +142,11 @@ int watchSignals(sd_event* event) {
 
 } // namespace
 
+SystemLog* getLogHandle(int number) {
+    static SystemLog* const log = systemLogCreate(interfaceName, "framework");
+    return number == 1 ? log : nullptr;
+}
+
 struct VeltraPluginServer::Connection {
     sd_event* event = nullptr;
     sd_bus* bus = nullptr;

@@ -24,6 +24,11 @@ int openat2(int directory, const char* path, const open_how& how) {
     return -1;
 }
 
+std::nullopt_t nothing(int number) {
+    errno = number;
+    return std::nullopt;
+}
+
 } // namespace
 
 std::string deviceRootPath() {
@@ -76,11 +81,13 @@ std::optional<DevicePath> splitDevicePath(std::string_view path) {
 
 std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size_t maximum) try {
     struct stat status;
-    if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode))
+    if (::fstat(file.get(), &status) != 0)
         return std::nullopt;
+    if (!S_ISREG(status.st_mode))
+        return nothing(S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
     const auto stated = static_cast<std::size_t>(status.st_size);
     if (stated > maximum)
-        return std::nullopt;
+        return nothing(EFBIG);
 
     // One byte more than stated, so that a file that is as long as it says needs one read for the bytes and one for
     // the end, into the same memory; and at least a page, since a kernel node that states no size may give all it has
@@ -99,10 +106,10 @@ std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size
             break;
         filled += static_cast<std::size_t>(count);
         if (filled > maximum)
-            return std::nullopt;
+            return nothing(EFBIG);
     }
     contents.resize(filled);
     return contents;
 } catch (const std::bad_alloc&) {
-    return std::nullopt;
+    return nothing(ENOMEM);
 }

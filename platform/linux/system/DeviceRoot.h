@@ -29,8 +29,8 @@ FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode = 0, std
 // Opens the directory at the device path `path` for reading and for the *at system calls.
 FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve = 0);
 
-// Opens the directory at the device path `path`, which is made first when it is missing: with mode `mode`, and those above
-// it with mode 0755. What is made outlasts a power cut.
+// Opens the directory at the device path `path`, which is made first when it is missing: with mode `mode`, and those
+// above it with mode 0755. What is made outlasts a power cut.
 FileDescriptor makeDirectoryInRoot(std::string_view path, mode_t mode);
 
 // A device path taken apart at its last slash.
@@ -42,9 +42,9 @@ struct DevicePath {
 // The parts of `path`, or none when it does not end in a name.
 std::optional<DevicePath> splitDevicePath(std::string_view path);
 
-// The rest of the open file from its position on; nothing when it is no regular file, cannot be read, or holds more
-// than `maximum` bytes. What counts are the bytes that come, not the size that the file system states: the nodes of
-// /sys and /proc state one that is not theirs, and a file may grow while it is read.
+// The rest of the open file from its position on; nothing, with errno set, when it is no regular file, cannot be read,
+// or holds more than `maximum` bytes. What counts are the bytes that come, not the size that the file system states:
+// the nodes of /sys and /proc state one that is not theirs, and a file may grow while it is read.
 std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size_t maximum);
 
 #endif

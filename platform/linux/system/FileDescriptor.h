@@ -25,6 +25,9 @@ public:
     explicit operator bool() const { return number_ >= 0; }
     int get() const { return number_; }
 
+    // Hands the number over to the caller, who closes it.
+    int release() { return std::exchange(number_, -1); }
+
 private:
     int number_ = -1;
 };

@@ -1,9 +1,13 @@
 #include "platform/Files.h"
 
 #include <cerrno>
+#include <cstdint>
+#include <cstdio>
 #include <cstring>
+#include <memory>
 #include <string>
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
@@ -17,6 +21,12 @@ namespace {
 
 constexpr mode_t logMode = 0640;
 
+// Says in *error, when it is given, what errno holds.
+void explain(Error* error) {
+    if (error)
+        *error = {"POSIXErrorDomain", errno, std::strerror(errno)};
+}
+
 // Whether `name` is free or a regular file.
 bool mayBeReplaced(const FileDescriptor& directory, const std::string& name) {
     struct stat status;
@@ -27,9 +37,48 @@ bool mayBeReplaced(const FileDescriptor& directory, const std::string& name) {
 
 } // namespace
 
-std::optional<Value::Data> readWhole(std::string_view path) {
+std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum, Error* error) {
     const FileDescriptor file = openInRoot(path, O_RDONLY | O_NONBLOCK);
-    return file ? readRegularFile(file, maximumSize) : std::nullopt;
+    std::optional<Value::Data> contents = file ? readRegularFile(file, maximum) : std::nullopt;
+    if (!contents)
+        explain(error);
+    return contents;
+}
+
+Kind kindOf(std::string_view path) {
+    const FileDescriptor file = openInRoot(path, O_PATH);
+    struct stat status;
+    if (!file || ::fstat(file.get(), &status) != 0)
+        return Kind::Nothing;
+    return S_ISDIR(status.st_mode) ? Kind::Directory : Kind::Other;
+}
+
+std::vector<std::string> list(std::string_view path) {
+    std::vector<std::string> names;
+    FileDescriptor file = openDirectoryInRoot(path);
+    const std::unique_ptr<DIR, int (*)(DIR*)> directory(file ? ::fdopendir(file.get()) : nullptr, ::closedir);
+    if (!directory)
+        return names;
+    file.release(); // the stream closes it
+    while (const dirent* entry = ::readdir(directory.get())) {
+        const std::string_view name = entry->d_name;
+        if (name != "." && name != "..")
+            names.emplace_back(name);
+    }
+    return names;
+}
+
+Value attributes(std::string_view path, Error* error) {
+    const FileDescriptor file = openInRoot(path, O_PATH);
+    struct stat status;
+    if (!file || ::fstat(file.get(), &status) != 0) {
+        explain(error);
+        return {};
+    }
+    Value::Dictionary found;
+    if (S_ISREG(status.st_mode) || S_ISDIR(status.st_mode))
+        found["Size"] = std::int64_t{status.st_size};
+    return found;
 }
 
 bool exists(std::string_view path) {

@@ -13,4 +13,8 @@
 // met.
 std::optional<Value> jsonToValue(std::string_view text, std::string* refusal = nullptr);
 
+// The text under `key` in the JSON object `text`, whatever else it holds: fractions and any nesting are allowed here,
+// and of a key that stands twice the last counts. None when `text` is no JSON object or has no text under that key.
+std::optional<std::string> jsonTextMember(std::string_view text, std::string_view key);
+
 #endif

@@ -1,0 +1,294 @@
+#include "Daemon/Common/HSPipeUtil.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+#include <utility>
+
+#include "Daemon/HSLog.h"
+#include "platform/Processes.h"
+#include "platform/Utf8.h"
+
+namespace {
+
+constexpr LogSource pipeLog{"HSPipeUtil"};
+
+constexpr int failed = 7;
+constexpr int noExitStatus = -1;
+constexpr std::size_t chunkSize = 1023;
+
+const char* programOf(const std::vector<std::string>& argv) {
+    return argv.empty() ? "" : argv.front().c_str();
+}
+
+// Closes a descriptor at the end of its life, or earlier.
+class Descriptor {
+public:
+    explicit Descriptor(int number) : number_(number) {}
+    Descriptor(const Descriptor&) = delete;
+    Descriptor& operator=(const Descriptor&) = delete;
+    ~Descriptor() { close(); }
+
+    void close() { processes::closeDescriptor(std::exchange(number_, -1)); }
+    int get() const { return number_; }
+    int release() { return std::exchange(number_, -1); }
+
+private:
+    int number_;
+};
+
+// Waits for a child that nobody else has waited for, so that it is reaped also when memory runs out on the way.
+class Child {
+public:
+    explicit Child(pid_t process) : process_(process) {}
+    Child(const Child&) = delete;
+    Child& operator=(const Child&) = delete;
+    ~Child() {
+        if (!waited_)
+            processes::killAndWait(process_);
+    }
+
+    // How the child ended. One that is stopped is killed after the wait.
+    processes::Ending wait() {
+        const processes::Ending ending = processes::waitFor(process_);
+        waited_ = true;
+        if (ending.kind == processes::Ending::Stopped)
+            processes::killAndWait(process_);
+        return ending;
+    }
+
+private:
+    pid_t process_;
+    bool waited_ = false;
+};
+
+// The output of a child as it comes in, chunk by chunk.
+class Output {
+public:
+    explicit Output(int readEnd) : readEnd_(readEnd) {}
+
+    // Reads one chunk; false at the end of the output and when it cannot be read.
+    bool readChunk() {
+        char chunk[chunkSize];
+        const ssize_t count = processes::readSome(readEnd_.get(), chunk, sizeof chunk);
+        if (count <= 0) {
+            readEnd_.close();
+            return false;
+        }
+        append({chunk, static_cast<std::size_t>(count)});
+        return true;
+    }
+
+    void readToEnd() {
+        while (readEnd_.get() >= 0 && readChunk()) {
+        }
+    }
+
+    // The read end, -1 once the end was met.
+    int descriptor() const { return readEnd_.get(); }
+
+    std::string takeText() {
+        text_ += utf8::repaired(std::exchange(incomplete_, {}));
+        return std::move(text_);
+    }
+
+private:
+    // A character that the end of a chunk cuts in two waits for its rest, unless a NUL ends the chunk before.
+    void append(std::string_view chunk) {
+        const std::size_t end = std::min(chunk.find('\0'), chunk.size());
+        const std::string pending = std::exchange(incomplete_, {}).append(chunk.substr(0, end));
+        std::size_t whole = pending.size();
+        if (end == chunk.size())
+            whole -= incompleteTail(pending);
+        text_ += utf8::repaired(std::string_view(pending).substr(0, whole));
+        incomplete_ = pending.substr(whole);
+    }
+
+    // The length of the character at the end of `text` that is not all there. No character is longer than four bytes.
+    static std::size_t incompleteTail(std::string_view text) {
+        for (std::size_t length = std::min<std::size_t>(3, text.size()); length > 0; --length) {
+            const utf8::Step step = utf8::next(text.substr(text.size() - length));
+            if (step.kind == utf8::Step::Incomplete && step.length == length)
+                return length;
+        }
+        return 0;
+    }
+
+    Descriptor readEnd_;
+    std::string text_;
+    std::string incomplete_;
+};
+
+// Writes the input and reads what comes meanwhile; the child then sees the end of its input.
+void feed(const char* program, Descriptor& input, const void* bytes, std::size_t length, Output& output) {
+    const char* next = static_cast<const char*>(bytes);
+    processes::makeNonBlocking(input.get());
+    while (length > 0) {
+        const processes::Ready ready = processes::waitUntilReady(input.get(), output.descriptor());
+        if (ready.toRead && output.descriptor() >= 0)
+            output.readChunk();
+        if (!ready.toWrite)
+            continue;
+        const ssize_t count = processes::writeSome(input.get(), next, length);
+        if (count >= 0) {
+            next += count;
+            length -= static_cast<std::size_t>(count);
+        } else if (count != -EAGAIN) {
+            pipeLog.info("write failed for %s: %s\n", program, processes::errorText(static_cast<int>(-count)));
+            break;
+        }
+    }
+    input.close();
+}
+
+// The result that an ending stands for. An exit is a word in the log of a call with input only.
+int resultOf(const processes::Ending& ending, const char* program, bool withInput) {
+    using processes::Ending;
+    if (withInput && ending.kind != Ending::Unknown)
+        pipeLog.info("child exited\n");
+    switch (ending.kind) {
+    case Ending::Exited:
+        if (withInput)
+            pipeLog.info("exit status: %d\n", ending.number);
+        return ending.number;
+    case Ending::Stopped:
+        pipeLog.info("%s was stopped by signal %d\n", program, ending.number);
+        break;
+    case Ending::Terminated:
+        pipeLog.info("%s was terminated by signal %d\n", program, ending.number);
+        break;
+    case Ending::Unknown:
+        pipeLog.info("waitpid failed for %s: %s\n", program, processes::errorText(ending.number));
+        break;
+    }
+    return noExitStatus;
+}
+
+struct Outcome {
+    int result = noExitStatus;
+    std::string output = {};
+};
+
+Outcome run(const std::vector<std::string>& argv) {
+    pid_t process = 0;
+    const int readEnd = hs_spawn_command(argv, process, true, nullptr);
+    if (readEnd < 0)
+        return {};
+    Child child(process);
+    Output output(readEnd);
+    pipeLog.info("Start Reading output from shell command\n");
+    output.readToEnd();
+    const int result = resultOf(child.wait(), programOf(argv), false);
+    return {result, output.takeText()};
+}
+
+Outcome runWithInput(const std::vector<std::string>& argv, const void* bytes, ssize_t length) {
+    const processes::BrokenPipeIgnored brokenPipeIgnored;
+    pipeLog.info("entering hs_execute_command_with_input_data: %s (%p - %zu)\n", programOf(argv), bytes, length);
+    pid_t process = 0;
+    int writeEnd = -1;
+    const int readEnd = hs_spawn_command(argv, process, false, &writeEnd);
+    if (readEnd < 0)
+        return {};
+    Child child(process);
+    Output output(readEnd);
+    Descriptor input(writeEnd);
+    feed(programOf(argv), input, bytes, length > 0 ? static_cast<std::size_t>(length) : 0, output);
+    pipeLog.info("Start Reading output from shell command\n");
+    output.readToEnd();
+    pipeLog.info("waiting for child to exit\n");
+    const int result = resultOf(child.wait(), programOf(argv), true);
+    return {result, output.takeText()};
+}
+
+// Reports the outcome of a call; a response of null means that nothing was run.
+int conclude(Outcome outcome, const char* failureFormat, Value* response, Error* error) {
+    Value::Dictionary dictionary{
+        {"Status", outcome.result == 0 ? 0 : failed}, {"Output", std::move(outcome.output)}, {"Error", ""}};
+    if (outcome.result != 0) {
+        const std::string description = format(failureFormat, outcome.result);
+        pipeLog.info("%@", description);
+        if (error) {
+            *error = {"HSErrorDomain", failed, description};
+            dictionary["Error"] = description;
+            pipeLog.info("%@", *error);
+        }
+    }
+    if (response)
+        *response = std::move(dictionary);
+    return outcome.result;
+}
+
+std::vector<std::string> argumentVector(const std::string& command, const std::vector<std::string>& options) {
+    std::vector<std::string> argv{command};
+    argv.insert(argv.end(), options.begin(), options.end());
+    return argv;
+}
+
+} // namespace
+
+int hs_spawn_command(const std::vector<std::string>& argv, pid_t& child, bool collectStandardError, int* input) {
+    const char* program = programOf(argv);
+    pipeLog.info("executing %s\n", program);
+    processes::Pipe outputPipe, inputPipe;
+    int problem = processes::createPipe(outputPipe);
+    Descriptor readEnd(outputPipe.readEnd), childOutput(outputPipe.writeEnd);
+    if (problem == 0 && input)
+        problem = processes::createPipe(inputPipe);
+    Descriptor childInput(inputPipe.readEnd), writeEnd(inputPipe.writeEnd);
+    if (problem != 0) {
+        pipeLog.info("pipe failed while preparing to execute %s: %s\n", program, processes::errorText(problem));
+        return -1;
+    }
+    const int childError = collectStandardError ? childOutput.get() : -1;
+    problem = processes::spawn(argv, {childInput.get(), childOutput.get(), childError}, child);
+    if (problem != 0) {
+        pipeLog.info("posix_spawn %s failed: %s\n", program, processes::errorText(problem));
+        return -1;
+    }
+    if (input)
+        *input = writeEnd.release();
+    return readEnd.release();
+}
+
+int hs_execute_command(const std::vector<std::string>& argv, Value* response, Error* error) {
+    Outcome outcome;
+    if (response)
+        outcome = run(argv);
+    else
+        pipeLog.error("Input response dictionary pointer is NULL.");
+    return conclude(std::move(outcome), "Error executing command, result = %d\n", response, error);
+}
+
+int hs_execute_command_with_input_data(const std::vector<std::string>& argv, const void* input, ssize_t length,
+                                       Value* response, Error* error) {
+    Outcome outcome;
+    if (response)
+        outcome = runWithInput(argv, input, length);
+    else
+        pipeLog.error("Input response dictionary pointer is NULL.");
+    return conclude(std::move(outcome), "Error executing command with data, result = %d\n", response, error);
+}
+
+int HSPipeUtil::HSPipeUtilExecCommand(const std::string& command, const std::vector<std::string>& options,
+                                      Value* response, Error* error) {
+    constexpr const char* name = "+[HSPipeUtil HSPipeUtilExecCommand:options:response:error:]";
+    pipeLog.info("Enter %s at line %d\n", name, __LINE__);
+    const int code = hs_execute_command(argumentVector(command, options), response, error) == 0 ? 0 : failed;
+    pipeLog.info("Exit %s at line %d, success = %d\n", name, __LINE__, code);
+    return code;
+}
+
+int HSPipeUtil::HSPipeUtilExecCommandWithData(const std::string& command, const std::vector<std::string>& options,
+                                              const Value::Data& data, Value* response, Error* error) {
+    constexpr const char* name = "+[HSPipeUtil HSPipeUtilExecCommandWithData:options:data:response:error:]";
+    pipeLog.info("Enter %s at line %d\n", name, __LINE__);
+    const std::vector<std::string> argv = argumentVector(command, options);
+    for (std::size_t index = 0; index < argv.size(); ++index)
+        pipeLog.info("argv[%d] = %s\n", index, argv[index]);
+    const int result =
+        hs_execute_command_with_input_data(argv, data.data(), static_cast<ssize_t>(data.size()), response, error);
+    const int code = result == 0 ? 0 : failed;
+    pipeLog.info("Exit %s at line %d, success = %d\n", name, __LINE__, code);
+    return code;
+}

@@ -1,0 +1,73 @@
+#include <chrono>
+#include <condition_variable>
+#include <memory>
+#include <mutex>
+
+#include "Daemon/HSLog.h"
+#include "device/ZPDevice.h"
+#include "platform/ReverseProxy.h"
+
+namespace {
+
+constexpr LogSource zplog{"ZPDevice"};
+
+constexpr std::chrono::seconds waitLimit{5};
+
+constexpr std::int32_t available = 1;
+constexpr std::int32_t endOfWaiting = 3;
+
+// What the callback and the call that waits for it share. Each owns a part of it, so that a callback that comes after
+// the call has returned finds it still there.
+class Availability {
+public:
+    void report(std::int32_t status) {
+        if (status != available && status != endOfWaiting)
+            return;
+        const std::lock_guard lock(mutex_);
+        if (status == available)
+            available_ = true;
+        ++signals_;
+        signalled_.notify_one();
+    }
+
+    void wait() {
+        std::unique_lock lock(mutex_);
+        signalled_.wait_for(lock, waitLimit, [this] { return signals_ > 0; });
+    }
+
+    bool isAvailable() const {
+        const std::lock_guard lock(mutex_);
+        return available_;
+    }
+
+private:
+    mutable std::mutex mutex_;
+    std::condition_variable signalled_;
+    unsigned signals_ = 0;
+    bool available_ = false;
+};
+
+using RegistrationPtr = std::unique_ptr<RPRegistration, decltype(&RPRelease)>;
+
+} // namespace
+
+Value ZPDevice::setupReverseProxy(const std::string& url) const {
+    zplog.info("%s:%d", "-[ZPDevice setupReverseProxy:]", __LINE__);
+    const auto availability = std::make_shared<Availability>();
+    const Value options = Value::Dictionary{{"TestReachability", false}};
+    const RegistrationPtr registration(
+        RPRegisterForAvailability([availability](std::int32_t status) { availability->report(status); }), RPRelease);
+    if (!registration) {
+        zplog.info("failed to register for reverse proxy availability");
+        return {};
+    }
+    RPRegistrationResume(registration.get());
+    availability->wait();
+    RPRegistrationInvalidate(registration.get());
+    if (!availability->isAvailable()) {
+        zplog.info("Failed to get proxy info");
+        return {};
+    }
+    zplog.info("Getting proxy info");
+    return RPCopyProxyDictionaryWithOptions(url, options);
+}

@@ -1,0 +1,210 @@
+#include "Daemon/CrashLogs.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <map>
+#include <string>
+#include <vector>
+
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include "tests/support/OwnProcess.h"
+#include "tests/support/RecordedLog.h"
+#include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+using Lines = std::vector<std::string>;
+
+const std::string logs = "/private/var/logs/", varrow = "/private/var/mobile/Library/Logs/Varrow/";
+
+class CrashLogs : public testing::Test {
+protected:
+    CrashLogs() { recordLog(); }
+
+    void runningBuild(const std::string& build) const {
+        root_.write("/System/Library/Quennel/SystemVersion.plist",
+                    "<plist version=\"1.0\"><dict><key>ProductName</key><string>Q</string>"
+                    "<key>ProductBuildVersion</key><string>" +
+                        build + "</string></dict></plist>");
+    }
+
+    // The collected files, "<name> <isPanic> <size>: <contents>", sorted.
+    Lines collect() {
+        recordLog();
+        const int status = get_ramdisk_logs(&response_);
+        EXPECT_EQ(response_["Status"], Value(status));
+        EXPECT_EQ(response_["Error"], Value(""));
+        EXPECT_EQ(status == 0, response_["Data"].array() != nullptr);
+        Lines entries;
+        if (const Value::Array* data = response_["Data"].array())
+            for (const Value& entry : *data) {
+                const Value::Data& contents = *entry["LogFileData"].data();
+                entries.push_back(
+                    *entry["LogFileName"].text() + " " + *entry["isPanic"].text() + " " +
+                    std::to_string(*entry["LogFileSize"].integer()) + ": " +
+                    std::string(contents.begin(), contents.begin() + std::min(contents.size(), size_t{40})));
+            }
+        std::ranges::sort(entries);
+        return entries;
+    }
+
+    static bool logged(const std::string& beginning) {
+        return std::ranges::any_of(recordedLog(),
+                                   [&](const std::string& line) { return line.starts_with("2 [HSLog] " + beginning); });
+    }
+
+    TemporaryRoot root_;
+    Value response_;
+};
+
+TEST_F(CrashLogs, directoriesThatAreMissingOrFilesShowInTheLogOnly) {
+    EXPECT_EQ(get_ramdisk_logs(&response_), 45);
+    EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", 45}, {"Error", ""}}));
+    const auto interim = [](const char* problem) {
+        return "2 [HSLog]  Response dict populated: " +
+               Value(Value::Dictionary{{"Status", 43}, {"Error", problem}}).description();
+    };
+    const std::string missing = interim("Log directory not found");
+    EXPECT_EQ(recordedLog(), (Lines{missing, missing, "2 [HSLog]  Returning Status: 45"}));
+
+    root_.write("/private/var/logs", "file");
+    root_.write(varrow + "a.ips", "a");
+    EXPECT_EQ(collect(), Lines{varrow + "a.ips NO 1: a"});
+    EXPECT_EQ(recordedLog(), (Lines{interim("Log directory expected. but found file"),
+                                    "2 [HSLog] File Name: " + varrow + "a.ips", "2 [HSLog]  Returning Status: 0"}));
+}
+
+TEST_F(CrashLogs, filesAreChosenByTheEndOfTheirNamesAndDirectoriesInOrder) {
+    for (const char* name : {"a.ips", "b.txt", "c.log", "d.LOG", "log", ".log", "e.log.gz"})
+        root_.write(logs + name, name);
+    root_.write(varrow + "f.log", "");
+    root_.write(logs + "old.log/g.ips", "deeper");
+    EXPECT_EQ(collect(), (Lines{logs + ".log NO 4: .log", logs + "a.ips NO 5: a.ips", logs + "c.log NO 5: c.log",
+                                varrow + "f.log NO 0: "}));
+    EXPECT_EQ(*response_["Data"].array()->back()["LogFileName"].text(), varrow + "f.log");
+    EXPECT_TRUE(logged("Suffix Mismatch . Skipping file : " + logs + "b.txt"));
+    EXPECT_TRUE(logged("Failed to load " + logs + "old.log: "));
+}
+
+TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
+    const std::string good = R"json({"os_version": "Quennel 3.1 (21A55)", "x": [1.5, {"os_version": 7}]})json";
+    const struct {
+        const char* build; // null: no version list
+        std::string report;
+        bool collected;
+    } rows[] = {
+        {"21A55", good + "\nmore {\n", true},
+        {"21A55", good, true},
+        {"21A5", good + "\n", true},
+        {"21A56", good + "\n", false},
+        {nullptr, good + "\n", false},
+        {"21A55", "\n" + good, false},
+        {"21A55", "21A55\n", false},
+        {"21A55", "", false},
+        {"21A55", "[" + good + "]", false},
+        {"21A55", "\"os_version 21A55\"", false},
+        {"21A55", R"({"os_version": 21})", false},
+        {"21A55", R"({"os_version": ["21A55"]})", false},
+        {"21A55", R"({"inner": {"os_version": "21A55"}})", false},
+        {"21A55", R"({"os_version": "21A55")", false},
+        {"21A55", R"({"os_version": "21A55"} x)", false},
+        {"21A55", good + "\n\xC3\xA9", false}, // no ASCII text
+    };
+    for (const auto& row : rows) {
+        fs::remove_all(root_.host("/System"));
+        if (row.build)
+            runningBuild(row.build);
+        root_.write(logs + "panic-full-1.ips", row.report);
+        EXPECT_EQ(check_panic_version(logs + "panic-full-1.ips"), row.collected) << row.report;
+        const Lines entries = collect();
+        EXPECT_EQ(entries.size(), row.collected ? 1U : 0U) << row.report;
+        EXPECT_TRUE(logged(row.collected ? "Panic Version and System Version matches. Sending to HOST"
+                                         : "Panic Version and System Version does not match. Skipping"));
+        if (row.collected) {
+            EXPECT_EQ(response_["Data"].array()->front()["isPanic"], Value("YES"));
+        }
+    }
+    root_.write("/System/Library/Quennel/SystemVersion.plist", "<plist><dict>");
+    EXPECT_FALSE(check_panic_version(logs + "panic-full-1.ips"));
+    EXPECT_FALSE(check_panic_version("/missing"));
+}
+
+TEST_F(CrashLogs, aDeeplyNestedPanicHeaderIsRefusedInNoTime) {
+    runningBuild("21A55");
+    const std::string nested(1'000'000, '[');
+    root_.write(logs + "panic.ips", R"({"x": )" + nested);
+    EXPECT_FALSE(check_panic_version(logs + "panic.ips"));
+    root_.write(logs + "panic.ips",
+                R"({"x": )" + nested + std::string(nested.size(), ']') + R"(, "os_version": "21A55"})");
+    EXPECT_TRUE(check_panic_version(logs + "panic.ips"));
+}
+
+TEST_F(CrashLogs, whatIsNoReadableFileNeitherHangsNorBreaksTheCollection) {
+    root_.write(logs + "good.log", "good");
+    root_.write(varrow + "target", "linked");
+    ::mkfifo(root_.host(logs + "fifo.log").c_str(), 0600);
+    ::mkfifo(root_.host(logs + "panic.log").c_str(), 0600);
+    const int socket = ::socket(AF_UNIX, SOCK_STREAM, 0);
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    const std::string socketPath = root_.host(logs + "socket.ips");
+    ASSERT_LT(socketPath.size(), sizeof address.sun_path);
+    socketPath.copy(address.sun_path, socketPath.size());
+    ASSERT_EQ(::bind(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    root_.link(logs + "out.log", "/etc/hostname");
+    root_.link(logs + "dots.log", "../../../../../../../../etc/hostname");
+    root_.link(logs + "in.log", varrow + "target");
+    root_.link(logs + "loop.log", "loop.log");
+
+    EXPECT_EQ(collect(), (Lines{logs + "good.log NO 4: good", logs + "in.log NO 6: linked"}));
+    ::close(socket);
+    for (const char* name : {"fifo.log", "socket.ips"})
+        EXPECT_TRUE(logged("Failed to retrieve size of " + logs + name + ".")) << name;
+    for (const char* name : {"out.log", "dots.log", "loop.log"})
+        EXPECT_TRUE(logged("Failed to retrieve attributes for " + logs + name + ": (")) << name;
+}
+
+TEST_F(CrashLogs, anUnreadableFileIsLeftOut) {
+    root_.write(logs + "good.log", "good");
+    root_.write(logs + "secret.log", "secret");
+    fs::permissions(root_.host(logs + "secret.log"), fs::perms::none);
+    fs::permissions(root_.around(), fs::perms::group_exec | fs::perms::others_exec, fs::perm_options::add);
+    inOwnProcess([&] {
+        const uid_t reader = ::geteuid() == 0 ? 65534 : ::geteuid(); // root may read everything
+        ASSERT_EQ(::seteuid(reader), 0);
+        EXPECT_EQ(collect(), Lines{logs + "good.log NO 4: good"});
+        EXPECT_TRUE(logged("Failed to load " + logs + "secret.log: "));
+    });
+}
+
+TEST_F(CrashLogs, aLargeLogIsCollectedWhole) {
+    constexpr std::size_t size = std::size_t{200} << 20;
+    root_.write(logs + "large.log", "start");
+    fs::resize_file(root_.host(logs + "large.log"), size);
+    EXPECT_EQ(get_ramdisk_logs(&response_), 0);
+    const Value& entry = response_["Data"].array()->front();
+    EXPECT_EQ(entry["LogFileSize"], Value(size));
+    EXPECT_EQ(entry["LogFileData"].data()->size(), size);
+
+#ifndef __SANITIZE_ADDRESS__ // which ends the process where an allocation would fail
+    fs::resize_file(root_.host(logs + "large.log"), std::size_t{1} << 42); // more than memory holds
+    EXPECT_EQ(get_ramdisk_logs(&response_), 45);
+    EXPECT_TRUE(logged("Failed to load " + logs + "large.log: "));
+#endif
+}
+
+TEST_F(CrashLogs, aFileNameCannotForgeALineOfTheLogNorBreakTheResponse) {
+    root_.write(logs + "a\n[HSLog:1] forged\xFF.log", "x");
+    EXPECT_EQ(collect(), Lines{logs + "a\n[HSLog:1] forged\uFFFD.log NO 1: x"});
+    EXPECT_TRUE(logged("File Name: " + logs + "a\\n[HSLog:1] forged\\xff.log"));
+}
+
+} // namespace

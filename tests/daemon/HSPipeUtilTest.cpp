@@ -1,0 +1,348 @@
+#include "Daemon/Common/HSPipeUtil.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include "platform/Format.h"
+#include "tests/support/RecordedLog.h"
+#include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+using Lines = std::vector<std::string>;
+
+constexpr const char* program = "/usr/bin/program";
+
+Value::Data bytes(std::string_view text) {
+    return {text.begin(), text.end()};
+}
+
+std::size_t openDescriptors() {
+    return static_cast<std::size_t>(std::distance(fs::directory_iterator("/proc/self/fd"), {}));
+}
+
+// The message of the operating system's error number, as the log lines end with it.
+std::string text(int number) {
+    return std::string(std::strerror(number)) + "\n";
+}
+
+// `line` with a star in place of the hexadecimal or decimal number behind the first `mark`.
+std::string withoutNumber(const std::string& line, std::string_view mark) {
+    const std::size_t start = line.find(mark);
+    if (start == std::string::npos)
+        return line;
+    const std::size_t number = start + mark.size();
+    const std::size_t end = std::min(line.find_first_not_of("0123456789abcdefx", number), line.size());
+    return line.substr(0, number) + "*" + line.substr(end);
+}
+
+// The recorded lines of HSPipeUtil, without what differs from run to run.
+Lines log() {
+    Lines lines;
+    for (const std::string& line : recordedLog())
+        lines.push_back(withoutNumber(withoutNumber(line, "at line "), "program ("));
+    return lines;
+}
+
+Lines infoLines(std::initializer_list<std::string> messages) {
+    Lines lines;
+    for (const std::string& message : messages)
+        lines.push_back("2 [HSPipeUtil] " + message);
+    return lines;
+}
+
+class HSPipeUtilTest : public testing::Test {
+protected:
+    HSPipeUtilTest() : descriptors_(openDescriptors()) { recordLog(); }
+
+    ~HSPipeUtilTest() override {
+        EXPECT_EQ(openDescriptors(), descriptors_);
+        EXPECT_EQ(::waitpid(-1, nullptr, WNOHANG), -1) << "a child was not reaped";
+        EXPECT_EQ(errno, ECHILD);
+    }
+
+    void script(const std::string& lines, const char* interpreter = "/bin/sh") const {
+        root_.write(program, std::string("#!") + interpreter + "\n" + lines);
+        fs::permissions(root_.host(program), fs::perms::owner_all);
+    }
+
+    // A program of this machine as the device's.
+    void binary(const char* path) const {
+        root_.makeDirectory("/usr/bin");
+        fs::copy_file(path, root_.host(program), fs::copy_options::overwrite_existing);
+    }
+
+    int run(const std::vector<std::string>& options = {}) {
+        error_ = {};
+        return HSPipeUtil::HSPipeUtilExecCommand(program, options, &response_, &error_);
+    }
+
+    int runWith(const Value::Data& data, const std::vector<std::string>& options = {}) {
+        error_ = {};
+        return HSPipeUtil::HSPipeUtilExecCommandWithData(program, options, data, &response_, &error_);
+    }
+
+    std::string output() const { return *response_["Output"].text(); }
+
+    TemporaryRoot root_;
+    Value response_;
+    Error error_;
+
+private:
+    const std::size_t descriptors_;
+};
+
+TEST_F(HSPipeUtilTest, theOutcomeIsDescribedInTheResultTheResponseAndTheError) {
+    const struct {
+        const char* lines;
+        int result;
+        const char* says; // in the line about a signal
+    } rows[] = {
+        {"echo out; echo err >&2; exit 0", 0, nullptr},
+        {"echo out; echo err >&2; exit 3", 3, nullptr},
+        {"echo out; echo err >&2; exit 255", 255, nullptr},
+        {"echo out; echo err >&2; kill -TERM $$", -1, "terminated by signal 15"},
+        {"echo out; echo err >&2; kill -KILL $$", -1, "terminated by signal 9"},
+    };
+    for (const auto& row : rows) {
+        script(row.lines);
+        for (const bool withInput : {false, true}) {
+            SCOPED_TRACE(row.lines);
+            recordLog();
+            Error error;
+            const int result = withInput ? hs_execute_command_with_input_data({program}, nullptr, 0, &response_, &error)
+                                         : hs_execute_command({program}, &response_, &error);
+            EXPECT_EQ(result, row.result);
+            const std::string description = row.result == 0
+                                                ? ""
+                                                : std::string(withInput ? "Error executing command with data, result = "
+                                                                        : "Error executing command, result = ") +
+                                                      std::to_string(row.result) + "\n";
+            EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", row.result == 0 ? 0 : 7},
+                                                         {"Output", withInput ? "out\n" : "out\nerr\n"},
+                                                         {"Error", description}}));
+            EXPECT_EQ(error, row.result == 0 ? Error() : (Error{"HSErrorDomain", 7, description}));
+            const std::string signalLine =
+                "2 [HSPipeUtil] " + std::string(program) + " was " + (row.says ? row.says : "");
+            EXPECT_EQ(std::ranges::count(log(), signalLine + "\n"), row.says ? 1 : 0);
+        }
+    }
+}
+
+TEST_F(HSPipeUtilTest, aStoppedChildIsReportedAndDoesNotStay) {
+    script("import ctypes, os, signal\n"
+           "os.write(1, b'out')\n"
+           "ctypes.CDLL(None).ptrace(0, 0, 0, 0)\n" // PTRACE_TRACEME: only a traced child is reported as stopped
+           "os.closerange(0, 3)\n"
+           "os.kill(os.getpid(), signal.SIGSTOP)\n",
+           "/usr/bin/python3");
+    EXPECT_EQ(run(), 7);
+    EXPECT_EQ(output(), "out");
+    EXPECT_EQ(error_.text, "Error executing command, result = -1\n");
+    EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] /usr/bin/program was stopped by signal 19\n"), 1);
+}
+
+TEST_F(HSPipeUtilTest, everyStepIsLogged) {
+    script("cat; exit 3");
+    const std::string failure = "Error executing command, result = 3\n";
+    const std::string failureWithData = "Error executing command with data, result = 3\n";
+    run({"-x"});
+    const char* name = "+[HSPipeUtil HSPipeUtilExecCommand:options:response:error:]";
+    EXPECT_EQ(log(), infoLines({format("Enter %s at line *\n", name), "executing /usr/bin/program\n",
+                                "Start Reading output from shell command\n", failure, error_.description(),
+                                format("Exit %s at line *, success = 7\n", name)}));
+    recordLog();
+    runWith(bytes("input"), {"-x", "y"});
+    name = "+[HSPipeUtil HSPipeUtilExecCommandWithData:options:data:response:error:]";
+    EXPECT_EQ(log(),
+              infoLines({format("Enter %s at line *\n", name), "argv[0] = /usr/bin/program\n", "argv[1] = -x\n",
+                         "argv[2] = y\n", "entering hs_execute_command_with_input_data: /usr/bin/program (* - 5)\n",
+                         "executing /usr/bin/program\n", "Start Reading output from shell command\n",
+                         "waiting for child to exit\n", "child exited\n", "exit status: 3\n", failureWithData,
+                         error_.description(), format("Exit %s at line *, success = 7\n", name)}));
+}
+
+TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
+    root_.write("/plain", "#!/bin/sh\n");
+    root_.write("/noise", "no program");
+    fs::permissions(root_.host("/noise"), fs::perms::owner_all);
+    root_.makeDirectory("/directory");
+    root_.write("/lost", "#!/nonexistent/interpreter\n");
+    fs::permissions(root_.host("/lost"), fs::perms::owner_all);
+    root_.link("/outside", fs::canonical("/bin/sh"));
+    const std::pair<std::string, int> rows[] = {
+        {"/missing", ENOENT}, {"", ENOENT},      {"/directory", EACCES}, {"/plain", EACCES},
+        {"/noise", ENOEXEC},  {"/lost", ENOENT}, {"/outside", ENOENT},   {"/../../../../../../../bin/sh", ENOENT}};
+    for (const auto& [path, number] : rows) {
+        const std::string failed = "2 [HSPipeUtil] posix_spawn " + path + " failed: " + text(number);
+        recordLog();
+        EXPECT_EQ(hs_execute_command({path}, &response_, &error_), -1);
+        EXPECT_EQ(std::ranges::count(log(), failed), 1) << path;
+        EXPECT_EQ(hs_execute_command_with_input_data({path}, "x", 1, &response_, nullptr), -1);
+        EXPECT_EQ(std::ranges::count(log(), failed), 2) << path;
+        EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", 7}, {"Output", ""}, {"Error", ""}}));
+        EXPECT_EQ(error_.text, "Error executing command, result = -1\n");
+    }
+}
+
+TEST_F(HSPipeUtilTest, withoutAResponseNothingIsRun) {
+    script("echo ran > \"$1\"");
+    const std::string trace = root_.host("/trace");
+    EXPECT_EQ(HSPipeUtil::HSPipeUtilExecCommand(program, {trace}, nullptr, &error_), 7);
+    EXPECT_EQ(error_, (Error{"HSErrorDomain", 7, "Error executing command, result = -1\n"}));
+    EXPECT_EQ(HSPipeUtil::HSPipeUtilExecCommandWithData(program, {trace}, {}, nullptr, &error_), 7);
+    EXPECT_EQ(error_.text, "Error executing command with data, result = -1\n");
+    EXPECT_EQ(std::ranges::count(log(), "4 [HSPipeUtil] Input response dictionary pointer is NULL."), 2);
+    EXPECT_EQ(root_.read("/trace"), "(missing)");
+}
+
+TEST_F(HSPipeUtilTest, theChildGetsItsArgumentsAnEmptyEnvironmentAndNoBlockedSignal) {
+    binary("/usr/bin/env");
+    EXPECT_EQ(run(), 0);
+    EXPECT_EQ(output(), "");
+    binary("/usr/bin/printf");
+    EXPECT_EQ(run({"<%s>", "a b", "", "ü"}), 0);
+    EXPECT_EQ(output(), "<a b><><ü>");
+
+    sigset_t signals, previous;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGTERM);
+    ASSERT_EQ(::pthread_sigmask(SIG_BLOCK, &signals, &previous), 0);
+    script("grep SigBlk /proc/self/status");
+    EXPECT_EQ(run(), 0);
+    ::pthread_sigmask(SIG_SETMASK, &previous, nullptr);
+    EXPECT_EQ(output(), "SigBlk:\t0000000000000000\n");
+}
+
+TEST_F(HSPipeUtilTest, inputAndOutputOfAnySizePassAtTheSameTime) {
+    constexpr std::size_t size = std::size_t{10} << 20;
+    Value::Data data(size);
+    for (std::size_t i = 0; i < size; ++i)
+        data[i] = static_cast<std::uint8_t>('a' + i % 25);
+    script("cat");
+    EXPECT_EQ(runWith(data), 0);
+    EXPECT_TRUE(bytes(output()) == data);
+
+    script("head -c 10485760 /dev/zero | tr '\\0' x; wc -c"); // all of the output before any of the input is read
+    EXPECT_EQ(runWith(data), 0);
+    EXPECT_TRUE(output() == std::string(size, 'x') + "10485760\n");
+
+    script("exec >&-; wc -c > \"$1\""); // the output ends long before the input
+    EXPECT_EQ(runWith(data, {root_.host("/count")}), 0);
+    EXPECT_EQ(root_.read("/count"), "10485760\n");
+
+    script("cat; echo end");
+    EXPECT_EQ(runWith({}), 0);
+    EXPECT_EQ(output(), "end\n");
+}
+
+TEST_F(HSPipeUtilTest, aChildThatIgnoresItsInputDecidesByItsExitStatus) {
+    struct sigaction before = {}, after = {};
+    for (const auto& handler : {SIG_DFL, SIG_IGN}) {
+        ASSERT_NE(std::signal(SIGPIPE, handler), SIG_ERR);
+        ASSERT_EQ(::sigaction(SIGPIPE, nullptr, &before), 0);
+        for (const int status : {0, 3}) {
+            recordLog();
+            script("exec <&-; exit " + std::to_string(status));
+            EXPECT_EQ(runWith(Value::Data(1 << 20)), status == 0 ? 0 : 7);
+            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] write failed for /usr/bin/program: " + text(EPIPE)), 1);
+        }
+        script("kill -PIPE $$; echo ignored");
+        EXPECT_EQ(runWith({}), 0);
+        EXPECT_EQ(output(), "ignored\n");
+        ASSERT_EQ(::sigaction(SIGPIPE, nullptr, &after), 0);
+        EXPECT_EQ(after.sa_handler, before.sa_handler);
+        EXPECT_EQ(after.sa_flags, before.sa_flags);
+    }
+    std::signal(SIGPIPE, SIG_DFL);
+}
+
+TEST_F(HSPipeUtilTest, anyOutputBecomesText) {
+    binary("/bin/cat");
+    using namespace std::string_literals;
+    const auto a = [](std::size_t count) { return std::string(count, 'a'); };
+    const std::string bad = "\uFFFD";
+    const std::pair<std::string, std::string> rows[] = {
+        {a(1022) + "é" + "b", a(1022) + "éb"},
+        {a(1021) + "€" + "b", a(1021) + "€b"},
+        {a(1022) + "😀", a(1022) + "😀"},
+        {a(1020) + "😀" + a(1022), a(1020) + "😀" + a(1022)},
+        {a(1022) + "\xC3", a(1022) + bad},
+        {a(1022) + "\xE2" + "x", a(1022) + bad + "x"},
+        {a(1021) + "\xE2\x82" + "\xE2\x82\xAC", a(1021) + bad + "€"},
+        {a(1023) + "\x80" + a(5), a(1023) + bad + a(5)},
+        {"\xFF\xC0\xAFz", bad + bad + bad + "z"},
+        {"ab\0cd"s, "ab"},
+        {a(1000) + "\0"s + a(30), a(1000) + a(8)},
+        {"\xC3\0\xA9"s, bad},
+        {a(1022) + "\xC3" + "\0x"s, a(1022) + bad},
+        {"\0"s + a(1022) + "end", "end"},
+        {std::string(60000, '\0'), ""},
+    };
+    for (const auto& [written, expected] : rows) {
+        root_.write("/file", written);
+        EXPECT_EQ(run({root_.host("/file")}), 0);
+        EXPECT_EQ(output(), expected) << written.size();
+    }
+}
+
+TEST_F(HSPipeUtilTest, nothingIsLeftBehindByTenThousandCalls) {
+    binary("/bin/true");
+    const std::size_t before = openDescriptors();
+    for (int round = 0; round < 2500; ++round) {
+        ASSERT_EQ(run(), 0);
+        ASSERT_EQ(hs_execute_command_with_input_data({"/missing"}, "x", 1, &response_, &error_), -1);
+        ASSERT_EQ(hs_execute_command({"/usr/bin"}, &response_, nullptr), -1);
+        ASSERT_EQ(runWith({'x'}), 0);
+    }
+    EXPECT_EQ(openDescriptors(), before);
+}
+
+TEST_F(HSPipeUtilTest, callsOnSeveralThreadsDoNotHoldEachOthersPipes) {
+    script("cat");
+    std::vector<std::thread> threads;
+    for (char letter = 'a'; letter < 'e'; ++letter)
+        threads.emplace_back([letter] {
+            for (int round = 0; round < 25; ++round) {
+                const std::string data(5000, letter);
+                Value response;
+                EXPECT_EQ(HSPipeUtil::HSPipeUtilExecCommandWithData(program, {}, bytes(data), &response, nullptr), 0);
+                EXPECT_TRUE(*response["Output"].text() == data);
+            }
+        });
+    for (std::thread& thread : threads)
+        thread.join();
+}
+
+TEST_F(HSPipeUtilTest, aProcessWithoutStandardDescriptorsRunsProgramsAllTheSame) {
+    script("cat");
+    int saved[3];
+    for (int number = 0; number < 3; ++number) {
+        saved[number] = ::fcntl(number, F_DUPFD_CLOEXEC, 10);
+        ::close(number);
+    }
+    const int plain = run(), fed = runWith(bytes("in"));
+    for (int number = 0; number < 3; ++number) {
+        ::dup2(saved[number], number);
+        ::close(saved[number]);
+    }
+    EXPECT_EQ(plain, 7); // without an input to inherit, cat fails and says so
+    EXPECT_EQ(fed, 0);
+    EXPECT_EQ(output(), "in");
+}
+
+} // namespace
