@@ -2,8 +2,8 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
+#include <iostream>
 #include <memory>
 #include <string>
 #include <vector>
@@ -169,7 +169,7 @@ ASN1_SEQUENCE(Entry) =
 }
 
 [[noreturn]] void fail(const char* what) {
-    std::fprintf(stderr, "bench-sysconfig: %s failed\n", what);
+    std::cerr << "bench-sysconfig: " << what << " failed\n";
     std::exit(1);
 }
 
@@ -224,10 +224,11 @@ void countItems(benchmark::State& state) {
 
 void decodeByVeltra(benchmark::State& state) {
     const std::vector<std::uint8_t> blob = makeBlob(static_cast<std::uint32_t>(state.range(0)));
-    for (auto _ : state) {
+    while (state.KeepRunning()) {
         SysConfig3Ptr object = decode(blob);
         state.PauseTiming();
         object.reset();
+        malloc_trim(0); // So that the order of the benchmarks does not matter; the README says how.
         state.ResumeTiming();
     }
     countItems(state);
@@ -238,10 +239,11 @@ void decodeByVeltra(benchmark::State& state) {
 
 void decodeByTemplates(benchmark::State& state) {
     const std::vector<std::uint8_t> blob = makeBlob(static_cast<std::uint32_t>(state.range(0)));
-    for (auto _ : state) {
+    while (state.KeepRunning()) {
         BlobPtr decoded = decodeByOpenSSL(blob);
         state.PauseTiming();
         decoded.reset();
+        malloc_trim(0); // So that the order of the benchmarks does not matter; the README says how.
         state.ResumeTiming();
     }
     countItems(state);
@@ -257,7 +259,7 @@ void encodeByVeltra(benchmark::State& state) {
         const BytesPtr owner(out.data);
         benchmark::DoNotOptimize(out.data);
     };
-    for (auto _ : state)
+    while (state.KeepRunning())
         run();
     countItems(state);
     state.counters["peak_per_blob"] = peakOf(run) / static_cast<double>(blob.size());
@@ -267,7 +269,7 @@ void encodeByTemplates(benchmark::State& state) {
     const std::vector<std::uint8_t> blob = makeBlob(static_cast<std::uint32_t>(state.range(0)));
     const BlobPtr decoded = decodeByOpenSSL(blob);
     int length = 0;
-    for (auto _ : state) {
+    while (state.KeepRunning()) {
         unsigned char* out = nullptr;
         length = i2d_Blob(decoded.get(), &out);
         benchmark::DoNotOptimize(out);

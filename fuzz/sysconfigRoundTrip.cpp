@@ -94,7 +94,7 @@ struct Script {
     }
 
     std::string text() {
-        std::string taken(octet() % 4 * 100U, 'x');
+        std::string taken(std::size_t{100} * (octet() % 4), 'x');
         const std::size_t length = std::min<std::size_t>(octet() % 16, left);
         taken.append(reinterpret_cast<const char*>(next), length);
         next += length;

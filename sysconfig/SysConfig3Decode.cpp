@@ -6,6 +6,14 @@ namespace {
 
 using namespace sysconfig;
 
+struct BlobItems {
+    DERItem magic;
+    DERItem version;
+    DERItem payload;
+    DERItem metadata;
+    DERItem manifest;
+};
+
 struct PayloadItems {
     DERItem key;
     DERItem comment;

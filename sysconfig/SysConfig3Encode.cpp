@@ -1,5 +1,5 @@
-// Every part is measured first, so that the blob is written once, into a buffer of exactly its size, straight from the
-// object.
+// Every part is measured first. Then the blob is written front to back into a buffer of exactly its size, straight from
+// the object, so that nothing but the blob itself is ever allocated.
 #include "der/DEREncode.h"
 #include "sysconfig/SysConfig3Internal.h"
 #include "sysconfig/SysConfig3Ptr.h"
@@ -19,13 +19,6 @@ struct MetadataItems {
     DERItem key;
     DERItem value;
 };
-
-constexpr DERItemSpec DEREncodeSysConfig3ItemSpecs[] = {
-    {offsetof(BlobItems, magic), DERTagInteger, 0},  {offsetof(BlobItems, version), DERTagInteger, 0},
-    {offsetof(BlobItems, payload), payloadTag, 0},   {offsetof(BlobItems, metadata), metadataTag, 0},
-    {offsetof(BlobItems, manifest), manifestTag, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3ItemSpecs_count = std::size(DEREncodeSysConfig3ItemSpecs);
 
 constexpr DERItemSpec DEREncodeSysConfig3PayloadDataItemSpecs[] = {
     {offsetof(PayloadItems, key), DERTagInteger, 0},
@@ -145,7 +138,7 @@ struct ManifestRecord {
 
 constexpr char encoding[] = "bool encodeSysConfig3(const struct __SysConfig3 *__single, SysConfigData *__single)";
 
-// A buffer to be filled from the front: one of the blob's last three elements, or the whole blob.
+// The buffer of the blob, filled from the front.
 struct Output {
     BytesPtr bytes;
     std::uint64_t size = 0;
@@ -153,16 +146,7 @@ struct Output {
 
     std::uint8_t* next() const { return bytes.get() + used; }
     std::uint64_t left() const { return size - used; }
-    DERItem item() const { return {bytes.get(), used}; }
 };
-
-// Allocates the buffer of an output whose size is set.
-bool allocate(Output* output) {
-    output->bytes.reset(static_cast<std::uint8_t*>(std::malloc(static_cast<std::size_t>(output->size))));
-    if (output->bytes == nullptr)
-        logHook()(messageLevel, "%s malloc failed.", encoding);
-    return output->bytes != nullptr;
-}
 
 template <typename Record>
 DERReturn measure(const Record& record, std::uint64_t* length) {
@@ -180,12 +164,21 @@ DERReturn write(const Record& record, Output* output) {
     return result;
 }
 
-DERReturn writeSetHeader(std::uint64_t contentLength, Output* output) {
+DERReturn writeInteger(const Octets4& value, Output* output) {
     std::uint64_t written = 0;
-    DERReturn result = DEREncodeItemSized(DERTagSet, 0, nullptr, output->next(), output->left(), &written);
+    const DERReturn result =
+        DEREncodeItemSized(DERTagInteger, sizeof value.octets, value.octets, output->next(), output->left(), &written);
+    output->used += written;
+    return result;
+}
+
+// Writes identifier and length octets of an item whose content follows.
+DERReturn writeHeader(DERTag tag, std::uint64_t contentLength, Output* output) {
+    std::uint64_t written = 0;
+    DERReturn result = DEREncodeItemSized(tag, 0, nullptr, output->next(), output->left(), &written);
     if (result != DERSuccess)
         return result;
-    // That was an empty SET. The length goes in the place of its one length octet.
+    // That was an item without content. The length goes in the place of its one length octet.
     output->used += written - 1;
     written = 0;
     result = DEREncodeLengthSized(contentLength, output->next(), output->left(), &written);
@@ -239,13 +232,31 @@ void reportEntryFailure(const MetadataRecord&, DERReturn result) {
     logHook()(messageLevel, "Failed to encode metadata entry sequence with return: %d", static_cast<int>(result));
 }
 
-// Calls `step` with the record of each entry, every one even when one fails.
-template <typename Record, typename Entry, typename Step>
-bool forEachRecord(const Entry* first, Step step) {
+// Adds up the encodings of a list's entries, all of them even when one fails. False, after reporting it, when an entry
+// cannot be written.
+template <typename Record, typename Entry>
+bool measureEntries(const Entry* first, std::uint64_t* contentLength) {
+    bool complete = true;
+    for (const Entry* entry = first; entry != nullptr; entry = entry->next) {
+        if (!hasValue(*entry))
+            return false;
+        const Record record(*entry);
+        std::uint64_t length = 0;
+        if (const DERReturn result = measure(record, &length); result != DERSuccess) {
+            reportEntryFailure(record, result);
+            complete = false;
+        }
+        *contentLength += length;
+    }
+    return complete;
+}
+
+template <typename Record, typename Entry>
+bool writeEntries(const Entry* first, Output* output) {
     bool complete = true;
     for (const Entry* entry = first; entry != nullptr; entry = entry->next) {
         const Record record(*entry);
-        if (const DERReturn result = step(record); result != DERSuccess) {
+        if (const DERReturn result = write(record, output); result != DERSuccess) {
             reportEntryFailure(record, result);
             complete = false;
         }
@@ -253,110 +264,76 @@ bool forEachRecord(const Entry* first, Step step) {
     return complete;
 }
 
-// Adds up the encodings of a list's entries. False, after reporting it, when one of them cannot be written.
-template <typename Record, typename Entry>
-bool measureEntries(const Entry* first, std::uint64_t* contentLength) {
-    for (const Entry* entry = first; entry != nullptr; entry = entry->next)
-        if (!hasValue(*entry))
-            return false;
-    return forEachRecord<Record>(first, [=](const Record& record) {
-        std::uint64_t length = 0;
-        const DERReturn result = measure(record, &length);
-        *contentLength += length;
-        return result;
-    });
+bool reportManifest(DERReturn result) {
+    if (result != DERSuccess)
+        logHook()(messageLevel, "Failed to encode manifest sequence with return: %d", static_cast<int>(result));
+    return result == DERSuccess;
 }
 
-template <typename Record, typename Entry>
-bool writeEntries(const Entry* first, Output* output) {
-    return forEachRecord<Record>(first, [=](const Record& record) { return write(record, output); });
+bool reportPayload(DERReturn result) {
+    if (result != DERSuccess)
+        logHook()(messageLevel, "Failed to encode payload sequence with return: %d", static_cast<int>(result));
+    return result == DERSuccess;
 }
 
-// One blob on its way. The last three elements are encoded into parts of their own, then put together.
-struct Blob {
-    const __SysConfig3& object;
-    ManifestRecord manifestRecord;
-    Octets4 magic;
-    Octets4 version;
-    std::uint64_t payloadContentLength = 0;
-    std::uint64_t metadataContentLength = 0;
-    Output payload;
-    Output metadata;
-    Output manifest;
-    Output whole;
+bool reportWhole(DERReturn result) {
+    if (result != DERSuccess)
+        logHook()(messageLevel, "Failed to encode sequence with return: %d", static_cast<int>(result));
+    return result == DERSuccess;
+}
 
-    explicit Blob(const __SysConfig3& source)
-        : object(source),
-          manifestRecord(*source.manifest),
-          magic(octetsOf(source.magic)),
-          version(octetsOf(source.version)) {}
-
-    bool measureParts() {
-        if (!measureEntries<PayloadRecord>(object.payload.first, &payloadContentLength) ||
-            !measureEntries<MetadataRecord>(object.metadata.first, &metadataContentLength))
-            return false;
-        payload.size = DERLengthOfItem(DERTagSet, payloadContentLength);
-        metadata.size = DERLengthOfItem(DERTagSet, metadataContentLength);
-        const DERReturn result = measure(manifestRecord, &manifest.size);
-        if (result != DERSuccess)
-            logHook()(messageLevel, "Failed to encode manifest sequence with return: %d", static_cast<int>(result));
-        return result == DERSuccess;
-    }
-
-    bool measureWhole() {
-        // Measuring looks at lengths only.
-        const BlobItems items = {itemOf(magic),
-                                 itemOf(version),
-                                 {nullptr, payload.size},
-                                 {nullptr, metadata.size},
-                                 {nullptr, manifest.size}};
-        DERReturn result = DERLengthOfEncodedSequenceFromObject(DERTagSequence, &items, sizeof items,
-                                                                DEREncodeSysConfig3ItemSpecs_count,
-                                                                DEREncodeSysConfig3ItemSpecs, &whole.size);
-        if (result == DERSuccess && whole.size > UINT32_MAX)
-            result = DERBufferOverflow;
-        return reportWhole(result);
-    }
-
-    bool writePayload() {
-        if (!allocate(&payload))
-            return false;
-        const DERReturn result = writeSetHeader(payloadContentLength, &payload);
-        if (result != DERSuccess)
-            logHook()(messageLevel, "Failed to encode payload sequence with return: %d", static_cast<int>(result));
-        return result == DERSuccess && writeEntries<PayloadRecord>(object.payload.first, &payload);
-    }
-
-    bool writeMetadata() {
-        return allocate(&metadata) && writeSetHeader(metadataContentLength, &metadata) == DERSuccess &&
-               writeEntries<MetadataRecord>(object.metadata.first, &metadata);
-    }
-
-    bool writeManifest() {
-        if (!allocate(&manifest))
-            return false;
-        const DERReturn result = write(manifestRecord, &manifest);
-        if (result != DERSuccess)
-            logHook()(messageLevel, "Failed to encode manifest sequence with return: %d", static_cast<int>(result));
-        return result == DERSuccess;
-    }
-
-    bool writeWhole() {
-        if (!allocate(&whole))
-            return false;
-        const BlobItems items = {itemOf(magic), itemOf(version), payload.item(), metadata.item(), manifest.item()};
-        return reportWhole(DEREncodeSequenceFromObject(DERTagSequence, &items, sizeof items,
-                                                       DEREncodeSysConfig3ItemSpecs_count, DEREncodeSysConfig3ItemSpecs,
-                                                       whole.next(), whole.left(), &whole.used));
-    }
-
-private:
-    static bool reportWhole(DERReturn result) {
-        if (result != DERSuccess)
-            logHook()(messageLevel, "Failed to encode sequence with return: %d", static_cast<int>(result));
-        return result == DERSuccess;
-    }
+// The sizes of a blob's parts, from the inside out.
+struct Sizes {
+    std::uint64_t payloadEntries = 0;
+    std::uint64_t payloadSet = 0;
+    std::uint64_t metadataEntries = 0;
+    std::uint64_t metadataSet = 0;
+    std::uint64_t manifestSequence = 0;
+    std::uint64_t content = 0;
+    std::uint64_t whole = 0;
 };
+
+bool measureBlob(const __SysConfig3& object, Sizes* sizes) {
+    if (!measureEntries<PayloadRecord>(object.payload.first, &sizes->payloadEntries) ||
+        !measureEntries<MetadataRecord>(object.metadata.first, &sizes->metadataEntries) ||
+        !reportManifest(measure(ManifestRecord(*object.manifest), &sizes->manifestSequence)))
+        return false;
+    sizes->payloadSet = DERLengthOfItem(DERTagSet, sizes->payloadEntries);
+    sizes->metadataSet = DERLengthOfItem(DERTagSet, sizes->metadataEntries);
+    sizes->content = 2 * DERLengthOfItem(DERTagInteger, sizeof(Octets4)) +
+                     DERLengthOfItem(payloadTag, sizes->payloadSet) + DERLengthOfItem(metadataTag, sizes->metadataSet) +
+                     DERLengthOfItem(manifestTag, sizes->manifestSequence);
+    sizes->whole = DERLengthOfItem(DERTagSequence, sizes->content);
+    return reportWhole(sizes->whole <= UINT32_MAX ? DERSuccess : DERBufferOverflow);
+}
+
+// The elements of the outer SEQUENCE.
+
+bool writeStart(const __SysConfig3& object, const Sizes& sizes, Output* output) {
+    DERReturn result = writeHeader(DERTagSequence, sizes.content, output);
+    if (result == DERSuccess)
+        result = writeInteger(octetsOf(object.magic), output);
+    if (result == DERSuccess)
+        result = writeInteger(octetsOf(object.version), output);
+    return reportWhole(result);
+}
+
+bool writePayload(const __SysConfig3& object, const Sizes& sizes, Output* output) {
+    return reportWhole(writeHeader(payloadTag, sizes.payloadSet, output)) &&
+           reportPayload(writeHeader(DERTagSet, sizes.payloadEntries, output)) &&
+           writeEntries<PayloadRecord>(object.payload.first, output);
+}
+
+bool writeMetadata(const __SysConfig3& object, const Sizes& sizes, Output* output) {
+    return reportWhole(writeHeader(metadataTag, sizes.metadataSet, output)) &&
+           writeHeader(DERTagSet, sizes.metadataEntries, output) == DERSuccess &&
+           writeEntries<MetadataRecord>(object.metadata.first, output);
+}
+
+bool writeManifest(const __SysConfig3& object, const Sizes& sizes, Output* output) {
+    return reportWhole(writeHeader(manifestTag, sizes.manifestSequence, output)) &&
+           reportManifest(write(ManifestRecord(*object.manifest), output));
+}
 
 } // namespace
 
@@ -368,11 +345,19 @@ bool encodeSysConfig3(const __SysConfig3* object, SysConfigData* out) {
     }
     if (!hasNoStaleHMAC(object, encoding))
         return false;
-    Blob blob(*object);
-    if (!blob.measureParts() || !blob.measureWhole() || !blob.writePayload() || !blob.writeMetadata() ||
-        !blob.writeManifest() || !blob.writeWhole())
+    Sizes sizes;
+    if (!measureBlob(*object, &sizes))
         return false;
-    out->length = static_cast<std::uint32_t>(blob.whole.used);
-    out->data = blob.whole.bytes.release();
+    Output output;
+    output.size = sizes.whole;
+    output.bytes.reset(static_cast<std::uint8_t*>(std::malloc(static_cast<std::size_t>(output.size))));
+    if (output.bytes == nullptr) {
+        logHook()(messageLevel, "%s malloc failed.", encoding);
+        return false;
+    }
+    if (!writeStart(*object, sizes, &output) || !writePayload(*object, sizes, &output) ||
+        !writeMetadata(*object, sizes, &output) || !writeManifest(*object, sizes, &output))
+        return false;
+    *out = {output.bytes.release(), static_cast<std::uint32_t>(output.used)};
     return true;
 }

@@ -65,8 +65,8 @@ bool replaceHMAC(const __SysConfig3* object, bool (*create)(const __SysConfig3*,
 bool matches(const __SysConfig3* object, bool (*create)(const __SysConfig3*, SysConfigData*),
              const SysConfigData& stored) {
     SysConfigData computed = {};
-    create(object, &computed);
-    const bool equal = _sysConfig3HMACsAreEqual(object->manifest->version, &stored, &computed);
+    const bool equal =
+        create(object, &computed) && _sysConfig3HMACsAreEqual(object->manifest->version, &stored, &computed);
     std::free(computed.data);
     return equal;
 }

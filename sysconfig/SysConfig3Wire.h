@@ -13,14 +13,6 @@ constexpr DERTag payloadTag = DERTagPrivateConstructed(0x53504159);
 constexpr DERTag metadataTag = DERTagPrivateConstructed(0x4D455441);
 constexpr DERTag manifestTag = DERTagPrivateConstructed(0x4D414E49);
 
-struct BlobItems {
-    DERItem magic;
-    DERItem version;
-    DERItem payload;
-    DERItem metadata;
-    DERItem manifest;
-};
-
 struct ManifestItems {
     DERItem payloadHMAC;
     DERItem metadataHMAC;

@@ -213,7 +213,7 @@ TEST(PayloadEntry, hasACommentAndOneValue) {
 }
 
 TEST(PayloadEntry, cutsStringsAtSixteenMebi) {
-    const std::string tooLong(0x1000001, 'x');
+    const std::string tooLong = std::string().append(0x1000001, 'x');
     const PayloadEntryPtr entry = payloadString(keyWCh0, tooLong.c_str(), tooLong.c_str());
     EXPECT_EQ(std::strlen(sysConfig3PayloadEntryGetComment(entry.get())), 0x1000000U);
     EXPECT_EQ(std::strlen(sysConfig3PayloadEntryGetString(entry.get())), 0x1000000U);

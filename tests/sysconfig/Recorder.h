@@ -76,8 +76,8 @@ private:
         char text[1024];
         std::va_list again;
         va_copy(again, arguments);
-        std::vsnprintf(text, sizeof text, format.data(), arguments);
-        std::string line = text;
+        const int length = std::vsnprintf(text, sizeof text, format.data(), arguments);
+        std::string line = length < 0 ? "cannot be formatted" : text;
         if (format.substr(0, 3) == "%s ") {
             const std::string_view prototype = va_arg(again, const char*);
             prototypes.emplace_back(prototype);

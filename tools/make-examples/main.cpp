@@ -1,7 +1,7 @@
 // make-examples FOLDER: writes the example blobs of examples/device/blobs into a folder that exists. The same octets
 // come out every time.
-#include <cstdio>
 #include <fstream>
+#include <iostream>
 #include <string>
 #include <vector>
 
@@ -58,14 +58,14 @@ bool write(const std::string& path, const std::uint8_t* data, std::size_t length
     file.write(reinterpret_cast<const char*>(data), static_cast<std::streamsize>(length));
     file.close();
     if (!file)
-        std::fprintf(stderr, "make-examples: cannot write %s\n", path.c_str());
+        std::cerr << "make-examples: cannot write " << path << "\n";
     return static_cast<bool>(file);
 }
 
 bool writeBlob(const std::string& path, const SysConfig3Ptr& object) {
     SysConfigData out = {};
     if (!encodeSysConfig3(object.get(), &out)) {
-        std::fprintf(stderr, "make-examples: cannot encode %s\n", path.c_str());
+        std::cerr << "make-examples: cannot encode " << path << "\n";
         return false;
     }
     const BytesPtr owner(out.data);
@@ -75,15 +75,16 @@ bool writeBlob(const std::string& path, const SysConfig3Ptr& object) {
 // One blob for each magic and version, all with the same two entries.
 bool writeEveryMagicAndVersion(const std::string& folder) {
     constexpr char magics[][5] = {"0Cfg", "appv", "bCfg", "dCfg", "eCfg", "fCfg", "mCfg", "seal", "tCfg"};
-    constexpr SysConfig3Version versions[] = {0x30001, 0x30002, 0x30003};
+    const struct {
+        SysConfig3Version number;
+        const char* name;
+    } versions[] = {{0x30001, "30001"}, {0x30002, "30002"}, {0x30003, "30003"}};
     for (const auto& magic : magics) {
-        for (const SysConfig3Version version : versions) {
-            const SysConfig3Ptr object = newObject(fourCharacterCode(magic), version);
-            char versionText[16];
-            std::snprintf(versionText, sizeof versionText, "%X", version);
+        for (const auto& version : versions) {
+            const SysConfig3Ptr object = newObject(fourCharacterCode(magic), version.number);
             if (!addData(object, fourCharacterCode("ExDt"), "example", {0x01, 0x02, 0x03, 0x04}) ||
                 !add(object, allocSysConfig3MetadataEntry("magic", nullptr, 0, magic)) ||
-                !writeBlob(folder + "/" + magic + "-" + versionText + ".bin", object))
+                !writeBlob(folder + "/" + magic + "-" + version.name + ".bin", object))
                 return false;
         }
     }
@@ -114,7 +115,7 @@ bool writeHoldsWCh0(const std::string& folder) {
 
 int main(int argc, char** argv) {
     if (argc != 2) {
-        std::fprintf(stderr, "usage: make-examples FOLDER\n");
+        std::cerr << "usage: make-examples FOLDER\n";
         return 2;
     }
     const std::string folder = argv[1];
