@@ -29,8 +29,8 @@ FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode = 0, std
 // Opens the directory at the device path `path` for reading and for the *at system calls.
 FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve = 0);
 
-// Opens the directory at the device path `path`, which is made first when it is missing: with mode `mode`, and those above
-// it with mode 0755. What is made outlasts a power cut.
+// Opens the directory at the device path `path`, which is made first when it is missing: with mode `mode`, and those
+// above it with mode 0755. What is made outlasts a power cut.
 FileDescriptor makeDirectoryInRoot(std::string_view path, mode_t mode);
 
 // A device path taken apart at its last slash.
