@@ -76,6 +76,8 @@ void newLog(int level, std::string_view text, std::initializer_list<FormatArgume
     return; // a line that memory does not suffice for is lost; the work it tells of goes on
 }
 
-void LogSource::write(LogLevel level, LineFormat format, std::initializer_list<FormatArgument> arguments) const {
+void LogSource::write(LogLevel level, LineFormat format, std::initializer_list<FormatArgument> arguments) const try {
     newLog(level, "[%@:%d] %@\n", {file, format.line, ::format(format.text, arguments)});
+} catch (const std::exception&) {
+    return; // as above
 }

@@ -84,9 +84,10 @@ typedef struct DERItemSpec {
 // Result of the operations of the codec and of the decoders built on it. The values are fixed; 4 is not used. Callbacks
 // and the decoders above may return any other 32-bit value too, which C++ allows only for a type of fixed width.
 #ifdef __cplusplus
-typedef enum DERReturn : uint32_t {
+enum DERReturn : uint32_t {
 #else
-typedef enum DERReturn {
+typedef uint32_t DERReturn;
+enum {
 #endif
     DERSuccess = 0,
     // No further item in the sequence. The regular end of a walk, not an error.
@@ -102,7 +103,7 @@ typedef enum DERReturn {
     // A value does not fit: an INTEGER is too large, an offset lies beyond the record, or the output buffer is too
     // small.
     DERBufferOverflow = 7
-} DERReturn;
+};
 
 #ifdef __cplusplus
 }

@@ -4,8 +4,10 @@
 
 #include <cstdint>
 #include <mutex>
+#include <optional>
 #include <string_view>
 
+#include "platform/Error.h"
 #include "platform/Value.h"
 
 // The one place through which the plug-in asks about the device. Nothing is read at construction and nothing is cached:
@@ -48,6 +50,26 @@ public:
     // four-character code `tag` (the first character in the most significant byte) in the ticket's "sepi" object is
     // true. A ticket that is missing or cannot be decoded, and a missing property, are a level-2 log line and false.
     bool getPostSwapEntitlement(std::uint32_t tag) const;
+
+    // The hardware registry's first service of a class. On success *service is its handle, which the caller gives back
+    // with HardwareRegistry::releaseService; on failure it stays as it was.
+    std::optional<Error> getService(std::string_view className, std::uint32_t* service) const;
+
+    // The top module's certificate as the hardware registry has it: a CMS certificates-only message or one certificate
+    // in DER, unchecked and possibly empty. On success *certificate, when `certificate` is given, is that data; on
+    // failure it stays as it was. A property of another kind than data counts as none.
+    std::optional<Error> getTcrtCertificate(Value* certificate) const;
+
+    // The serial number of a certificate, as getTcrtCertificate hands it out, or of the first one of several: its
+    // content octets as lower-case hexadecimal text. Nothing, and a level-4 line, for what holds no certificate.
+    Value getCertificateSerialNumber(const Value& certificate) const;
+
+    // 32 bytes from the secure random source as data, other ones each time; nothing when that source is broken.
+    Value createChallenge() const;
+
+    // Whether the display's top module answers a challenge rightly, or is of a model that needs not. Blocks for at most
+    // 10 seconds; a module that has not answered by then has failed, and what it answers later changes nothing.
+    bool authenticateDisplay() const;
 
     // Four of the identities under the names of properties.
     Value coverGlassSerialNumber() const { return getCoverGlassSerialNumber(); }

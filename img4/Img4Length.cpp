@@ -21,7 +21,7 @@ DERReturn parseLength(const DERItem& buffer, uint32_t magic, uint64_t* total) {
         return result;
     if (innerLength == 0)
         return DERDecodeError;
-    if (!equalsFourCC(inner.content, magic))
+    if (innerLength != inner.content.length || !equalsFourCC(inner.content, magic))
         return DERUnexpectedTag;
     const uint64_t headerLength = static_cast<uint64_t>(outer.content.data - buffer.data);
     if (outerLength > UINT64_MAX - headerLength)

@@ -46,7 +46,7 @@ DERReturn parseCompression(const Img4Record& record, uint32_t* algorithm, uint32
 
 // The content of the payload's [0], absent when there is none.
 DERReturn parseProperties(const Img4Record& record, DERItem* properties) {
-    Img4PayloadWithProperties fields;
+    Img4PayloadWithProperties fields = {};
     const DERReturn result = DERParseSequence(&record.payloadRaw, DERNumImg4PayloadWithPropertiesItemSpecs,
                                               DERImg4PayloadWithPropertiesItemSpecs, &fields, sizeof fields);
     *properties = fields.properties;

@@ -19,6 +19,16 @@ using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Val
 // of the export, or one of "OrloExport" 2002 that says which identity could not be gathered.
 HSMessageResponse OrloExport(const HSMessageRequest& request, const Value& hardwareModel);
 
+// "getTCRT": answers with the top module's certificate as hexadecimal text under "CertData" (left out when it is empty)
+// and its serial number under "CertSerialNumber", "DummyCertificateSerialNumber" when that cannot be read. A model
+// whose top module has no certificate is a failure without error; otherwise the error is that of the hardware registry.
+HSMessageResponse getTCRT(const HSMessageRequest& request, const Value& hardwareModel);
+
+// "putTCRT": has the display authenticated and then stores the top module's certificate as the "tcrt" record of the
+// screen and the top module's chip. The error is "TcrtAuthErrorDomain" 401 for a display that fails, or that of the
+// hardware registry or of the data store.
+HSMessageResponse putTCRT(const HSMessageRequest& request, const Value& hardwareModel);
+
 // "putPSD2": stores the contents of the file named by "psd2DataPath" as the secure face sensor's "psd2" record. A
 // failure has a reason under "psd2 put error".
 HSMessageResponse putPSD2(const HSMessageRequest& request, const Value& hardwareModel);

@@ -1,6 +1,5 @@
 #include <array>
 #include <cstdint>
-#include <cstdlib>
 #include <limits>
 #include <optional>
 
@@ -12,6 +11,7 @@
 
 namespace {
 
+using sysconfig::BytesPtr;
 using sysconfig::PayloadEntryPtr;
 using sysconfig::SysConfig3Ptr;
 
@@ -83,9 +83,8 @@ void addEntry(const SysConfig3Ptr& object, std::uint32_t key, const std::array<s
 Value::Data encode(const SysConfig3Ptr& object) {
     SysConfigData encoded = {};
     encodeSysConfig3(object.get(), &encoded);
-    Value::Data data(encoded.data, encoded.data + encoded.length);
-    std::free(encoded.data);
-    return data;
+    const BytesPtr owner(encoded.data);
+    return Value::Data(encoded.data, encoded.data + encoded.length);
 }
 
 } // namespace

@@ -17,6 +17,8 @@ struct CommandRow {
 // In the order in which a request's command is compared with them.
 constexpr CommandRow commands[] = {
     {"OrloExport", OrloExport},
+    {"getTCRT", getTCRT},
+    {"putTCRT", putTCRT},
     {"putPSD2", putPSD2},
     {"getPSD2", getPSD2},
     {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement},

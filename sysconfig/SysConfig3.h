@@ -13,7 +13,9 @@
 //     deallocSysConfig3(object);
 //
 // Failure. Every operation accepts a null for every pointer. A failure is a null or false result; it leaves the object
-// as it was and writes no output, unless the operation says otherwise, and says what is wrong through the log hook.
+// as it was and writes no output, unless the operation says otherwise, and says what is wrong through the log hook. A
+// few operations keep silent about a null argument: the copies, sysConfig3GetMetadataEntryForKey for a null key,
+// sysConfig3MetadataEntryGetData, and the creation of the payload and metadata HMACs for a null object.
 // Running out of memory is such a failure too: the library neither throws nor aborts.
 //
 // Ownership. What an alloc, copy or decode operation returns belongs to the caller, who releases it with the dealloc

@@ -111,8 +111,7 @@ const ProblemCase problemCases[] = {
     {"The container ends before its payload, at offset 8.", sequence({ia5("IMG4")})},
     {"The container's payload is context [0] instead of SEQUENCE, at offset 8.",
      sequence({ia5("IMG4"), context(0, {})})},
-    {"The container goes on behind its restore information, at offset ",
-     sequence({ia5("IMG4"), payload({}), integer(1)})},
+    {"The container holds INTEGER behind its last field, at offset ", sequence({ia5("IMG4"), payload({}), integer(1)})},
     {"The magic is \"IM4Q\" instead of \"IM4P\", at offset ",
      sequence({ia5("IMG4"), sequence({ia5("IM4Q"), ia5("sepi"), ia5("1"), octets({1})})})},
     {"The compression algorithm is 2, and 1 is the last, at offset ", payloadOf({compression(2, 1)})},
@@ -164,7 +163,8 @@ TEST(ShowImg4, saysWhatIsWrongAndWhere) {
 TEST(ShowImg4, notesWhatTheDecoderPassesOver) {
     const Report behind = show(join({payload({}), {1, 2, 3}}));
     EXPECT_TRUE(behind.ok);
-    EXPECT_NE(behind.text.find("followed by 3 octets that belong to nothing"), std::string::npos) << behind.text;
+    EXPECT_NE(behind.text.find("followed by octets that belong to nothing, 3 of them, at offset "), std::string::npos)
+        << behind.text;
 
     const Report twice =
         show(inRestoreInfo(join({img4maker::property("test", integer(1)), img4maker::property("test", integer(2))})));

@@ -4,8 +4,8 @@
 #include "img4/Img4.h"
 #include "tests/support/Img4Maker.h"
 
-#include <cstdio>
 #include <cstdlib>
+#include <iostream>
 #include <string_view>
 
 namespace img4answers {
@@ -73,7 +73,7 @@ void Inquiry::note(const DERItem& view) {
         return;
     if (view.data < data_ || view.data > data_ + length_ ||
         view.length > static_cast<std::size_t>(data_ + length_ - view.data)) {
-        std::fputs("a view leaves the buffer\n", stderr);
+        std::cerr << "a view leaves the buffer\n";
         std::abort();
     }
     note(static_cast<std::uint64_t>(view.data - data_));

@@ -2,6 +2,7 @@
 
 #include <mutex>
 #include <string_view>
+#include <utility>
 
 #include "Daemon/HSLog.h"
 #include "platform/SystemLog.h"
@@ -13,6 +14,7 @@ namespace {
 SystemLog onlyLog;
 std::mutex mutex;
 std::vector<std::string> lines;
+std::vector<std::string> consoleLines;
 
 // "<time>-[<file>:<number>] <message>\n" as "[<file>] <message>".
 std::string withoutTimeAndNumber(std::string_view line) {
@@ -42,12 +44,27 @@ void systemLogWrite(SystemLog*, SystemLogType type, std::string_view message) {
     lines.push_back(level + " " + withoutTimeAndNumber(message));
 }
 
-void consoleLog(std::string_view) {}
+// "<operation>:<number> - <message>" loses its number; every other line stays as it is.
+void consoleLog(std::string_view line) {
+    const std::size_t end = line.find(" - ");
+    const std::size_t number = line.substr(0, end).rfind(':');
+    std::string kept(line);
+    if (end != std::string_view::npos && number != std::string_view::npos)
+        kept.erase(number, end - number);
+    const std::lock_guard lock(mutex);
+    consoleLines.push_back(std::move(kept));
+}
 
 void recordLog() {
     logInit(nullptr);
     const std::lock_guard lock(mutex);
     lines.clear();
+    consoleLines.clear();
+}
+
+std::vector<std::string> recordedConsole() {
+    const std::lock_guard lock(mutex);
+    return consoleLines;
 }
 
 std::vector<std::string> recordedLog() {

@@ -9,6 +9,9 @@
 // Starts recording; earlier lines are forgotten.
 void recordLog();
 
+// The console lines since recordLog, with the line number of an operation's line left out: "<operation> - <message>".
+std::vector<std::string> recordedConsole();
+
 // The lines since recordLog, as "<level> [<file>] <message>", without time and line number.
 std::vector<std::string> recordedLog();
 

@@ -1,5 +1,8 @@
 #include "tools/orloctl/Client.h"
 
+#include <algorithm>
+#include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <memory>
 #include <optional>
@@ -17,7 +20,7 @@ constexpr const char* servicePath = "/com/tevari/VeltraOrloServices";
 constexpr const char* serviceInterface = "com.tevari.VeltraPluginServer";
 
 using Clock = std::chrono::steady_clock;
-using BusPtr = std::unique_ptr<sd_bus, decltype(&sd_bus_flush_close_unref)>;
+using BusPtr = std::unique_ptr<sd_bus, decltype(&sd_bus_close_unref)>;
 using MessagePtr = std::unique_ptr<sd_bus_message, decltype(&sd_bus_message_unref)>;
 using SlotPtr = std::unique_ptr<sd_bus_slot, decltype(&sd_bus_slot_unref)>;
 
@@ -85,9 +88,8 @@ Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address)
         return answer;
     }
     const std::string where = " on the bus \"" + address.bus + "\"";
-    if (std::string_view(error.name) == SD_BUS_ERROR_NO_REPLY || std::string_view(error.name) == SD_BUS_ERROR_TIMEOUT)
-        answer.problem = "The service" + where + " did not answer: " + text + " (the timeout is " +
-                         std::to_string(address.timeout.count()) + " s)";
+    if (std::string_view(error.name) == SD_BUS_ERROR_NO_REPLY)
+        answer.problem = "The service" + where + " did not answer: " + text;
     else if (std::string_view(error.name) == SD_BUS_ERROR_SERVICE_UNKNOWN)
         answer.problem = "The service " + std::string(serviceName) + " is not running" + where + ".";
     else
@@ -112,20 +114,32 @@ int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
     return 0;
 }
 
+Answer noAnswer(const ServiceAddress& address, const std::string& why) {
+    return {Outcome::Unreachable,
+            {},
+            "The service on the bus \"" + address.bus + "\" did not answer: " + why + " (the timeout is " +
+                std::to_string(address.timeout.count()) + " s)"};
+}
+
+// The timeout counts from here, also while the bus itself keeps the client waiting.
 Answer converse(sd_bus* connection, const ServiceAddress& address, const std::string& command,
                 const Value::Dictionary& arguments) {
+    constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
+    constexpr std::chrono::microseconds tick = std::chrono::seconds(1);
+    const auto deadline = Clock::now() + address.timeout;
     const MessagePtr message = requestMessage(connection, command, arguments);
-    const auto timeout = std::chrono::microseconds(address.timeout).count();
     Pending pending{address, command, {}};
     sd_bus_slot* slot = nullptr;
-    check(sd_bus_call_async(connection, &slot, message.get(), onReply, &pending, static_cast<std::uint64_t>(timeout)));
+    check(sd_bus_call_async(connection, &slot, message.get(), onReply, &pending, noTimeoutOfItsOwn));
     const SlotPtr slotOwner(slot, sd_bus_slot_unref);
-    constexpr std::uint64_t oneSecond = 1'000'000;
     ElapsedTime elapsed;
     while (!pending.answer) {
         if (check(sd_bus_process(connection, nullptr)) > 0)
             continue;
-        check(sd_bus_wait(connection, oneSecond));
+        const auto left = std::chrono::duration_cast<std::chrono::microseconds>(deadline - Clock::now());
+        if (left.count() <= 0)
+            return noAnswer(address, "time is up");
+        check(sd_bus_wait(connection, static_cast<std::uint64_t>(std::min(left, tick).count())));
         elapsed.show();
     }
     return *pending.answer;
@@ -138,7 +152,7 @@ Answer sendRequest(const ServiceAddress& address, const std::string& command, co
     if (const int result = bus::open(address.bus, &opened); result < 0)
         return {
             Outcome::Unreachable, {}, "Cannot reach the bus \"" + address.bus + "\": " + bus::Failure(result).what()};
-    const BusPtr connection(opened, sd_bus_flush_close_unref);
+    const BusPtr connection(opened, sd_bus_close_unref);
     try {
         return converse(connection.get(), address, command, arguments);
     } catch (const bus::Refusal& refusal) {

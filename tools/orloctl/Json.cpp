@@ -3,6 +3,7 @@
 #include <limits>
 
 #include "Daemon/Conversions.h"
+#include "platform/linux/system/Json.h"
 
 namespace {
 
@@ -13,13 +14,10 @@ constexpr int maximumNesting = 32;
 Value valueFrom(const ordered_json& json, int nesting);
 
 Value dataFrom(const ordered_json& hexadecimal) {
-    if (!hexadecimal.is_string())
-        throw JsonFailure("\"$data\" takes a text of hexadecimal digits");
-    try {
-        return hexString2Binary(hexadecimal.get<std::string>());
-    } catch (const ConversionFailure& failure) {
-        throw JsonFailure(std::string("\"$data\": ") + failure.what());
-    }
+    const std::string digits = hexadecimal.is_string() ? hexadecimal.get<std::string>() : "-";
+    if (digits.size() % 2 != 0 || digits.find_first_not_of("0123456789abcdefABCDEF") != std::string::npos)
+        throw JsonFailure("\"$data\" takes a text of pairs of hexadecimal digits");
+    return hexString2Binary(digits);
 }
 
 Value dictionaryFrom(const ordered_json& json, int nesting) {
@@ -90,6 +88,9 @@ ordered_json jsonFromValue(const Value& value) {
 }
 
 Value valueFromJson(const std::string& text) {
+    std::string refusal;
+    if (!jsonToValue(text, &refusal))
+        throw JsonFailure("holds " + refusal);
     try {
         return valueFrom(ordered_json::parse(text), 0);
     } catch (const ordered_json::exception& failure) {

@@ -17,7 +17,7 @@ public:
 nlohmann::ordered_json jsonFromValue(const Value& value);
 
 // The value of a JSON text. Raises JsonFailure for malformed JSON and for what no Value can hold: null, a number with a
-// fraction or beyond 64 bits, a nesting of more than 32.
+// fraction or beyond 64 bits, a key that stands twice in one object, a nesting of more than 32.
 Value valueFromJson(const std::string& text);
 
 #endif

@@ -73,9 +73,11 @@ std::string padded(std::uint64_t number, std::size_t width) {
 
 class Tree {
 public:
-    Tree(const std::uint8_t* data, std::size_t length) : data_(data), whole_{data, length} {}
+    // The findings go into `report`.
+    Tree(const std::uint8_t* data, std::size_t length, Report& report)
+        : data_(data), whole_{data, length}, report_(report) {}
 
-    Report show();
+    void show();
 
 private:
     // Each returns false when the tree ends here.
@@ -89,7 +91,7 @@ private:
     const std::uint8_t* data_;
     DERItem whole_;
     std::uint64_t items_ = 0;
-    Report report_;
+    Report& report_;
 };
 
 void Tree::note(std::uint64_t offset, const DerFault& fault) {
@@ -164,7 +166,7 @@ bool Tree::walk(const DERItem& content, unsigned depth, ordered_json& items) {
     return true;
 }
 
-Report Tree::show() {
+void Tree::show() {
     ordered_json items = ordered_json::array();
     report_.json["length"] = whole_.length;
     report_.text = "  offset  hdr  content  item\n";
@@ -177,11 +179,12 @@ Report Tree::show() {
         report_.json["itemsNotShown"] = items_ - mostShown;
         report_.text += std::to_string(items_ - mostShown) + " further items are not shown\n";
     }
-    return std::move(report_);
 }
 
 } // namespace
 
 Report showDer(const std::uint8_t* data, std::size_t length) {
-    return Tree(data, length).show();
+    Report report;
+    Tree(data, length, report).show();
+    return report;
 }

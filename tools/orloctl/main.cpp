@@ -1,14 +1,15 @@
 // orloctl: the host's side of the service, for people and scripts.
-#include <cstdio>
-#include <cstdlib>
+#include <algorithm>
 #include <exception>
 #include <functional>
 #include <iostream>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <CLI/CLI.hpp>
 
+#include "Daemon/Conversions.h"
 #include "platform/Files.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
@@ -27,7 +28,8 @@ constexpr const char* resultPath = "/tmp/new_bCfg";
 constexpr const char* exitStatuses = R"(Exit status:
   0  success
   1  the plug-in answered with a failure
-  2  wrong usage, or a local file that cannot be read or written
+  2  wrong usage, a request that the service refuses, or a local file that
+     cannot be read or written
   3  the service cannot be reached, or did not answer in time
   4  the plug-in does not know the command
   5  an offline reader met bad input
@@ -97,6 +99,8 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
         std::cout << "  result: " << remarks.result << '\n';
     if (!remarks.note.empty())
         std::cerr << "orloctl: " << remarks.note << '\n';
+    if (!answer.problem.empty() && answer.outcome == Outcome::Usage)
+        std::cerr << "orloctl: " << answer.problem << '\n';
     return status;
 }
 
@@ -116,6 +120,25 @@ int exportClasses(const Options& options, const std::vector<std::string>& classe
     return send(options, "OrloExport", arguments);
 }
 
+int getTcrt(const Options& options, const std::string& copyPath) {
+    const Answer answer = sendRequest(options.address, "getTCRT", {});
+    if (answer.outcome != Outcome::Success)
+        return report(options, answer);
+    const Value response(answer.response);
+    const std::string* text = response["response"]["CertData"].text();
+    Remarks remarks;
+    if (response["response"]["CertSerialNumber"] == Value("DummyCertificateSerialNumber"))
+        remarks.note = "the serial number cannot be read: the hardware registry holds no certificate but other bytes";
+    if (!text)
+        remarks.note = "the certificate in the hardware registry is empty";
+    if (!copyPath.empty()) {
+        const Value::Data certificate = text ? hexString2Binary(*text) : Value::Data{};
+        writeLocalFile(copyPath, certificate);
+        remarks.result = copyPath + ", " + std::to_string(certificate.size()) + " bytes";
+    }
+    return report(options, answer, remarks);
+}
+
 int setBcfg(const Options& options, const std::string& devicePath, const std::string& copyPath) {
     const Answer answer = sendRequest(options.address, "setGlobalbCfg", {{"bcfgDataPath", devicePath}});
     if (answer.outcome != Outcome::Success)
@@ -129,12 +152,20 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
     if (result && result->empty())
         remarks.note = "the result is empty: " + devicePath +
                        " is missing on the device, or is no configuration blob that can be rewritten";
-    if (!copyPath.empty()) {
-        if (!result)
-            return fail(options, Outcome::Usage, remarks.note);
-        writeLocalFile(copyPath, *result);
+    if (copyPath.empty())
+        return report(options, answer, remarks);
+    if (result) {
+        try {
+            writeLocalFile(copyPath, *result);
+            return report(options, answer, remarks);
+        } catch (const UsageError& failure) {
+            remarks.note = failure.what();
+        }
     }
-    return report(options, answer, remarks);
+    Answer uncopied = answer;
+    uncopied.outcome = Outcome::Usage;
+    uncopied.problem = "The request was carried out, but its result was not copied.";
+    return report(options, uncopied, remarks);
 }
 
 int show(const Options& options, const Report& found) {
@@ -173,6 +204,8 @@ public:
     }
 
     int run(int argc, char** argv) {
+        // A failure to parse the command line may come before the flag is read.
+        options_.json = std::find(argv, argv + argc, std::string_view("--json")) != argv + argc;
         try {
             app_.parse(argc, argv);
             options_.address.timeout = std::chrono::seconds(options_.timeoutSeconds);
@@ -181,8 +214,8 @@ public:
             return app_.exit(printed);
         } catch (const CLI::ParseError& wrong) {
             return fail(options_, Outcome::Usage, std::string(wrong.what()) + " (orloctl --help says more)");
-        } catch (const UsageError& wrong) {
-            return fail(options_, Outcome::Usage, wrong.what());
+        } catch (const std::exception& failure) {
+            return fail(options_, Outcome::Usage, failure.what());
         }
     }
 
@@ -196,6 +229,13 @@ private:
         verb = app_.add_subcommand("check-entitlement",
                                    "Ask whether the boot ticket entitles the device to swapped parts");
         verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
+
+        verb = app_.add_subcommand("get-tcrt", "Read the top module's certificate and its serial number");
+        verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file");
+        verb->callback([this] { run_ = [this] { return getTcrt(options_, copyPath_); }; });
+
+        verb = app_.add_subcommand("put-tcrt", "Authenticate the display and store the top module's certificate");
+        verb->callback([this] { run_ = [this] { return call(options_, "putTCRT", {}); }; });
 
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
         verb->add_option("FILE", path_, "The blob, a path on the device")->required();
@@ -267,10 +307,5 @@ private:
 } // namespace
 
 int main(int argc, char** argv) {
-    try {
-        return CommandLine().run(argc, argv);
-    } catch (const std::exception& failure) {
-        std::cerr << "orloctl: " << failure.what() << '\n';
-        return static_cast<int>(Outcome::Usage);
-    }
+    return CommandLine().run(argc, argv);
 }

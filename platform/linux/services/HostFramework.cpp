@@ -117,7 +117,8 @@ const sd_bus_vtable methods[] = {
     SD_BUS_VTABLE_END,
 };
 
-// SIGTERM and SIGINT arrive through the event loop, between two requests. The mask is inherited by every thread.
+// From here on SIGTERM and SIGINT arrive through the event loop, between two requests. The mask is inherited by every
+// thread that is made later.
 int watchSignals(sd_event* event) {
     sigset_t signals;
     sigemptyset(&signals);
@@ -158,19 +159,20 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     const std::string name(serviceName);
     const std::string which = busInUse();
     connection_ = new Connection;
-    int result = sd_event_new(&connection_->event);
+    std::signal(SIGPIPE, SIG_IGN); // a reader of standard error that is gone must not end the service
+    int result = bus::open(which, &connection_->bus);
     if (result >= 0)
-        result = watchSignals(connection_->event);
+        result = sd_bus_add_object_vtable(connection_->bus, nullptr, objectPath(name).c_str(), interfaceName, methods,
+                                          static_cast<VeltraPluginServer*>(this));
+    // The first call that waits for the bus.
+    const char* uniqueName = nullptr;
     if (result >= 0)
-        result = bus::open(which, &connection_->bus);
+        result = sd_bus_get_unique_name(connection_->bus, &uniqueName);
     if (result < 0) {
         consoleLog(name + ": cannot reach the bus \"" + which + "\": " + bus::Failure(result).what());
         return false;
     }
-    result = sd_bus_add_object_vtable(connection_->bus, nullptr, objectPath(name).c_str(), interfaceName, methods,
-                                      static_cast<VeltraPluginServer*>(this));
-    if (result >= 0)
-        result = sd_bus_request_name(connection_->bus, name.c_str(), 0);
+    result = sd_bus_request_name(connection_->bus, name.c_str(), 0);
     if (result < 0) {
         consoleLog(name + ": cannot own this name on the bus \"" + which +
                    "\": " + (result == -EEXIST ? "another process owns it already" : bus::Failure(result).what()));
@@ -180,7 +182,11 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
 }
 
 void VeltraPluginServer::resume() {
-    int result = sd_bus_set_exit_on_disconnect(connection_->bus, 1);
+    int result = sd_event_new(&connection_->event);
+    if (result >= 0)
+        result = watchSignals(connection_->event);
+    if (result >= 0)
+        result = sd_bus_set_exit_on_disconnect(connection_->bus, 1);
     if (result >= 0)
         result = sd_bus_attach_event(connection_->bus, connection_->event, SD_EVENT_PRIORITY_NORMAL);
     if (result >= 0) {

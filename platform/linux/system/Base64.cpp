@@ -32,7 +32,7 @@ std::optional<Value::Data> base64Decode(std::string_view text) {
     for (std::size_t at = 0; at < characters.size(); at += piece) {
         const int length = static_cast<int>(std::min(piece, characters.size() - at));
         const auto* const place = reinterpret_cast<const unsigned char*>(characters.data() + at);
-        if (EVP_DecodeBlock(out.data() + at / 4 * 3, place, length) < 0)
+        if (EVP_DecodeBlock(out.data() + at / 4 * 3, place, length) != length / 4 * 3)
             return std::nullopt;
     }
     out.resize(out.size() - padding);

@@ -1,19 +1,26 @@
 #include "platform/Crypto.h"
 
+#include <cerrno>
 #include <cstring>
 
 #include <openssl/core_names.h>
+#include <openssl/crypto.h>
 #include <openssl/evp.h>
 #include <openssl/params.h>
-#include <openssl/rand.h>
+#include <sys/random.h>
 
 namespace crypto {
 
 namespace {
 
+// Whether the library could be set up at its first use, which its own operations take for granted.
+bool libraryIsUsable() noexcept {
+    return OSSL_LIB_CTX_get0_global_default() != nullptr;
+}
+
 bool digest(const EVP_MD* algorithm, const void* data, std::size_t length, std::uint8_t* out,
             std::size_t size) noexcept {
-    if (EVP_Digest(data, length, out, nullptr, algorithm, nullptr) == 1)
+    if (libraryIsUsable() && EVP_Digest(data, length, out, nullptr, algorithm, nullptr) == 1)
         return true;
     std::memset(out, 0, size);
     return false;
@@ -44,8 +51,10 @@ HMACSHA256::~HMACSHA256() {
 bool HMACSHA256::init(const void* key, std::size_t length) noexcept {
     usable_ = false;
     if (!context_) {
+        if (!libraryIsUsable())
+            return false;
         EVP_MAC* mac = EVP_MAC_fetch(nullptr, "HMAC", nullptr);
-        context_ = EVP_MAC_CTX_new(mac);
+        context_ = mac ? EVP_MAC_CTX_new(mac) : nullptr;
         EVP_MAC_free(mac);
     }
     if (!context_)
@@ -71,15 +80,18 @@ bool HMACSHA256::final(std::uint8_t (&out)[sha256Size]) noexcept {
 }
 
 bool randomBytes(void* out, std::size_t length) noexcept {
-    auto* bytes = static_cast<unsigned char*>(out);
-    while (length > 0) {
-        const int piece = length > 1 << 20 ? 1 << 20 : static_cast<int>(length);
-        if (RAND_bytes(bytes, piece) != 1) {
-            std::memset(out, 0, static_cast<std::size_t>(bytes - static_cast<unsigned char*>(out)));
+    auto* next = static_cast<std::uint8_t*>(out);
+    std::size_t left = length;
+    while (left > 0) {
+        const ssize_t count = ::getrandom(next, left, 0);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count <= 0) {
+            std::memset(out, 0, length);
             return false;
         }
-        bytes += piece;
-        length -= static_cast<std::size_t>(piece);
+        next += count;
+        left -= static_cast<std::size_t>(count);
     }
     return true;
 }

@@ -83,12 +83,13 @@ std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size
         return std::nullopt;
 
     // One byte more than stated, so that a file that is as long as it says needs one read for the bytes and one for
-    // the end, into the same memory.
-    Value::Data contents(stated + 1);
+    // the end, into the same memory; and at least a page, since a kernel node that states no size may give all it has
+    // to the first read only.
+    Value::Data contents(std::max<std::size_t>(stated + 1, 4096));
     std::size_t filled = 0;
     while (true) {
         if (filled == contents.size())
-            contents.resize(std::min(std::max<std::size_t>(contents.size() * 2, 4096), maximum + 1));
+            contents.resize(std::min(contents.size() * 2, maximum + 1));
         const ssize_t count = ::read(file.get(), contents.data() + filled, contents.size() - filled);
         if (count < 0 && errno == EINTR)
             continue;

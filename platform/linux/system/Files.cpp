@@ -17,11 +17,6 @@ namespace {
 
 constexpr mode_t logMode = 0640;
 
-bool isRegular(const FileDescriptor& file) {
-    struct stat status;
-    return ::fstat(file.get(), &status) == 0 && S_ISREG(status.st_mode);
-}
-
 // Whether `name` is free or a regular file.
 bool mayBeReplaced(const FileDescriptor& directory, const std::string& name) {
     struct stat status;
@@ -61,7 +56,11 @@ bool replace(std::string_view path, const Value::Data& contents, std::optional<E
 
 bool append(std::string_view path, std::string_view text) {
     const FileDescriptor file = openInRoot(path, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK, logMode);
-    if (!file || !isRegular(file))
+    struct stat status;
+    if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode))
+        return false;
+    // A new file has the mode that it should have, whatever bits the umask took.
+    if (status.st_size == 0 && (status.st_mode & 07777) != logMode && ::fchmod(file.get(), logMode) != 0)
         return false;
     ssize_t count;
     do

@@ -7,9 +7,10 @@
 
 #include "platform/Value.h"
 
-// The value of a JSON text (RFC 8259). Objects are dictionaries, null is a value of nothing. None for anything that is
-// not JSON, for a number that is no integer of 64 signed bits (1.0 is none), for a key that stands twice in one object
-// for a nesting of more than 32 and for more than 1048576 values; *refusal, when given, then says what was met.
+// The value of a JSON text (RFC 8259). Objects are dictionaries; null, and a number that is no integer of 64 signed
+// bits (1.0 is none), are values of nothing. None for anything that is not JSON, for a key that stands twice in one
+// object, for a nesting of more than 32, and for more than 1048576 values; *refusal, when given, then says what was
+// met.
 std::optional<Value> jsonToValue(std::string_view text, std::string* refusal = nullptr);
 
 #endif

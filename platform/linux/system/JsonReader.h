@@ -14,15 +14,16 @@
 #include "platform/Value.h"
 
 // Builds a Value from the events of the library's parser. Refuses what a Value cannot hold or what no honest writer
-// sends: fractions, integers beyond 64 signed bits, texts that are no UTF-8, a key that stands twice in one dictionary,
-// collections nested deeper than `maximumNesting`, and more than `maximumValues` values, since the smallest of them
-// takes one byte of input but some fifty of memory. Declared sizes are never believed.
+// sends: fractions and integers beyond 64 signed bits (unless they may be nothing), texts that are no UTF-8, a key that
+// stands twice in one dictionary, collections nested deeper than `maximumNesting`, and more than `maximumValues`
+// values, since the smallest of them takes one byte of input but some fifty of memory. Declared sizes are never
+// believed.
 class ValueBuilder : public nlohmann::json_sax<nlohmann::json> {
 public:
     static constexpr std::size_t maximumNesting = 32;
     static constexpr std::size_t maximumValues = std::size_t{1} << 20;
 
-    // `nothingAllowed`: whether null stands for a value of nothing or is refused.
+    // `nothingAllowed`: whether null and numbers that do not fit stand for a value of nothing or are refused.
     explicit ValueBuilder(bool nothingAllowed) : nothingAllowed_(nothingAllowed) {}
 
     // The value, once the parser has accepted the whole input.
@@ -36,11 +37,11 @@ public:
     bool number_integer(number_integer_t value) override { return add(Value(value)); }
     bool number_unsigned(number_unsigned_t value) override {
         if (value > static_cast<number_unsigned_t>(std::numeric_limits<std::int64_t>::max()))
-            return refuse("an integer beyond 64 signed bits");
+            return unfitting("an integer beyond 64 signed bits");
         return add(Value(value));
     }
     bool number_float(number_float_t, const string_t&) override {
-        return refuse("a number that is no integer of 64 signed bits");
+        return unfitting("a number that is no integer of 64 signed bits");
     }
     bool string(string_t& value) override {
         return utf8::isValid(value) ? add(Value(std::move(value))) : refuse("a text that is no UTF-8");
@@ -78,6 +79,9 @@ private:
         refusal_ = std::move(what);
         return false;
     }
+
+    // A number that no Value holds.
+    bool unfitting(const char* what) { return nothingAllowed_ ? add(Value()) : refuse(what); }
 
     bool open(Level level) {
         if (levels_.size() == maximumNesting)

@@ -1,0 +1,254 @@
+"""The top module's certificate and its authentication, as the host sees them, with openssl as the judge."""
+import json
+import re
+import sqlite3
+import subprocess
+import time
+import unittest
+
+from harness import Service
+
+RELAY, AUTHENTICATOR = "TeskAuthI2CRelayInterface", "TevariAuthCPAID"
+PREFIXES = ("M3", "M8", "M9", "M4", "M11", "M12")
+NO_DISPLAY = {"domain": "TcrtAuthErrorDomain", "code": 401, "description": "Top Module Tesk Authentication Failed"}
+DUMMY = "DummyCertificateSerialNumber"
+
+
+def tcrt_error(description):
+    return {"domain": "TcrtErrorDomain", "code": 400, "description": description}
+
+
+class WatchedService(Service):
+    """A service whose console log is kept."""
+
+    def run(self, *command, **options):
+        if str(command[0]).endswith("start-service"):
+            with open(self.root / "console", "wb") as console:
+                return super().run(*command, stderr=console, **options)
+        return super().run(*command, **options)
+
+    def console_of(self, act):
+        """The console lines, without line numbers, that come while `act` runs."""
+        before = len((self.root / "console").read_text().splitlines())
+        act()
+        lines = (self.root / "console").read_text().splitlines()[before:]
+        return [re.sub(r":\d+ - ", " - ", line, count=1) for line in lines]
+
+
+class TopModuleTest(unittest.TestCase):
+    def setUp(self):
+        self.service = WatchedService()
+        self.addCleanup(self.service.close)
+        self.description = json.loads((self.service.root / "etc/veltra/device.json").read_text())
+
+    def describe(self, model="M3", holder=RELAY, **sections):
+        """Changes the device: `holder` names the class of the service that has the certificate, None removes it."""
+        self.description["answers"]["HWModelStr"] = model
+        chip = {"class": "Chip", "properties": {"AccessoryCertificate": {"$file": "/sys/tesk/cert.der", "as": "data"}}}
+        self.description["registry"] = [{"class": holder, "children": [chip]}] if holder else []
+        self.description.update(sections)
+        (self.service.root / "etc/veltra/device.json").write_text(json.dumps(self.description))
+
+    def hold(self, contents):
+        (self.service.root / "sys/tesk/cert.der").write_bytes(contents)
+
+    def example(self, name):
+        return (self.service.root / "sys/tesk" / name).read_bytes()
+
+    def call(self, verb):
+        """Exit status, and the response's dictionary and error."""
+        status, answer = self.service.orloctl(verb)
+        self.assertEqual(answer["response"]["statusCode"], 0 if status == 0 else -1, answer)
+        return status, answer["response"].get("response"), answer["response"].get("error")
+
+    def get(self):
+        status, found, error = self.call("get-tcrt")
+        self.assertEqual((status, error), (0, None))
+        return found
+
+    def openssl(self, *words, stdin=b""):
+        return subprocess.run(
+            ["openssl", *map(str, words)], input=stdin, stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, check=True
+        ).stdout
+
+    def certificate(self, key, serial):
+        """A certificate in PEM and in DER."""
+        pem = self.openssl("req", "-x509", "-new", "-key", key, "-subj", f"/CN=Module {serial}", "-set_serial", serial)
+        return pem, self.openssl("x509", "-outform", "DER", stdin=pem)
+
+    def message(self, *certificates):
+        """A certificates-only message."""
+        words = []
+        for number, pem in enumerate(certificates):
+            path = self.service.root / f"part{number}.pem"
+            path.write_bytes(pem)
+            words += ["-certfile", path]
+        return self.openssl("crl2pkcs7", "-nocrl", "-outform", "DER", *words)
+
+    def key(self, name, *kind):
+        path = self.service.root / name
+        self.openssl("genpkey", *kind, "-out", path)
+        return path
+
+
+class GetTcrt(TopModuleTest):
+    def test_openssl_agrees_on_certificate_and_serial_number(self):
+        keys = (
+            self.key("rsa.pem", "-algorithm", "RSA", "-pkeyopt", "rsa_keygen_bits:2048"),
+            self.key("ec.pem", "-algorithm", "EC", "-pkeyopt", "ec_paramgen_curve:P-384"),
+        )
+        numbers = (0x01, 0x7F, 0x80, 0x7B << 56, 0x9A << 56, 0x5A << 152, 0x81 << 144, 0xFF << 152, -5)
+        for key in keys:
+            for number in numbers:
+                pem, der = self.certificate(key, number)
+                octets = number.to_bytes(number.bit_length() // 8 + 1, "big", signed=True).hex()
+                self.assertEqual(int(self.openssl("x509", "-noout", "-serial", stdin=pem).split(b"=")[1], 16), number)
+                for contents in (der, self.message(pem)):
+                    with self.subTest(key=key.name, number=number, bare=contents is der):
+                        self.hold(contents)
+                        self.assertEqual(self.get(), {"CertData": contents.hex(), "CertSerialNumber": octets})
+
+    def test_the_first_certificate_of_several_counts_and_the_bytes_stay_as_they_are(self):
+        key = self.key("ec.pem", "-algorithm", "EC", "-pkeyopt", "ec_paramgen_curve:P-256")
+        # The second one is the shorter, so that sorting would put it in front.
+        first, second = self.certificate(key, 0x1234567890)[0], self.certificate(key, 7)[0]
+        self.hold(self.message(first, second))
+        copy = self.service.root / "copy"
+        status, answer = self.service.orloctl("get-tcrt", "-o", copy)
+        self.assertEqual(status, 0, answer)
+        self.assertEqual(copy.read_bytes(), self.example("cert.der"))
+        shown = self.openssl("pkcs7", "-inform", "DER", "-in", copy, "-print_certs")
+        self.assertEqual(self.openssl("x509", "-noout", "-serial", stdin=shown), b"serial=1234567890\n")
+        self.assertEqual(answer["response"]["response"]["CertSerialNumber"], "1234567890")
+
+    def test_every_supported_model_reads_it_and_no_other_touches_the_registry(self):
+        expected = {"CertData": self.example("cert.der").hex(), "CertSerialNumber": "009a3c5e71d2046b88"}
+        for holder in (RELAY, AUTHENTICATOR):
+            for prefix in PREFIXES:
+                self.describe(f"x{prefix}y", holder)
+                self.assertEqual(self.get(), expected)
+        for model in ("M1", "M2", "m3", "M 3", "", None):
+            self.describe(model)
+            console = self.service.console_of(lambda: self.assertEqual(self.call("get-tcrt"), (1, None, None)))
+            self.assertEqual(console, [])
+
+    def test_what_is_no_certificate_has_no_serial_number_but_is_handed_out(self):
+        good, message = self.example("cert.der"), self.example("cert.p7c")
+        no_certificates = self.message()
+        for contents in (b"\x00", good[:-1], good + b"\x00", bytes(range(256)), message + b"\x00", no_certificates,
+                         b"\x30\x80", b"\x30\x84\x7f\xff\xff\xff"):
+            with self.subTest(contents[-8:]):
+                self.hold(contents)
+                lines = self.service.messages_of(
+                    lambda: self.assertEqual(
+                        self.get(), {"CertData": contents.hex(), "CertSerialNumber": DUMMY}
+                    )
+                )
+                self.assertEqual(lines[-1], "Unable to read Certificate Serial Number")
+        self.hold(b"")
+        self.assertEqual(self.get(), {"CertSerialNumber": DUMMY})
+        self.hold(message)
+        self.assertEqual(self.get()["CertSerialNumber"], "009a3c5e71d2046b88")
+
+    def test_log_and_console_tell_every_step(self):
+        self.describe("M4", AUTHENTICATOR)
+        lines = self.service.messages_of(self.get)[4:]
+        self.assertRegex(lines[0], r"^-\[ZPOrloServices handleMessage:completion:\]:\d+ - Received getTCRT$")
+        self.assertEqual(
+            lines[1:],
+            ["cannot get service", "Serial Number : <009a3c5e71d2046b88>", "Hex Serial Number : 009a3c5e71d2046b88"],
+        )
+        get, service = "-[ZPDevice getTcrtCertificate:] - ", "-[ZPDevice getService:service:] - Entering for service "
+        self.assertEqual(
+            self.service.console_of(self.get),
+            [get + "Entering", service + RELAY, service + AUTHENTICATOR, get + "IO Service Found ",
+             get + "tcrt Found in IOReg"],
+        )
+
+    def test_a_registry_without_it_is_a_failure_that_says_what_is_missing(self):
+        for holder, act, description in (
+            (None, lambda: None, "cannot get service"),
+            (RELAY, lambda: (self.service.root / "sys/tesk/cert.der").unlink(), "tcrt is NULL in IOReg"),
+        ):
+            self.describe("M12", holder)
+            act()
+            for verb in ("get-tcrt", "put-tcrt"):
+                lines = self.service.messages_of(
+                    lambda: self.assertEqual(self.call(verb), (1, None, tcrt_error(description)))
+                )
+                self.assertIn(description, lines[-1] if holder else lines[-2])
+
+
+class PutTcrt(TopModuleTest):
+    def records(self):
+        path = self.service.root / "var/lib/orlo/store.db"
+        if not path.exists():
+            return {}
+        with sqlite3.connect(path) as store:
+            return {(row[0], row[1]): row[2] for row in store.execute("SELECT class, instance, data FROM records")}
+
+    def assert_refused(self, says):
+        """The request fails for the display, without a look at the registry by the plug-in and without a session."""
+        lines = []
+
+        def act():
+            lines.extend(self.service.messages_of(lambda: self.assertEqual(self.call("put-tcrt"), (1, None, NO_DISPLAY))))
+
+        self.assertEqual(self.service.console_of(act), [])
+        self.assertEqual(lines[-3:-1], says)
+        self.assertEqual(lines[-1], "Top Module Authentication Failed. Failing the test")
+        self.assertEqual(self.records(), {})
+
+    def test_the_record_comes_out_of_the_store_as_the_same_bytes(self):
+        certificate = self.example("cert.der")
+        for model, holder, contents in (
+            ("M3", RELAY, certificate), ("xM3y", AUTHENTICATOR, self.example("cert.p7c")), ("M3", RELAY, certificate),
+            ("M1", RELAY, b"no certificate \x00\xff"), (None, RELAY, bytes(range(256)) * 256),
+        ):
+            with self.subTest((model, holder)):
+                self.describe(model, holder)
+                self.hold(contents)
+                self.assertEqual(self.call("put-tcrt"), (0, None, None))
+                self.assertEqual(self.records(), {("tcrt", "SCR0001-TMA0001"): contents})
+
+    def test_a_missing_identity_stands_as_null_in_the_instance(self):
+        answers = self.description["answers"]
+        for missing, instance in (("ScreenSerialNumber", "(null)-TMA0001"), ("TopModuleAuthChipID", "(null)-(null)")):
+            del answers[missing]
+            self.describe("M4")
+            lines = self.service.messages_of(lambda: self.assertEqual(self.call("put-tcrt"), (0, None, None)))
+            self.assertIn(f"tcrt- : {instance}", lines)
+            self.assertEqual(self.records()[("tcrt", instance)], self.example("cert.der"))
+
+    def test_a_wrong_key_fails_and_a_right_one_passes(self):
+        self.key("other.pem", "-algorithm", "EC", "-pkeyopt", "ec_paramgen_curve:P-256")
+        for chip in ({"mode": "key", "key": "/other.pem"}, {"mode": "key"}, {"mode": "fail", "delayMs": 30}, {}):
+            self.describe("M3", componentAuth=chip)
+            self.assert_refused(["Starting Top Module Auth : M3", "Top Module Auth Passsed : 0"])
+        self.describe("M4")
+        self.assertEqual(self.call("put-tcrt"), (0, None, None))
+        self.describe("M3", componentAuth={"mode": "key", "key": "/etc/veltra/tesk-key.pem", "delayMs": 30})
+        self.assertEqual(self.call("put-tcrt"), (0, None, None))
+
+    def test_a_chip_that_answers_too_late_or_never_fails_after_10_seconds_and_the_service_serves_on(self):
+        for chip in ({"mode": "silent"}, {"mode": "pass", "delayMs": 10500}):
+            self.describe("M3", componentAuth=chip)
+            start = time.monotonic()
+            self.assert_refused(
+                ["Display Auth not completed within 10 secs. Timeout has occurred", "Top Module Auth Passsed : 0"]
+            )
+            self.assertTrue(10 <= time.monotonic() - start < 15)
+        # The late answer comes while this request waits for its own, which is not taken for it.
+        self.describe("M3", componentAuth={"mode": "fail", "delayMs": 2000})
+        self.assert_refused(["Starting Top Module Auth : M3", "Top Module Auth Passsed : 0"])
+        self.describe("M3", componentAuth={"mode": "pass"})
+        self.assertEqual(self.call("put-tcrt"), (0, None, None))
+
+    def test_a_data_store_that_fails_is_reported(self):
+        self.describe("M4", store={"backend": "none"})
+        status, _, error = self.call("put-tcrt")
+        self.assertEqual((status, error["domain"], error["code"]), (1, "Orlo Error Domain", 1008))
+
+
+if __name__ == "__main__":
+    unittest.main()

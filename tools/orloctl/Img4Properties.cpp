@@ -1,0 +1,161 @@
+#include "tools/orloctl/Img4Properties.h"
+
+#include <set>
+
+#include "der/DERDecode.h"
+#include "tools/orloctl/DerText.h"
+
+namespace img4show {
+
+using nlohmann::ordered_json;
+
+namespace {
+
+constexpr unsigned deepestDictionary = 8;
+
+// Why the decoder refuses the property in `content`, an element with the tag `tag`, and the place of the fault.
+struct PropertyFault {
+    const std::uint8_t* place;
+    std::string reason;
+};
+
+PropertyFault propertyFault(const DERItem& content, DERTag tag) {
+    DERDecodedInfo whole;
+    DERDecodedInfo item;
+    DERSequence elements;
+    const auto headerFault = [](const std::uint8_t* place, const std::uint8_t* end) -> PropertyFault {
+        const auto why = derHeaderFault({place, static_cast<std::uint64_t>(end - place)});
+        return why ? PropertyFault{place + why->offset, "is no strict DER inside: " + why->reason}
+                   : PropertyFault{place, "cannot be decoded"};
+    };
+    if (DERDecodeItem(&content, &whole) != DERSuccess)
+        return headerFault(content.data, content.data + content.length);
+    if (whole.tag != DERTagSequence)
+        return {content.data, "holds " + derTagName(whole.tag) + " instead of SEQUENCE"};
+    DERDecodeSeqContentInit(&whole.content, &elements);
+    const std::uint8_t* place = elements.next;
+    DERReturn result = DERDecodeSeqNext(&elements, &item);
+    std::uint32_t code = 0;
+    if (result == DERSuccess && (item.tag != DERTagIA5String || item.content.length != sizeof code ||
+                                 DERParseInteger(&item.content, &code) != DERSuccess))
+        return {place, "has no four-character name inside"};
+    if (result == DERSuccess && Img4PropertyTag(code) != tag)
+        return {place, "is named " + quotedText(item.content, sizeof code) + " inside"};
+    if (result == DEREndOfSequence)
+        return {place, "is empty inside"};
+    if (result == DERSuccess) {
+        place = elements.next;
+        result = DERDecodeSeqNext(&elements, &item);
+    }
+    if (result == DEREndOfSequence)
+        return {place, "has no value"};
+    if (result != DERSuccess)
+        return headerFault(place, elements.end);
+    if (elements.next != elements.end)
+        return {elements.next, "goes on behind its value"};
+    return {elements.end, "goes on behind the SEQUENCE of name and value"};
+}
+
+bool looksLikeDictionary(const DERItem& content) {
+    DERDecodedInfo first;
+    return content.length == 0 ||
+           (DERDecodeItem(&content, &first) == DERSuccess && first.tag == Img4PropertyTag(first.tag));
+}
+
+} // namespace
+
+ordered_json PropertyReader::dictionary(const DERItem& content, const std::string& where, unsigned depth) {
+    ordered_json properties = ordered_json::array();
+    std::set<DERTag> seen;
+    DERSequence sequence;
+    DERDecodedInfo element;
+    DERDecodeSeqContentInit(&content, &sequence);
+    while (sequence.next != sequence.end) {
+        const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
+        if (DERDecodeSeqNext(&sequence, &element) != DERSuccess) {
+            findings_.headerFault(rest, "A property of " + where);
+            break;
+        }
+        const DERItem encoding = {rest.data, static_cast<std::uint64_t>(sequence.next - rest.data)};
+        ordered_json property = describe(element, encoding, where, depth);
+        if (!seen.insert(element.tag).second)
+            property["hidden"] = "behind an earlier one of that tag, which a lookup takes";
+        if (++count_ <= mostProperties)
+            properties.push_back(std::move(property));
+    }
+    return properties;
+}
+
+// One element of a dictionary, which should be a property.
+ordered_json PropertyReader::describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
+                                      unsigned depth) {
+    const std::uint64_t number = element.tag & DERTagNumberMask;
+    const bool isProperty = element.tag == Img4PropertyTag(number);
+    ordered_json json = {{"name", isProperty ? codeText(number) : derTagName(element.tag)},
+                         {"offset", findings_.offsetOf(encoding.data)}};
+    const std::string what = (isProperty ? quotedCode(number) : derTagName(element.tag)) + " of " + where;
+    Img4Property property;
+    if (!isProperty) {
+        findings_.fault(encoding.data, what + " is no property");
+        json["fault"] = "is no property";
+    } else if (DERImg4DecodeProperty(&element.content, element.tag, &property) == DERSuccess) {
+        describeValue(property, what, depth, json);
+    } else {
+        const PropertyFault why = propertyFault(element.content, element.tag);
+        findings_.fault(why.place, what + ", which begins " + findings_.at(encoding.data) + ", " + why.reason);
+        json["fault"] = why.reason;
+    }
+    return json;
+}
+
+void PropertyReader::valueFault(const Img4Property& property, const std::string& what, const std::string& reason,
+                                ordered_json& json) {
+    findings_.fault(property.value.data, what + " " + reason);
+    json["fault"] = reason;
+    json["hex"] = boundedHex(property.value);
+}
+
+void PropertyReader::describeValue(const Img4Property& property, const std::string& what, unsigned depth,
+                                   ordered_json& json) {
+    const DERItem& value = property.value;
+    bool truth = false;
+    std::uint64_t number = 0;
+    json["type"] = derTagName(property.valueTag);
+    switch (property.valueTag) {
+    case DERTagBoolean:
+        if (DERParseBoolean(&value, &truth) == DERSuccess)
+            json["value"] = truth;
+        else
+            valueFault(property, what, "is a BOOLEAN that is not 00 or FF", json);
+        break;
+    case DERTagInteger:
+        if (const DERReturn result = DERParseInteger64(&value, &number); result == DERSuccess)
+            json["value"] = number;
+        else
+            valueFault(property, what,
+                       result == DERBufferOverflow ? "is an INTEGER of more than 64 bits"
+                                                   : "is no non-negative INTEGER in its shortest form",
+                       json);
+        break;
+    case DERTagIA5String:
+        json["value"] = escapedText(value, mostCharactersShown);
+        if (value.length > mostCharactersShown)
+            json["sha256"] = sha256Text(value);
+        break;
+    case DERTagSet:
+    case DERTagSequence:
+        if (depth < deepestDictionary && looksLikeDictionary(value))
+            json["properties"] = dictionary(value, quotedCode(property.tag & DERTagNumberMask), depth + 1);
+        else
+            json.update(dataJson(value));
+        break;
+    default:
+        if (const auto why = derContentFault(property.valueTag, value))
+            valueFault(property, what, "has a value that is not DER: " + why->reason, json);
+        else
+            json.update(dataJson(value));
+        break;
+    }
+}
+
+} // namespace img4show
