@@ -1,18 +1,14 @@
 // The data-store library on a real database, in a device root of its own.
 #include "platform/OrloDataStore.h"
 
-#include <algorithm>
-#include <atomic>
 #include <csignal>
 #include <filesystem>
 #include <memory>
-#include <random>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
 #include <sqlite3.h>
-#include <sys/mman.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -358,51 +354,6 @@ TEST_F(OrloDataStore, servesSeveralProcessesThatBeginWithANewStoreAtOnce) {
               (std::vector<std::string>{"ok", "120", "120"}));
     const std::filesystem::directory_iterator files(root_.host("/var/lib/orlo"));
     EXPECT_EQ(std::distance(begin(files), end(files)), 2); // the database and the trust object
-}
-
-// A record that shows from any part of it which one it is.
-Data numbered(std::uint8_t number) {
-    return Data(std::size_t{number} * 700 + 1, number);
-}
-
-TEST_F(OrloDataStore, losesNoAnsweredPutAndKeepsNoHalfOneWhenItsProcessIsKilled) {
-    auto* const answered = static_cast<std::atomic<std::uint8_t>*>(
-        ::mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0));
-    ASSERT_NE(answered, MAP_FAILED);
-    ASSERT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", numbered(0)), 0);
-    std::mt19937 random(20); // NOLINT(cert-msc51-cpp): the same moments in every run
-    for (int round = 0; round < 15; ++round) {
-        *answered = 0;
-        const pid_t pid = ::fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
-            for (std::uint8_t number = 1; number < 100; ++number) {
-                if (put(openFor("psd2", "S1"), "psd2", "S1", numbered(number)) != 0)
-                    std::_Exit(1);
-                *answered = number;
-            }
-            ::pause();
-        }
-        const std::uint8_t upTo = static_cast<std::uint8_t>(random() % 8);
-        while (*answered < upTo)
-            ::sched_yield();
-        ::usleep(static_cast<useconds_t>(random() % 3000)); // into the middle of the next put
-        ::kill(pid, SIGKILL);
-        int status = 0;
-        ASSERT_EQ(::waitpid(pid, &status, 0), pid);
-        ASSERT_TRUE(WIFSIGNALED(status));
-
-        const std::uint8_t last = *answered;
-        const Value found = get(openFor("psd2", "S1"), "psd2", "S1");
-        // The put in hand may have been done, but the answer not given. Before the first, the record is the last
-        // round's.
-        if (last > 0)
-            EXPECT_TRUE(found == Value(numbered(last)) || found == Value(numbered(last + 1))) << round;
-        else
-            EXPECT_TRUE(found.data() && *found.data() == numbered(found.data()->front())) << round;
-    }
-    ::munmap(answered, 4096);
-    EXPECT_EQ(sql("PRAGMA integrity_check; SELECT count(*) FROM records"), (std::vector<std::string>{"ok", "1"}));
 }
 
 TEST_F(OrloDataStore, tellsWhyInOneLineOfItsLog) {
