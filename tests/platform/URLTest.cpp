@@ -16,7 +16,7 @@ TEST(URL, theSyntaxOfRFC3986Decides) {
         "mailto:John.Doe@example.com",
         "tel:+1-816-555-1212",
         "telnet://192.0.2.16:80/",
-        "urn:oasis:names:specification:docbook:dtd:xml:4.1.2",
+        "urn:example:animal:ferret:nose",
         "http://a/b/c/d;p?q",
         "g:h",
         "./g:h",
