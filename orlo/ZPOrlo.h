@@ -13,8 +13,9 @@
 // One session of the data-store library. Lives for one request: put or get a record, then drop it. Each put and each
 // get sets the permission and fetches the trust object anew; nothing is kept between them.
 //
-// An operation that returns an Error or nothing has succeeded when it returns nothing. No operation raises. Only the
-// session handle may be read and written from several threads at once.
+// An operation that returns an Error or nothing has succeeded when it returns nothing. No operation raises, but for
+// std::bad_alloc where no error stands for that. Only the session handle may be read and written from several threads
+// at once.
 class ZPOrlo {
 public:
     // A session with the default options.

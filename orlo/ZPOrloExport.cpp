@@ -2,12 +2,12 @@
 
 #include <chrono>
 #include <string>
-#include <thread>
 #include <utility>
 
 #include "Daemon/HSLog.h"
 #include "orlo/OrloEndpoints.h"
 #include "orlo/OrloSession.h"
+#include "platform/Pause.h"
 
 namespace {
 
@@ -158,7 +158,7 @@ private:
             zplog.info("Successfully exported Orlo Data");
             return std::nullopt;
         }
-        std::this_thread::sleep_for(pauseAfterFailure);
+        pauseFor(pauseAfterFailure);
         return libraryError_ ? makeError(exportFailed, libraryError_->text)
                              : makeError(exportFailedSilently, nullptr, nullptr);
     }

@@ -7,7 +7,8 @@
 #include "platform/Error.h"
 #include "platform/Value.h"
 
-// Keeps no state. No operation raises, and no failure is retried.
+// Keeps no state. No operation raises, but for std::bad_alloc where no error stands for that, and no failure is
+// retried.
 class ZPOrloExport {
 public:
     // The data instance of each class in `exportList`: a dictionary from class to instance, read from the device in the

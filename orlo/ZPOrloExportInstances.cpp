@@ -44,7 +44,7 @@ struct ClassRow {
     IfMissing ifMissing = IfMissing::Stops;
     bool secondLeads = false;          // in the instance, the second identity stands before the first
     const char* readingLine = nullptr; // logged with the class once the identity has been asked for
-    const char* notJoined = nullptr;   // the message when the instance cannot be made of its parts
+    const char* notJoined = nullptr;   // the message when memory does not suffice to join them; null: the second's
 };
 
 constexpr ClassRow classes[] = {
@@ -116,8 +116,8 @@ Value readInstance(const ClassRow& row, const Value& dataClass, Value* error) {
     if (!isComposite)
         return first;
     Value instance = joined(row, first, second);
-    if (instance.isNothing() && row.notJoined)
-        report(row.notJoined, error);
+    if (instance.isNothing())
+        report(row.notJoined ? row.notJoined : row.second.missing, error);
     return instance;
 }
 

@@ -4,6 +4,6 @@
 #include <chrono>
 
 // Lets the calling thread rest for that long: hardware needs a while that nothing announces the end of.
-void pauseFor(std::chrono::seconds duration);
+void pauseFor(std::chrono::milliseconds duration);
 
 #endif

@@ -1,9 +1,12 @@
+#include <new>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include "orlo/ZPOrloExport.h"
+#include "tests/orlo/FailingAllocation.h"
 #include "tests/platform/ServicesDouble.h"
 #include "tests/support/RecordedLog.h"
 
@@ -196,6 +199,37 @@ TEST_F(DataInstances, listsMayBeEmptyRepeatClassesAndEndAtAnUnknownOne) {
         EXPECT_EQ(error_, Value("Key doesn't exist - " + unknown.description()));
         EXPECT_EQ(keysAsked(), Lines{"CoverGlassSNKey"});
         EXPECT_EQ(exportLog(), Lines{"4 [ZPOrloExport] Key " + unknown.description() + " doesn't exist"});
+    }
+}
+
+TEST_F(DataInstances, anInstanceThatMemoryDoesNotSufficeForStops) {
+    const std::pair<const char*, const char*> rows[] = {{"tcrt", "Error Reading gpCl SN"},
+                                                        {"AlsH", "Error Reading Ambient Light SN"}};
+    for (const auto& [dataClass, message] : rows) {
+        bool isReported = false;
+        bool hasFailed = true;
+        for (int count = 1; hasFailed; ++count) {
+            answerAllBut({});
+            services_.answers["ScreenSerialNumber"] = "a number that no small string holds";
+            services_.answers["CoverGlassSNKey"] = "another number that no small string holds";
+            const Value::Array list = {dataClass};
+            Value gathered;
+            failAllocation(count);
+            try {
+                gathered = gather(list);
+            } catch (const std::bad_alloc&) {
+                error_ = {}; // memory ran out elsewhere
+            }
+            hasFailed = allocationHasFailed();
+            failAllocation(0);
+            if (error_.isNothing())
+                continue;
+            isReported = true;
+            EXPECT_EQ(gathered, Value());
+            EXPECT_EQ(error_, Value(message));
+            EXPECT_EQ(exportLog(), Lines{std::string("4 [ZPOrloExport] ") + message});
+        }
+        EXPECT_TRUE(isReported) << dataClass;
     }
 }
 

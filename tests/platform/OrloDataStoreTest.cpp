@@ -3,6 +3,7 @@
 
 #include <csignal>
 #include <filesystem>
+#include <fstream>
 #include <memory>
 #include <string>
 #include <vector>
@@ -221,7 +222,14 @@ TEST_F(OrloDataStore, exportsAllPairsOrNone) {
     EXPECT_EQ(sql("SELECT id, data_version, ticket FROM exports"),
               (std::vector<std::string>{"1|1|e3b98a4da31a127d4bde6e43033f66ba274cab0eb7eb1c70ec41402bf6273dd8",
                                         "2|1|e3b98a4da31a127d4bde6e43033f66ba274cab0eb7eb1c70ec41402bf6273dd8"}));
-    EXPECT_EQ(sql("SELECT * FROM export_pairs"), (std::vector<std::string>{"1|0|tcrt|T1", "1|1|psd2|S1"}));
+    const std::vector<std::string> pairs = {"1|0|tcrt|T1", "1|1|psd2|S1"};
+    EXPECT_EQ(sql("SELECT * FROM export_pairs"), pairs);
+
+    // A pair that cannot be written takes the ones before it along.
+    sql("CREATE UNIQUE INDEX one ON export_pairs (class) WHERE export_id > 2");
+    EXPECT_EQ(exportAll(session, {"psd2", "psd2"}, {"S1", "S1"}), 5);
+    EXPECT_EQ(sql("SELECT count(*) FROM exports"), std::vector<std::string>{"2"});
+    EXPECT_EQ(sql("SELECT * FROM export_pairs"), pairs);
 }
 
 TEST_F(OrloDataStore, makesNoSessionWithoutATicketOrAUsableStore) {
@@ -289,6 +297,39 @@ TEST_F(OrloDataStore, neverFollowsALinkBesideTheDatabase) {
     root_.link("/var", "/private");
     EXPECT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", {'r'}), 0);
     EXPECT_EQ(root_.contents().count("/private/lib/orlo/store.db"), 1U);
+}
+
+// A rollback journal as a crash would leave it, without pages, that names `super` as the journal above it.
+std::string journalBelow(const std::string& super, std::uint32_t pages) {
+    const auto number = [](std::uint32_t n) {
+        return std::string{static_cast<char>(n >> 24), static_cast<char>(n >> 16), static_cast<char>(n >> 8),
+                           static_cast<char>(n)};
+    };
+    const std::string magic = "\xd9\xd5\x05\xf9\x20\xa1\x63\xd7";
+    constexpr std::uint32_t sector = 512;
+    constexpr std::uint32_t page = 4096;
+    std::string journal = magic + number(0) + number(0) + number(pages) + number(sector) + number(page);
+    journal.resize(sector);
+    std::uint32_t sum = 0;
+    for (const char c : super)
+        sum += static_cast<unsigned char>(c);
+    return journal + number(0) + super + number(static_cast<std::uint32_t>(super.size())) + number(sum) + magic;
+}
+
+TEST_F(OrloDataStore, leavesAFileAloneThatAPlantedJournalNames) {
+    const std::filesystem::path victim = root_.around() / "victim";
+    ASSERT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", {'r'}), 0);
+    const std::string database = root_.read(storePath);
+    std::ofstream(victim) << "precious";
+    root_.write(std::string(storePath) + "-journal",
+                journalBelow(victim, static_cast<std::uint32_t>(database.size() / 4096)));
+    logged().clear();
+    EXPECT_EQ(open(), nullptr);
+    EXPECT_EQ(logged().size(), 1U);
+    EXPECT_TRUE(std::filesystem::exists(victim));
+
+    std::filesystem::remove(root_.host(std::string(storePath) + "-journal"));
+    EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{'r'}));
 }
 
 TEST_F(OrloDataStore, refusesADatabaseOfAnotherKindAndRunsNothingOfIt) {

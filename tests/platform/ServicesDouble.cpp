@@ -202,7 +202,7 @@ SystemLog* getLogHandle(int number) {
     return number == 1 ? systemLogDefault() : nullptr;
 }
 
-void pauseFor(std::chrono::seconds duration) {
+void pauseFor(std::chrono::milliseconds duration) {
     record("pauseFor " + std::to_string(duration.count()));
 }
 

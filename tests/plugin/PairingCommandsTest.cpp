@@ -250,8 +250,8 @@ TEST_F(PairingCommands, onlyAnErrorOfTheUpdaterMakesTheLoadFail) {
         EXPECT_EQ(servicesDouble().pairing.loadResults, std::vector<std::int32_t>{success ? 0 : -1});
         const Lines& calls = servicesDouble().calls;
         EXPECT_EQ(std::ranges::count(calls, "VanterUpdaterRelease"), step.released ? 1 : 0);
-        EXPECT_EQ(std::ranges::count(calls, "pauseFor 10"), success ? 1 : 0);
-        EXPECT_TRUE(!success || calls.back() == "pauseFor 10");
+        EXPECT_EQ(std::ranges::count(calls, "pauseFor 10000"), success ? 1 : 0);
+        EXPECT_TRUE(!success || calls.back() == "pauseFor 10000");
     }
 }
 
@@ -266,7 +266,7 @@ TEST_F(PairingCommands, theUpdaterGetsTheTicketTheOptionsAndThePatch) {
     servicesDouble().pairing.tickets = {{""}, {"tick"}};
     pair();
     EXPECT_EQ(servicesDouble().pairing.loadResults, (std::vector<std::int32_t>{0, 0}));
-    EXPECT_EQ(std::ranges::count(servicesDouble().calls, "pauseFor 10"), 2);
+    EXPECT_EQ(std::ranges::count(servicesDouble().calls, "pauseFor 10000"), 2);
     servicesDouble().pairing.tickets = {{""}};
     pair();
     EXPECT_EQ(servicesDouble().updater.createOptions, Value(Value::Dictionary{{"Options", innerOptions}}));

@@ -6,7 +6,7 @@ import threading
 import time
 import unittest
 
-from harness import Service
+from harness import LOG, Service
 
 STORE = "var/lib/orlo/store.db"
 TICKET = "System/Library/Caches/apticket.der"
@@ -295,17 +295,26 @@ class Store(OrloTest):
         def record(number):
             return bytes([number]) * (1 + number * 997)
 
+        unanswered = 0
         stored = record(0)
         self.write("tmp/in", stored)
         self.assertEqual(self.put(), SUCCESS)
         for number in range(1, 201):
             self.write("tmp/in", record(number))
-            killing = number % 8 == 0
+            killing = number % 4 == 0
             if killing:
-                delay = moments.uniform(0, 0.03)
-                killer = threading.Thread(target=lambda: (time.sleep(delay), os.kill(self.service.pid, 9)))
+                logged = (self.root / LOG).stat().st_size
+
+                def kill(delay=moments.uniform(0, 0.02)):
+                    while (self.root / LOG).stat().st_size == logged:  # until the request is there
+                        time.sleep(0)
+                    time.sleep(delay)
+                    os.kill(self.service.pid, 9)
+
+                killer = threading.Thread(target=kill)
                 killer.start()
             status, _ = self.service.orloctl("--timeout", "20", "put-psd2", "/tmp/in")
+            unanswered += status != 0
             candidates = [record(number)] if status == 0 else [stored, record(number)]
             if not killing:
                 self.assertEqual(status, 0)
@@ -317,6 +326,7 @@ class Store(OrloTest):
             self.assertEqual(self.get(), SUCCESS)
             stored = self.read("tmp/out")
             self.assertIn(stored, candidates, number)
+        self.assertGreater(unanswered, 0)
         self.assertEqual(self.rows("PRAGMA integrity_check"), ["ok"])
 
     def test_two_services_share_a_store(self):

@@ -65,15 +65,30 @@ int pathAsItIs(sqlite3_vfs*, const char* path, int size, char* out) {
     return length >= 0 && length < size ? SQLITE_OK : SQLITE_CANTOPEN;
 }
 
-// SQLite's own way to files, but for one thing: it would replace each symbolic link in a database's path by its target
-// and then open that. Paths here begin with the descriptor of the open directory, "/proc/self/fd/<n>/", and have to
-// stay so, since the directory must not be looked up again by name. The last part of a path SQLite opens with
-// O_NOFOLLOW.
+const sqlite3_vfs& usualAccess() {
+    static const sqlite3_vfs& usual = *sqlite3_vfs_find("unix");
+    return usual;
+}
+
+// A rollback journal may name a super-journal, any file of the machine, which SQLite reads and then deletes. No
+// database here has one, so a journal with one was put there by somebody else.
+int openNoSuperJournal(sqlite3_vfs* access, sqlite3_filename path, sqlite3_file* file, int flags, int* outFlags) {
+    if ((flags & SQLITE_OPEN_SUPER_JOURNAL) == 0)
+        return usualAccess().xOpen(access, path, file, flags, outFlags);
+    file->pMethods = nullptr;
+    return SQLITE_CANTOPEN;
+}
+
+// SQLite's own way to files, but for two things: that, and that it would replace each symbolic link in a database's
+// path by its target and then open that. Paths here begin with the descriptor of the open directory,
+// "/proc/self/fd/<n>/", and have to stay so, since the directory must not be looked up again by name. The last part of
+// a path SQLite opens with O_NOFOLLOW.
 const char* fileAccess() {
     static sqlite3_vfs access = [] {
-        sqlite3_vfs own = *sqlite3_vfs_find("unix");
+        sqlite3_vfs own = usualAccess();
         own.zName = "veltra";
         own.xFullPathname = pathAsItIs;
+        own.xOpen = openNoSuperJournal;
         return own;
     }();
     static const int registered = sqlite3_vfs_register(&access, 0);

@@ -2,6 +2,6 @@
 
 #include <thread>
 
-void pauseFor(std::chrono::seconds duration) {
+void pauseFor(std::chrono::milliseconds duration) {
     std::this_thread::sleep_for(duration);
 }
