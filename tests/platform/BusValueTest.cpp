@@ -148,4 +148,27 @@ TEST(BusValue, aWrittenDictionaryReadsBackButForWhatDBusCannotCarry) {
     EXPECT_EQ(Value(bus::readDictionary(message.get())), expected);
 }
 
+TEST(BusValue, whatABusWouldDropTheSenderOfIsNotWritten) {
+    LooseBus bus;
+    const Value::Data data(bus::maximumOctets - 5);
+    const struct {
+        Dictionary dictionary;
+        bool isWritten;
+    } rows[] = {{{{"d", data}, {"t", "abc"}}, true},
+                {{{"d", data}, {"t", "abcd"}}, false},
+                {{{"d", data}, {"t", "\xFF\xFF"}}, false}, // becomes longer when it is repaired
+                {{{"d", data}, {"t", Value::Array{Value::Data(4)}}}, false},
+                {{{"d", Value::Data(bus::maximumOctets)}}, false}};
+    for (const auto& row : rows) {
+        const LooseBus::Message message = bus.message();
+        int code = 0;
+        try {
+            bus::appendDictionary(message.get(), row.dictionary);
+        } catch (const bus::Failure& failure) {
+            code = failure.code;
+        }
+        EXPECT_EQ(code, row.isWritten ? 0 : -EMSGSIZE);
+    }
+}
+
 } // namespace

@@ -71,6 +71,12 @@ TEST(CertificateService, onlyAWholeCertificateIsOne) {
     EXPECT_FALSE(parse(certificatemaker::certsOnlyMessage({good})));
     EXPECT_FALSE(createCertificateWithBytes(nullptr, 0));
 
+    // Lengths as BER has them: of indefinite form, and with an octet more than is needed.
+    ASSERT_EQ(good[1], 0x82);
+    const Bytes content(good.begin() + 4, good.end());
+    EXPECT_FALSE(parse(Bytes{0x30, 0x80} + content + Bytes{0x00, 0x00}));
+    EXPECT_FALSE(parse(Bytes{0x30, 0x83, 0x00, good[2], good[3]} + content));
+
     Bytes padded = good;
     const auto serialNumber = padded.begin() + positionOf({0x02, 0x02, 0x01, 0x80}, good);
     serialNumber[2] = 0x00; // a zero that the number 1 does not need

@@ -102,11 +102,19 @@ class GetTcrt(TopModuleTest):
             for number in numbers:
                 pem, der = self.certificate(key, number)
                 octets = number.to_bytes(number.bit_length() // 8 + 1, "big", signed=True).hex()
-                self.assertEqual(int(self.openssl("x509", "-noout", "-serial", stdin=pem).split(b"=")[1], 16), number)
                 for contents in (der, self.message(pem)):
                     with self.subTest(key=key.name, number=number, bare=contents is der):
                         self.hold(contents)
-                        self.assertEqual(self.get(), {"CertData": contents.hex(), "CertSerialNumber": octets})
+                        found = self.get()
+                        self.assertEqual(found["CertSerialNumber"], octets)
+                        self.assertEqual(self.judge(bytes.fromhex(found["CertData"]), contents is der), (number, der))
+
+    def judge(self, contents, is_bare):
+        """Serial number and certificate as openssl reads them."""
+        pem = self.openssl("x509" if is_bare else "pkcs7", "-inform", "DER", *([] if is_bare else ["-print_certs"]),
+                           stdin=contents)
+        serial = self.openssl("x509", "-noout", "-serial", stdin=pem).split(b"=")[1]
+        return int(serial, 16), self.openssl("x509", "-outform", "DER", stdin=pem)
 
     def test_the_first_certificate_of_several_counts_and_the_bytes_stay_as_they_are(self):
         key = self.key("ec.pem", "-algorithm", "EC", "-pkeyopt", "ec_paramgen_curve:P-256")
@@ -149,6 +157,17 @@ class GetTcrt(TopModuleTest):
         self.assertEqual(self.get(), {"CertSerialNumber": DUMMY})
         self.hold(message)
         self.assertEqual(self.get()["CertSerialNumber"], "009a3c5e71d2046b88")
+
+    def test_what_no_message_can_carry_is_an_error_reply(self):
+        self.hold(bytes(15 << 20))
+        status, answer = self.service.orloctl("get-tcrt")
+        self.assertEqual((status, "Message too long" in answer["problem"]), (3, True), answer)
+        self.hold(self.example("cert.p7c"))
+        self.get()
+
+    def test_a_copy_that_cannot_be_written_leaves_the_answer(self):
+        status, answer = self.service.orloctl("get-tcrt", "-o", self.service.root)
+        self.assertEqual((status, answer["response"]["statusCode"]), (2, 0), answer)
 
     def test_log_and_console_tell_every_step(self):
         self.describe("M4", AUTHENTICATOR)
@@ -200,21 +219,36 @@ class PutTcrt(TopModuleTest):
         self.assertEqual(self.records(), {})
 
     def test_the_record_comes_out_of_the_store_as_the_same_bytes(self):
-        certificate = self.example("cert.der")
-        for model, holder, contents in (
-            ("M3", RELAY, certificate), ("xM3y", AUTHENTICATOR, self.example("cert.p7c")), ("M3", RELAY, certificate),
-            ("M1", RELAY, b"no certificate \x00\xff"), (None, RELAY, bytes(range(256)) * 256),
-        ):
+        certificate, message = self.example("cert.der"), self.example("cert.p7c")
+        families = [(f"x{prefix}y", holder, contents) for prefix in PREFIXES
+                    for holder, contents in ((RELAY, certificate), (AUTHENTICATOR, message))]
+        for model, holder, contents in families + [
+            ("M1", RELAY, b"no certificate \x00\xff"), (None, RELAY, bytes(range(256)) * 256), ("M4", RELAY, b""),
+            ("M4", RELAY, self.message()),
+        ]:
             with self.subTest((model, holder)):
                 self.describe(model, holder)
                 self.hold(contents)
                 self.assertEqual(self.call("put-tcrt"), (0, None, None))
                 self.assertEqual(self.records(), {("tcrt", "SCR0001-TMA0001"): contents})
 
+    def test_a_module_without_a_certificate_fails_on_a_display_that_is_authenticated(self):
+        for contents in (b"", self.message(), b"garbage", self.example("cert.der")[:-1]):
+            with self.subTest(contents[:4]):
+                self.describe("M3")
+                self.hold(contents)
+                self.assert_refused(["Starting Top Module Auth : M3", "Top Module Auth Passsed : 0"])
+
     def test_a_missing_identity_stands_as_null_in_the_instance(self):
         answers = self.description["answers"]
-        for missing, instance in (("ScreenSerialNumber", "(null)-TMA0001"), ("TopModuleAuthChipID", "(null)-(null)")):
-            del answers[missing]
+        given = dict(answers)
+        for missing, instance in (
+            (["ScreenSerialNumber"], "(null)-TMA0001"), (["TopModuleAuthChipID"], "SCR0001-(null)"),
+            (["ScreenSerialNumber", "TopModuleAuthChipID"], "(null)-(null)"),
+        ):
+            answers.update(given)
+            for key in missing:
+                del answers[key]
             self.describe("M4")
             lines = self.service.messages_of(lambda: self.assertEqual(self.call("put-tcrt"), (0, None, None)))
             self.assertIn(f"tcrt- : {instance}", lines)

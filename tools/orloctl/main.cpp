@@ -121,6 +121,24 @@ int exportClasses(const Options& options, const std::vector<std::string>& classe
     return send(options, "OrloExport", arguments);
 }
 
+int reportUncopied(const Options& options, Answer answer, const Remarks& remarks) {
+    answer.outcome = Outcome::Usage;
+    answer.problem = "The request was carried out, but its result was not copied.";
+    return report(options, answer, remarks);
+}
+
+// Copies the request's result to a file and reports both: a copy that fails does not take the answer along.
+int reportCopied(const Options& options, const Answer& answer, Remarks remarks, const std::string& copyPath,
+                 const Value::Data& contents) {
+    try {
+        writeLocalFile(copyPath, contents);
+        return report(options, answer, remarks);
+    } catch (const UsageError& failure) {
+        remarks.note = failure.what();
+    }
+    return reportUncopied(options, answer, remarks);
+}
+
 int getTcrt(const Options& options, const std::string& copyPath) {
     const Answer answer = sendRequest(options.address, "getTCRT", {});
     if (answer.outcome != Outcome::Success)
@@ -132,12 +150,11 @@ int getTcrt(const Options& options, const std::string& copyPath) {
         remarks.note = "the serial number cannot be read: the hardware registry holds no certificate but other bytes";
     if (!text)
         remarks.note = "the certificate in the hardware registry is empty";
-    if (!copyPath.empty()) {
-        const Value::Data certificate = text ? hexString2Binary(*text) : Value::Data{};
-        writeLocalFile(copyPath, certificate);
-        remarks.result = copyPath + ", " + std::to_string(certificate.size()) + " bytes";
-    }
-    return report(options, answer, remarks);
+    if (copyPath.empty())
+        return report(options, answer, remarks);
+    const Value::Data certificate = text ? hexString2Binary(*text) : Value::Data{};
+    remarks.result = copyPath + ", " + std::to_string(certificate.size()) + " bytes";
+    return reportCopied(options, answer, remarks, copyPath, certificate);
 }
 
 int callServer(const Options& options, const char* command, const std::string& url) {
@@ -159,18 +176,8 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
                        " is missing on the device, or is no configuration blob that can be rewritten";
     if (copyPath.empty())
         return report(options, answer, remarks);
-    if (result) {
-        try {
-            writeLocalFile(copyPath, *result);
-            return report(options, answer, remarks);
-        } catch (const UsageError& failure) {
-            remarks.note = failure.what();
-        }
-    }
-    Answer uncopied = answer;
-    uncopied.outcome = Outcome::Usage;
-    uncopied.problem = "The request was carried out, but its result was not copied.";
-    return report(options, uncopied, remarks);
+    return result ? reportCopied(options, answer, remarks, copyPath, *result)
+                  : reportUncopied(options, answer, remarks);
 }
 
 int show(const Options& options, const Report& found) {

@@ -1,5 +1,6 @@
 #include "platform/linux/services/BusValue.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
@@ -225,11 +226,30 @@ private:
         --containers_;
     }
 
+    // Raises when the message would grow beyond what a bus carries, before anything that long is copied.
+    void count(std::size_t octets) {
+        if (octets > maximumOctets - octets_)
+            throw Failure(-EMSGSIZE);
+        octets_ += octets;
+    }
+
     void text(const std::string& text) {
+        count(text.size());
+        const std::string repaired = utf8::repaired(text);
         std::string carried;
-        for (const char character : utf8::repaired(text))
-            carried += character == '\0' ? "\uFFFD" : std::string(1, character);
+        for (std::size_t start = 0, end = 0; end < repaired.size(); start = end + 1) {
+            end = std::min(repaired.find('\0', start), repaired.size());
+            carried.append(repaired, start, end - start);
+            if (end < repaired.size())
+                carried += "\uFFFD";
+        }
+        count(carried.size() - text.size()); // what takes the place of a bad sequence is never shorter
         check(sd_bus_message_append_basic(message_, SD_BUS_TYPE_STRING, carried.c_str()));
+    }
+
+    void bytes(const Value::Data& data) {
+        count(data.size());
+        check(sd_bus_message_append_array(message_, SD_BUS_TYPE_BYTE, data.data(), data.size()));
     }
 
     void array(const Value::Array& array) {
@@ -245,7 +265,7 @@ private:
         if (value.text())
             text(*value.text());
         else if (const Value::Data* data = value.data())
-            check(sd_bus_message_append_array(message_, SD_BUS_TYPE_BYTE, data->data(), data->size()));
+            bytes(*data);
         else if (value.array())
             array(*value.array());
         else if (value.dictionary())
@@ -267,6 +287,7 @@ private:
 
     sd_bus_message* message_;
     int containers_ = 0;
+    std::size_t octets_ = 0; // of texts and data
 };
 
 } // namespace

@@ -26,6 +26,10 @@ constexpr int maximumNesting = 32;
 // growth in proportion while it is far above what any command needs.
 constexpr std::size_t maximumValues = 100'000;
 
+// How many octets the texts and data of one written message may have in all. A system bus takes messages of up to 32
+// MiB and drops a client that sends more; what is left is for the lengths and types around the values.
+constexpr std::size_t maximumOctets = std::size_t{28} << 20;
+
 // Raised for a message that holds what no Value can. The sentence names the key.
 class Refusal : public std::runtime_error {
 public:
@@ -43,7 +47,8 @@ public:
 Value::Dictionary readDictionary(sd_bus_message* message);
 
 // Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
-// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and Failure.
+// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and Failure, which
+// is -EMSGSIZE for more than a message holds.
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary);
 
 // Opens the bus that `which` names: "system", "session" or a D-Bus address. Returns a negative errno on failure; on

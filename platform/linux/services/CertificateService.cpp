@@ -1,5 +1,6 @@
 #include "platform/CertificateService.h"
 
+#include <algorithm>
 #include <limits>
 #include <utility>
 
@@ -46,6 +47,17 @@ bool isCertsOnly(CMS_ContentInfo* message) {
     return !signers || sk_CMS_SignerInfo_num(signers) == 0;
 }
 
+// Whether these octets are the certificate's DER encoding. The library reads lengths of BER too (X.690 8.1.3), which
+// DER does not have.
+bool isEncodedAs(X509* x509, const std::uint8_t* bytes, std::size_t length) {
+    unsigned char* encoding = nullptr;
+    const int encodedLength = i2d_X509(x509, &encoding);
+    const bool isSame = encodedLength >= 0 && static_cast<std::size_t>(encodedLength) == length &&
+                        std::equal(bytes, bytes + length, encoding);
+    OPENSSL_free(encoding);
+    return isSame;
+}
+
 } // namespace
 
 std::optional<std::vector<CertificateRef>> copyCertificatesFromCertsOnlyMessage(const Value::Data& message) {
@@ -67,7 +79,7 @@ std::optional<std::vector<CertificateRef>> copyCertificatesFromCertsOnlyMessage(
 CertificateRef createCertificateWithBytes(const std::uint8_t* bytes, std::size_t length) {
     const openssl::QuietErrors quiet;
     Owner<X509, X509_free> x509(decodeWhole(d2i_X509, X509_free, bytes, length));
-    return x509 ? wrap(std::move(x509)) : nullptr;
+    return x509 && isEncodedAs(x509.get(), bytes, length) ? wrap(std::move(x509)) : nullptr;
 }
 
 std::optional<Value::Data> copySerialNumberData(const CertificateRef& certificate, Error* error) {

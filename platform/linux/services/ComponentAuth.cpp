@@ -9,6 +9,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <system_error>
 #include <thread>
 #include <utility>
@@ -42,9 +43,9 @@ public:
 
     void runAt(Clock::time_point due, Task task) {
         const std::lock_guard lock(mutex_);
-        tasks_.emplace(due, std::move(task));
         if (!thread_.joinable())
             thread_ = std::jthread([this](const std::stop_token& stop) { run(stop); });
+        tasks_.emplace(due, std::move(task));
         changed_.notify_one();
     }
 
@@ -124,17 +125,23 @@ bool verify(EVP_PKEY* key, const Value::Data& challenge, const Value::Data& sign
            EVP_DigestVerify(context.get(), signature.data(), signature.size(), challenge.data(), challenge.size()) == 1;
 }
 
+// A service of the hardware registry, held until the end.
+struct HeldService {
+    explicit HeldService(std::string_view className)
+        : handle(HardwareRegistry::getMatchingService(HardwareRegistry::serviceMatching(className))) {}
+    ~HeldService() { HardwareRegistry::releaseService(handle); }
+    HeldService(const HeldService&) = delete;
+    HeldService& operator=(const HeldService&) = delete;
+
+    const HardwareRegistry::Service handle;
+};
+
 // The bytes of the certificate in the hardware registry, or nothing.
 Value moduleCertificate() {
-    for (const char* className : {"TeskAuthI2CRelayInterface", "TevariAuthCPAID"}) {
-        const auto service = HardwareRegistry::getMatchingService(HardwareRegistry::serviceMatching(className));
-        if (service == 0)
-            continue;
-        Value certificate = HardwareRegistry::searchProperty(
-            service, HardwareRegistry::servicePlane, "AccessoryCertificate", HardwareRegistry::searchRecursively);
-        HardwareRegistry::releaseService(service);
-        return certificate;
-    }
+    for (const char* className : {"TeskAuthI2CRelayInterface", "TevariAuthCPAID"})
+        if (const HeldService service(className); service.handle != 0)
+            return HardwareRegistry::searchProperty(service.handle, HardwareRegistry::servicePlane,
+                                                    "AccessoryCertificate", HardwareRegistry::searchRecursively);
     return {};
 }
 
