@@ -35,14 +35,14 @@ class ElapsedTime {
 public:
     ~ElapsedTime() {
         if (shown_)
-            std::fputs("\r\033[K", stderr);
+            (void)std::fputs("\r\033[K", stderr);
     }
 
     void show() {
         const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - start_).count();
         if (seconds < 1 || !terminal_)
             return;
-        std::fprintf(stderr, "\r%lld s", static_cast<long long>(seconds));
+        (void)std::fprintf(stderr, "\r%lld s", static_cast<long long>(seconds));
         shown_ = true;
     }
 

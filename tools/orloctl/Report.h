@@ -6,7 +6,7 @@
 #include <nlohmann/json.hpp>
 
 // What an offline reader found in a file: once for programs, once for people.
-struct Report {
+struct Report { // NOLINT(bugprone-exception-escape): moving JSON asserts, which throws nothing here
     nlohmann::ordered_json json;
     std::string text;
     bool ok = true;

@@ -25,7 +25,7 @@ void keepMessage(int, const char* format, ...) {
     char line[512];
     va_list arguments;
     va_start(arguments, format);
-    std::vsnprintf(line, sizeof line, format, arguments);
+    (void)std::vsnprintf(line, sizeof line, format, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
     va_end(arguments);
     const std::string message = line;
     const std::size_t prototypeEnd = format[0] == '%' && format[1] == 's' ? message.find(") ") : std::string::npos;
@@ -55,7 +55,7 @@ private:
 
 std::string hexadecimal(std::uint32_t number) {
     char digits[16];
-    std::snprintf(digits, sizeof digits, "0x%X", number);
+    (void)std::snprintf(digits, sizeof digits, "0x%X", number);
     return digits;
 }
 
@@ -192,7 +192,8 @@ std::string reportText(const ordered_json& json) {
     text += entriesText("Metadata entries", json["metadata"]);
     text += "HMACs: " + json["hmacState"].get<std::string>() + "\n";
     for (const auto& [name, digits] : json["hmacs"].items())
-        text += "  " + name + ": " + (digits == "" ? "absent" : digits.get<std::string>()) + "\n";
+        text += "  " + name + ": " +
+                (digits.get_ref<const std::string&>().empty() ? "absent" : digits.get<std::string>()) + "\n";
     for (const ordered_json& message : json["messages"])
         text += "Note: " + message.get<std::string>() + "\n";
     return text;

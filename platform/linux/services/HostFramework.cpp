@@ -164,7 +164,7 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     const std::string name(serviceName);
     const std::string which = busInUse();
     connection_ = new Connection;
-    std::signal(SIGPIPE, SIG_IGN); // a reader of standard error that is gone must not end the service
+    (void)std::signal(SIGPIPE, SIG_IGN); // a reader of standard error that is gone must not end the service
     int result = bus::open(which, &connection_->bus);
     if (result >= 0)
         result = sd_bus_add_object_vtable(connection_->bus, nullptr, objectPath(name).c_str(), interfaceName, methods,
