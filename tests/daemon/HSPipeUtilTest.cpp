@@ -16,6 +16,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/Format.h"
+#include "tests/support/OwnProcess.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
 
@@ -198,6 +199,23 @@ TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
         EXPECT_EQ(error_.text, "Error executing command, result = -1\n");
     }
 }
+
+#ifdef VELTRA_MEMORY_CAN_BE_LIMITED
+TEST_F(HSPipeUtilTest, aChildThatWritesMoreThanMemoryHoldsDecidesByItsEnd) {
+    script("exec yes");
+    inOwnProcess([&] {
+        limitMemory(std::size_t{100} << 20);
+        EXPECT_EQ(run(), 7);
+        EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] /usr/bin/program was terminated by signal 13\n"), 1);
+        EXPECT_GT(response_["Output"].text()->size(), std::size_t{10} << 20);
+        EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
+
+        EXPECT_EQ(runWith(Value::Data(1 << 20)), 7); // SIGPIPE is ignored, so the child sees that writing fails
+        EXPECT_EQ(error_.text, "Error executing command with data, result = 1\n");
+        EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
+    });
+}
+#endif
 
 TEST_F(HSPipeUtilTest, withoutAResponseNothingIsRun) {
     script("echo ran > \"$1\"");
