@@ -10,6 +10,7 @@
 #include <vector>
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -198,6 +199,67 @@ TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
         EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", 7}, {"Output", ""}, {"Error", ""}}));
         EXPECT_EQ(error_.text, "Error executing command, result = -1\n");
     }
+}
+
+// Leaves the process `count` unused descriptors.
+void leaveDescriptors(int count) {
+    constexpr rlim_t most = 64;
+    const rlimit limit{most, most};
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &limit), 0);
+    std::vector<int> taken;
+    for (int number = ::dup(0); number >= 0; number = ::dup(0))
+        taken.push_back(number);
+    for (int i = 0; i < count; ++i) {
+        ::close(taken.back());
+        taken.pop_back();
+    }
+}
+
+int unusedDescriptors() {
+    std::vector<int> taken;
+    for (int number = ::dup(0); number >= 0; number = ::dup(0))
+        taken.push_back(number);
+    for (const int number : taken)
+        ::close(number);
+    return static_cast<int>(taken.size());
+}
+
+TEST_F(HSPipeUtilTest, withoutDescriptorsForThePipesNothingIsRunAndNoneStaysOpen) {
+    script("exit 0");
+    const std::string noPipe = "2 [HSPipeUtil] pipe failed while preparing to execute /usr/bin/program: ";
+    const std::string noStart = "2 [HSPipeUtil] posix_spawn /usr/bin/program failed: ";
+    const struct {
+        bool withInput;
+        int unused;
+        const std::string& line;
+    } rows[] = {{false, 0, noPipe}, {false, 1, noPipe}, {false, 2, noStart}, {true, 1, noPipe},
+                {true, 2, noPipe},  {true, 3, noPipe},  {true, 4, noStart}};
+    for (const auto& row : rows) {
+        inOwnProcess([&] {
+            leaveDescriptors(row.unused);
+            EXPECT_EQ(row.withInput ? runWith(bytes("in")) : run(), 7);
+            EXPECT_EQ(std::ranges::count(log(), row.line + text(EMFILE)), 1) << row.unused;
+            EXPECT_EQ(output(), "");
+            EXPECT_EQ(unusedDescriptors(), row.unused);
+        });
+    }
+}
+
+TEST_F(HSPipeUtilTest, aChildThatCannotBeWaitedForIsAFailureWithItsOutput) {
+    script("echo out");
+    inOwnProcess([&] {
+        ASSERT_NE(std::signal(SIGCHLD, SIG_IGN), SIG_ERR); // the kernel then reaps the children itself
+        for (const bool withInput : {false, true}) {
+            recordLog();
+            EXPECT_EQ(withInput ? runWith({}) : run(), 7);
+            EXPECT_EQ(error_.text,
+                      std::string("Error executing command") + (withInput ? " with data" : "") + ", result = -1\n");
+            EXPECT_EQ(output(), "out\n");
+            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] waitpid failed for /usr/bin/program: " + text(ECHILD)),
+                      1);
+            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] child exited\n"), 0);
+        }
+    });
 }
 
 #ifdef VELTRA_MEMORY_CAN_BE_LIMITED
