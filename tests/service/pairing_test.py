@@ -215,6 +215,27 @@ class Pairing(unittest.TestCase):
         results = [post[2] for post in self.network.posts() if post[1] == "/corvo/pair/result"]
         self.assertEqual(results, ["-1"] * 4)
 
+    def test_a_calibration_program_that_is_missing_or_killed_fails_no_pairing(self):
+        program = "/usr/local/bin/q21isp"
+        much = "x" * 1000000
+        for name, script, lines in (
+            ("missing", None, [f"posix_spawn {program} failed: No such file or directory", "Output: "]),
+            ("killed after much output", f"head -c {len(much)} /dev/zero | tr '\\0' x; kill -KILL $$",
+             [f"{program} was terminated by signal 9", f"Output: {much}"]),
+        ):
+            with self.subTest(name):
+                (self.service.root / program[1:]).unlink(missing_ok=True)
+                if script:
+                    self.write(program[1:], f"#!/bin/sh\n{script}\n".encode())
+                    (self.service.root / program[1:]).chmod(0o755)
+                self.assertEqual(self.service.orloctl("pair", self.url("corvo"))[0], 0)
+                self.assertEqual(self.service.orloctl("call", "x")[0], 4)
+                log = "\n".join(self.service.log())
+                for line in lines:
+                    self.assertTrue(f"] {line}\n" in log, line[:80])
+        # The second pairing found the chip done.
+        self.assertEqual(log.count("Vanter: installed a firmware of 7000 bytes\n"), 1)
+
 
 class CrashLogs(unittest.TestCase):
     def setUp(self):
