@@ -108,4 +108,13 @@ TEST_F(ZPDeviceReverseProxy, aCallbackThatComesAfterTheCallIsHarmless) {
     EXPECT_TRUE(setUp({"", {.events = {{3}}, .proxy = proxy}, false, none, soon}).isNothing());
 }
 
+TEST_F(ZPDeviceReverseProxy, availabilityThatComesWhileTheCallEndsCountsOrDoesNot) {
+    for (int round = 0; round < 50; ++round) {
+        const Value result = setUp({"", {.events = {{3}, {1}}, .proxy = proxy}, false, none, soon});
+        EXPECT_TRUE(result.isNothing() || result == proxy);
+        EXPECT_EQ(log().back(),
+                  result.isNothing() ? "2 [ZPDevice] Failed to get proxy info" : "2 [ZPDevice] Getting proxy info");
+    }
+}
+
 } // namespace
