@@ -52,7 +52,7 @@ protected:
         root_.write("/etc/veltra/device.json", R"({"reverseProxy": )" + reverseProxy + "}");
     }
 
-    RegistrationPtr registration(Deliveries& deliveries) const {
+    static RegistrationPtr registration(Deliveries& deliveries) {
         return {RPRegisterForAvailability(deliveries.callback()), RPRelease};
     }
 
@@ -76,6 +76,7 @@ TEST_F(ReverseProxy, eventsComeInTheirOrderAndNotBeforeTheyAreDue) {
     Deliveries deliveries;
     const RegistrationPtr proxy = registration(deliveries);
     const Clock::time_point start = Clock::now();
+    ASSERT_NE(proxy, nullptr);
     RPRegistrationResume(proxy.get());
     EXPECT_EQ(deliveries.waitFor(3), (Statuses{7, 1, 3}));
     EXPECT_GE(Clock::now() - start, 40ms);
@@ -89,6 +90,7 @@ TEST_F(ReverseProxy, malformedEventsAreLeftOutAndTimesAreBounded) {
         describe(R"({"events": [)" + std::string(odd) + ", " + good + "]}");
         Deliveries deliveries;
         const RegistrationPtr proxy = registration(deliveries);
+        ASSERT_NE(proxy, nullptr);
         RPRegistrationResume(proxy.get());
         EXPECT_EQ(deliveries.waitFor(1), Statuses{2}) << odd;
     }
@@ -101,6 +103,7 @@ TEST_F(ReverseProxy, malformedEventsAreLeftOutAndTimesAreBounded) {
         describe(R"({"events": )" + std::string(events) + "}");
         Deliveries deliveries;
         const RegistrationPtr proxy = registration(deliveries);
+        ASSERT_NE(proxy, nullptr);
         RPRegistrationResume(proxy.get());
         EXPECT_EQ(deliveries.waitFor(statuses.size()), statuses) << events;
     }
@@ -108,7 +111,7 @@ TEST_F(ReverseProxy, malformedEventsAreLeftOutAndTimesAreBounded) {
         describe(R"({"events": )" + std::string(events) + "}");
         Deliveries deliveries;
         const RegistrationPtr proxy = registration(deliveries);
-        EXPECT_NE(proxy, nullptr) << events;
+        ASSERT_NE(proxy, nullptr) << events;
         RPRegistrationResume(proxy.get());
         EXPECT_EQ(deliveries.waitFor(0), Statuses{}) << events;
     }
@@ -118,6 +121,8 @@ TEST_F(ReverseProxy, nothingIsDeliveredBeforeResumeNorAfterInvalidation) {
     describe(R"({"events": [{"status": 1, "afterMs": 10}]})");
     Deliveries first, second;
     RegistrationPtr idle = registration(first), resumed = registration(second);
+    ASSERT_NE(idle, nullptr);
+    ASSERT_NE(resumed, nullptr);
     RPRegistrationResume(resumed.get());
     EXPECT_EQ(second.waitFor(1), Statuses{1});
     EXPECT_EQ(first.waitFor(0), Statuses{});
@@ -132,6 +137,7 @@ TEST_F(ReverseProxy, anEventThatIsMinutesAwayHoldsUpNeitherInvalidationNorReleas
     for (const bool invalidated : {true, false}) {
         Deliveries deliveries;
         RegistrationPtr proxy = registration(deliveries);
+        ASSERT_NE(proxy, nullptr);
         RPRegistrationResume(proxy.get());
         EXPECT_EQ(deliveries.waitFor(1), Statuses{7});
         const Clock::time_point start = Clock::now();
