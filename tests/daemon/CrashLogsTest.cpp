@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <iterator>
 #include <map>
 #include <string>
 #include <vector>
@@ -47,10 +48,10 @@ protected:
         if (const Value::Array* data = response_["Data"].array())
             for (const Value& entry : *data) {
                 const Value::Data& contents = *entry["LogFileData"].data();
-                entries.push_back(
-                    *entry["LogFileName"].text() + " " + *entry["isPanic"].text() + " " +
-                    std::to_string(*entry["LogFileSize"].integer()) + ": " +
-                    std::string(contents.begin(), contents.begin() + std::min(contents.size(), size_t{40})));
+                entries.push_back(*entry["LogFileName"].text() + " " + *entry["isPanic"].text() + " " +
+                                  std::to_string(*entry["LogFileSize"].integer()) + ": " +
+                                  std::string(contents.begin(),
+                                              contents.begin() + std::min<std::ptrdiff_t>(std::ssize(contents), 40)));
             }
         std::ranges::sort(entries);
         return entries;

@@ -37,7 +37,7 @@ protected:
         servicesDouble().reverseProxy = row.reverseProxy;
         recordLog();
         const auto start = std::chrono::steady_clock::now();
-        const Value result = ZPDevice::sharedSingleton().setupReverseProxy(url);
+        Value result = ZPDevice::sharedSingleton().setupReverseProxy(url);
         const auto took = std::chrono::steady_clock::now() - start;
         EXPECT_GE(took, row.least) << row.name;
         EXPECT_LE(took, row.most) << row.name;

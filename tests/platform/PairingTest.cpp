@@ -1,8 +1,9 @@
 #include "platform/Pairing.h"
 
+#include <cstdint>
 #include <future>
+#include <optional>
 #include <string>
-#include <string_view>
 #include <utility>
 #include <vector>
 

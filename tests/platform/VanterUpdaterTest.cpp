@@ -1,9 +1,12 @@
 #include "platform/VanterUpdater.h"
 
+#include <filesystem>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -92,9 +95,9 @@ TEST_F(VanterUpdaterTest, whatCouldNotBeInstalledLeavesTheChipAsItWas) {
 }
 
 TEST_F(VanterUpdaterTest, updatersOfSeveralThreadsShareTheChip) {
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 4; ++i)
-        threads.emplace_back([] {
+    std::vector<std::thread> threads(4);
+    for (std::thread& thread : threads)
+        thread = std::thread([] {
             for (int round = 0; round < 20; ++round) {
                 EXPECT_TRUE(install("same patch"));
                 EXPECT_TRUE(isDone());
