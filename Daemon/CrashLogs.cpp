@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <limits>
+#include <new>
 #include <optional>
 #include <string>
 #include <utility>
@@ -48,7 +49,7 @@ bool hasLogSuffix(std::string_view path) {
 }
 
 // The log entry of one file, or nothing when it is left out.
-Value entryOf(const std::string& path, std::string_view name) {
+Value entryOf(const std::string& path, std::string_view name) try {
     if (!hasLogSuffix(path)) {
         crashLog.info("Suffix Mismatch . Skipping file : %@", shown(path));
         return {};
@@ -76,10 +77,13 @@ Value entryOf(const std::string& path, std::string_view name) {
         crashLog.info("Failed to load %@: %@", shown(path), error);
         return {};
     }
-    return Value::Dictionary{{"isPanic", isPanic ? "YES" : "NO"},
-                             {"LogFileName", utf8::repaired(path)},
-                             {"LogFileSize", size},
-                             {"LogFileData", std::move(*contents)}};
+    Value::Dictionary entry{
+        {"isPanic", isPanic ? "YES" : "NO"}, {"LogFileName", utf8::repaired(path)}, {"LogFileSize", size}};
+    entry["LogFileData"] = std::move(*contents); // in a list it would be copied
+    return Value(std::move(entry));
+} catch (const std::bad_alloc& failure) {
+    crashLog.info("Failed to load %@: %@", shown(path), failure.what());
+    return {};
 }
 
 void collect(std::string_view directory, Value::Array& entries) {
@@ -102,14 +106,6 @@ const char* problemWith(std::string_view directory) {
         break;
     }
     return nullptr;
-}
-
-// The file as ASCII text; none when it cannot be read or holds a byte that is no ASCII.
-std::optional<std::string> asciiText(std::string_view path) {
-    const std::optional<Value::Data> contents = files::readWhole(path, anySize);
-    if (!contents || std::ranges::any_of(*contents, [](std::uint8_t byte) { return byte >= 0x80; }))
-        return std::nullopt;
-    return std::string(contents->begin(), contents->end());
 }
 
 Value systemVersionList() {
@@ -139,12 +135,17 @@ int get_ramdisk_logs(Value* response) {
     return status;
 }
 
-bool check_panic_version(std::string_view path) {
-    const std::optional<std::string> report = asciiText(path);
+bool check_panic_version(std::string_view path) try {
+    const std::optional<Value::Data> report = files::readWhole(path, anySize);
     const Value systemVersion = systemVersionList();
     const std::string* build = systemVersion["ProductBuildVersion"].text();
-    if (!report || !build)
+    if (!report || report->empty() || !build)
         return false;
-    const auto version = jsonTextMember(std::string_view(*report).substr(0, report->find('\n')), "os_version");
+    const std::string_view text(reinterpret_cast<const char*>(report->data()), report->size());
+    if (std::ranges::any_of(text, [](char byte) { return static_cast<unsigned char>(byte) >= 0x80; }))
+        return false; // no ASCII text
+    const auto version = jsonTextMember(text.substr(0, text.find('\n')), "os_version");
     return version && version->find(*build) != std::string::npos;
+} catch (const std::bad_alloc&) {
+    return false; // as a report that cannot be read
 }

@@ -1,8 +1,8 @@
 // The reverse proxy: the way from the device through the host computer to servers on the network.
 //
 // On Linux the device description stands for it: "reverseProxy" has "events", which are delivered in their order, each
-// "afterMs" milliseconds after the registration was resumed, and the settings under "proxy". A device whose description
-// has no such entry refuses registration.
+// "afterMs" milliseconds (at most an hour) after the registration was resumed, and the settings under "proxy". An event
+// without a "status" of 32 signed bits is left out. A device whose description has no such entry refuses registration.
 #ifndef VELTRA_PLATFORM_REVERSE_PROXY_H
 #define VELTRA_PLATFORM_REVERSE_PROXY_H
 

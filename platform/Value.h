@@ -41,6 +41,7 @@ public:
     const Data* data() const { return std::get_if<Data>(&content_); }
     const Array* array() const { return std::get_if<Array>(&content_); }
     const Dictionary* dictionary() const { return std::get_if<Dictionary>(&content_); }
+    Dictionary* dictionary() { return std::get_if<Dictionary>(&content_); } // to be changed in place
 
     // A number as an integer or as true (not 0) or false.
     std::optional<std::int64_t> integer() const;

@@ -51,27 +51,28 @@ void vanterUpdaterLog(const std::string& context, const std::string& message) {
     serviceLog.info("%s: %s", context, message);
 }
 
-// A copy of the ticket; none when memory does not suffice.
-std::optional<Value::Data> copyTicket(const std::uint8_t* ticket, std::size_t length) try {
-    Value::Data copy(length);
-    if (length > 0)
-        std::memcpy(copy.data(), ticket, length);
-    return copy;
-} catch (const std::exception&) { // the length is beyond memory, or beyond what any memory could hold
-    return std::nullopt;
-}
-
-Value::Dictionary updaterOptions(const Value& ticket) {
+// The updater options, with the ticket unless it is empty; nothing when memory does not suffice.
+Value updaterOptions(const std::uint8_t* ticket, std::size_t length) try {
     Value::Dictionary options;
-    if (!ticket.data()->empty()) {
-        options["Vanter,Ticket"] = ticket;
-        serviceLog.error("added ticket");
+    if (length > 0) {
+        Value::Data copy(length);
+        std::memcpy(copy.data(), ticket, length);
+        options["Vanter,Ticket"] = std::move(copy);
     }
     options["Options"] = Value::Dictionary{{"WaftonPairingOption", true},
                                            {"PersonalizedFirmwareRootPath", "/usr/local/share/firmware/isp/"},
                                            {"RestoreSystemPartition", "/private/var/mobile/"},
                                            {"RestoreInternal", true}};
-    return options;
+    return Value(std::move(options));
+} catch (const std::exception&) { // the length is beyond memory, or beyond what any memory could hold
+    return {};
+}
+
+void logTicket(const Value& ticket) {
+    const Value empty = Value::Data{};
+    traceError("value of ticket is:%@", ticket.data() ? ticket : empty);
+    if (ticket.data())
+        serviceLog.error("added ticket");
 }
 
 // Whether the chip told about itself; what it told is only logged.
@@ -87,17 +88,17 @@ bool logDeviceInformation(const Value& information) {
     return true;
 }
 
-std::optional<Error> installPatch(VanterUpdater* updater, Value::Dictionary options) {
+std::optional<Error> installPatch(VanterUpdater* updater, Value options) {
     std::optional<Value::Data> patch = files::readWhole(patchPath);
     if (!patch || patch->empty()) {
         trace("Files not found");
         return std::nullopt;
     }
     trace("Patch found successfully");
-    options["FirmwareData"] = std::move(*patch);
+    options.dictionary()->insert_or_assign("FirmwareData", std::move(*patch));
     std::optional<Error> error;
     Value output;
-    if (!VanterUpdaterExecCommand(updater, "performNextStage", std::move(options), &output, &error) || error)
+    if (!VanterUpdaterExecCommand(updater, "performNextStage", options, &output, &error) || error)
         traceError("VanterUpdaterExecCommand failed: %@:%@", error, output);
     else
         trace("Vanter Firmware Update Successful");
@@ -107,15 +108,13 @@ std::optional<Error> installPatch(VanterUpdater* updater, Value::Dictionary opti
 // Brings the chip's firmware up to the patch. Only an Error of the updater library is a failure; whatever else keeps
 // the patch from being installed is a line in the log.
 std::optional<Error> updateVanter(const std::uint8_t* ticket, std::size_t length) {
-    std::optional<Value::Data> copy = copyTicket(ticket, length);
-    if (!copy) {
+    Value options = updaterOptions(ticket, length);
+    if (options.isNothing()) {
         traceError("updaterOptions failed to allocate");
         return std::nullopt;
     }
     traceError("updaterOptions created successfully");
-    const Value ticketData = std::move(*copy);
-    traceError("value of ticket is:%@", ticketData);
-    Value::Dictionary options = updaterOptions(ticketData);
+    logTicket(options["Vanter,Ticket"]);
 
     std::optional<Error> error;
     const UpdaterPtr updater(VanterUpdaterCreate(options, vanterUpdaterLog, updaterName, &error), VanterUpdaterRelease);

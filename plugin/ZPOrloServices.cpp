@@ -1,5 +1,6 @@
 #include "plugin/ZPOrloServices.h"
 
+#include <new>
 #include <optional>
 
 #include "Daemon/Common/HSPipeUtil.h"
@@ -49,11 +50,13 @@ void ZPOrloServices::printPluginVersion() const {
     serviceLog.info("Plugin  - version %@", pluginVersion());
 }
 
-void ZPOrloServices::q21isp_loadDAT() {
+void ZPOrloServices::q21isp_loadDAT() try {
     Value response;
     Error error;
     HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
     serviceLog.info("Output: %@", response["Output"]);
+} catch (const std::bad_alloc&) {
+    return; // an output that memory does not suffice for is lost; the load has happened all the same
 }
 
 void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSCompletion& completion) {

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <new>
 #include <string_view>
 #include <utility>
 
@@ -67,16 +68,14 @@ class Output {
 public:
     explicit Output(int readEnd) : readEnd_(readEnd) {}
 
-    // Reads one chunk; false at the end of the output and when it cannot be read.
+    // Reads one chunk; false at the end of the output and when it cannot be read or kept.
     bool readChunk() {
         char chunk[chunkSize];
         const ssize_t count = processes::readSome(readEnd_.get(), chunk, sizeof chunk);
-        if (count <= 0) {
-            readEnd_.close();
-            return false;
-        }
-        append({chunk, static_cast<std::size_t>(count)});
-        return true;
+        if (count > 0 && append({chunk, static_cast<std::size_t>(count)}))
+            return true;
+        readEnd_.close();
+        return false;
     }
 
     void readToEnd() {
@@ -87,14 +86,17 @@ public:
     // The read end, -1 once the end was met.
     int descriptor() const { return readEnd_.get(); }
 
-    std::string takeText() {
+    std::string takeText() try {
         text_ += utf8::repaired(std::exchange(incomplete_, {}));
+        return std::move(text_);
+    } catch (const std::bad_alloc&) {
         return std::move(text_);
     }
 
 private:
-    // A character that the end of a chunk cuts in two waits for its rest, unless a NUL ends the chunk before.
-    void append(std::string_view chunk) {
+    // A character that the end of a chunk cuts in two waits for its rest, unless a NUL ends the chunk before. False
+    // when memory does not suffice; the text then ends before the chunk.
+    bool append(std::string_view chunk) try {
         const std::size_t end = std::min(chunk.find('\0'), chunk.size());
         const std::string pending = std::exchange(incomplete_, {}).append(chunk.substr(0, end));
         std::size_t whole = pending.size();
@@ -102,6 +104,9 @@ private:
             whole -= incompleteTail(pending);
         text_ += utf8::repaired(std::string_view(pending).substr(0, whole));
         incomplete_ = pending.substr(whole);
+        return true;
+    } catch (const std::bad_alloc&) {
+        return false;
     }
 
     // The length of the character at the end of `text` that is not all there. No character is longer than four bytes.
@@ -203,8 +208,8 @@ Outcome runWithInput(const std::vector<std::string>& argv, const void* bytes, ss
 
 // Reports the outcome of a call; a response of null means that nothing was run.
 int conclude(Outcome outcome, const char* failureFormat, Value* response, Error* error) {
-    Value::Dictionary dictionary{
-        {"Status", outcome.result == 0 ? 0 : failed}, {"Output", std::move(outcome.output)}, {"Error", ""}};
+    Value::Dictionary dictionary{{"Status", outcome.result == 0 ? 0 : failed}, {"Error", ""}};
+    dictionary["Output"] = std::move(outcome.output); // in the list it would be copied
     if (outcome.result != 0) {
         const std::string description = format(failureFormat, outcome.result);
         pipeLog.info("%@", description);

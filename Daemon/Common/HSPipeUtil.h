@@ -4,7 +4,8 @@
 // long that takes, and describes the outcome in a response dictionary of three keys:
 //   "Status"  0 when the child exited with status 0, otherwise 7
 //   "Output"  all that it wrote, as text: U+FFFD stands for each sequence that is no UTF-8, and from a NUL on the rest
-//             of the at most 1023 bytes that were read with it is left out
+//             of the at most 1023 bytes that were read with it is left out; output that memory does not suffice for is
+//             no longer read from there on, and the child that goes on writing gets SIGPIPE
 //   "Error"   empty on success; after a failure the description of the Error, when the caller asked for one
 // The Error of a failure has domain "HSErrorDomain" and code 7. Both out-values may be null; without a response nothing
 // is run and the call fails. *error is filled after a failure only.

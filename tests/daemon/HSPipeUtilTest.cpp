@@ -10,12 +10,14 @@
 #include <vector>
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
 
 #include "platform/Format.h"
+#include "tests/support/OwnProcess.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
 
@@ -199,6 +201,84 @@ TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
     }
 }
 
+// Leaves the process `count` unused descriptors.
+void leaveDescriptors(int count) {
+    constexpr rlim_t most = 64;
+    const rlimit limit{most, most};
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &limit), 0);
+    std::vector<int> taken;
+    for (int number = ::dup(0); number >= 0; number = ::dup(0))
+        taken.push_back(number);
+    for (int i = 0; i < count; ++i) {
+        ::close(taken.back());
+        taken.pop_back();
+    }
+}
+
+int unusedDescriptors() {
+    std::vector<int> taken;
+    for (int number = ::dup(0); number >= 0; number = ::dup(0))
+        taken.push_back(number);
+    for (const int number : taken)
+        ::close(number);
+    return static_cast<int>(taken.size());
+}
+
+TEST_F(HSPipeUtilTest, withoutDescriptorsForThePipesNothingIsRunAndNoneStaysOpen) {
+    script("exit 0");
+    const std::string noPipe = "2 [HSPipeUtil] pipe failed while preparing to execute /usr/bin/program: ";
+    const std::string noStart = "2 [HSPipeUtil] posix_spawn /usr/bin/program failed: ";
+    const struct {
+        bool withInput;
+        int unused;
+        const std::string& line;
+    } rows[] = {{false, 0, noPipe}, {false, 1, noPipe}, {false, 2, noStart}, {true, 1, noPipe},
+                {true, 2, noPipe},  {true, 3, noPipe},  {true, 4, noStart}};
+    for (const auto& row : rows) {
+        inOwnProcess([&] {
+            leaveDescriptors(row.unused);
+            EXPECT_EQ(row.withInput ? runWith(bytes("in")) : run(), 7);
+            EXPECT_EQ(std::ranges::count(log(), row.line + text(EMFILE)), 1) << row.unused;
+            EXPECT_EQ(output(), "");
+            EXPECT_EQ(unusedDescriptors(), row.unused);
+        });
+    }
+}
+
+TEST_F(HSPipeUtilTest, aChildThatCannotBeWaitedForIsAFailureWithItsOutput) {
+    script("echo out");
+    inOwnProcess([&] {
+        ASSERT_NE(std::signal(SIGCHLD, SIG_IGN), SIG_ERR); // the kernel then reaps the children itself
+        for (const bool withInput : {false, true}) {
+            recordLog();
+            EXPECT_EQ(withInput ? runWith({}) : run(), 7);
+            EXPECT_EQ(error_.text,
+                      std::string("Error executing command") + (withInput ? " with data" : "") + ", result = -1\n");
+            EXPECT_EQ(output(), "out\n");
+            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] waitpid failed for /usr/bin/program: " + text(ECHILD)),
+                      1);
+            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] child exited\n"), 0);
+        }
+    });
+}
+
+#ifdef VELTRA_MEMORY_CAN_BE_LIMITED
+TEST_F(HSPipeUtilTest, aChildThatWritesMoreThanMemoryHoldsDecidesByItsEnd) {
+    script("exec yes");
+    inOwnProcess([&] {
+        limitMemory(std::size_t{100} << 20);
+        EXPECT_EQ(run(), 7);
+        EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] /usr/bin/program was terminated by signal 13\n"), 1);
+        EXPECT_GT(response_["Output"].text()->size(), std::size_t{10} << 20);
+        EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
+
+        EXPECT_EQ(runWith(Value::Data(1 << 20)), 7); // SIGPIPE is ignored, so the child sees that writing fails
+        EXPECT_EQ(error_.text, "Error executing command with data, result = 1\n");
+        EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
+    });
+}
+#endif
+
 TEST_F(HSPipeUtilTest, withoutAResponseNothingIsRun) {
     script("echo ran > \"$1\"");
     const std::string trace = root_.host("/trace");
@@ -268,7 +348,7 @@ TEST_F(HSPipeUtilTest, aChildThatIgnoresItsInputDecidesByItsExitStatus) {
         EXPECT_EQ(after.sa_handler, before.sa_handler);
         EXPECT_EQ(after.sa_flags, before.sa_flags);
     }
-    std::signal(SIGPIPE, SIG_DFL);
+    ASSERT_NE(std::signal(SIGPIPE, SIG_DFL), SIG_ERR);
 }
 
 TEST_F(HSPipeUtilTest, anyOutputBecomesText) {

@@ -11,6 +11,7 @@
 #include "platform/Format.h"
 #include "plugin/ZPOrloServices.h"
 #include "tests/platform/ServicesDouble.h"
+#include "tests/support/OwnProcess.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
 
@@ -271,6 +272,27 @@ TEST_F(PairingCommands, theUpdaterGetsTheTicketTheOptionsAndThePatch) {
     pair();
     EXPECT_EQ(servicesDouble().updater.createOptions, Value(Value::Dictionary{{"Options", innerOptions}}));
 }
+
+#ifdef VELTRA_MEMORY_CAN_BE_LIMITED
+TEST_F(PairingCommands, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
+    constexpr std::size_t size = std::size_t{64} << 20;
+    servicesDouble().pairing.tickets = {{std::string(size, 't')}};
+    servicesDouble().updater.isDone = {true};
+    const struct {
+        std::size_t memory;
+        bool created;
+    } rows[] = {{size * 5 / 2, true}, {size / 2, false}}; // the double keeps a copy of its own
+    for (const auto& row : rows) {
+        inOwnProcess([&] {
+            limitMemory(row.memory);
+            EXPECT_EQ(pair().statusCode(), 0);
+            EXPECT_EQ(servicesDouble().pairing.loadResults, std::vector<std::int32_t>{0});
+            EXPECT_EQ(called("VanterUpdaterCreate Vanter"), row.created);
+            EXPECT_EQ(linesBehind("updaterOptions failed to allocate").empty(), row.created);
+        });
+    }
+}
+#endif
 
 TEST_F(PairingCommands, theCalibrationLoadOnlyLogs) {
     const struct {

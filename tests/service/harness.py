@@ -1,4 +1,5 @@
 """The real service on a bus and a device root of its own, driven by orloctl and busctl."""
+import ctypes
 import json
 import os
 import pathlib
@@ -12,6 +13,10 @@ SOURCE = pathlib.Path(__file__).resolve().parents[2]
 BIN = pathlib.Path(os.environ["VELTRA_BIN"])
 NAME = "com.tevari.VeltraOrloServices"
 LOG = f"private/var/log/{NAME}.log"
+
+# A service that start-service leaves behind becomes a child of the tests, which can then tell how it ended.
+PR_SET_CHILD_SUBREAPER = 36
+assert ctypes.CDLL(None).prctl(PR_SET_CHILD_SUBREAPER, 1, 0, 0, 0) == 0
 
 
 class PrivateBus:
@@ -30,7 +35,8 @@ class PrivateBus:
 
 class Service:
     """A running service on a bus of its own. `answers` replaces the example device's answers; None leaves its whole
-    description as it is. With the `root` of another service it shares that one's device."""
+    description as it is. With the `root` of another service it shares that one's device. At the end it must end cleanly,
+    with nothing that the sanitizer finds leaked."""
 
     def __init__(self, answers=None, root=None):
         self.owns_root = root is None
@@ -44,7 +50,7 @@ class Service:
             "VELTRA_BUS": self.bus.address,
             "DBUS_SESSION_BUS_ADDRESS": self.bus.address,
             # The sanitizer keeps freed memory aside, which would hide what a test of memory looks for.
-            "ASAN_OPTIONS": "quarantine_size_mb=1:thread_local_quarantine_size_kb=64",
+            "ASAN_OPTIONS": "detect_leaks=1:quarantine_size_mb=1:thread_local_quarantine_size_kb=64",
         }
         self.start()
 
@@ -62,18 +68,25 @@ class Service:
 
     def kill(self):
         """Ends the service at once, unless it has ended."""
-        try:
-            os.kill(self.pid, signal.SIGKILL)
-        except ProcessLookupError:
-            pass
+        signal.pidfd_send_signal(self.ended, signal.SIGKILL)
         self.wait_end()
+        os.waitid(os.P_PIDFD, self.ended, os.WEXITED)
         os.close(self.ended)
 
-    def close(self):
+    def stop(self):
+        """Ends the service as its manager does, unless it has ended, and checks that it ended cleanly."""
+        signal.pidfd_send_signal(self.ended, signal.SIGTERM)
+        status = self.wait_end(60)
         self.kill()
-        self.bus.close()
-        if self.owns_root:
-            shutil.rmtree(self.root)
+        assert status == 0, f"the service ended with status {status}"
+
+    def close(self):
+        try:
+            self.stop()
+        finally:
+            self.bus.close()
+            if self.owns_root:
+                shutil.rmtree(self.root)
 
     def describe(self, answers):
         (self.root / "etc/veltra/device.json").write_text(json.dumps({"answers": answers}))
@@ -111,5 +124,10 @@ class Service:
                 return int(line.split()[1])
         raise AssertionError("the service has no memory figure")
 
-    def wait_end(self):
-        select.select([self.ended], [], [])
+    def wait_end(self, seconds=None):
+        """The exit status, or the number of the signal that ended the service as a negative number; None when it still
+        runs after that time."""
+        if not select.select([self.ended], [], [], seconds)[0]:
+            return None
+        ending = os.waitid(os.P_PIDFD, self.ended, os.WEXITED | os.WNOWAIT)
+        return ending.si_status if ending.si_code == os.CLD_EXITED else -ending.si_status

@@ -10,7 +10,7 @@ import subprocess
 import tempfile
 import unittest
 
-from harness import Service
+from harness import BIN, Service
 
 TICKET = "the ticket"
 PATCH = b"\x00patch\xff" * 1000
@@ -215,6 +215,27 @@ class Pairing(unittest.TestCase):
         results = [post[2] for post in self.network.posts() if post[1] == "/corvo/pair/result"]
         self.assertEqual(results, ["-1"] * 4)
 
+    def test_a_calibration_program_that_is_missing_or_killed_fails_no_pairing(self):
+        program = "/usr/local/bin/q21isp"
+        much = "x" * 1000000
+        for name, script, lines in (
+            ("missing", None, [f"posix_spawn {program} failed: No such file or directory", "Output: "]),
+            ("killed after much output", f"head -c {len(much)} /dev/zero | tr '\\0' x; kill -KILL $$",
+             [f"{program} was terminated by signal 9", f"Output: {much}"]),
+        ):
+            with self.subTest(name):
+                (self.service.root / program[1:]).unlink(missing_ok=True)
+                if script:
+                    self.write(program[1:], f"#!/bin/sh\n{script}\n".encode())
+                    (self.service.root / program[1:]).chmod(0o755)
+                self.assertEqual(self.service.orloctl("pair", self.url("corvo"))[0], 0)
+                self.assertEqual(self.service.orloctl("call", "x")[0], 4)
+                log = "\n".join(self.service.log())
+                for line in lines:
+                    self.assertTrue(f"] {line}\n" in log, line[:80])
+        # The second pairing found the chip done.
+        self.assertEqual(log.count("Vanter: installed a firmware of 7000 bytes\n"), 1)
+
 
 class CrashLogs(unittest.TestCase):
     def setUp(self):
@@ -250,6 +271,55 @@ class CrashLogs(unittest.TestCase):
                                            "copy": str(copies / copy)})
             self.assertEqual((copies / copy).read_bytes(), contents)
         self.assertEqual(len(os.listdir(copies)), 3)
+
+    def test_a_log_that_cannot_be_copied_holds_up_no_other(self):
+        varrow = self.service.root / "private/var/mobile/Library/Logs/Varrow"
+        varrow.mkdir(parents=True)
+        copies = self.service.root / "copies"
+        (copies / "directory.log").mkdir(parents=True)
+        os.symlink(copies / "victim", copies / "link.log")
+        os.mkfifo(copies / "fifo.log")
+        (copies / "earlier.log").write_bytes(b"earlier")
+        os.link(copies / "earlier.log", copies / "hard link")
+        no_text = b"\xff" * 251 + b".log"  # a legal name; as text it is three times as long
+        longest = b"a" * 250 + b".ips"
+        for name in (b"directory.log", b"link.log", b"fifo.log", b"earlier.log", no_text, longest):
+            (self.logs / os.fsdecode(name)).write_bytes(name[:9])
+        (varrow / os.fsdecode(longest)).write_bytes(b"second")
+        previous = os.umask(0)
+        self.addCleanup(os.umask, previous)
+        status, answer = self.service.orloctl("crash-logs", "-o", copies)
+        self.assertEqual((status, answer["exitStatus"], len(answer["logs"])), (2, 2, 7))
+        self.assertIn(str(copies), answer["problem"])
+        copied = {"earlier.log": b"earlier.l", "\ufffd" * 83 + ".log": no_text[:9], os.fsdecode(longest): longest[:9],
+                  "2-" + "a" * 249 + ".ips": b"second"}
+        failed = {"directory.log", "link.log", "fifo.log"}
+        self.assertEqual({log["copy"] for log in answer["logs"] if "copy" in log}, {f"{copies}/{name}" for name in copied})
+        self.assertEqual({log["note"].split(": ")[0] for log in answer["logs"] if "note" in log},
+                         {f"not copied to {copies}/{name}" for name in failed})
+        self.assertEqual(set(os.listdir(copies)), copied.keys() | failed | {"hard link"})
+        for name, contents in copied.items():
+            self.assertEqual((copies / name).read_bytes(), contents)
+            self.assertEqual((copies / name).stat().st_mode & 0o7777, 0o600)
+        self.assertEqual((copies / "hard link").read_bytes(), b"earlier")
+
+    def test_the_list_for_people(self):
+        crash_logs = [BIN / "orloctl", "crash-logs"]
+        self.assertEqual(self.service.run(*crash_logs).stdout, "The device keeps no crash logs.\n")
+        self.assertEqual(self.service.run(*crash_logs, "-o", self.service.root / "copies").returncode, 0)
+        (self.logs / "a\n.log").write_bytes(b"x" * 1000)
+        self.assertEqual(
+            self.service.run(*crash_logs).stdout,
+            "NAME                               SIZE  PANIC\n"
+            "/private/var/logs/a\\n.log          1000  no\n",
+        )
+        (self.service.root / "copies/a\n.log").mkdir()
+        done = self.service.run(*crash_logs, "-o", self.service.root / "copies", stderr=subprocess.PIPE)
+        lines = done.stdout.splitlines()
+        self.assertEqual((done.returncode, len(lines)), (2, 4), done)
+        self.assertTrue(lines[2].startswith("/private/var/logs/a\\n.log: not copied to "), lines[2])
+        self.assertEqual(lines[3], f"0 copied to {self.service.root}/copies")
+        self.assertTrue(done.stderr.startswith("orloctl: Not all logs were copied to "), done.stderr)
 
     def test_a_device_without_logs_is_a_success(self):
         self.assertEqual(self.service.orloctl("crash-logs"), (0, {"exitStatus": 0, "status": 45, "logs": []}))

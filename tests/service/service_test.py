@@ -244,7 +244,7 @@ class Survival(ServiceTest):
                                  stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
         self.assertEqual(self.set_bcfg("/blobs/every-kind.bin")[0], 0)
         os.kill(self.service.pid, signal.SIGTERM)
-        self.service.wait_end()
+        self.assertEqual(self.service.wait_end(), 0)
         flood.kill()
         flood.wait()
         self.assertTrue(self.service.log()[-1].endswith("Writting new data to file"), self.service.log()[-1])

@@ -1,7 +1,12 @@
 #ifndef VELTRA_TESTS_OWN_PROCESS_H
 #define VELTRA_TESTS_OWN_PROCESS_H
 
+#include <cstddef>
 #include <cstdlib>
+#include <fstream>
+
+#include <sys/resource.h>
+#include <unistd.h>
 
 #include <gtest/gtest.h>
 
@@ -15,5 +20,20 @@ void inOwnProcess(Body body) {
     };
     EXPECT_EXIT(run(), testing::ExitedWithCode(0), "");
 }
+
+// The sanitizers need more address space than any limit leaves them, and end the process where an allocation fails.
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+#define VELTRA_MEMORY_CAN_BE_LIMITED
+
+// Lets the process, one of inOwnProcess, have `bytes` of memory more than it has now.
+inline void limitMemory(std::size_t bytes) {
+    std::size_t pages = 0;
+    std::ifstream("/proc/self/statm") >> pages;
+    ASSERT_GT(pages, 0U);
+    const rlim_t limit = pages * static_cast<std::size_t>(::getpagesize()) + bytes;
+    const rlimit limits{limit, limit};
+    ASSERT_EQ(::setrlimit(RLIMIT_AS, &limits), 0);
+}
+#endif
 
 #endif

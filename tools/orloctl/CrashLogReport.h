@@ -6,8 +6,11 @@
 #include "tools/orloctl/Report.h"
 
 // Collects the crash and panic logs below the device root and lists them. With a directory, which is made when it is
-// missing, each file is copied there under its own name, or under that name behind a number when two have the same.
-// Raises UsageError when a copy cannot be written.
+// missing, each file is copied there, for its owner alone (mode 0600), since it may hold what only root could read on
+// the device. A copy has the log's own name, behind a number when two have the same, and shortened to what a file name
+// may hold. It replaces a file of that name, but neither follows a symbolic link nor writes to anything else. A log
+// that cannot be copied is listed with a note that says why, the others are copied all the same, and the report is not
+// ok. Raises UsageError when there is no directory to copy to.
 Report collectCrashLogs(const std::string& copyDirectory);
 
 #endif

@@ -180,8 +180,8 @@ int setBcfg(const Options& options, const std::string& devicePath, const std::st
                   : reportUncopied(options, answer, remarks);
 }
 
-int show(const Options& options, const Report& found) {
-    const int status = static_cast<int>(found.ok ? Outcome::Success : Outcome::BadInput);
+int show(const Options& options, const Report& found, Outcome failure = Outcome::BadInput) {
+    const int status = static_cast<int>(found.ok ? Outcome::Success : failure);
     if (options.json) {
         ordered_json json{{"exitStatus", status}};
         json.update(found.json);
@@ -289,7 +289,8 @@ private:
     void addReaders() {
         CLI::App* crashLogs = app_.add_subcommand("crash-logs", "List the device's crash and panic logs, offline");
         crashLogs->add_option("-o,--output", copyPath_, "Copy them into this local directory");
-        crashLogs->callback([this] { run_ = [this] { return show(options_, collectCrashLogs(copyPath_)); }; });
+        crashLogs->callback(
+            [this] { run_ = [this] { return show(options_, collectCrashLogs(copyPath_), Outcome::Usage); }; });
 
         CLI::App* readers = app_.add_subcommand("show", "Show what a local file holds, without the service");
         readers->require_subcommand(1);

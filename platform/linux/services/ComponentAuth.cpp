@@ -38,8 +38,9 @@ class TaskThread {
 public:
     using Task = std::function<void()>;
 
-    // The cryptographic library is set up first, so that it is torn down after the thread has ended.
-    TaskThread() { OPENSSL_init_crypto(0, nullptr); }
+    // The cryptographic library is set up first, so that it is torn down after the thread has ended. Without an option
+    // it would put that off until its first use, on the thread.
+    TaskThread() { OPENSSL_init_crypto(OPENSSL_INIT_LOAD_CRYPTO_STRINGS, nullptr); }
 
     void runAt(Clock::time_point due, Task task) {
         const std::lock_guard lock(mutex_);

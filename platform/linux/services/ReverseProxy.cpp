@@ -21,15 +21,20 @@ struct Event {
     std::chrono::milliseconds after;
 };
 
+// The described events; one whose status is missing or fits no 32 bits is left out.
 std::vector<Event> eventsOf(const Value& reverseProxy) {
     constexpr std::int64_t longest = 3'600'000;
     std::vector<Event> events;
-    if (const Value::Array* described = reverseProxy["events"].array())
-        for (const Value& event : *described)
-            if (const auto status = event["status"].integer())
-                events.push_back({static_cast<std::int32_t>(*status),
-                                  std::chrono::milliseconds(
-                                      std::clamp<std::int64_t>(event["afterMs"].integer().value_or(0), 0, longest))});
+    const Value::Array* described = reverseProxy["events"].array();
+    if (!described)
+        return events;
+    for (const Value& event : *described) {
+        const auto status = event["status"].integer();
+        if (!status || !std::in_range<std::int32_t>(*status))
+            continue;
+        const std::int64_t after = std::clamp<std::int64_t>(event["afterMs"].integer().value_or(0), 0, longest);
+        events.push_back({static_cast<std::int32_t>(*status), std::chrono::milliseconds(after)});
+    }
     return events;
 }
 

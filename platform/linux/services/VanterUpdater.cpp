@@ -1,5 +1,8 @@
 #include "platform/VanterUpdater.h"
 
+#include <functional>
+#include <map>
+#include <mutex>
 #include <utility>
 
 #include "platform/Crypto.h"
@@ -43,20 +46,66 @@ std::string firmwarePath(const Value& chip) {
     return path ? *path : std::string();
 }
 
+// The SHA-384 of a firmware; false with an Error when it cannot be computed.
+bool digestOf(const Value::Data& firmware, Value::Data& digest, std::optional<Error>* error) {
+    digest.resize(crypto::sha384Size);
+    return crypto::sha384(firmware.data(), firmware.size(), digest.data()) ||
+           refuse(error, NoDigest, "The digest of the firmware cannot be computed");
+}
+
+// What this process has installed: by the path of the firmware, its digest.
+class Installed {
+public:
+    // Makes `firmware` the contents of the file at `path`; false, with everything as it was, when it cannot be written.
+    bool install(const std::string& path, const Value::Data& firmware, Value::Data digest) {
+        const std::lock_guard lock(mutex_);
+        if (!files::replace(path, firmware))
+            return false;
+        digests_.insert_or_assign(path, std::move(digest));
+        return true;
+    }
+
+    // What was installed at `path`, empty for nothing.
+    Value::Data digestAt(const std::string& path) const {
+        const std::lock_guard lock(mutex_);
+        const auto found = digests_.find(path);
+        return found == digests_.end() ? Value::Data{} : found->second;
+    }
+
+private:
+    mutable std::mutex mutex_;
+    std::map<std::string, Value::Data, std::less<>> digests_;
+};
+
+Installed& installed() {
+    static Installed shared;
+    return shared;
+}
+
 } // namespace
 
 class VanterUpdater {
 public:
     VanterUpdater(VanterUpdaterLog log, std::string_view name) : log_(log), name_(name) {}
 
-    bool isDone(const Value& chip) const { return done_ || chip["done"].boolean().value_or(false); }
+    // A part that was put in meanwhile has another firmware, or none.
+    static bool isDone(const Value& chip, std::optional<Error>* error) {
+        if (chip["done"].boolean().value_or(false))
+            return true;
+        const Value::Data expected = installed().digestAt(firmwarePath(chip));
+        if (expected.empty())
+            return false;
+        Value::Data found;
+        const auto firmware = files::readWhole(firmwarePath(chip));
+        return firmware && digestOf(*firmware, found, error) && found == expected;
+    }
 
     bool queryInfo(const Value& chip, Value* output, std::optional<Error>* error) const {
         Value::Dictionary information;
         if (const auto firmware = files::readWhole(firmwarePath(chip))) {
-            Value::Data digest(crypto::sha384Size);
-            if (!crypto::sha384(firmware->data(), firmware->size(), digest.data()))
-                return refuse(error, NoDigest, "The digest of the installed firmware cannot be computed");
+            Value::Data digest;
+            if (!digestOf(*firmware, digest, error))
+                return false;
             information["Digest"] = std::move(digest);
         }
         say(information.empty() ? "no firmware is installed" : "a firmware is installed");
@@ -65,13 +114,15 @@ public:
         return true;
     }
 
-    bool performNextStage(const Value& chip, const Value& options, Value* output, std::optional<Error>* error) {
+    bool performNextStage(const Value& chip, const Value& options, Value* output, std::optional<Error>* error) const {
         const Value::Data* firmware = options["FirmwareData"].data();
         if (!firmware)
             return refuse(error, NoFirmwareData, "There is no firmware to install");
-        if (!files::replace(firmwarePath(chip), *firmware))
+        Value::Data digest;
+        if (!digestOf(*firmware, digest, error))
+            return false;
+        if (!installed().install(firmwarePath(chip), *firmware, std::move(digest)))
             return refuse(error, NotInstalled, "The firmware cannot be written to " + firmwarePath(chip));
-        done_ = true;
         say(format("installed a firmware of %lu bytes", firmware->size()));
         if (output)
             *output = Value::Dictionary{{"InstalledSize", firmware->size()}};
@@ -86,7 +137,6 @@ private:
 
     const VanterUpdaterLog log_;
     const std::string name_;
-    bool done_ = false;
 };
 
 VanterUpdater* VanterUpdaterCreate(const Value&, VanterUpdaterLog log, std::string_view name,
@@ -94,9 +144,9 @@ VanterUpdater* VanterUpdaterCreate(const Value&, VanterUpdaterLog log, std::stri
     return mayRun(chip(), "create", error) ? new VanterUpdater(log, name) : nullptr;
 }
 
-bool VanterUpdaterIsDone(VanterUpdater* updater, std::optional<Error>* error) {
+bool VanterUpdaterIsDone(VanterUpdater*, std::optional<Error>* error) {
     const Value described = chip();
-    return mayRun(described, "isDone", error) && updater->isDone(described);
+    return mayRun(described, "isDone", error) && VanterUpdater::isDone(described, error);
 }
 
 bool VanterUpdaterExecCommand(VanterUpdater* updater, std::string_view step, const Value& options, Value* output,
