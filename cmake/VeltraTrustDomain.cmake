@@ -3,7 +3,7 @@
 # such library goes into a program or library with the decoder.
 function(veltra_trust_domain name folder)
     get_filename_component(folder ${folder} ABSOLUTE BASE_DIR ${PROJECT_SOURCE_DIR})
-    file(GLOB files CONFIGURE_DEPENDS ${folder}/*.der)
+    file(GLOB files ${folder}/*.der)
     set(source ${CMAKE_CURRENT_BINARY_DIR}/${name}.cpp)
     set(script ${PROJECT_SOURCE_DIR}/cmake/WriteTrustDomain.cmake)
     add_custom_command(OUTPUT ${source}
