@@ -60,6 +60,18 @@ Key makeRSAKey(unsigned bits) {
     return own(EVP_RSA_gen(bits));
 }
 
+Key makeMultiPrimeRSAKey(unsigned bits) {
+    constexpr int primes = 3;
+    EVP_PKEY* key = nullptr;
+    const std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free)> maker(
+        EVP_PKEY_CTX_new_from_name(nullptr, "RSA", nullptr), EVP_PKEY_CTX_free);
+    if (EVP_PKEY_keygen_init(maker.get()) != 1 ||
+        EVP_PKEY_CTX_set_rsa_keygen_bits(maker.get(), static_cast<int>(bits)) != 1 ||
+        EVP_PKEY_CTX_set_rsa_keygen_primes(maker.get(), primes) != 1 || EVP_PKEY_generate(maker.get(), &key) != 1)
+        throw std::runtime_error("cannot make a key");
+    return own(key);
+}
+
 Key makeECKey(const char* curve) {
     return own(EVP_EC_gen(curve));
 }

@@ -20,6 +20,7 @@ using Key = std::shared_ptr<EVP_PKEY>;
 
 Key readKey(const std::string& pemFile);
 Key makeRSAKey(unsigned bits);
+Key makeMultiPrimeRSAKey(unsigned bits); // of three primes, found sooner than two
 Key makeECKey(const char* curve);
 Bytes readFile(const std::string& path);
 
