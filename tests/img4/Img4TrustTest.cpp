@@ -402,8 +402,8 @@ TEST(Img4Trust, aTrustedDigestStandsInForTheSignatureAndTheConstraints) {
     Decoded trusted(unsound);
     Judge context;
     context.trustedDigest = digestBy(*fastEntry().profile, view);
-    EXPECT_EQ(Img4DecodePerformTrustEvaluationWithCallbacks(objectCode, &trusted.record, &callbacks, fastEntry().profile,
-                                                            &context),
+    EXPECT_EQ(Img4DecodePerformTrustEvaluationWithCallbacks(objectCode, &trusted.record, &callbacks,
+                                                            fastEntry().profile, &context),
               DERSuccess);
     EXPECT_EQ(context.lookups, 1);
     EXPECT_EQ(context.seen, seenInAll());
@@ -442,9 +442,9 @@ TEST(Img4Trust, anObjectFoundByTheCallerReplacesTheSearch) {
     Decoded refused(manifest);
     Judge other;
     other.objectAnswer = DERIncompleteSequence;
-    EXPECT_EQ(
-        Img4DecodePerformTrustEvaluationWithCallbacks(objectCode, &refused.record, &callbacks, fastEntry().profile, &other),
-        DERIncompleteSequence);
+    EXPECT_EQ(Img4DecodePerformTrustEvaluationWithCallbacks(objectCode, &refused.record, &callbacks,
+                                                            fastEntry().profile, &other),
+              DERIncompleteSequence);
     EXPECT_EQ(refused.record.objp.data, nullptr);
 }
 

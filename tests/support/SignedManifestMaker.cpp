@@ -106,9 +106,7 @@ Bytes sign(const Key& key, std::uint64_t digestLength, const Bytes& message) {
 }
 
 Bytes bitString(const Bytes& octets, std::uint8_t unusedBits) {
-    Bytes content = {unusedBits};
-    content.insert(content.end(), octets.begin(), octets.end());
-    return item(DERTagBitString, content);
+    return item(DERTagBitString, join({Bytes(1, unusedBits), octets}));
 }
 
 Bytes algorithm(const Bytes& oid, const Bytes& parameters) {

@@ -156,14 +156,40 @@ public:
     QuietErrors& operator=(const QuietErrors&) = delete;
 };
 
-Key importPublicKey(const char* type, OSSL_PARAM* params) noexcept {
-    EVP_PKEY* key = nullptr;
-    const KeyContext importer(EVP_PKEY_CTX_new_from_name(nullptr, type, nullptr));
-    if (importer == nullptr || EVP_PKEY_fromdata_init(importer.get()) != 1 ||
-        EVP_PKEY_fromdata(importer.get(), &key, EVP_PKEY_PUBLIC_KEY, params) != 1)
-        return nullptr;
-    return Key(key);
-}
+// A context for the import of public keys of one type. Making it costs a tenth of a verification, so that one that has
+// served is kept for the next key, whichever thread brings it.
+class Importer {
+public:
+    struct Type {
+        const char* name;
+        std::atomic<EVP_PKEY_CTX*> spare = nullptr;
+    };
+
+    explicit Importer(Type& type) noexcept : type_(type), context_(type.spare.exchange(nullptr)) {
+        if (context_ != nullptr)
+            return;
+        context_.reset(EVP_PKEY_CTX_new_from_name(nullptr, type.name, nullptr));
+        if (context_ != nullptr && EVP_PKEY_fromdata_init(context_.get()) != 1)
+            context_ = nullptr;
+    }
+    Importer(const Importer&) = delete;
+    Importer& operator=(const Importer&) = delete;
+
+    Key import(OSSL_PARAM* params) && noexcept {
+        EVP_PKEY* key = nullptr;
+        if (context_ == nullptr || EVP_PKEY_fromdata(context_.get(), &key, EVP_PKEY_PUBLIC_KEY, params) != 1)
+            return nullptr;
+        context_.reset(type_.spare.exchange(context_.release()));
+        return Key(key);
+    }
+
+private:
+    Type& type_;
+    KeyContext context_;
+};
+
+Importer::Type rsaKeys = {"RSA"};
+Importer::Type ecKeys = {"EC"};
 
 bool verify(EVP_PKEY_CTX* verifier, Bytes hash, Bytes signature) noexcept {
     return EVP_PKEY_verify(verifier, signature.data, signature.length, hash.data, hash.length) == 1;
@@ -194,7 +220,7 @@ Key importRSAKey(Bytes modulus, Bytes exponent) noexcept {
     NativeNumber e(exponent);
     OSSL_PARAM params[] = {n.parameter(OSSL_PKEY_PARAM_RSA_N), e.parameter(OSSL_PKEY_PARAM_RSA_E),
                            OSSL_PARAM_construct_end()};
-    return importPublicKey("RSA", params);
+    return Importer(rsaKeys).import(params);
 }
 
 struct CurveDescription {
@@ -214,7 +240,7 @@ Key importPoint(Curve curve, Bytes point) noexcept {
         OSSL_PARAM_construct_utf8_string(OSSL_PKEY_PARAM_GROUP_NAME, const_cast<char*>(description.name), 0),
         OSSL_PARAM_construct_octet_string(OSSL_PKEY_PARAM_PUB_KEY, const_cast<std::uint8_t*>(point.data), point.length),
         OSSL_PARAM_construct_end()};
-    return importPublicKey("EC", params);
+    return Importer(ecKeys).import(params);
 }
 
 } // namespace
