@@ -1,19 +1,24 @@
 include(CMakePackageConfigHelpers)
 
-# veltra_codec_library(<name> SOURCES ... HEADERS ... [CODECS <name>...] [PLATFORM <target>...] [REQUIRES <pkg>...])
+# veltra_codec_library(<name> SOURCES ... HEADERS ... [OBJECTS <target>...] [CODECS <name>...] [PLATFORM <target>...]
+#                      [REQUIRES <pkg>...])
 #
 # One C-callable codec, compiled once and offered twice: the static library `<name>` and the shared library
 # `<name>-shared` (lib<name>.a, lib<name>.so). Both are installed with HEADERS, a pkg-config file and the CMake package
-# `veltra`. CODECS are other codecs that it stands on, PLATFORM the static libraries of the platform that go into it,
-# REQUIRES the pkg-config modules that a static link needs.
+# `veltra`. OBJECTS are object libraries that go into both, CODECS are other codecs that it stands on, PLATFORM the static
+# libraries of the platform that go into it, REQUIRES the pkg-config modules that a static link needs.
 function(veltra_codec_library name)
-    cmake_parse_arguments(ARG "" "" "SOURCES;HEADERS;CODECS;PLATFORM;REQUIRES" ${ARGN})
+    cmake_parse_arguments(ARG "" "" "SOURCES;HEADERS;OBJECTS;CODECS;PLATFORM;REQUIRES" ${ARGN})
     add_library(${name}-objects OBJECT ${ARG_SOURCES})
     target_compile_options(${name}-objects PRIVATE
         $<$<COMPILE_LANGUAGE:CXX>:-fno-exceptions -fno-rtti -fno-threadsafe-statics>)
 
-    add_library(${name} STATIC $<TARGET_OBJECTS:${name}-objects>)
-    add_library(${name}-shared SHARED $<TARGET_OBJECTS:${name}-objects>)
+    set(objects $<TARGET_OBJECTS:${name}-objects>)
+    foreach(library IN LISTS ARG_OBJECTS)
+        list(APPEND objects $<TARGET_OBJECTS:${library}>)
+    endforeach()
+    add_library(${name} STATIC ${objects})
+    add_library(${name}-shared SHARED ${objects})
     set_target_properties(${name}-shared PROPERTIES
         OUTPUT_NAME ${name} VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
         # The codecs that it stands on are installed beside it.

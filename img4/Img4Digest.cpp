@@ -1,14 +1,11 @@
 #include "img4/Img4Internal.h"
-
-#include "platform/Crypto.h"
+#include "img4/Img4Trust.h"
 
 #include <cstring>
 
 using namespace img4;
 
 namespace {
-
-static_assert(Img4HashLength == crypto::sha1Size && Img4MaxDigestLength == crypto::sha384Size);
 
 // What a digest is taken of: a raw encoding, and the digest of it that the record may hold already.
 struct Source {
@@ -24,10 +21,6 @@ Source payloadOf(const Img4Record& record) {
 Source manifestOf(const Img4Record& record) {
     return {isPresent(record.manifestRaw) ? &record.manifestRaw : nullptr,
             record.manifestHashed != 0 ? record.manifest.digest : nullptr};
-}
-
-DERReturn sha1(const uint8_t* data, uint64_t length, uint8_t* out, void* /*context*/) {
-    return crypto::sha1(data, static_cast<std::size_t>(length), out) ? DERSuccess : Img4Failure;
 }
 
 DERReturn copyHash(const Img4Record* record, Source (*sourceOf)(const Img4Record&), uint8_t* out, uint64_t length,
@@ -61,11 +54,11 @@ DERReturn copyDigest(const Img4Record* record, Source (*sourceOf)(const Img4Reco
 } // namespace
 
 DERReturn Img4DecodeCopyPayloadHash(const Img4Record* record, uint8_t* out, uint64_t length) {
-    return copyHash(record, payloadOf, out, length, sha1, nullptr);
+    return copyHash(record, payloadOf, out, length, sha1_digest, nullptr);
 }
 
 DERReturn Img4DecodeCopyManifestHash(const Img4Record* record, uint8_t* out, uint64_t length) {
-    return copyHash(record, manifestOf, out, length, sha1, nullptr);
+    return copyHash(record, manifestOf, out, length, sha1_digest, nullptr);
 }
 
 DERReturn Img4DecodeCopyPayloadHashWithCallback(const Img4Record* record, uint8_t* out, uint64_t length,

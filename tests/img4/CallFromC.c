@@ -1,7 +1,7 @@
 /* The header compiles as C11, and the shared library serves a C program. */
 #include <stdio.h>
 
-#include "img4/Img4.h"
+#include "img4/Img4Trust.h"
 
 /* A manifest with the object "sepi", which carries "eksp" with the value true. */
 static const uint8_t manifest[] = {
@@ -24,6 +24,38 @@ static DERReturn sumOctets(const uint8_t* data, uint64_t length, uint8_t* out, v
     for (int i = 0; i < Img4HashLength; ++i)
         out[i] = (uint8_t)*sum;
     return DERSuccess;
+}
+
+static DERReturn countProperties(DERTag tag, const Img4PropertyValue* value, uint32_t selector, void* context) {
+    unsigned* count = context;
+    *count += tag != 0 && value->tag == DERTagBoolean && selector == Img4SelectorObject;
+    return DERSuccess;
+}
+
+static int checkTrust(Img4Record* record, uint32_t object) {
+    const uint8_t* (*const lookup)(const Img4Record*, void*) = NULL;
+    const Img4TrustCallbacks callbacks = {countProperties, lookup, NULL};
+    Img4DomainProfile domainProfile;
+    Img4ChainRefusal refusal = {Img4ChainSound, 0};
+    Img4Property property;
+    unsigned count = 0;
+    int failures = 0;
+    for (uint16_t i = 0; i < Img4NumTrustProfiles; ++i)
+        failures += check(Img4DecodePerformTrustEvaluationWithCallbacks(
+                              object, record, &callbacks, Img4TrustProfiles[i].profile, &count) == Img4Failure,
+                          Img4TrustProfiles[i].name);
+    failures += check(Img4DecodeMakeDomainProfile(&Img4TrustProfiles[0], Img4TrustProfiles[0].root,
+                                                  &Img4BuiltInTrustDomain, &domainProfile) == DERSuccess,
+                      "domain profile");
+    domainProfile.refusal = &refusal;
+    failures += check(Img4DecodePerformTrustEvaluation(object, record, countProperties, &domainProfile.profile,
+                                                       &count) == Img4Failure &&
+                          refusal.fault == Img4ChainLength && count == 0,
+                      "refusal");
+    failures += check(DERImg4DecodeFindProperty(&record->manb, Img4PropertyTag(object), DERTagSet, &property) ==
+                          DEREndOfSequence,
+                      "no dictionaries without trust");
+    return failures;
 }
 
 int main(void) {
@@ -50,6 +82,7 @@ int main(void) {
                               DERSuccess &&
                           total == sizeof manifest,
                       "length");
+    failures += checkTrust(&record, sepi);
     failures += check(Img4DecodeParseLengthFromBuffer(NULL, 0, &total) == Img4Failure && total == 0, "failure");
     return failures == 0 ? 0 : 1;
 }

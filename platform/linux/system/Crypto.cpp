@@ -1,12 +1,18 @@
 #include "platform/Crypto.h"
 
+#include <algorithm>
+#include <atomic>
+#include <bit>
 #include <cerrno>
 #include <cstring>
+#include <memory>
 
 #include <openssl/core_names.h>
 #include <openssl/crypto.h>
+#include <openssl/err.h>
 #include <openssl/evp.h>
 #include <openssl/params.h>
+#include <openssl/rsa.h>
 #include <sys/random.h>
 
 namespace crypto {
@@ -18,12 +24,34 @@ bool libraryIsUsable() noexcept {
     return OSSL_LIB_CTX_get0_global_default() != nullptr;
 }
 
-bool digest(const EVP_MD* algorithm, const void* data, std::size_t length, std::uint8_t* out,
-            std::size_t size) noexcept {
-    if (libraryIsUsable() && EVP_Digest(data, length, out, nullptr, algorithm, nullptr) == 1)
-        return true;
-    std::memset(out, 0, size);
-    return false;
+// One digest, fetched at its first use and kept: a fetch costs as much as the digest of a kilobyte.
+struct DigestAlgorithm {
+    const char* name;
+    std::size_t size;
+    std::atomic<EVP_MD*> fetched = nullptr;
+};
+
+DigestAlgorithm digestAlgorithms[] = {
+    {"SHA1", sha1Size}, {"SHA256", sha256Size}, {"SHA384", sha384Size}, {"SHA512", sha512Size}};
+
+DigestAlgorithm& describe(Digest algorithm) {
+    return digestAlgorithms[static_cast<std::size_t>(algorithm)];
+}
+
+// Null when memory has run out.
+const EVP_MD* implementation(DigestAlgorithm& algorithm) noexcept {
+    EVP_MD* known = algorithm.fetched.load(std::memory_order_acquire);
+    if (known != nullptr || !libraryIsUsable())
+        return known;
+    EVP_MD* const fetched = EVP_MD_fetch(nullptr, algorithm.name, nullptr);
+    if (algorithm.fetched.compare_exchange_strong(known, fetched, std::memory_order_acq_rel))
+        return fetched;
+    EVP_MD_free(fetched); // another thread was first
+    return known;
+}
+
+EVP_MD_CTX* context(RunningDigest* running) {
+    return reinterpret_cast<EVP_MD_CTX*>(running);
 }
 
 EVP_MAC_CTX* context(void* pointer) {
@@ -32,16 +60,47 @@ EVP_MAC_CTX* context(void* pointer) {
 
 } // namespace
 
+bool digest(Digest algorithm, Bytes data, std::uint8_t* out) noexcept {
+    DigestAlgorithm& description = describe(algorithm);
+    const EVP_MD* const md = implementation(description);
+    if (md != nullptr && EVP_Digest(data.data, data.length, out, nullptr, md, nullptr) == 1)
+        return true;
+    std::memset(out, 0, description.size);
+    return false;
+}
+
 bool sha1(const void* data, std::size_t length, std::uint8_t* out) noexcept {
-    return digest(EVP_sha1(), data, length, out, sha1Size);
+    return digest(Digest::SHA1, {static_cast<const std::uint8_t*>(data), length}, out);
 }
 
 bool sha256(const void* data, std::size_t length, std::uint8_t* out) noexcept {
-    return digest(EVP_sha256(), data, length, out, sha256Size);
+    return digest(Digest::SHA256, {static_cast<const std::uint8_t*>(data), length}, out);
 }
 
 bool sha384(const void* data, std::size_t length, std::uint8_t* out) noexcept {
-    return digest(EVP_sha384(), data, length, out, sha384Size);
+    return digest(Digest::SHA384, {static_cast<const std::uint8_t*>(data), length}, out);
+}
+
+RunningDigest* startDigest(Digest algorithm) noexcept {
+    const EVP_MD* const md = implementation(describe(algorithm));
+    EVP_MD_CTX* const started = md != nullptr ? EVP_MD_CTX_new() : nullptr;
+    if (started == nullptr || EVP_DigestInit_ex(started, md, nullptr) == 1)
+        return reinterpret_cast<RunningDigest*>(started);
+    EVP_MD_CTX_free(started);
+    return nullptr;
+}
+
+bool updateDigest(RunningDigest* running, Bytes data) noexcept {
+    return EVP_DigestUpdate(context(running), data.data, data.length) == 1;
+}
+
+bool finishDigest(RunningDigest* running, std::uint8_t* out) noexcept {
+    const int size = EVP_MD_CTX_get_size(context(running));
+    const bool done = EVP_DigestFinal_ex(context(running), out, nullptr) == 1;
+    if (!done && size > 0)
+        std::memset(out, 0, static_cast<std::size_t>(size));
+    EVP_MD_CTX_free(context(running));
+    return done;
 }
 
 HMACSHA256::~HMACSHA256() {
@@ -77,6 +136,135 @@ bool HMACSHA256::final(std::uint8_t (&out)[sha256Size]) noexcept {
         return true;
     std::memset(out, 0, sizeof out);
     return false;
+}
+
+namespace {
+
+template <class Object, void (*Free)(Object*)>
+struct Release {
+    void operator()(Object* object) const { Free(object); }
+};
+using Key = std::unique_ptr<EVP_PKEY, Release<EVP_PKEY, EVP_PKEY_free>>;
+using KeyContext = std::unique_ptr<EVP_PKEY_CTX, Release<EVP_PKEY_CTX, EVP_PKEY_CTX_free>>;
+
+// What the library notes about bad keys and signatures is forgotten; what it noted before stays.
+class QuietErrors {
+public:
+    QuietErrors() noexcept { ERR_set_mark(); }
+    ~QuietErrors() { ERR_pop_to_mark(); }
+    QuietErrors(const QuietErrors&) = delete;
+    QuietErrors& operator=(const QuietErrors&) = delete;
+};
+
+// A context for the import of public keys of one type. Making it costs a tenth of a verification, so that one that has
+// served is kept for the next key, whichever thread brings it.
+class Importer {
+public:
+    struct Type {
+        const char* name;
+        std::atomic<EVP_PKEY_CTX*> spare = nullptr;
+    };
+
+    explicit Importer(Type& type) noexcept : type_(type), context_(type.spare.exchange(nullptr)) {
+        if (context_ != nullptr)
+            return;
+        context_.reset(EVP_PKEY_CTX_new_from_name(nullptr, type.name, nullptr));
+        if (context_ != nullptr && EVP_PKEY_fromdata_init(context_.get()) != 1)
+            context_ = nullptr;
+    }
+    Importer(const Importer&) = delete;
+    Importer& operator=(const Importer&) = delete;
+
+    Key import(OSSL_PARAM* params) && noexcept {
+        EVP_PKEY* key = nullptr;
+        if (context_ == nullptr || EVP_PKEY_fromdata(context_.get(), &key, EVP_PKEY_PUBLIC_KEY, params) != 1)
+            return nullptr;
+        context_.reset(type_.spare.exchange(context_.release()));
+        return Key(key);
+    }
+
+private:
+    Type& type_;
+    KeyContext context_;
+};
+
+Importer::Type rsaKeys = {"RSA"};
+Importer::Type ecKeys = {"EC"};
+
+bool verify(EVP_PKEY_CTX* verifier, Bytes hash, Bytes signature) noexcept {
+    return EVP_PKEY_verify(verifier, signature.data, signature.length, hash.data, hash.length) == 1;
+}
+
+// A number in the order of octets that parameters of the library have.
+class NativeNumber {
+public:
+    static constexpr std::size_t capacity = 1024;
+
+    // Of at most `capacity` octets, big-endian.
+    explicit NativeNumber(Bytes number) noexcept : length_(number.length) {
+        std::copy_n(number.data, number.length, octets_);
+        if constexpr (std::endian::native == std::endian::little)
+            std::reverse(octets_, octets_ + length_);
+    }
+    OSSL_PARAM parameter(const char* name) noexcept { return OSSL_PARAM_construct_BN(name, octets_, length_); }
+
+private:
+    unsigned char octets_[capacity];
+    std::size_t length_;
+};
+
+Key importRSAKey(Bytes modulus, Bytes exponent) noexcept {
+    if (modulus.length > NativeNumber::capacity || exponent.length > NativeNumber::capacity)
+        return nullptr;
+    NativeNumber n(modulus);
+    NativeNumber e(exponent);
+    OSSL_PARAM params[] = {n.parameter(OSSL_PKEY_PARAM_RSA_N), e.parameter(OSSL_PKEY_PARAM_RSA_E),
+                           OSSL_PARAM_construct_end()};
+    return Importer(rsaKeys).import(params);
+}
+
+struct CurveDescription {
+    const char* name;
+    std::size_t pointLength;
+};
+
+constexpr CurveDescription curves[] = {{"P-256", 65}, {"P-384", 97}};
+
+Key importPoint(Curve curve, Bytes point) noexcept {
+    constexpr std::uint8_t uncompressed = 0x04;
+    const CurveDescription& description = curves[static_cast<std::size_t>(curve)];
+    if (point.length != description.pointLength || point.data[0] != uncompressed)
+        return nullptr;
+    // Parameters are read only here, whatever their type says.
+    OSSL_PARAM params[] = {
+        OSSL_PARAM_construct_utf8_string(OSSL_PKEY_PARAM_GROUP_NAME, const_cast<char*>(description.name), 0),
+        OSSL_PARAM_construct_octet_string(OSSL_PKEY_PARAM_PUB_KEY, const_cast<std::uint8_t*>(point.data), point.length),
+        OSSL_PARAM_construct_end()};
+    return Importer(ecKeys).import(params);
+}
+
+} // namespace
+
+bool verifyRSASignature(Digest algorithm, Bytes hash, Bytes modulus, Bytes exponent, Bytes signature) noexcept {
+    DigestAlgorithm& description = describe(algorithm);
+    const EVP_MD* const md = implementation(description);
+    if (md == nullptr || hash.length != description.size || signature.length != modulus.length)
+        return false;
+    const QuietErrors quiet;
+    const Key key = importRSAKey(modulus, exponent);
+    const KeyContext verifier(key != nullptr ? EVP_PKEY_CTX_new_from_pkey(nullptr, key.get(), nullptr) : nullptr);
+    return verifier != nullptr && EVP_PKEY_verify_init(verifier.get()) == 1 &&
+           EVP_PKEY_CTX_set_rsa_padding(verifier.get(), RSA_PKCS1_PADDING) == 1 &&
+           EVP_PKEY_CTX_set_signature_md(verifier.get(), md) == 1 && verify(verifier.get(), hash, signature);
+}
+
+bool verifyECDSASignature(Curve curve, Bytes point, Bytes hash, Bytes signature) noexcept {
+    if (!libraryIsUsable())
+        return false;
+    const QuietErrors quiet;
+    const Key key = importPoint(curve, point);
+    const KeyContext verifier(key != nullptr ? EVP_PKEY_CTX_new_from_pkey(nullptr, key.get(), nullptr) : nullptr);
+    return verifier != nullptr && EVP_PKEY_verify_init(verifier.get()) == 1 && verify(verifier.get(), hash, signature);
 }
 
 bool randomBytes(void* out, std::size_t length) noexcept {

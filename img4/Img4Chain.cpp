@@ -1,0 +1,234 @@
+#include "der/DERItemSpecs.h"
+#include "img4/Img4TrustInternal.h"
+
+#include <cstring>
+
+using namespace img4;
+
+namespace {
+
+constexpr uint64_t largestCertificate = 0x1FFFF;
+
+constexpr uint8_t commonNameOctets[] = {0x55, 0x04, 0x03};
+constexpr DERItem oidCommonName = {commonNameOctets, sizeof commonNameOctets};
+
+struct Certificate {
+    DERSignedCertCrl fields;
+    DERTBSCert tbs;
+    DERItem key;
+};
+
+bool areEqual(const DERItem& one, const DERItem& other) {
+    return one.length == other.length &&
+           (one.length == 0 || std::memcmp(one.data, other.data, static_cast<std::size_t>(one.length)) == 0);
+}
+
+bool isAbsentOrNull(const DERItem& parameters) {
+    constexpr uint8_t null[] = {0x05, 0x00};
+    return !isPresent(parameters) || areEqual(parameters, {null, sizeof null});
+}
+
+bool parseAlgorithm(const DERItem& content, DERAlgorithmId* algorithm) {
+    return DERParseSequenceContent(&content, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, algorithm,
+                                   sizeof *algorithm) == DERSuccess;
+}
+
+// The octets of a BIT STRING whose bits fill them.
+bool parseOctets(const DERItem& bitString, DERItem* octets) {
+    uint8_t unusedBits = 0;
+    return DERParseBitString(&bitString, octets, &unusedBits) == DERSuccess && unusedBits == 0 && isPresent(*octets);
+}
+
+bool isNamedCurve(const DERItem& parameters, const DERItem* curve) {
+    DERItem oid;
+    return isWholeItem(parameters, DERTagObjectIdentifier, &oid) && DEROidCompare(&oid, curve);
+}
+
+bool isPoint(const DERItem& key, const DERItem* curveOid) {
+    const NamedCurve* curve = curveOfPoint(key.length);
+    return curve != nullptr && DEROidCompare(curve->oid, curveOid);
+}
+
+bool parseKey(const DERItem& subjectPublicKeyInfo, KeyKind kind, const DERItem* curveOid, DERItem* key) {
+    DERSubjPubKeyInfo info;
+    DERAlgorithmId algorithm;
+    if (DERParseSequenceContent(&subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info,
+                                sizeof info) != DERSuccess ||
+        !parseAlgorithm(info.algorithm, &algorithm) || !parseOctets(info.publicKey, key))
+        return false;
+    if (kind == KeyKind::RSA)
+        return DEROidCompare(&algorithm.algorithm, &oidRsa) && isAbsentOrNull(algorithm.parameters);
+    return DEROidCompare(&algorithm.algorithm, &oidEcPubKey) && isNamedCurve(algorithm.parameters, curveOid) &&
+           isPoint(*key, curveOid);
+}
+
+Img4ChainFault parseCertificate(const DERItem& encoding, KeyKind kind, const Img4TrustProfile& profile,
+                                Certificate* certificate) {
+    if (DERParseSequence(&encoding, DERNumSignedCertCrlItemSpecs, DERSignedCertCrlItemSpecs, &certificate->fields,
+                         sizeof certificate->fields) != DERSuccess ||
+        DERParseSequence(&certificate->fields.tbs, DERNumTBSCertItemSpecs, DERTBSCertItemSpecs, &certificate->tbs,
+                         sizeof certificate->tbs) != DERSuccess)
+        return Img4ChainEncoding;
+    return parseKey(certificate->tbs.subjectPublicKeyInfo, kind, profile.keyAlgorithmOid, &certificate->key)
+               ? Img4ChainSound
+               : Img4ChainKey;
+}
+
+// The encodings of the certificates, the root's first.
+struct Encodings {
+    DERItem certificates[longestChain];
+    uint32_t count;
+};
+
+Img4ChainRefusal splitChain(const DERItem& certChain, uint32_t length, Encodings* encodings) {
+    DERSequence rest;
+    DERDecodedInfo decoded;
+    DERDecodeSeqContentInit(&certChain, &rest);
+    for (;;) {
+        const uint8_t* start = rest.next;
+        const DERReturn result = DERDecodeSeqNext(&rest, &decoded);
+        if (result == DEREndOfSequence)
+            return {encodings->count == length ? Img4ChainSound : Img4ChainLength, encodings->count};
+        if (result != DERSuccess)
+            return {Img4ChainEncoding, encodings->count};
+        if (encodings->count == length)
+            return {Img4ChainLength, encodings->count};
+        const DERItem encoding = {start, static_cast<uint64_t>(rest.next - start)};
+        if (encoding.length > largestCertificate)
+            return {Img4ChainCertificateSize, encodings->count};
+        encodings->certificates[encodings->count++] = encoding;
+    }
+}
+
+bool verifySignature(const Certificate& issuer, const Certificate& issued, const Img4TrustProfile& profile) {
+    const uint64_t length = profile.digestInfo->length;
+    uint8_t digest[Img4LongestDigest];
+    DERItem signature;
+    return parseOctets(issued.fields.signature, &signature) && length <= sizeof digest &&
+           profile.computeDigest(&issued.fields.tbs, digest, length, &profile) == DERSuccess &&
+           profile.verifySignature(&issuer.key, &signature, digest, length, &profile) == DERSuccess;
+}
+
+bool isSignedWith(const Certificate& certificate, KeyKind kind, const DERItem* algorithmOid) {
+    DERAlgorithmId algorithm;
+    return parseAlgorithm(certificate.fields.signatureAlgorithm, &algorithm) &&
+           DEROidCompare(&algorithm.algorithm, algorithmOid) &&
+           (kind == KeyKind::EC || isAbsentOrNull(algorithm.parameters));
+}
+
+Img4ChainFault checkIssued(const Certificate& issuer, const Certificate& issued, KeyKind kind,
+                           const Img4TrustProfile& profile) {
+    if (!areEqual(issued.tbs.issuer, issuer.tbs.subject))
+        return Img4ChainIssuer;
+    if (!isSignedWith(issued, kind, profile.signatureAlgorithmOid))
+        return Img4ChainSignatureAlgorithm;
+    return verifySignature(issuer, issued, profile) ? Img4ChainSound : Img4ChainSignature;
+}
+
+// Finds the common name among the attributes of one RelativeDistinguishedName, as a whole encoding.
+bool findCommonName(const DERItem& attributes, DERItem* name) {
+    DERSequence rest;
+    DERDecodedInfo element;
+    DERDecodeSeqContentInit(&attributes, &rest);
+    while (DERDecodeSeqNext(&rest, &element) == DERSuccess) {
+        DERAttributeTypeAndValue attribute;
+        if (element.tag != DERTagSequence ||
+            DERParseSequenceContent(&element.content, DERNumAttributeTypeAndValueItemSpecs,
+                                    DERAttributeTypeAndValueItemSpecs, &attribute, sizeof attribute) != DERSuccess)
+            return false;
+        *name = attribute.value;
+        if (DEROidCompare(&attribute.type, &oidCommonName))
+            return true;
+    }
+    return false;
+}
+
+// The first common name decides.
+bool isAuthority(const DERItem& subject, const DERItem& authorityName) {
+    DERSequence rest;
+    DERDecodedInfo relativeName;
+    DERItem name;
+    DERDecodeSeqContentInit(&subject, &rest);
+    while (DERDecodeSeqNext(&rest, &relativeName) == DERSuccess && relativeName.tag == DERTagSet)
+        if (findCommonName(relativeName.content, &name))
+            return isPresent(authorityName) && areEqual(name, authorityName);
+    return false;
+}
+
+// Takes the constraints from the leaf's extensions. RFC 5280 4.2 forbids two of the same kind.
+bool findConstraints(const DERItem& extensions, const DERItem& oid, DERItem* certProperties) {
+    DERItem list;
+    DERItem content;
+    DERSequence rest;
+    DERDecodedInfo element;
+    if (!isPresent(extensions))
+        return true;
+    if (!isWholeItem(extensions, DERTagSequence, &list) || list.length == 0)
+        return false;
+    DERDecodeSeqContentInit(&list, &rest);
+    DERReturn result = DERDecodeSeqNext(&rest, &element);
+    for (; result == DERSuccess; result = DERDecodeSeqNext(&rest, &element)) {
+        DERExtension extension;
+        if (element.tag != DERTagSequence ||
+            DERParseSequenceContent(&element.content, DERNumExtensionItemSpecs, DERExtensionItemSpecs, &extension,
+                                    sizeof extension) != DERSuccess)
+            return false;
+        if (!DEROidCompare(&extension.extensionID, &oid))
+            continue;
+        if (isPresent(*certProperties) || !isWholeItem(extension.value, DERTagSet, &content))
+            return false;
+        *certProperties = extension.value;
+    }
+    return result == DEREndOfSequence;
+}
+
+Img4ChainRefusal verifyCertificates(const ChainRules& rules, const Certificate* certificates,
+                                    const DERItem& authorityName, const Img4TrustProfile& profile) {
+    for (uint32_t i = 1; i < rules.length; ++i) {
+        const Img4ChainFault fault = checkIssued(certificates[i - 1], certificates[i], rules.key, profile);
+        if (fault != Img4ChainSound)
+            return {fault, i};
+    }
+    if (rules.authority && !isAuthority(certificates[1].tbs.subject, authorityName))
+        return {Img4ChainAuthority, 1};
+    return {Img4ChainSound, rules.length - 1};
+}
+
+bool arePresent(const ChainArguments& arguments) {
+    const Img4TrustProfile* profile = arguments.profile;
+    return arguments.certChain != nullptr && profile != nullptr && profile->computeDigest != nullptr &&
+           profile->verifySignature != nullptr && profile->digestInfo != nullptr;
+}
+
+} // namespace
+
+Img4ChainRefusal img4::verifyChain(const ChainRules& rules, const DERItem& root, const Img4TrustDomain& domain,
+                                   const ChainArguments& arguments) {
+    if (arguments.leafKey == nullptr || arguments.certProperties == nullptr)
+        return {Img4ChainParameters, 0};
+    *arguments.leafKey = {};
+    *arguments.certProperties = {};
+    if (!arePresent(arguments))
+        return {Img4ChainParameters, 0};
+    Encodings encodings = {{root}, 1};
+    if (const Img4ChainRefusal refusal = splitChain(*arguments.certChain, rules.length, &encodings);
+        refusal.fault != Img4ChainSound)
+        return refusal;
+    Certificate certificates[longestChain];
+    for (uint32_t i = 0; i < rules.length; ++i) {
+        const Img4ChainFault fault =
+            parseCertificate(encodings.certificates[i], rules.key, *arguments.profile, &certificates[i]);
+        if (fault != Img4ChainSound)
+            return {fault, i};
+    }
+    Img4ChainRefusal refusal = verifyCertificates(rules, certificates, domain.authorityName, *arguments.profile);
+    if (refusal.fault != Img4ChainSound)
+        return refusal;
+    const Certificate& leaf = certificates[rules.length - 1];
+    if (!findConstraints(leaf.tbs.extensions, domain.manifestCertSpecOid, arguments.certProperties)) {
+        *arguments.certProperties = {};
+        return {Img4ChainExtensions, rules.length - 1};
+    }
+    *arguments.leafKey = leaf.key;
+    return refusal;
+}

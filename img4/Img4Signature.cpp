@@ -1,0 +1,147 @@
+#include "der/DERItemSpecs.h"
+#include "img4/Img4TrustInternal.h"
+
+#include <bit>
+#include <cstddef>
+#include <cstring>
+
+using namespace img4;
+
+namespace {
+
+constexpr std::size_t leastModulusBits = 1024;
+constexpr std::size_t mostModulusBits = 4096;
+constexpr std::size_t mostModulusBits3k = 3072;
+
+struct RSAKey {
+    crypto::Bytes modulus;
+    crypto::Bytes exponent;
+};
+
+// The octets of a number that is not negative, without leading zeros; none for zero.
+bool parseNumber(DERItem integer, crypto::Bytes* number) {
+    if (!hasContent(integer) || (integer.data[0] & 0x80) != 0)
+        return false;
+    while (integer.length != 0 && integer.data[0] == 0)
+        integer = {integer.data + 1, integer.length - 1};
+    *number = bytesOf(integer);
+    return true;
+}
+
+bool parseRSAKey(const DERItem& encoding, RSAKey* key) {
+    DERItem content;
+    DERRSAPubKeyPKCS1 fields;
+    return isWholeItem(encoding, DERTagSequence, &content) &&
+           DERParseSequenceContent(&content, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs, &fields,
+                                   sizeof fields) == DERSuccess &&
+           parseNumber(fields.modulus, &key->modulus) && parseNumber(fields.publicExponent, &key->exponent);
+}
+
+std::size_t bitsOf(const crypto::Bytes& number) {
+    if (number.length == 0)
+        return 0;
+    return (number.length - 1) * 8 + static_cast<std::size_t>(std::bit_width(number.data[0]));
+}
+
+bool isOdd(const crypto::Bytes& number) {
+    return number.length != 0 && (number.data[number.length - 1] & 1) != 0;
+}
+
+bool isLess(const crypto::Bytes& one, const crypto::Bytes& other) {
+    if (one.length != other.length)
+        return one.length < other.length;
+    return std::memcmp(one.data, other.data, one.length) < 0;
+}
+
+// RFC 8017 3.1: the modulus is a product of odd primes, and the exponent lies between 3 and the modulus and is odd.
+// With the exponent 1 anyone could sign.
+bool isSoundKey(const RSAKey& key, std::size_t mostBits) {
+    const std::size_t bits = bitsOf(key.modulus);
+    return bits >= leastModulusBits && bits <= mostBits && isOdd(key.modulus) && isOdd(key.exponent) &&
+           bitsOf(key.exponent) > 1 && isLess(key.exponent, key.modulus);
+}
+
+bool arePresent(const DERItem* key, const DERItem* signature, const uint8_t* digest) {
+    return key != nullptr && hasContent(*key) && signature != nullptr && hasContent(*signature) && digest != nullptr;
+}
+
+DERReturn verifyRSA(std::size_t mostBits, const DERItem* keyItem, const DERItem* signature, const uint8_t* digest,
+                    uint64_t length, const Img4TrustProfile* profile) {
+    const Img4DigestImplementation* implementation = digestOf(profile, length);
+    RSAKey key;
+    if (implementation == nullptr || !arePresent(keyItem, signature, digest) || !parseRSAKey(*keyItem, &key) ||
+        !isSoundKey(key, mostBits) || signature->length != key.modulus.length)
+        return Img4Failure;
+    const crypto::Bytes hash = {digest, static_cast<std::size_t>(length)};
+    return crypto::verifyRSASignature(implementation->algorithm, hash, key.modulus, key.exponent, bytesOf(*signature))
+               ? DERSuccess
+               : Img4Failure;
+}
+
+// A positive INTEGER in its shortest form (X.690 8.3.2) of at most `mostOctets` octets.
+bool isPositive(const DERItem& integer, uint64_t mostOctets) {
+    if (!hasContent(integer) || (integer.data[0] & 0x80) != 0)
+        return false;
+    if (integer.data[0] != 0)
+        return integer.length <= mostOctets;
+    return integer.length > 1 && (integer.data[1] & 0x80) != 0 && integer.length <= mostOctets + 1;
+}
+
+bool isECDSASignature(const DERItem& encoding, const NamedCurve& curve) {
+    struct Numbers {
+        DERItem r;
+        DERItem s;
+    };
+    const DERItemSpec specs[] = {{offsetof(Numbers, r), DERTagInteger, 0}, {offsetof(Numbers, s), DERTagInteger, 0}};
+    DERItem content;
+    Numbers numbers;
+    return isWholeItem(encoding, DERTagSequence, &content) &&
+           DERParseSequenceContent(&content, std::size(specs), specs, &numbers, sizeof numbers) == DERSuccess &&
+           isPositive(numbers.r, curve.coordinateLength) && isPositive(numbers.s, curve.coordinateLength);
+}
+
+constexpr NamedCurve curves[] = {
+    {&oidEcPrime256v1, crypto::Curve::P256, 32, 65},
+    {&oidAnsip384r1, crypto::Curve::P384, 48, 97},
+};
+
+} // namespace
+
+const NamedCurve* img4::curveOfPoint(uint64_t length) {
+    for (const NamedCurve& curve : curves)
+        if (curve.pointLength == length)
+            return &curve;
+    return nullptr;
+}
+
+bool img4::isWholeItem(const DERItem& encoding, DERTag tag, DERItem* content) {
+    DERDecodedInfo decoded;
+    if (DERDecodeItem(&encoding, &decoded) != DERSuccess || decoded.tag != tag ||
+        decoded.content.data + decoded.content.length != encoding.data + encoding.length)
+        return false;
+    *content = decoded.content;
+    return true;
+}
+
+DERReturn verify_signature_rsa(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
+                               const Img4TrustProfile* profile) {
+    return verifyRSA(mostModulusBits, key, signature, digest, length, profile);
+}
+
+DERReturn verify_signature_rsa3k(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
+                                 const Img4TrustProfile* profile) {
+    return verifyRSA(mostModulusBits3k, key, signature, digest, length, profile);
+}
+
+DERReturn verify_signature_ecdsa(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
+                                 const Img4TrustProfile* profile) {
+    if (digestOf(profile, length) == nullptr || profile->keyAlgorithmOid == nullptr ||
+        !arePresent(key, signature, digest))
+        return Img4Failure;
+    const NamedCurve* curve = curveOfPoint(key->length);
+    if (curve == nullptr || !isECDSASignature(*signature, *curve))
+        return Img4Failure;
+    const crypto::Bytes hash = {digest, static_cast<std::size_t>(length)};
+    return crypto::verifyECDSASignature(curve->curve, bytesOf(*key), hash, bytesOf(*signature)) ? DERSuccess
+                                                                                                : Img4Failure;
+}

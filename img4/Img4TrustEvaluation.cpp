@@ -1,0 +1,262 @@
+#include "img4/Img4TrustInternal.h"
+
+#include <cstring>
+
+using namespace img4;
+
+namespace {
+
+bool isComplete(const Img4TrustProfile* profile) {
+    return profile != nullptr && profile->computeDigest != nullptr && profile->verifyChain != nullptr &&
+           profile->verifySignature != nullptr && profile->evaluateCertificateProperties != nullptr &&
+           profile->digestInfo != nullptr;
+}
+
+// One evaluation of a record under a profile.
+struct Evaluation {
+    Img4Record& record;
+    const Img4TrustCallbacks& callbacks;
+    const Img4TrustProfile& profile;
+    void* context;
+
+    DERReturn computeDigest(const DERItem& data, uint8_t* out) const {
+        return profile.computeDigest(&data, out, profile.digestInfo->length, &profile);
+    }
+    bool isTrustedDigest() const;
+    DERReturn verifySignature() const;
+    DERReturn findObject(uint32_t object) const;
+    DERReturn run(const uint32_t* object) const;
+};
+
+bool Evaluation::isTrustedDigest() const {
+    if (callbacks.lookupTrustedDigest == nullptr)
+        return false;
+    const uint8_t* trusted = callbacks.lookupTrustedDigest(&record, context);
+    return trusted != nullptr &&
+           std::memcmp(trusted, record.manifest.digest, static_cast<std::size_t>(profile.digestInfo->length)) == 0;
+}
+
+DERReturn Evaluation::verifySignature() const {
+    Img4ManifestRecord& manifest = record.manifest;
+    DERItem leafKey = {};
+    if (const DERReturn result = profile.verifyChain(&manifest.certChain, &leafKey, &manifest.certProperties, &profile);
+        result != DERSuccess)
+        return result;
+    if (const DERReturn result = computeDigest(manifest.body, manifest.bodyDigest); result != DERSuccess)
+        return result;
+    return profile.verifySignature(&leafKey, &manifest.signature, manifest.bodyDigest, profile.digestInfo->length,
+                                   &profile);
+}
+
+DERReturn Evaluation::findObject(uint32_t object) const {
+    const DERTag tag = Img4PropertyTag(object);
+    Img4Property found = {};
+    const DERReturn result = callbacks.findObject != nullptr
+                                 ? callbacks.findObject(&record.manb, tag, DERTagSet, &found, context)
+                                 : DERImg4DecodeFindProperty(&record.manb, tag, DERTagSet, &found);
+    if (result == DERSuccess)
+        record.objp = found.value;
+    return result;
+}
+
+// Runs `digest` into the record; the flag tells the whole time whether the record's digest is valid.
+template <typename Compute>
+DERReturn storeDigest(uint8_t* flag, Compute compute) {
+    *flag = 0;
+    const DERReturn result = compute();
+    *flag = result == DERSuccess;
+    return result;
+}
+
+// Evaluates the manifest alone when `object` is null.
+DERReturn Evaluation::run(const uint32_t* object) const {
+    DERReturn result =
+        storeDigest(&record.manifestHashed, [&] { return computeDigest(record.manifestRaw, record.manifest.digest); });
+    if (result != DERSuccess)
+        return result;
+    const bool verified = !isTrustedDigest();
+    if (verified && (result = verifySignature()) != DERSuccess)
+        return result;
+    if ((result = findManifestDictionaries(record, &record.manb, &record.manp)) != DERSuccess)
+        return result;
+    if (object != nullptr && (result = findObject(*object)) != DERSuccess)
+        return result;
+    if (verified && (result = profile.evaluateCertificateProperties(&record)) != DERSuccess)
+        return result;
+    if (hasContent(record.payload.data)) {
+        result =
+            storeDigest(&record.payloadHashed, [&] { return computeDigest(record.payloadRaw, record.payload.digest); });
+        if (result != DERSuccess)
+            return result;
+    }
+    result = Img4DecodeEvaluateManifestProperties(&record, callbacks.evaluateProperty, context);
+    if (object == nullptr || result != DERSuccess)
+        return result;
+    return Img4DecodeEvaluateObjectProperties(&record, callbacks.evaluateProperty, context);
+}
+
+DERReturn evaluate(const uint32_t* object, Img4Record* record, const Img4TrustCallbacks* callbacks,
+                   const Img4TrustProfile* profile, void* context) {
+    if (record == nullptr || callbacks == nullptr || callbacks->evaluateProperty == nullptr || !isComplete(profile) ||
+        !isPresent(record->manifestRaw))
+        return DERParamError;
+    if (profile->digestInfo->length > Img4MaxDigestLength)
+        return DERBufferOverflow;
+    return Evaluation{*record, *callbacks, *profile, context}.run(object);
+}
+
+DERReturn walkProperties(const Img4Record* record, DERItem Img4Record::*dictionary, uint32_t selector,
+                         Img4PropertyCallback evaluateProperty, void* context) {
+    if (record == nullptr)
+        return DERParamError;
+    return Img4DecodeEvaluateDictionaryProperties(&(record->*dictionary), selector, evaluateProperty, context);
+}
+
+bool isJudgedType(DERTag valueTag) {
+    return valueTag == DERTagBoolean || valueTag == DERTagInteger || valueTag == DERTagOctetString ||
+           valueTag == DERTagIA5String;
+}
+
+DERReturn judge(const DERDecodedInfo& element, uint32_t selector, Img4PropertyCallback evaluateProperty,
+                void* context) {
+    Img4Property property;
+    // Tags that are not private and constructed name no property, and are refused here.
+    if (const DERReturn result = DERImg4DecodeProperty(&element.content, element.tag, &property); result != DERSuccess)
+        return result;
+    if (!isJudgedType(property.valueTag))
+        return DERUnexpectedTag;
+    const Img4PropertyValue value = {property.value, property.valueTag};
+    return evaluateProperty(property.tag, &value, selector, context);
+}
+
+} // namespace
+
+DERReturn Img4DecodePerformTrustEvaluation(uint32_t object, Img4Record* record, Img4PropertyCallback evaluateProperty,
+                                           const Img4TrustProfile* profile, void* context) {
+    const Img4TrustCallbacks callbacks = {evaluateProperty, nullptr, nullptr};
+    return evaluate(&object, record, &callbacks, profile, context);
+}
+
+DERReturn Img4DecodePerformTrustEvaluatation(uint32_t object, Img4Record* record, Img4PropertyCallback evaluateProperty,
+                                             const Img4TrustProfile* profile, void* context) {
+    return Img4DecodePerformTrustEvaluation(object, record, evaluateProperty, profile, context);
+}
+
+DERReturn Img4DecodePerformTrustEvaluationWithCallbacks(uint32_t object, Img4Record* record,
+                                                        const Img4TrustCallbacks* callbacks,
+                                                        const Img4TrustProfile* profile, void* context) {
+    return evaluate(&object, record, callbacks, profile, context);
+}
+
+DERReturn Img4DecodePerformTrustEvaluatationWithCallbacks(uint32_t object, Img4Record* record,
+                                                          const Img4TrustCallbacks* callbacks,
+                                                          const Img4TrustProfile* profile, void* context) {
+    return evaluate(&object, record, callbacks, profile, context);
+}
+
+DERReturn Img4DecodePerformManifestTrustEvaluationWithCallbacks(Img4Record* record, const Img4TrustCallbacks* callbacks,
+                                                                const Img4TrustProfile* profile, void* context) {
+    return evaluate(nullptr, record, callbacks, profile, context);
+}
+
+DERReturn Img4DecodeEvaluateManifestProperties(const Img4Record* record, Img4PropertyCallback evaluateProperty,
+                                               void* context) {
+    return walkProperties(record, &Img4Record::manp, Img4SelectorManifest, evaluateProperty, context);
+}
+
+DERReturn Img4DecodeEvaluateObjectProperties(const Img4Record* record, Img4PropertyCallback evaluateProperty,
+                                             void* context) {
+    return walkProperties(record, &Img4Record::objp, Img4SelectorObject, evaluateProperty, context);
+}
+
+DERReturn Img4DecodeEvaluateDictionaryProperties(const DERItem* dictionary, uint32_t selector,
+                                                 Img4PropertyCallback evaluateProperty, void* context) {
+    if (dictionary == nullptr || evaluateProperty == nullptr)
+        return DERParamError;
+    DERSequence rest;
+    DERDecodedInfo element;
+    DERDecodeSeqContentInit(dictionary, &rest);
+    DERReturn result = DERDecodeSeqNext(&rest, &element);
+    for (; result == DERSuccess; result = DERDecodeSeqNext(&rest, &element))
+        if (const DERReturn judged = judge(element, selector, evaluateProperty, context); judged != DERSuccess)
+            return judged;
+    return result == DEREndOfSequence ? DERSuccess : result;
+}
+
+DERReturn Img4DecodeEvaluateTrust(uint32_t object, Img4Record* record, Img4PropertyCallback evaluateProperty,
+                                  void* context) {
+    return Img4DecodeEvaluateTrustWithCallbacks(object, record, evaluateProperty, img4_verify_signature_with_chain,
+                                                Img4DecodeEvaluateCertificateProperties, sha1_digest, context);
+}
+
+namespace {
+
+// The parts of the SHA-1 flow.
+struct Parts {
+    Img4PropertyCallback evaluateProperty;
+    Img4SignatureWithChainVerifier verify;
+    Img4CertificateCheck checkCertificate;
+    Img4DigestFunction digest;
+    void* context;
+
+    DERReturn computeDigest(const DERItem& data, uint8_t* out) const {
+        return digest(data.data, data.length, out, context);
+    }
+    DERReturn verifySignature(Img4ManifestRecord& manifest) const;
+    DERReturn run(uint32_t object, Img4Record& record) const;
+};
+
+DERReturn Parts::verifySignature(Img4ManifestRecord& manifest) const {
+    if (const DERReturn result = computeDigest(manifest.body, manifest.bodyDigest); result != DERSuccess)
+        return result;
+    return verify(&manifest.certChain, &manifest.signature, manifest.bodyDigest, &manifest.certProperties, context);
+}
+
+DERReturn Parts::run(uint32_t object, Img4Record& record) const {
+    Img4Property found = {};
+    DERReturn result = verifySignature(record.manifest);
+    if (result != DERSuccess)
+        return result;
+    if ((result = findManifestDictionaries(record, &record.manb, &record.manp)) != DERSuccess)
+        return result;
+    result = DERImg4DecodeFindProperty(&record.manb, Img4PropertyTag(object), DERTagSet, &found);
+    if (result != DERSuccess)
+        return result;
+    record.objp = found.value;
+    if ((result = checkCertificate(&record)) != DERSuccess)
+        return result;
+    if (hasContent(record.payload.data)) {
+        result =
+            storeDigest(&record.payloadHashed, [&] { return computeDigest(record.payloadRaw, record.payload.digest); });
+        if (result != DERSuccess)
+            return result;
+    }
+    if ((result = Img4DecodeEvaluateManifestProperties(&record, evaluateProperty, context)) != DERSuccess)
+        return result;
+    if ((result = Img4DecodeEvaluateObjectProperties(&record, evaluateProperty, context)) != DERSuccess)
+        return result;
+    return storeDigest(&record.manifestHashed,
+                       [&] { return computeDigest(record.manifestRaw, record.manifest.digest); });
+}
+
+} // namespace
+
+DERReturn Img4DecodeEvaluateTrustWithCallbacks(uint32_t object, Img4Record* record,
+                                               Img4PropertyCallback evaluateProperty,
+                                               Img4SignatureWithChainVerifier verify,
+                                               Img4CertificateCheck checkCertificate, Img4DigestFunction digest,
+                                               void* context) {
+    if (record == nullptr || evaluateProperty == nullptr || verify == nullptr || checkCertificate == nullptr ||
+        digest == nullptr || !isPresent(record->manifestRaw))
+        return DERParamError;
+    return Parts{evaluateProperty, verify, checkCertificate, digest, context}.run(object, *record);
+}
+
+DERReturn img4_verify_signature_with_chain(const DERItem* chain, const DERItem* signature, const uint8_t* digest,
+                                           DERItem* certProperties, void* /*context*/) {
+    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa1kSha1;
+    DERItem leafKey = {};
+    if (const DERReturn result = verify_chain_img4_v1(chain, &leafKey, certProperties, &profile); result != DERSuccess)
+        return result;
+    return verify_signature_rsa(&leafKey, signature, digest, Img4HashLength, &profile);
+}

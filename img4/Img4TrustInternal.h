@@ -1,0 +1,81 @@
+// What the files of trust evaluation share.
+#ifndef VELTRA_IMG4_TRUST_INTERNAL_H
+#define VELTRA_IMG4_TRUST_INTERNAL_H
+
+#include "img4/Img4Internal.h"
+#include "img4/Img4Trust.h"
+#include "platform/Crypto.h"
+
+struct Img4DigestImplementation {
+    crypto::Digest algorithm;
+};
+
+// The built-in domain, made from the DER files of its folder when the library is built.
+extern "C" {
+extern const DERItem ROOT_CA_CERTIFICATE;
+extern const DERItem RSA3K_SHA384_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_ROOT_CA_CERTIFICATE_BRX1;
+extern const DERItem RSA4K_SHA384_X86_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_DDI_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_DDI_GLOBAL_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_DDI_FAKE_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_DDI_FAKE_GLOBAL_ROOT_CA_CERTIFICATE;
+extern const DERItem RSA4K_SHA384_LP_ROOT_CA_CERTIFICATE;
+extern const DERItem EC384_SHA384_LP_ROOT_CA_CERTIFICATE;
+extern const DERItem QA_EC384_SHA384_ROOT_CA_CERTIFICATE;
+extern const DERItem LOCAL_EC256_SHA256_ROOT_CA_CERTIFICATE;
+extern const DERItem LOCAL_EC384_SHA384_ROOT_CA_CERTIFICATE;
+}
+
+namespace img4 {
+
+inline crypto::Bytes bytesOf(const DERItem& item) {
+    return {item.data, static_cast<std::size_t>(item.length)};
+}
+
+// True when `encoding` is one item of the tag `tag` and nothing else; *content is then its content.
+bool isWholeItem(const DERItem& encoding, DERTag tag, DERItem* content);
+
+// The digest of `profile`, or null when it has none that makes `length` octets.
+const Img4DigestImplementation* digestOf(const Img4TrustProfile* profile, uint64_t length);
+
+struct NamedCurve {
+    const DERItem* oid;
+    crypto::Curve curve;
+    uint64_t coordinateLength; // octets, also of the order
+    uint64_t pointLength;      // of the uncompressed form
+};
+
+// The curve whose points have that length, or null.
+const NamedCurve* curveOfPoint(uint64_t length);
+
+extern const DERItem oidEcPubKey;
+
+enum class KeyKind {
+    RSA,
+    EC
+};
+
+// What tells the chain verifiers apart besides the root.
+struct ChainRules {
+    uint32_t length;
+    KeyKind key;
+    bool authority; // whether the middle certificate must carry the authority's name
+};
+
+constexpr uint32_t longestChain = 3;
+
+struct ChainArguments {
+    const DERItem* certChain;
+    DERItem* leafKey;
+    DERItem* certProperties;
+    const Img4TrustProfile* profile;
+};
+
+Img4ChainRefusal verifyChain(const ChainRules& rules, const DERItem& root, const Img4TrustDomain& domain,
+                             const ChainArguments& arguments);
+
+} // namespace img4
+
+#endif

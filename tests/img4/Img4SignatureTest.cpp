@@ -1,0 +1,665 @@
+#include "tests/img4/TrustDomain.h"
+
+#include <functional>
+
+#include <gtest/gtest.h>
+#include <openssl/bn.h>
+#include <openssl/core_names.h>
+#include <openssl/rsa.h>
+
+namespace {
+
+using namespace img4maker;
+using namespace signedmanifest;
+
+// Numbers without sign or size, as big-endian octets.
+using Number = std::unique_ptr<BIGNUM, decltype(&BN_free)>;
+
+Number number(const Bytes& octets) {
+    return {BN_bin2bn(octets.data(), static_cast<int>(octets.size()), nullptr), BN_free};
+}
+
+Number parameter(const Key& key, const char* name) {
+    BIGNUM* value = nullptr;
+    EXPECT_EQ(EVP_PKEY_get_bn_param(key.get(), name, &value), 1) << name;
+    return {value, BN_free};
+}
+
+Bytes octetsOf(const BIGNUM* value, std::size_t length) {
+    Bytes octets(length);
+    EXPECT_EQ(BN_bn2binpad(value, octets.data(), static_cast<int>(length)), static_cast<int>(length));
+    return octets;
+}
+
+Bytes octetsOf(const BIGNUM* value) {
+    return octetsOf(value, static_cast<std::size_t>(BN_num_bytes(value)));
+}
+
+Bytes sum(const Bytes& one, const BIGNUM* other) {
+    const Number total = number(one);
+    EXPECT_EQ(BN_add(total.get(), total.get(), other), 1);
+    return octetsOf(total.get());
+}
+
+// The INTEGER with these content octets, made non-negative or not.
+Bytes rawInteger(const Bytes& content) {
+    return item(DERTagInteger, content);
+}
+
+Bytes positiveInteger(Bytes magnitude) {
+    if (magnitude.empty() || (magnitude.front() & 0x80) != 0)
+        magnitude.insert(magnitude.begin(), 0);
+    return rawInteger(magnitude);
+}
+
+const Bytes null = {0x05, 0x00};
+const Bytes message = filler(100);
+
+Bytes digestOfMessage(const Img4TrustProfile& profile) {
+    Bytes digest(profile.digestInfo->length);
+    const DERItem view = viewOf(message);
+    EXPECT_EQ(Img4DecodeComputeDigest(&view, digest.data(), digest.size(), &profile), DERSuccess);
+    return digest;
+}
+
+using Verifier = decltype(verify_signature_rsa)*;
+
+bool accepts(Verifier verify, const Img4TrustProfile& profile, const Bytes& key, const Bytes& signature,
+             const Bytes& digest) {
+    const DERItem keyView = viewOf(key);
+    const DERItem signatureView = viewOf(signature);
+    const DERReturn result = verify(&keyView, &signatureView, digest.data(), digest.size(), &profile);
+    EXPECT_TRUE(result == DERSuccess || result == Img4Failure) << result;
+    return result == DERSuccess;
+}
+
+// RSA
+
+// Signs a block that is padded already.
+Bytes signRaw(const Key& key, const Bytes& block) {
+    const std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free)> signer(
+        EVP_PKEY_CTX_new_from_pkey(nullptr, key.get(), nullptr), EVP_PKEY_CTX_free);
+    std::size_t length = block.size();
+    Bytes signature(length);
+    EXPECT_EQ(EVP_PKEY_sign_init(signer.get()), 1);
+    EXPECT_EQ(EVP_PKEY_CTX_set_rsa_padding(signer.get(), RSA_NO_PADDING), 1);
+    EXPECT_EQ(EVP_PKEY_sign(signer.get(), signature.data(), &length, block.data(), block.size()), 1);
+    return signature;
+}
+
+// What a padded block consists of (RFC 8017 9.2).
+struct Block {
+    Bytes start = {0x00, 0x01};
+    std::size_t paddingLength = 0; // 0: as much as fills the block
+    Bytes separator = {0x00};
+    Bytes digestInfo;
+    Bytes rest;
+    std::uint8_t padding = 0xFF;
+};
+
+Bytes encode(const Block& block, std::size_t length) {
+    const std::size_t others =
+        block.start.size() + block.separator.size() + block.digestInfo.size() + block.rest.size();
+    Bytes encoded =
+        join({block.start, Bytes(block.paddingLength != 0 ? block.paddingLength : length - others, block.padding),
+              block.separator, block.digestInfo, block.rest});
+    encoded.resize(length, 0xAA);
+    return encoded;
+}
+
+// A SEQUENCE with its length in the long form, which is no DER as long as the content is short.
+Bytes longSequence(const Bytes& content) {
+    return join({Bytes{0x30, 0x81, static_cast<std::uint8_t>(content.size())}, content});
+}
+
+struct BlockCase {
+    const char* name;
+    bool accepted;
+    std::function<void(Block&, const Bytes& digest, const Bytes& oid)> change;
+};
+
+const BlockCase blockCases[] = {
+    {"sound", true, [](Block&, const Bytes&, const Bytes&) {}},
+    {"no NULL", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid}), octets(digest)});
+     }},
+    {"other parameters", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid, octets({})}), octets(digest)});
+     }},
+    {"octets in the NULL", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid, Bytes{0x05, 0x01, 0x00}}), octets(digest)});
+     }},
+    {"long length outside", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = longSequence(join({sequence({oid, null}), octets(digest)}));
+     }},
+    {"long length of the algorithm", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({longSequence(join({oid, null})), octets(digest)});
+     }},
+    {"long length of the digest", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence(
+             {sequence({oid, null}), join({Bytes{0x04, 0x81, static_cast<std::uint8_t>(digest.size())}, digest})});
+     }},
+    {"indefinite length", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = join({Bytes{0x30, 0x80}, sequence({oid, null}), octets(digest), Bytes{0x00, 0x00}});
+     }},
+    {"octets behind the digest", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid, null}), octets(digest), null});
+     }},
+    {"octets behind the algorithm's NULL", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid, null, null}), octets(digest)});
+     }},
+    {"octets behind the DigestInfo", false, [](Block& b, const Bytes&, const Bytes&) { b.rest = {0x00}; }},
+    {"short padding and octets behind", false, [](Block& b, const Bytes&, const Bytes&) { b.paddingLength = 8; }},
+    {"padding of seven octets", false, [](Block& b, const Bytes&, const Bytes&) { b.paddingLength = 7; }},
+    {"other octets in the padding", false, [](Block& b, const Bytes&, const Bytes&) { b.padding = 0xFE; }},
+    {"zeros as padding", false, [](Block& b, const Bytes&, const Bytes&) { b.padding = 0x00; }},
+    {"padding that ends in another octet", false, [](Block& b, const Bytes&, const Bytes&) { b.separator = {0x01}; }},
+    {"no end of the padding", false, [](Block& b, const Bytes&, const Bytes&) { b.separator = {}; }},
+    {"two ends of the padding", false,
+     [](Block& b, const Bytes&, const Bytes&) {
+         b.separator = {0x00, 0x00};
+     }},
+    {"padding of encryption", false,
+     [](Block& b, const Bytes&, const Bytes&) {
+         b.start = {0x00, 0x02};
+     }},
+    {"padding of type 0", false,
+     [](Block& b, const Bytes&, const Bytes&) {
+         b.start = {0x00, 0x00};
+     }},
+    {"first octet left out", false, [](Block& b, const Bytes&, const Bytes&) { b.start = {0x01}; }},
+    {"other digest algorithm", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         Bytes other = oid;
+         other.back() ^= 0x03;
+         b.digestInfo = sequence({sequence({other, null}), octets(digest)});
+     }},
+    {"digest in a BIT STRING", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid, null}), item(DERTagBitString, digest)});
+     }},
+    {"DigestInfo in a SET", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = set({sequence({oid, null}), octets(digest)});
+     }},
+    {"digest that lacks an octet", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         b.digestInfo = sequence({sequence({oid, null}), octets(Bytes(digest.begin(), digest.end() - 1))});
+     }},
+    {"digest alone", false, [](Block& b, const Bytes& digest, const Bytes&) { b.digestInfo = digest; }},
+    {"other digest", false,
+     [](Block& b, const Bytes& digest, const Bytes& oid) {
+         Bytes other = digest;
+         other.back() ^= 1;
+         b.digestInfo = sequence({sequence({oid, null}), octets(other)});
+     }},
+    {"nothing", false, [](Block& b, const Bytes&, const Bytes&) { b.digestInfo = {}; }},
+};
+
+const Key& rsaKey() {
+    static const Key key = readKey(TEST_TRUST_DOMAIN "/keys/ROOT_CA_CERTIFICATE.pem");
+    return key;
+}
+
+Img4TrustProfile profileWith(const Img4TrustProfile& like, const Img4DigestInfo& digestInfo) {
+    Img4TrustProfile profile = like;
+    profile.digestInfo = &digestInfo;
+    return profile;
+}
+
+const Img4DigestInfo* const digestInfos[] = {&kQDSupportDigestInfoSha1, &kQDSupportDigestInfoSha256,
+                                             &kQDSupportDigestInfoSha384, &kQDSupportDigestInfoSha512};
+
+TEST(Img4RSASignature, isOverTheExactBlock) {
+    for (const Img4DigestInfo* info : digestInfos) {
+        const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, *info);
+        const Bytes digest = digestOfMessage(profile);
+        const Bytes key = publicKeyBits(rsaKey());
+        EXPECT_TRUE(accepts(verify_signature_rsa, profile, key, sign(rsaKey(), info->length, message), digest));
+        for (const BlockCase& row : blockCases) {
+            SCOPED_TRACE(std::to_string(info->length) + ", " + row.name);
+            Block block;
+            block.digestInfo = sequence({sequence({oid(*info->oid), null}), octets(digest)});
+            row.change(block, digest, oid(*info->oid));
+            const Bytes signature = signRaw(rsaKey(), encode(block, 256));
+            EXPECT_EQ(accepts(verify_signature_rsa, profile, key, signature, digest), row.accepted);
+        }
+    }
+}
+
+TEST(Img4RSASignature, isANumberBelowTheModulusOfItsLength) {
+    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
+    const Bytes digest = digestOfMessage(profile);
+    const Bytes key = publicKeyBits(rsaKey());
+    const Bytes sound = sign(rsaKey(), digest.size(), message);
+    const Number modulus = parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_N);
+    const Number below(BN_dup(modulus.get()), BN_free);
+    ASSERT_EQ(BN_sub_word(below.get(), 1), 1);
+    Bytes one(256);
+    one.back() = 1;
+    const std::pair<const char*, Bytes> refused[] = {
+        {"none", {}},
+        {"zero in front", join({Bytes{0x00}, sound})},
+        {"octet behind", join({sound, Bytes{0x00}})},
+        {"octet missing", Bytes(sound.begin(), sound.end() - 1)},
+        {"plus modulus", sum(sound, modulus.get())},
+        {"zero", Bytes(256)},
+        {"zero of one octet", {0x00}},
+        {"one", one},
+        {"modulus", octetsOf(modulus.get())},
+        {"one below the modulus", octetsOf(below.get())},
+        {"all ones", Bytes(256, 0xFF)},
+    };
+    for (const auto& [name, signature] : refused)
+        EXPECT_FALSE(accepts(verify_signature_rsa, profile, key, signature, digest)) << name;
+}
+
+TEST(Img4RSASignature, keepsItsLeadingZeros) {
+    const Key key = readKey(TEST_TRUST_DOMAIN "/keys/kImg4DecodeSecureBootRsa1kSha1-leaf.pem");
+    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa1kSha1;
+    Bytes text = message;
+    Bytes signature;
+    do {
+        ++text[text.front() == 0xFF ? 1 : 0];
+        signature = sign(key, Img4HashLength, text);
+    } while (signature.front() != 0);
+    const DERItem view = viewOf(text);
+    Bytes digest(Img4HashLength);
+    ASSERT_EQ(Img4DecodeComputeDigest(&view, digest.data(), digest.size(), &profile), DERSuccess);
+    EXPECT_TRUE(accepts(verify_signature_rsa, profile, publicKeyBits(key), signature, digest));
+    signature.erase(signature.begin());
+    EXPECT_FALSE(accepts(verify_signature_rsa, profile, publicKeyBits(key), signature, digest));
+}
+
+TEST(Img4RSASignature, needsASoundKey) {
+    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
+    const Bytes digest = digestOfMessage(profile);
+    const Bytes n = octetsOf(parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_N).get());
+    const Bytes e = octetsOf(parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_E).get());
+    const Bytes sound = sign(rsaKey(), digest.size(), message);
+    Block block;
+    block.digestInfo = sequence({sequence({oid(*profile.digestInfo->oid), null}), octets(digest)});
+    const Bytes forged = encode(block, n.size());
+    Bytes even = n;
+    even.back() ^= 1;
+    Bytes trailing = sequence({positiveInteger(n), positiveInteger(e)});
+    trailing.push_back(0);
+    struct Row {
+        const char* name;
+        Bytes key;
+        Bytes signature;
+        bool accepted = false;
+    };
+    const Row rows[] = {
+        {"sound", sequence({positiveInteger(n), positiveInteger(e)}), sound, true},
+        {"zeros before the modulus", sequence({rawInteger(join({Bytes{0, 0}, n})), positiveInteger(e)}), sound, true},
+        {"negative modulus", sequence({rawInteger(n), positiveInteger(e)}), sound},
+        {"even modulus", sequence({positiveInteger(even), positiveInteger(e)}), sound},
+        {"modulus of zero", sequence({positiveInteger({}), positiveInteger(e)}), {0x00}},
+        {"no modulus", sequence({rawInteger({}), positiveInteger(e)}), sound},
+        {"exponent 1", sequence({positiveInteger(n), positiveInteger({1})}), forged},
+        {"exponent 0", sequence({positiveInteger(n), rawInteger({0})}), sound},
+        {"even exponent", sequence({positiveInteger(n), positiveInteger({2})}), sound},
+        {"negative exponent", sequence({positiveInteger(n), rawInteger({0x81})}), sound},
+        {"exponent as large as the modulus", sequence({positiveInteger(n), positiveInteger(n)}), sound},
+        {"exponent larger than the modulus", sequence({positiveInteger(n), positiveInteger(join({Bytes{1}, n}))}),
+         sound},
+        {"no exponent", sequence({positiveInteger(n)}), sound},
+        {"third number", sequence({positiveInteger(n), positiveInteger(e), integer(1)}), sound},
+        {"octet behind", trailing, sound},
+        {"SET", set({positiveInteger(n), positiveInteger(e)}), sound},
+        {"whole SubjectPublicKeyInfo", publicKeyInfo(rsaKey()), sound},
+        {"none", {}, sound},
+    };
+    for (const Row& row : rows)
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, row.key, row.signature, digest), row.accepted) << row.name;
+}
+
+TEST(Img4RSASignature, needsAModulusWithinTheVerifiersLimits) {
+    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
+    const Bytes digest = digestOfMessage(profile);
+    struct Row {
+        unsigned bits;
+        bool accepted;
+        bool acceptedBy3k;
+    };
+    // The upper limits are tried with more than two primes, which are found sooner; to a verifier they look alike.
+    for (const Row& row : {Row{1016, false, false}, Row{1024, true, true}, Row{3072, true, true},
+                           Row{3073, true, false}, Row{4096, true, false}, Row{4097, false, false}}) {
+        const Key key = row.bits > 2048 ? makeMultiPrimeRSAKey(row.bits) : makeRSAKey(row.bits);
+        const Bytes bits = publicKeyBits(key);
+        const Bytes signature = sign(key, digest.size(), message);
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature, digest), row.accepted) << row.bits;
+        EXPECT_EQ(accepts(verify_signature_rsa3k, profile, bits, signature, digest), row.acceptedBy3k) << row.bits;
+    }
+}
+
+// ECDSA
+
+struct CurveUnderTest {
+    const char* name;
+    const Img4TrustProfile* profile;
+};
+
+const CurveUnderTest curves[] = {{"P-256", &kImg4DecodeSecureBootEc256Sha256},
+                                 {"P-384", &kImg4DecodeSecureBootEc384Sha384}};
+
+// The magnitudes of the numbers of a sound signature, and the order and the field of its curve.
+struct Sound {
+    Bytes r;
+    Bytes s;
+    Number order;
+    Number field;
+};
+
+Sound soundSignature(const Key& key, const Img4TrustProfile& profile) {
+    const Bytes signature = sign(key, profile.digestInfo->length, message);
+    const std::size_t lengthOfR = signature[3];
+    Sound sound = {Bytes(signature.begin() + 4, signature.begin() + 4 + static_cast<long>(lengthOfR)),
+                   Bytes(signature.begin() + 6 + static_cast<long>(lengthOfR), signature.end()),
+                   parameter(key, OSSL_PKEY_PARAM_EC_ORDER), parameter(key, OSSL_PKEY_PARAM_EC_P)};
+    sound.r = octetsOf(number(sound.r).get());
+    sound.s = octetsOf(number(sound.s).get());
+    return sound;
+}
+
+Bytes difference(const BIGNUM* one, const Bytes& other) {
+    const Number result = number(other);
+    EXPECT_EQ(BN_sub(result.get(), one, result.get()), 1);
+    return octetsOf(result.get());
+}
+
+// The content octets of a negative INTEGER.
+Bytes negative(const Bytes& magnitude) {
+    Bytes octets = join({Bytes{0x00}, magnitude});
+    for (std::uint8_t& octet : octets)
+        octet = static_cast<std::uint8_t>(~octet);
+    for (std::size_t i = octets.size(); i-- > 0 && ++octets[i] == 0;) {
+    }
+    return octets;
+}
+
+struct PairCase {
+    const char* name;
+    bool accepted;
+    std::function<Bytes(const Sound&)> make;
+};
+
+Bytes pair(const Bytes& r, const Bytes& s) {
+    return sequence({positiveInteger(r), positiveInteger(s)});
+}
+
+const PairCase pairCases[] = {
+    {"sound", true, [](const Sound& x) { return pair(x.r, x.s); }},
+    {"s on the other side of the order", true,
+     [](const Sound& x) { return pair(x.r, difference(x.order.get(), x.s)); }},
+    {"r and s swapped", false, [](const Sound& x) { return pair(x.s, x.r); }},
+    {"r = 0", false, [](const Sound& x) { return pair({}, x.s); }},
+    {"s = 0", false, [](const Sound& x) { return pair(x.r, {}); }},
+    {"r = s = 0", false, [](const Sound&) { return pair({}, {}); }},
+    {"r = s = 1", false, [](const Sound&) { return pair({1}, {1}); }},
+    {"r = 0, s = 1", false, [](const Sound&) { return pair({}, {1}); }},
+    {"r = order", false, [](const Sound& x) { return pair(octetsOf(x.order.get()), x.s); }},
+    {"s = order", false, [](const Sound& x) { return pair(x.r, octetsOf(x.order.get())); }},
+    {"r = field", false, [](const Sound& x) { return pair(octetsOf(x.field.get()), x.s); }},
+    {"r = s = order", false, [](const Sound& x) { return pair(octetsOf(x.order.get()), octetsOf(x.order.get())); }},
+    {"r = order - 1", false, [](const Sound& x) { return pair(difference(x.order.get(), {1}), x.s); }},
+    {"r plus order", false, [](const Sound& x) { return pair(sum(x.r, x.order.get()), x.s); }},
+    {"s plus order", false, [](const Sound& x) { return pair(x.r, sum(x.s, x.order.get())); }},
+    {"r much too long", false,
+     [](const Sound& x) {
+         return pair(join({Bytes{1}, Bytes(100), x.r}), x.s);
+     }},
+    {"r negative", false,
+     [](const Sound& x) {
+         return sequence({rawInteger(negative(x.r)), positiveInteger(x.s)});
+     }},
+    {"s negative", false,
+     [](const Sound& x) {
+         return sequence({positiveInteger(x.r), rawInteger(negative(x.s))});
+     }},
+    {"r minus order", false,
+     [](const Sound& x) {
+         return sequence({rawInteger(negative(difference(x.order.get(), x.r))), positiveInteger(x.s)});
+     }},
+    {"zeros before r", false,
+     [](const Sound& x) {
+         return sequence({rawInteger(join({Bytes{0, 0}, x.r})), positiveInteger(x.s)});
+     }},
+    {"zeros before s", false,
+     [](const Sound& x) {
+         return sequence({positiveInteger(x.r), rawInteger(join({Bytes{0, 0}, x.s}))});
+     }},
+    {"r empty", false,
+     [](const Sound& x) {
+         return sequence({rawInteger({}), positiveInteger(x.s)});
+     }},
+    {"s empty", false,
+     [](const Sound& x) {
+         return sequence({positiveInteger(x.r), rawInteger({})});
+     }},
+    {"r of two octets for zero", false,
+     [](const Sound& x) {
+         return sequence({rawInteger({0, 0}), positiveInteger(x.s)});
+     }},
+    {"s missing", false, [](const Sound& x) { return sequence({positiveInteger(x.r)}); }},
+    {"both missing", false, [](const Sound&) { return sequence({}); }},
+    {"third number", false,
+     [](const Sound& x) {
+         return sequence({positiveInteger(x.r), positiveInteger(x.s), positiveInteger({1})});
+     }},
+    {"NULL inside", false,
+     [](const Sound& x) {
+         return sequence({positiveInteger(x.r), positiveInteger(x.s), null});
+     }},
+    {"tagged element in front", false,
+     [](const Sound& x) {
+         return sequence({context(0, {}), positiveInteger(x.r), positiveInteger(x.s)});
+     }},
+    {"octets behind", false,
+     [](const Sound& x) {
+         return join({pair(x.r, x.s), null});
+     }},
+    {"zero octet behind", false,
+     [](const Sound& x) {
+         return join({pair(x.r, x.s), Bytes{0}});
+     }},
+    {"cut short", false,
+     [](const Sound& x) {
+         Bytes encoding = pair(x.r, x.s);
+         encoding.pop_back();
+         return encoding;
+     }},
+    {"r an OCTET STRING", false,
+     [](const Sound& x) {
+         return sequence({octets(x.r), positiveInteger(x.s)});
+     }},
+    {"r an ENUMERATED", false,
+     [](const Sound& x) {
+         Bytes r = positiveInteger(x.r);
+         r[0] = 0x0A;
+         return sequence({r, positiveInteger(x.s)});
+     }},
+    {"s a REAL", false,
+     [](const Sound& x) {
+         return sequence({positiveInteger(x.r), Bytes{0x09, 0x01, 0x42}});
+     }},
+    {"NULLs", false,
+     [](const Sound&) {
+         return sequence({null, null});
+     }},
+    {"SET", false,
+     [](const Sound& x) {
+         return set({positiveInteger(x.r), positiveInteger(x.s)});
+     }},
+    {"SEQUENCE in a SEQUENCE", false, [](const Sound& x) { return sequence({pair(x.r, x.s)}); }},
+    {"long length", false,
+     [](const Sound& x) {
+         return longSequence(join({positiveInteger(x.r), positiveInteger(x.s)}));
+     }},
+    {"long length of r", false,
+     [](const Sound& x) {
+         Bytes r = positiveInteger(x.r);
+         r.insert(r.begin() + 1, 0x81);
+         return sequence({r, positiveInteger(x.s)});
+     }},
+    {"indefinite length", false,
+     [](const Sound& x) {
+         return join({Bytes{0x30, 0x80}, positiveInteger(x.r), positiveInteger(x.s), Bytes{0x00, 0x00}});
+     }},
+    {"plain r and s", false,
+     [](const Sound& x) {
+         return join({x.r, x.s});
+     }},
+    {"one octet", false, [](const Sound&) { return Bytes{0x30}; }},
+    {"none", false, [](const Sound&) { return Bytes{}; }},
+};
+
+TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDER) {
+    for (const CurveUnderTest& curve : curves) {
+        const Key key = makeECKey(curve.name);
+        const Bytes digest = digestOfMessage(*curve.profile);
+        const Sound sound = soundSignature(key, *curve.profile);
+        for (const PairCase& row : pairCases)
+            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), row.make(sound), digest),
+                      row.accepted)
+                << curve.name << ", " << row.name;
+    }
+}
+
+struct PointCase {
+    const char* name;
+    std::function<Bytes(Bytes point, const Key& key)> make;
+};
+
+Bytes withForm(Bytes point, std::uint8_t form) {
+    point.front() = form;
+    return point;
+}
+
+Bytes parityOf(const Bytes& point) {
+    return {static_cast<std::uint8_t>(point.back() & 1)};
+}
+
+const PointCase refusedPoints[] = {
+    {"not on the curve",
+     [](Bytes point, const Key&) {
+         point.back() ^= 1;
+         return point;
+     }},
+    {"hybrid", [](const Bytes& point,
+                  const Key&) { return withForm(point, static_cast<std::uint8_t>(0x06 + parityOf(point).front())); }},
+    {"compressed",
+     [](const Bytes& point, const Key&) {
+         return withForm(Bytes(point.begin(), point.begin() + 1 + static_cast<long>(point.size() / 2)),
+                         static_cast<std::uint8_t>(0x02 + parityOf(point).front()));
+     }},
+    {"form of a compressed point", [](const Bytes& point, const Key&) { return withForm(point, 0x02); }},
+    {"infinity", [](const Bytes&, const Key&) { return Bytes{0x00}; }},
+    {"infinity of full length", [](const Bytes& point, const Key&) { return Bytes(point.size()); }},
+    {"origin", [](const Bytes& point, const Key&) { return withForm(Bytes(point.size()), 0x04); }},
+    {"coordinates of the field's size",
+     [](const Bytes& point, const Key& key) {
+         const Bytes p = octetsOf(parameter(key, OSSL_PKEY_PARAM_EC_P).get(), point.size() / 2);
+         return join({Bytes{0x04}, p, p});
+     }},
+    {"coordinates swapped",
+     [](const Bytes& point, const Key&) {
+         const auto middle = point.begin() + 1 + static_cast<long>(point.size() / 2);
+         return join({Bytes{0x04}, Bytes(middle, point.end()), Bytes(point.begin() + 1, middle)});
+     }},
+    {"bare coordinates", [](const Bytes& point, const Key&) { return Bytes(point.begin() + 1, point.end()); }},
+    {"octet behind",
+     [](const Bytes& point, const Key&) {
+         return join({point, Bytes{0}});
+     }},
+    {"octet missing", [](const Bytes& point, const Key&) { return Bytes(point.begin(), point.end() - 1); }},
+    {"in an OCTET STRING", [](const Bytes& point, const Key&) { return octets(point); }},
+    {"whole SubjectPublicKeyInfo", [](const Bytes&, const Key& key) { return publicKeyInfo(key); }},
+    {"of the other curve",
+     [](const Bytes& point, const Key&) { return publicKeyBits(makeECKey(point.size() == 65 ? "P-384" : "P-256")); }},
+    {"of P-521", [](const Bytes&, const Key&) { return publicKeyBits(makeECKey("P-521")); }},
+    {"of another key",
+     [](const Bytes& point, const Key&) { return publicKeyBits(makeECKey(point.size() == 65 ? "P-256" : "P-384")); }},
+    {"of the key's negation",
+     [](const Bytes& point, const Key& key) {
+         const auto middle = point.begin() + 1 + static_cast<long>(point.size() / 2);
+         const Bytes y = difference(parameter(key, OSSL_PKEY_PARAM_EC_P).get(), Bytes(middle, point.end()));
+         return join({Bytes(point.begin(), middle), octetsOf(number(y).get(), point.size() / 2)});
+     }},
+    {"none", [](const Bytes&, const Key&) { return Bytes{}; }},
+};
+
+TEST(Img4ECDSASignature, needsAnUncompressedPointOnItsCurve) {
+    for (const CurveUnderTest& curve : curves) {
+        const Key key = makeECKey(curve.name);
+        const Bytes digest = digestOfMessage(*curve.profile);
+        const Bytes signature = sign(key, digest.size(), message);
+        ASSERT_TRUE(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), signature, digest));
+        for (const PointCase& row : refusedPoints)
+            EXPECT_FALSE(
+                accepts(verify_signature_ecdsa, *curve.profile, row.make(publicKeyBits(key), key), signature, digest))
+                << curve.name << ", " << row.name;
+    }
+}
+
+TEST(Img4ECDSASignature, takesTheCurveFromThePointAndTheDigestFromTheProfile) {
+    for (const char* curve : {"P-256", "P-384"}) {
+        const Key key = makeECKey(curve);
+        for (const Img4DigestInfo* info : digestInfos) {
+            const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootEc384Sha384, *info);
+            EXPECT_TRUE(accepts(verify_signature_ecdsa, profile, publicKeyBits(key), sign(key, info->length, message),
+                                digestOfMessage(profile)))
+                << curve << ", " << info->length;
+        }
+    }
+}
+
+TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
+    const Key ecKey = makeECKey("P-384");
+    struct Row {
+        Verifier verify;
+        const Img4TrustProfile* profile;
+        const Key& key;
+    };
+    const Row rows[] = {{verify_signature_rsa, &kImg4DecodeSecureBootRsa4kSha384, rsaKey()},
+                        {verify_signature_rsa3k, &kImg4DecodeSecureBootRsa3kSha384, rsaKey()},
+                        {verify_signature_ecdsa, &kImg4DecodeSecureBootEc384Sha384, ecKey}};
+    for (const Row& row : rows) {
+        const Bytes bits = publicKeyBits(row.key);
+        const Bytes octetsOfSignature = sign(row.key, 48, message);
+        const Bytes digest = digestOfMessage(*row.profile);
+        const DERItem key = viewOf(bits);
+        const DERItem signature = viewOf(octetsOfSignature);
+        const DERItem none = {};
+        Img4TrustProfile withoutDigest = *row.profile;
+        withoutDigest.digestInfo = nullptr;
+        const Img4DigestInfo bare = {48, nullptr, nullptr};
+        const Img4TrustProfile withoutImplementation = profileWith(*row.profile, bare);
+        ASSERT_EQ(row.verify(&key, &signature, digest.data(), 48, row.profile), DERSuccess);
+        EXPECT_EQ(row.verify(nullptr, &signature, digest.data(), 48, row.profile), Img4Failure);
+        EXPECT_EQ(row.verify(&none, &signature, digest.data(), 48, row.profile), Img4Failure);
+        EXPECT_EQ(row.verify(&key, nullptr, digest.data(), 48, row.profile), Img4Failure);
+        EXPECT_EQ(row.verify(&key, &none, digest.data(), 48, row.profile), Img4Failure);
+        EXPECT_EQ(row.verify(&key, &signature, nullptr, 48, row.profile), Img4Failure);
+        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 32, row.profile), Img4Failure);
+        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 48, nullptr), Img4Failure);
+        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 48, &withoutDigest), Img4Failure);
+        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 48, &withoutImplementation), Img4Failure);
+    }
+    Img4TrustProfile withoutKeyAlgorithm = kImg4DecodeSecureBootEc384Sha384;
+    withoutKeyAlgorithm.keyAlgorithmOid = nullptr;
+    EXPECT_FALSE(accepts(verify_signature_ecdsa, withoutKeyAlgorithm, publicKeyBits(ecKey), sign(ecKey, 48, message),
+                         digestOfMessage(withoutKeyAlgorithm)));
+}
+
+} // namespace

@@ -1,0 +1,36 @@
+// The test domain's signers, one for each profile that the linked decoder has.
+#ifndef VELTRA_TESTS_IMG4_TRUST_DOMAIN_H
+#define VELTRA_TESTS_IMG4_TRUST_DOMAIN_H
+
+#include "tests/support/SignedManifestMaker.h"
+
+#include <cstring>
+#include <map>
+#include <span>
+#include <string>
+
+inline std::span<const Img4TrustProfileEntry> allProfiles() {
+    return {Img4TrustProfiles, Img4NumTrustProfiles};
+}
+
+inline const signedmanifest::Signer& signerOf(const Img4TrustProfileEntry& entry) {
+    static std::map<std::string, signedmanifest::Signer> signers;
+    return signers.try_emplace(entry.name, TEST_TRUST_DOMAIN, entry).first->second;
+}
+
+inline const Img4TrustProfileEntry& entryOf(const Img4TrustProfile& profile) {
+    for (const Img4TrustProfileEntry& entry : allProfiles())
+        if (entry.profile == &profile)
+            return entry;
+    std::abort();
+}
+
+inline bool isEC(const Img4TrustProfileEntry& entry) {
+    return entry.profile->verifySignature == verify_signature_ecdsa;
+}
+
+inline DERItem viewOf(const img4maker::Bytes& bytes) {
+    return {bytes.data(), bytes.size()};
+}
+
+#endif
