@@ -9,7 +9,7 @@
 
 #include "Daemon/CrashLogs.h"
 #include "platform/Utf8.h"
-#include "tools/orloctl/Arguments.h"
+#include "tools/orloctl/LocalFiles.h"
 
 namespace {
 
