@@ -25,23 +25,26 @@ bool areEqual(const DERItem& one, const DERItem& other) {
     return std::equal(one.data, one.data + one.length, other.data, other.data + other.length);
 }
 
-// How far the verification of a chain has come, for comparison: the checks of all certificates' keys come before those
-// of names and signatures, and these are made certificate by certificate.
+// How far the verification of a chain has come, for comparison: certificates are counted before they are parsed, all of
+// their keys come before names and signatures, and these are checked certificate by certificate.
 std::tuple<int, std::uint32_t, int> progressOf(const Img4ChainRefusal& refusal) {
     switch (refusal.fault) {
     case Img4ChainSound:
-        return {4, 0, 0};
+        return {5, 0, 0};
     case Img4ChainAuthority:
     case Img4ChainExtensions:
-        return {3, 0, refusal.fault};
+        return {4, 0, refusal.fault};
     case Img4ChainIssuer:
     case Img4ChainSignatureAlgorithm:
     case Img4ChainSignature:
-        return {2, refusal.certificate, refusal.fault};
+        return {3, refusal.certificate, refusal.fault};
     case Img4ChainKey:
+        return {2, refusal.certificate, 0};
+    case Img4ChainEncoding:
+    case Img4ChainCertificateSize:
         return {1, refusal.certificate, 0};
     default:
-        return {0, refusal.certificate, 0};
+        return {0, 0, 0};
     }
 }
 
