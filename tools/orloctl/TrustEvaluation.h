@@ -27,7 +27,8 @@ TrustEvaluation evaluateTrust(const Img4Record& record, const DomainProfile& pro
                               std::optional<std::uint32_t> object);
 
 struct TrustRefusal {
-    const char* step;   // "chain", "signature", "dictionaries", "object", "constraints", "payload" or "properties"
+    // "chain", "signature", "dictionaries", "object", "constraints" or "properties"; "digest" for want of memory.
+    const char* step;
     std::string reason; // a sentence without its full stop
     const std::uint8_t* place;
     std::optional<std::uint32_t> certificate; // its place in the chain, when it is about one
