@@ -41,6 +41,16 @@ bool hasConstraint(const Report& report, const char* state) {
     return false;
 }
 
+// Names in a chain can say anything.
+bool isExplained(const std::string& problem, const std::string& step) {
+    if (step == "chain")
+        return !problem.starts_with("The chain cannot be verified");
+    for (const char* words : {"cannot be decoded", "cannot be judged", "cannot be computed"})
+        if (problem.find(words) != std::string::npos)
+            return false;
+    return true;
+}
+
 void check(const DERItem& file, const TrustDomain& domain, std::optional<std::uint32_t> object) {
     const Report report = verifyImg4(file, domain, object);
     FUZZ_REQUIRE(report.ok == isTrusted(file, domain, object));
@@ -49,10 +59,8 @@ void check(const DERItem& file, const TrustDomain& domain, std::optional<std::ui
     FUZZ_REQUIRE(!report.json.dump().empty());
     for (const std::string& text : {report.text, report.problem})
         FUZZ_REQUIRE(std::all_of(text.begin(), text.end(), isPrintable));
-    for (const char* unexplained :
-         {"cannot be decoded", "cannot be judged", "cannot be verified", "cannot be computed"})
-        FUZZ_REQUIRE(report.problem.find(unexplained) == std::string::npos);
     const std::string step = report.json.value("failedStep", "");
+    FUZZ_REQUIRE(isExplained(report.problem, step));
     FUZZ_REQUIRE(!report.ok || !hasConstraint(report, "broken"));
     FUZZ_REQUIRE(step != "constraints" || !report.json.contains("constraints") || hasConstraint(report, "broken"));
     FUZZ_REQUIRE(step != "signature");

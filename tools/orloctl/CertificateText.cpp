@@ -221,7 +221,7 @@ std::string nameText(const DERItem& name) {
         if (!attributes)
             return "#" + upperCase(hexText(name, mostOctetsOfValue));
         // RFC 4514 2.1: the last one comes first.
-        text = *attributes + (text.empty() ? "" : ",") + text;
+        text.insert(0, *attributes + (text.empty() ? "" : ","));
     }
     return text.size() > longestName ? text.substr(0, longestName) + "..." : text;
 }

@@ -144,8 +144,8 @@ bool Verification::namesRoot(const DomainProfile& profile) const {
 std::optional<TrustEvaluation> Verification::evaluate() const {
     using Rank = std::pair<bool, std::tuple<int, std::uint32_t, int>>;
     std::optional<TrustEvaluation> refused;
-    const DomainProfile* best = nullptr;
-    Rank bestRank;
+    const DomainProfile* best = &domain_.profiles.front();
+    Rank bestRank = {false, {-1, 0, 0}};
     for (const DomainProfile& profile : domain_.profiles) {
         const Img4ChainRefusal refusal = judgeChain(record_, profile);
         const Rank rank = {namesRoot(profile), progressOf(refusal)};
@@ -154,7 +154,7 @@ std::optional<TrustEvaluation> Verification::evaluate() const {
             if (evaluation.status == DERSuccess)
                 return evaluation;
             refused = refused ? refused : evaluation;
-        } else if (best == nullptr || rank > bestRank) {
+        } else if (rank > bestRank) {
             best = &profile;
             bestRank = rank;
         }

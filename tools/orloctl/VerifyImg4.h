@@ -13,7 +13,7 @@
 // and with it the object that has the four-character code `object`. The profile reported is the first that trusts it;
 // when none does it is the one whose root the chain names, with the first reason for its refusal, and there is none
 // when no root is named. The report is ok when the manifest is trusted. The chain is shown in any case, what the
-// manifest says only once its signature was verified. Safe on any octets.
+// manifest says only once its signature was verified. `domain` has at least one profile. Safe on any octets.
 Report verifyImg4(const DERItem& file, const TrustDomain& domain, std::optional<std::uint32_t> object);
 
 // The number of the four printable ASCII characters in `text`. Raises UsageError for any other text.
