@@ -1,14 +1,9 @@
 #include "tools/orloctl/Arguments.h"
 
-#include <cerrno>
-#include <cstring>
-#include <fstream>
-#include <iterator>
-#include <string_view>
 #include <utility>
 
-#include "platform/Files.h"
 #include "tools/orloctl/Json.h"
+#include "tools/orloctl/LocalFiles.h"
 
 namespace {
 
@@ -45,26 +40,4 @@ Value::Dictionary parseArguments(const std::vector<std::string>& words) {
             throw UsageError("The key \"" + key + "\" is given twice");
     }
     return arguments;
-}
-
-Value::Data readLocalFile(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    Value::Data contents;
-    char piece[65536];
-    while (file.read(piece, sizeof piece) || file.gcount() > 0) {
-        contents.insert(contents.end(), piece, piece + file.gcount());
-        if (contents.size() > files::maximumSize)
-            throw UsageError(path + " is larger than 256 MiB");
-    }
-    if (!file.eof())
-        throw UsageError("Cannot read " + path + ": " + std::strerror(errno));
-    return contents;
-}
-
-void writeLocalFile(const std::string& path, const Value::Data& contents) {
-    std::ofstream file(path, std::ios::binary | std::ios::trunc);
-    file.write(reinterpret_cast<const char*>(contents.data()), static_cast<std::streamsize>(contents.size()));
-    file.close();
-    if (!file)
-        throw UsageError("Cannot write " + path + ": " + std::strerror(errno));
 }

@@ -19,6 +19,7 @@
 #include "platform/linux/system/FileDescriptor.h"
 #include "platform/linux/system/NewFile.h"
 #include "tools/orloctl/Arguments.h"
+#include "tools/orloctl/LocalFiles.h"
 
 namespace {
 

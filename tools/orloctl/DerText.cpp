@@ -10,6 +10,7 @@ namespace {
 constexpr std::uint64_t classShift = 62;
 constexpr DERTag constructedFlag = UINT64_C(1) << 61;
 constexpr std::uint8_t moreBit = 0x80;
+constexpr std::size_t longestOid = 128;
 
 enum Form {
     Primitive,
@@ -277,4 +278,27 @@ std::string hexText(const DERItem& data, std::uint64_t most) {
     for (std::uint64_t i = 0; i < std::min(data.length, most); ++i)
         digits += hexOctet(data.data[i]);
     return digits + (data.length > most ? "..." : "");
+}
+
+std::string oidText(const DERItem& content) {
+    std::string text;
+    std::uint64_t component = 0;
+    bool first = true;
+    for (std::uint64_t i = 0; i < content.length; ++i) {
+        if (component > UINT64_MAX >> 7 || text.size() > longestOid)
+            return text + "...";
+        component = component << 7 | (content.data[i] & 0x7F);
+        if ((content.data[i] & 0x80) != 0)
+            continue;
+        if (first) {
+            // The first octets hold two components (X.690 8.19.4).
+            const std::uint64_t root = component < 80 ? component / 40 : 2;
+            text = std::to_string(root) + "." + std::to_string(component - root * 40);
+            first = false;
+        } else {
+            text += "." + std::to_string(component);
+        }
+        component = 0;
+    }
+    return text;
 }

@@ -37,6 +37,9 @@ std::string quotedCode(std::uint64_t number);
 std::string escapedText(const DERItem& text, std::uint64_t most);
 std::string quotedText(const DERItem& text, std::uint64_t most);
 
+// The content of an OBJECT IDENTIFIER as numbers with dots. A very long one ends in an ellipsis.
+std::string oidText(const DERItem& content);
+
 // Two lower-case digits an octet; at most `most` octets, then an ellipsis.
 std::string hexText(const DERItem& data, std::uint64_t most);
 

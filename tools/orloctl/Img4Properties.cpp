@@ -13,11 +13,13 @@ namespace {
 
 constexpr unsigned deepestDictionary = 8;
 
-// Why the decoder refuses the property in `content`, an element with the tag `tag`, and the place of the fault.
-struct PropertyFault {
-    const std::uint8_t* place;
-    std::string reason;
-};
+bool looksLikeDictionary(const DERItem& content) {
+    DERDecodedInfo first;
+    return content.length == 0 ||
+           (DERDecodeItem(&content, &first) == DERSuccess && first.tag == Img4PropertyTag(first.tag));
+}
+
+} // namespace
 
 PropertyFault propertyFault(const DERItem& content, DERTag tag) {
     DERDecodedInfo whole;
@@ -55,14 +57,6 @@ PropertyFault propertyFault(const DERItem& content, DERTag tag) {
         return {elements.next, "goes on behind its value"};
     return {elements.end, "goes on behind the SEQUENCE of name and value"};
 }
-
-bool looksLikeDictionary(const DERItem& content) {
-    DERDecodedInfo first;
-    return content.length == 0 ||
-           (DERDecodeItem(&content, &first) == DERSuccess && first.tag == Img4PropertyTag(first.tag));
-}
-
-} // namespace
 
 ordered_json PropertyReader::dictionary(const DERItem& content, const std::string& where, unsigned depth) {
     ordered_json properties = ordered_json::array();

@@ -7,6 +7,14 @@
 
 namespace img4show {
 
+struct PropertyFault {
+    const std::uint8_t* place;
+    std::string reason; // a clause whose subject is the property
+};
+
+// Why the decoder refuses the property in `content`, an element with the tag `tag`.
+PropertyFault propertyFault(const DERItem& content, DERTag tag);
+
 // Reads the properties in the dictionaries of one file.
 class PropertyReader {
 public:

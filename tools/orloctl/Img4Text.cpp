@@ -35,15 +35,11 @@ private:
     std::string text_;
 };
 
-// "brdI"  INTEGER 12
+// brdI  INTEGER 12
 std::string propertyLine(const ordered_json& property) {
     std::string line = property["name"];
     if (property.contains("type"))
-        line += "  " + property["type"].get<std::string>();
-    if (property.contains("value"))
-        line += " " + property["value"].dump();
-    else if (property.contains("length"))
-        line += " " + bytesText(property);
+        line += "  " + img4ValueText(property);
     if (property.contains("fault"))
         line += "  WRONG: " + property["fault"].get<std::string>();
     if (property.contains("hidden"))
@@ -108,6 +104,21 @@ void Lines::addRestoreInfo(const ordered_json& restoreInfo) {
 }
 
 } // namespace
+
+std::string img4ValueText(const ordered_json& property) {
+    std::string text = property["type"];
+    if (property.contains("value"))
+        text += " " + property["value"].dump();
+    else if (property.contains("length"))
+        text += " " + bytesText(property);
+    return text;
+}
+
+std::string img4PropertiesText(const ordered_json& properties, unsigned depth) {
+    Lines lines;
+    lines.addProperties(depth, properties);
+    return std::move(lines).text();
+}
 
 std::string img4Text(const ordered_json& json) {
     Lines lines;

@@ -14,29 +14,6 @@ constexpr std::uint64_t mostShown = 50000;
 constexpr std::uint64_t mostOctetsOfValue = 32;
 constexpr std::uint64_t mostCharactersOfValue = 128;
 
-std::string oidText(const DERItem& content) {
-    std::string text;
-    std::uint64_t component = 0;
-    bool first = true;
-    for (std::uint64_t i = 0; i < content.length; ++i) {
-        if (component > UINT64_MAX >> 7 || text.size() > mostCharactersOfValue)
-            return text + "...";
-        component = component << 7 | (content.data[i] & 0x7F);
-        if ((content.data[i] & 0x80) != 0)
-            continue;
-        if (first) {
-            // The first octets hold two components (X.690 8.19.4).
-            const std::uint64_t root = component < 80 ? component / 40 : 2;
-            text = std::to_string(root) + "." + std::to_string(component - root * 40);
-            first = false;
-        } else {
-            text += "." + std::to_string(component);
-        }
-        component = 0;
-    }
-    return text;
-}
-
 ordered_json integerValue(const DERItem& content) {
     if (content.length == 0 || content.length > sizeof(std::int64_t))
         return "0x" + hexText(content, mostOctetsOfValue);

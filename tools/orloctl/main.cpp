@@ -3,6 +3,7 @@
 #include <exception>
 #include <functional>
 #include <iostream>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -15,9 +16,11 @@
 #include "tools/orloctl/Client.h"
 #include "tools/orloctl/CrashLogReport.h"
 #include "tools/orloctl/Json.h"
+#include "tools/orloctl/LocalFiles.h"
 #include "tools/orloctl/ShowBcfg.h"
 #include "tools/orloctl/ShowDer.h"
 #include "tools/orloctl/ShowImg4.h"
+#include "tools/orloctl/VerifyImg4.h"
 #include "tools/orloctl/Version.h"
 
 namespace {
@@ -33,7 +36,7 @@ constexpr const char* exitStatuses = R"(Exit status:
      cannot be read or written
   3  the service cannot be reached, or did not answer in time
   4  the plug-in does not know the command
-  5  an offline reader met bad input
+  5  an offline reader met bad input, or a file is not trusted
 
 The bus is the one in the environment variable VELTRA_BUS unless --bus names another. Paths of the device are seen below
 the device root (environment variable VELTRA_DEVICE_ROOT, default /).)";
@@ -196,6 +199,20 @@ int show(const Options& options, const Report& found, Outcome failure = Outcome:
     return status;
 }
 
+struct VerifyOptions {
+    std::optional<std::string> profile;
+    std::optional<std::string> object;
+    std::optional<std::string> trustFolder;
+};
+
+int verify(const Options& options, const std::string& path, const VerifyOptions& how) {
+    const auto object = how.object ? std::optional(objectCode(*how.object)) : std::nullopt;
+    const TrustDomain domain =
+        how.trustFolder ? readTrustDomain(*how.trustFolder, how.profile) : builtInTrustDomain(how.profile);
+    const Value::Data file = readLocalFile(path);
+    return show(options, verifyImg4({file.data(), file.size()}, domain, object));
+}
+
 class CommandLine {
 public:
     CommandLine() {
@@ -213,6 +230,7 @@ public:
         addRequests();
         addRecords();
         addReaders();
+        addVerifiers();
     }
 
     int run(int argc, char** argv) {
@@ -309,6 +327,23 @@ private:
         addReader(readers, "der", "The items of a DER file as a tree, and where strict DER ends", showDer);
     }
 
+    void addVerifiers() {
+        CLI::App* verifiers = app_.add_subcommand("verify", "Say whether a local file is trusted, without the service");
+        verifiers->require_subcommand(1);
+        verifiers->fallthrough();
+
+        CLI::App* verb = verifiers->add_subcommand(
+            "img4", "Verify the chain, the signature and the constraints of a container or bare manifest");
+        verb->add_option("FILE", path_, "A local file")->required();
+        verb->add_option("--profile", verifyOptions_.profile,
+                         "The trust profile, such as kImg4DecodeSecureBootEc384Sha384; without it, the one that fits");
+        verb->add_option("--object", verifyOptions_.object, "Evaluate the object with this four-character code too");
+        verb->add_option("--trust-dir", verifyOptions_.trustFolder,
+                         "Take roots and names from this folder, which scripts/make-trust-domain has made, instead of "
+                         "those that are built in");
+        verb->callback([this] { run_ = [this] { return verify(options_, path_, verifyOptions_); }; });
+    }
+
     void addReader(CLI::App* readers, const char* name, const char* help,
                    Report (*read)(const std::uint8_t*, std::size_t)) {
         CLI::App* verb = readers->add_subcommand(name, help);
@@ -328,6 +363,7 @@ private:
     std::string copyPath_;
     std::string keyPath_;
     std::string url_;
+    VerifyOptions verifyOptions_;
     std::vector<std::string> words_;
     std::function<int()> run_;
 };

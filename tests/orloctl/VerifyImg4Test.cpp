@@ -1,0 +1,363 @@
+#include "tools/orloctl/VerifyImg4.h"
+
+#include "tests/support/SignedManifestMaker.h"
+
+#include <functional>
+#include <map>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace signedmanifest;
+using namespace img4maker;
+using nlohmann::ordered_json;
+
+constexpr const char* ec384 = "kImg4DecodeSecureBootEc384Sha384";
+constexpr const char* ec256 = "kImg4DecodeSecureBootEc256Sha256";
+constexpr const char* rsa1k = "kImg4DecodeSecureBootRsa1kSha1";
+constexpr const char* rsa3k = "kImg4DecodeSecureBootRsa3kSha384";
+constexpr const char* rsa4k = "kImg4DecodeSecureBootRsa4kSha384";
+constexpr const char* localPolicy = "kImg4DecodeLocalPolicyEc384Sha384";
+
+const Signer& signerOf(const std::string& profile) {
+    static std::map<std::string, Signer> signers;
+    for (unsigned i = 0; i < Img4NumTrustProfiles; ++i)
+        if (profile == Img4TrustProfiles[i].name)
+            return signers.try_emplace(profile, TEST_TRUST_DOMAIN, Img4TrustProfiles[i]).first->second;
+    std::abort();
+}
+
+Bytes soundManifest(const std::string& profile) {
+    const Signer& signer = signerOf(profile);
+    return signer.manifest(standardManifest(), signer.standardChain());
+}
+
+Report verify(const Bytes& bytes, const TrustDomain& domain, const std::string& object = "") {
+    return verifyImg4({bytes.data(), bytes.size()}, domain,
+                      object.empty() ? std::nullopt : std::optional(objectCode(object)));
+}
+
+TrustDomain testDomain(const std::optional<std::string>& profile = std::nullopt) {
+    return readTrustDomain(TEST_TRUST_DOMAIN, profile);
+}
+
+TEST(VerifyImg4, trustsWhatEveryProfileSignsAndFindsThatProfile) {
+    const TrustDomain all = testDomain();
+    ASSERT_EQ(all.profiles.size(), Img4NumTrustProfiles);
+    for (const DomainProfile& profile : all.profiles) {
+        const Img4TrustProfileEntry& entry = *profile.entry;
+        const Bytes manifest = soundManifest(entry.name);
+        for (const TrustDomain& domain : {testDomain(), testDomain(entry.name)}) {
+            const Report report = verify(container(payload({}), manifest, {}), domain, "sepi");
+            EXPECT_TRUE(report.ok) << entry.name << "\n" << report.problem;
+            EXPECT_EQ(report.json["profile"], entry.name);
+            EXPECT_EQ(report.json["root"], entry.rootName);
+            EXPECT_EQ(report.json["trusted"], true);
+            EXPECT_EQ(report.json["chain"].size(), entry.chainLength);
+            EXPECT_EQ(report.json["chain"].front()["role"], "root");
+            EXPECT_EQ(report.json["chain"].back()["role"], "leaf");
+            EXPECT_EQ(report.json["digests"]["payload"].get<std::string>().size(),
+                      2 * entry.profile->digestInfo->length);
+            EXPECT_FALSE(report.json.contains("failedStep"));
+        }
+        for (const DomainProfile& other : all.profiles)
+            EXPECT_EQ(verify(manifest, testDomain(other.entry->name)).ok, &entry == other.entry)
+                << entry.name << " under " << other.entry->name;
+    }
+}
+
+TEST(VerifyImg4, showsWhatTheManifestSaysAndTheLeafDemands) {
+    const Report alone = verify(soundManifest(ec384), testDomain());
+    EXPECT_EQ(alone.json["objects"], ordered_json({"boot", "sepi"}));
+    EXPECT_FALSE(alone.json.contains("object"));
+    ASSERT_EQ(alone.json["constraints"].size(), 2U);
+    EXPECT_EQ(alone.json["constraints"][0]["demand"], "must be INTEGER 7");
+    EXPECT_EQ(alone.json["constraints"][0]["state"], "met");
+    EXPECT_EQ(alone.json["constraints"][1]["dictionary"], "OBJP");
+    EXPECT_EQ(alone.json["constraints"][1]["state"], "not checked");
+    EXPECT_EQ(alone.json["manifestProperties"].size(), 4U);
+    EXPECT_NE(alone.text.find("\n  ABCD  INTEGER 7\n"), std::string::npos) << alone.text;
+
+    const Report object = verify(soundManifest(ec384), testDomain(), "sepi");
+    EXPECT_EQ(object.json["object"]["name"], "sepi");
+    EXPECT_EQ(object.json["object"]["properties"][2]["value"], 300);
+    EXPECT_EQ(object.json["constraints"][1]["state"], "met");
+    EXPECT_NE(object.text.find("\nResult: trusted under kImg4DecodeSecureBootEc384Sha384: "), std::string::npos);
+}
+
+// A file that is refused, and what is said of it.
+struct RefusalCase {
+    const char* step;
+    const char* problem;
+    std::function<Bytes()> make;
+    const char* profile = nullptr; // all of them
+    const char* object = "";
+};
+
+// The manifest that `profile` signs with a leaf whose constraints are these.
+Bytes constrained(const List& constraints, Manifest fields = standardManifest()) {
+    const Signer& signer = signerOf(ec384);
+    return signer.manifest(std::move(fields), signer.chainWith(signer.issue(signer.leaf(constraints))));
+}
+
+Bytes withProperty(const Bytes& encoding) {
+    Manifest fields = standardManifest();
+    fields.properties.push_back(encoding);
+    return constrained({}, fields);
+}
+
+Bytes withObject(const Bytes& encoding) {
+    Manifest fields = standardManifest();
+    fields.objects = {encoding};
+    return constrained({}, fields);
+}
+
+// A sound manifest of `profile` whose leaf was changed before it was issued.
+Bytes withLeaf(const char* profile, const std::function<void(Certificate&)>& change) {
+    const Signer& signer = signerOf(profile);
+    Certificate leaf = signer.leaf({});
+    change(leaf);
+    return signer.manifest(standardManifest(), signer.chainWith(signer.issue(leaf)));
+}
+
+// `bytes` with the first octet of `text` in it changed.
+Bytes changedAt(Bytes bytes, std::string_view text) {
+    const auto place = std::search(bytes.begin(), bytes.end(), text.begin(), text.end());
+    if (place == bytes.end())
+        throw std::runtime_error("there is no such text");
+    *place ^= 1;
+    return bytes;
+}
+
+Bytes withChain(const char* profile, const List& chain) {
+    return signerOf(profile).manifest(standardManifest(), chain);
+}
+
+Bytes withoutAuthority() {
+    const Signer& signer = signerOf(rsa1k);
+    Certificate middle = signer.leaf({});
+    middle.issuer = subjectOf(readFile(std::string(TEST_TRUST_DOMAIN) + "/ROOT_CA_CERTIFICATE.der"));
+    middle.publicKeyInfo = publicKeyInfo(signer.issuerKey());
+    middle.subject = distinguishedName("Somebody");
+    Certificate leaf = signer.leaf({});
+    leaf.issuer = middle.subject;
+    return withChain(rsa1k, {signer.issue(middle, signer.rootKey()), signer.issue(leaf)});
+}
+
+Bytes withSignature(const char* profile, const Bytes& signature) {
+    Manifest fields = standardManifest();
+    fields.certChain = join(signerOf(profile).standardChain());
+    fields.signature = signature;
+    return manifest(fields);
+}
+
+// A manifest with any body, signed.
+Bytes withBody(const Bytes& body, std::uint64_t version = 0) {
+    const Signer& signer = signerOf(ec384);
+    return sequence({ia5("IM4M"), integer(version), body, octets(sign(signer.leafKey(), 48, body)),
+                     sequence(signer.standardChain())});
+}
+
+List twice(List list) {
+    list.push_back(list.back());
+    return list;
+}
+
+Bytes shortened(Bytes bytes) {
+    bytes.pop_back();
+    return bytes;
+}
+
+const RefusalCase refusalCases[] = {
+    {"file", "The file is empty", [] { return Bytes{}; }},
+    {"file", "content is cut short", [] { return shortened(soundManifest(ec384)); }},
+    {"file", "has neither a signature nor a chain", [] { return unsignedManifest({}); }},
+    {"file", "is a bare payload", [] { return payload({}); }},
+    {"file", "The container has no manifest", [] { return container(payload({}), {}, {}); }},
+
+    {"chain", "The chain has 1 certificate, the root included, and the profile demands 2",
+     [] { return withChain(ec384, {}); }, ec384},
+    {"chain", "The chain has 3 certificates, the root included, and the profile demands 2",
+     [] { return withChain(ec384, twice(signerOf(ec384).standardChain())); }},
+    {"chain", "Certificate 1 is no certificate", [] { return withChain(ec384, {sequence({integer(1)})}); }},
+    {"chain", "Certificate 1 is no strict DER: the length is indefinite",
+     [] {
+         return withChain(ec384, {{0x30, 0x80}});
+     }},
+    {"chain", "Certificate 1 is longer than 131071 octets",
+     [] { return withChain(ec384, {sequence({octets(filler(131071))})}); }},
+    {"chain",
+     "Certificate 1 (\"CN=Tevari Manifest Signing,O=Tevari\") has the key EC P-256, and the profile demands EC on "
+     "P-384",
+     [] { return soundManifest(ec256); }, ec384},
+    {"chain",
+     "names the issuer \"CN=Tevari RSA 4096 Root CA,O=Tevari\", and the one before it is \"CN=Tevari RSA 3072 Root "
+     "CA,O=Tevari\"",
+     [] { return soundManifest(rsa4k); }, rsa3k},
+    {"chain",
+     "Certificate 2 (\"CN=Manifest Signing of a Test\") names the issuer \"CN=Nobody\", and the one before it is \"CN=",
+     [] { return withLeaf(localPolicy, [](Certificate& leaf) { leaf.issuer = distinguishedName("Nobody"); }); }},
+    {"chain",
+     "No known root has signed this chain: its first certificate (\"CN=Manifest Signing of a Test\") names the issuer "
+     "\"CN=Nobody\"",
+     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.issuer = distinguishedName("Nobody"); }); }},
+    {"chain", "is signed with ecdsa-with-SHA256, and the profile demands ecdsa-with-SHA384",
+     [] {
+         return withLeaf(ec384, [](Certificate& leaf) { leaf.signatureAlgorithm = algorithm(oid(oidSha256Ecdsa)); });
+     }},
+    {"chain", "is signed with sha384WithRSAEncryption and parameters, which it must not have",
+     [] {
+         return withLeaf(rsa3k,
+                         [](Certificate& leaf) { leaf.signatureAlgorithm = algorithm(oid(oidSha384Rsa), integer(1)); });
+     }},
+    {"chain",
+     "The signature on certificate 1 (\"CN=Uevari Manifest Signing,O=Tevari\") does not verify under the key of the "
+     "root (\"CN=Tevari Local P-384 Root CA,O=Tevari\"): the certificate was changed",
+     [] { return changedAt(soundManifest(ec384), "Tevari Manifest Signing"); }},
+    {"chain", "is no BIT STRING of whole octets",
+     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.unusedBits = 1; }); }},
+    {"chain",
+     "does not carry the common name of the secure-boot authority, \"Tevari Secure Boot Certification Authority\"",
+     withoutAuthority},
+    {"chain", "has a malformed or empty list of extensions",
+     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.extensions = extensions({}); }); }},
+
+    {"signature",
+     "does not verify under the key of the leaf (\"CN=Tevari Manifest Signing,O=Tevari\"): the manifest's body was "
+     "changed",
+     [] { return changedAt(soundManifest(ec384), "text"); }},
+    {"signature", "(\"CN=Tevari Manifest Signing,O=Tevari\"): it has 511 octets, and those of the key have 512",
+     [] { return withSignature(rsa4k, filler(511)); }},
+
+    {"dictionaries", "The manifest's body has no \"MANB\"", [] { return withBody(set({object("MANX", {})})); }},
+    {"dictionaries", "\"MANB\" of the manifest's body is SET instead of SEQUENCE",
+     [] { return withBody(manifestBody(standardManifest()), 2); }},
+    {"dictionaries", "\"MANB\" has no \"MANP\"", [] { return withBody(set({object("MANB", {})})); }},
+
+    {"object", "The manifest has no \"xyzt\"", [] { return soundManifest(ec384); }, nullptr, "xyzt"},
+    {"object", "\"sepi\" of the manifest is INTEGER instead of SET",
+     [] { return withObject(property("sepi", integer(1))); }, nullptr, "sepi"},
+    {"object", "private \"sepi\" of the manifest is named \"boot\" inside",
+     [] {
+         return withObject(item(propertyTag("sepi"), sequence({ia5("boot"), set({})})));
+     },
+     nullptr, "sepi"},
+
+    {"constraints", "The leaf certificate carries no constraints",
+     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.extensions = {}; }); }},
+    {"constraints", "says that \"ABCD\" of the manifest must be INTEGER 8, and it is INTEGER 7",
+     [] { return constrained({object("MANP", {property("ABCD", integer(8))})}); }},
+    {"constraints", "says that \"ABCD\" of the manifest must be BOOLEAN true, and it is INTEGER 7",
+     [] { return constrained({object("MANP", {property("ABCD", boolean(true))})}); }},
+    {"constraints", "says that \"NONE\" of the manifest must be OCTET STRING 1 byte: 07, and there is none",
+     [] { return constrained({object("MANP", {property("NONE", octets({7}))})}); }},
+    {"constraints", "says that \"NONE\" of the object must be there, and there is none",
+     [] { return constrained({object("OBJP", {mustBePresent("NONE")})}); }, nullptr, "sepi"},
+    {"constraints", "says that \"ABCD\" of the manifest must not be there, and it is INTEGER 7",
+     [] {
+         return constrained({object("MANP", {mustBePresent("TEXT"), mustBeAbsent("ABCD")})});
+     }},
+    {"constraints", "private \"ABCD\" is IA5String, which is no kind of constraint",
+     [] { return constrained({object("MANP", {property("ABCD", ia5("text"))})}); }},
+    {"constraints", "private \"NEWP\" is no dictionary of constraints",
+     [] { return constrained({object("NEWP", {})}); }},
+    {"constraints", "private \"MANP\" is INTEGER instead of SET",
+     [] { return constrained({property("MANP", integer(1))}); }},
+    {"constraints", "private \"MANP\" is named \"OBJP\" inside",
+     [] {
+         return constrained({item(propertyTag("MANP"), sequence({ia5("OBJP"), set({})}))});
+     }},
+
+    {"properties", "private \"LIST\" of the manifest is SEQUENCE, and only BOOLEAN,",
+     [] { return withProperty(property("LIST", sequence({}))); }},
+    {"properties", "INTEGER of the manifest is no property", [] { return withProperty(integer(1)); }},
+    {"properties", "private \"LONG\" of the object goes on behind its value",
+     [] {
+         return withObject(
+             object("sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))}));
+     },
+     nullptr, "sepi"},
+};
+
+TEST(VerifyImg4, saysWhyItRefusesAndWhere) {
+    for (const RefusalCase& row : refusalCases) {
+        const Bytes bytes = row.make();
+        const Report report =
+            verify(bytes, testDomain(row.profile != nullptr ? std::optional<std::string>(row.profile) : std::nullopt),
+                   row.object);
+        EXPECT_FALSE(report.ok) << row.problem;
+        EXPECT_NE(report.problem.find(row.problem), std::string::npos) << row.problem << "\n" << report.problem;
+        EXPECT_EQ(report.json["failedStep"], row.step) << row.problem;
+        EXPECT_LE(report.json["problemOffset"], bytes.size()) << row.problem;
+        EXPECT_EQ(report.json["trusted"], false);
+        EXPECT_NE(report.text.find("\nResult: not trusted\n"), std::string::npos);
+    }
+}
+
+// Somebody who does not know the key must not get the words of a forged manifest onto the screen as if they counted.
+TEST(VerifyImg4, showsPropertiesOnlyOnceTheSignatureWasVerified) {
+    const Report forged = verify(changedAt(soundManifest(ec384), "text"), testDomain(), "sepi");
+    EXPECT_FALSE(forged.json.contains("manifestProperties"));
+    EXPECT_FALSE(forged.json.contains("objects"));
+    EXPECT_EQ(forged.json["constraints"][0]["state"], "not checked");
+    EXPECT_EQ(forged.json["chain"].size(), 2U);
+
+    const Report incomplete = verify(soundManifest(ec384), testDomain(), "xyzt");
+    EXPECT_EQ(incomplete.json["objects"], ordered_json({"boot", "sepi"}));
+    EXPECT_FALSE(incomplete.json.contains("object"));
+}
+
+// The roots that are built in have the names of the tests' roots, and other keys.
+TEST(VerifyImg4, aRootOfTheSameNameIsNotTheRoot) {
+    for (unsigned i = 0; i < Img4NumTrustProfiles; ++i) {
+        const char* name = Img4TrustProfiles[i].name;
+        const Report report = verify(soundManifest(name), builtInTrustDomain(std::nullopt));
+        EXPECT_FALSE(report.ok);
+        EXPECT_EQ(report.json["profile"], name);
+        EXPECT_NE(report.problem.find("another key of that name has signed it"), std::string::npos) << report.problem;
+    }
+}
+
+TEST(VerifyImg4, hostileNamesStayWithinTheLine) {
+    Manifest fields = standardManifest();
+    fields.properties.push_back(property("EVIL", ia5("\x1B[2J\nResult: trusted")));
+    const Signer& signer = signerOf(ec384);
+    Certificate leaf = signer.leaf({});
+    leaf.subject = distinguishedName("a,O=b\x1B[31m\n\"+\\;<> ");
+    const Report report = verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain());
+    ASSERT_TRUE(report.ok) << report.problem;
+    EXPECT_EQ(report.json["chain"][1]["subject"], "CN=a\\,O=b\\1B[31m\\0A\\\"\\+\\\\\\;\\<\\>\\ ");
+    EXPECT_EQ(report.text.find('\x1B'), std::string::npos);
+    EXPECT_EQ(report.text.find("\nResult: trusted\n"), std::string::npos);
+
+    leaf.subject = set({integer(1)});
+    EXPECT_FALSE(verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain()).ok);
+    leaf.subject = sequence({integer(1), integer(2)});
+    EXPECT_EQ(
+        verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain()).json["chain"][1]["subject"],
+        "#020101020102");
+}
+
+TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
+    const Report report = verify(withProperty(property("BAD!", item(DERTagBoolean, {1}))), testDomain());
+    EXPECT_TRUE(report.ok) << report.problem;
+    ASSERT_EQ(report.json["notes"].size(), 1U);
+    EXPECT_NE(report.text.find("Note: \"BAD!\" of the manifest is a BOOLEAN that is not 00 or FF"), std::string::npos)
+        << report.text;
+}
+
+TEST(VerifyImg4, boundsWhatItShows) {
+    Manifest fields = standardManifest();
+    for (int i = 0; i < 1500; ++i)
+        fields.objects.push_back(object(largeObjectName(static_cast<unsigned>(i % 1000)), {}));
+    const Report objects = verify(constrained({}, fields), testDomain());
+    EXPECT_EQ(objects.json["objects"].size(), 1000U);
+    EXPECT_NE(objects.text.find("502 further objects are not shown"), std::string::npos);
+
+    const Report chain = verify(withChain(ec384, List(150, sequence({}))), testDomain());
+    EXPECT_EQ(chain.json["chain"].size(), 101U); // with the root
+    EXPECT_NE(chain.text.find("50 further certificates are not shown"), std::string::npos);
+}
+
+} // namespace

@@ -1,0 +1,41 @@
+// Words for X.509 certificates (RFC 5280): whose they are, who issued them, with which key and algorithm. What cannot
+// be read is named as such, so that any octets have words. Only printable ASCII comes out.
+#ifndef VELTRA_TOOLS_ORLOCTL_CERTIFICATETEXT_H
+#define VELTRA_TOOLS_ORLOCTL_CERTIFICATETEXT_H
+
+#include <cstddef>
+#include <optional>
+#include <string>
+
+#include <nlohmann/json.hpp>
+
+#include "der/DERItemSpecs.h"
+
+struct Certificate {
+    DERSignedCertCrl fields;
+    DERTBSCert tbs;
+};
+
+// The fields of the encoded certificate; nothing when the outer structures are not those of a certificate.
+std::optional<Certificate> readCertificate(const DERItem& encoding);
+
+// The content of a Name in the form of RFC 4514, "CN=Tevari Root CA,O=Tevari". Octets that are no printable ASCII are
+// escaped, and so are values that are no text. A long name ends in an ellipsis.
+std::string nameText(const DERItem& name);
+
+// The content of a SubjectPublicKeyInfo: "RSA 4096 bits", "EC P-384".
+std::string keyText(const DERItem& subjectPublicKeyInfo);
+
+// The size of an RSA key's modulus; nothing for other keys.
+std::optional<std::size_t> rsaBits(const DERItem& subjectPublicKeyInfo);
+
+// An algorithm's object identifier: "sha384WithRSAEncryption" where the name is known, else numbers with dots. The
+// second form takes the content of an AlgorithmIdentifier.
+std::string algorithmName(const DERItem& oid);
+std::string algorithmText(const DERItem& identifier);
+
+// "subject", "issuer", "key", "signatureAlgorithm", "serialNumber" and the "sha256" of the encoding; with a "fault"
+// instead when it is no certificate.
+nlohmann::ordered_json certificateJson(const DERItem& encoding);
+
+#endif

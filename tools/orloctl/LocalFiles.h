@@ -1,0 +1,22 @@
+// Files of this machine, not of the device, that the command line names.
+#ifndef VELTRA_TOOLS_ORLOCTL_LOCALFILES_H
+#define VELTRA_TOOLS_ORLOCTL_LOCALFILES_H
+
+#include <stdexcept>
+#include <string>
+
+#include "platform/Value.h"
+
+// The command line asks for what cannot be done; what() says so in a sentence without a full stop.
+class UsageError : public std::runtime_error {
+public:
+    using std::runtime_error::runtime_error;
+};
+
+// The contents of a file. Raises UsageError when it cannot be read or is larger than 256 MiB.
+Value::Data readLocalFile(const std::string& path);
+
+// Makes `contents` the contents of a file. Raises UsageError when it cannot be written.
+void writeLocalFile(const std::string& path, const Value::Data& contents);
+
+#endif

@@ -1,0 +1,317 @@
+#include "tools/orloctl/VerifyImg4.h"
+
+#include <algorithm>
+#include <tuple>
+
+#include "tools/orloctl/CertificateText.h"
+#include "tools/orloctl/DerItems.h"
+#include "tools/orloctl/DerText.h"
+#include "tools/orloctl/Img4Findings.h"
+#include "tools/orloctl/Img4Properties.h"
+#include "tools/orloctl/LocalFiles.h"
+#include "tools/orloctl/ShowImg4.h"
+#include "tools/orloctl/TrustConstraints.h"
+#include "tools/orloctl/TrustEvaluation.h"
+#include "tools/orloctl/VerifyText.h"
+
+namespace {
+
+using nlohmann::ordered_json;
+
+constexpr std::size_t mostObjects = 1000;
+constexpr DERTag manifestPropertiesTag = Img4PropertyTag(Img4FourCC('M', 'A', 'N', 'P'));
+
+bool areEqual(const DERItem& one, const DERItem& other) {
+    return std::equal(one.data, one.data + one.length, other.data, other.data + other.length);
+}
+
+// How far the verification of a chain has come, for comparison: certificates are counted before they are parsed, all of
+// their keys come before names and signatures, and these are checked certificate by certificate.
+std::tuple<int, std::uint32_t, int> progressOf(const Img4ChainRefusal& refusal) {
+    switch (refusal.fault) {
+    case Img4ChainSound:
+        return {5, 0, 0};
+    case Img4ChainAuthority:
+    case Img4ChainExtensions:
+        return {4, 0, refusal.fault};
+    case Img4ChainIssuer:
+    case Img4ChainSignatureAlgorithm:
+    case Img4ChainSignature:
+        return {3, refusal.certificate, refusal.fault};
+    case Img4ChainKey:
+        return {2, refusal.certificate, 0};
+    case Img4ChainEncoding:
+    case Img4ChainCertificateSize:
+        return {1, refusal.certificate, 0};
+    default:
+        return {0, 0, 0};
+    }
+}
+
+const char* digestName(std::uint64_t length) {
+    return length == 20 ? "SHA-1" : length == 32 ? "SHA-256" : "SHA-384";
+}
+
+class Verification {
+public:
+    // The findings go into `report`.
+    Verification(const DERItem& file, const TrustDomain& domain, std::optional<std::uint32_t> object, Report& report)
+        : file_(file), domain_(domain), object_(object), report_(report) {}
+
+    void run();
+
+private:
+    bool readFile();
+    bool readBareManifest();
+    std::optional<TrustEvaluation> evaluate() const;
+    bool namesRoot(const DomainProfile& profile) const;
+
+    void refuse(const TrustRefusal& refusal);
+    void refuseUnknownRoot();
+    void describe(const TrustEvaluation& evaluation);
+    void addChain(const DomainProfile* profile);
+    void addConstraints(const Img4Record& record);
+    void addDigests(const TrustEvaluation& evaluation);
+    void addProperties(const TrustEvaluation& evaluation);
+    void addObjects(const DERItem& manb);
+    ordered_json properties(const DERItem& dictionary, const std::string& where);
+    void note(const std::string& text) { notes_.push_back(text); }
+
+    DERItem file_;
+    const TrustDomain& domain_;
+    std::optional<std::uint32_t> object_;
+    Report& report_;
+    Img4Record record_ = {};
+    std::vector<DERItem> certificates_; // without the root
+    std::uint64_t count_ = 0;           // of all of them
+    ordered_json notes_ = ordered_json::array();
+};
+
+void Verification::refuse(const TrustRefusal& refusal) {
+    const std::ptrdiff_t offset = refusal.place - file_.data;
+    report_.ok = false;
+    report_.problem = refusal.reason + " (at offset " + std::to_string(offset) + ").";
+    report_.json["failedStep"] = refusal.step;
+    if (refusal.certificate)
+        report_.json["failedCertificate"] = *refusal.certificate;
+    report_.json["problemOffset"] = offset;
+}
+
+bool Verification::readBareManifest() {
+    Img4Record other;
+    report_.json["kind"] = "manifest";
+    if (Img4DecodeInitManifest(file_.data, file_.length, &record_) == DERSuccess)
+        return true;
+    if (Img4DecodeInitUnsignedManifest(file_.data, file_.length, &other) == DERSuccess) {
+        report_.json["kind"] = "unsigned manifest";
+        refuse({"file", "The manifest has neither a signature nor a chain", file_.data, std::nullopt});
+    } else if (Img4DecodeInitPayload(file_.data, file_.length, &other) == DERSuccess) {
+        report_.json["kind"] = "payload";
+        refuse({"file", "The file is a bare payload, and only a manifest is signed", file_.data, std::nullopt});
+    } else {
+        const Report shown = showImg4(file_.data, file_.length);
+        report_.json["kind"] = shown.json.value("kind", "file");
+        report_.json["failedStep"] = "file";
+        report_.json["problemOffset"] = shown.json.value("problemOffset", 0);
+        report_.problem = shown.problem;
+        report_.ok = false;
+    }
+    return false;
+}
+
+bool Verification::readFile() {
+    bool hasManifest = false;
+    if (Img4DecodeInit(file_.data, file_.length, &record_) != DERSuccess)
+        return readBareManifest();
+    report_.json["kind"] = "container";
+    Img4DecodeManifestExists(&record_, &hasManifest);
+    if (!hasManifest)
+        refuse({"file", "The container has no manifest, so that nothing vouches for its payload", file_.data,
+                std::nullopt});
+    return hasManifest;
+}
+
+// Whether the first certificate names the profile's root as its issuer.
+bool Verification::namesRoot(const DomainProfile& profile) const {
+    const auto root = readCertificate(profile.made.root);
+    const auto first = certificates_.empty() ? std::nullopt : readCertificate(certificates_.front());
+    return root && first && areEqual(first->tbs.issuer, root->tbs.subject);
+}
+
+// Verifying a chain is cheap, since most roots are not the one that it names, and the digest of a large manifest is
+// not. So chains come first, and one evaluation is made of the profile whose chain is sound, or comes nearest to it.
+// Nothing when there are several profiles and the chain names the root of none.
+std::optional<TrustEvaluation> Verification::evaluate() const {
+    using Rank = std::pair<bool, std::tuple<int, std::uint32_t, int>>;
+    std::optional<TrustEvaluation> refused;
+    const DomainProfile* best = &domain_.profiles.front();
+    Rank bestRank = {false, {-1, 0, 0}};
+    for (const DomainProfile& profile : domain_.profiles) {
+        const Img4ChainRefusal refusal = judgeChain(record_, profile);
+        const Rank rank = {namesRoot(profile), progressOf(refusal)};
+        if (refusal.fault == Img4ChainSound) {
+            const TrustEvaluation evaluation = evaluateTrust(record_, profile, object_);
+            if (evaluation.status == DERSuccess)
+                return evaluation;
+            refused = refused ? refused : evaluation;
+        } else if (rank > bestRank) {
+            best = &profile;
+            bestRank = rank;
+        }
+    }
+    if (refused)
+        return refused;
+    const bool isFirstReadable = !certificates_.empty() && readCertificate(certificates_.front());
+    if (domain_.profiles.size() > 1 && !bestRank.first && isFirstReadable)
+        return std::nullopt;
+    return evaluateTrust(record_, *best, object_);
+}
+
+void Verification::refuseUnknownRoot() {
+    const auto first = readCertificate(certificates_.front());
+    refuse({"chain",
+            "No known root has signed this chain: its first certificate (\"" + nameText(first->tbs.subject) +
+                "\") names the issuer \"" + nameText(first->tbs.issuer) +
+                "\", and no root of the trust domain has "
+                "that name",
+            certificates_.front().data, 1});
+}
+
+void Verification::addChain(const DomainProfile* profile) {
+    ordered_json chain = ordered_json::array();
+    if (profile != nullptr) {
+        chain.push_back({{"number", 0}, {"role", "root"}});
+        chain.back().update(certificateJson(profile->made.root));
+    }
+    for (std::size_t i = 0; i < certificates_.size(); ++i) {
+        chain.push_back({{"number", i + 1},
+                         {"role", i + 1 == count_ ? "leaf" : "intermediate"},
+                         {"offset", certificates_[i].data - file_.data},
+                         {"length", certificates_[i].length}});
+        chain.back().update(certificateJson(certificates_[i]));
+    }
+    report_.json["chain"] = std::move(chain);
+    if (count_ > certificates_.size())
+        note(std::to_string(count_ - certificates_.size()) + " further certificates are not shown");
+}
+
+void Verification::addConstraints(const Img4Record& record) {
+    constexpr const char* states[] = {"met", "broken", "not checked"};
+    if (record.manifest.certProperties.data == nullptr)
+        return;
+    ordered_json constraints = ordered_json::array();
+    for (const TrustConstraint& constraint : readConstraints(record)) {
+        constraints.push_back({{"dictionary", constraint.dictionary},
+                               {"name", constraint.name},
+                               {"demand", constraint.demand},
+                               {"state", states[constraint.state]}});
+        if (!constraint.found.empty())
+            constraints.back()["found"] = constraint.found;
+    }
+    report_.json["constraints"] = std::move(constraints);
+}
+
+void Verification::addDigests(const TrustEvaluation& evaluation) {
+    const Img4Record& record = evaluation.record;
+    const std::uint64_t length = evaluation.profile->made.profile.digestInfo->length;
+    ordered_json digests = {{"algorithm", digestName(length)}};
+    if (record.manifestHashed != 0)
+        digests["manifest"] = hexText({record.manifest.digest, length}, length);
+    if (evaluation.refusal.fault == Img4ChainSound)
+        digests["body"] = hexText({record.manifest.bodyDigest, length}, length);
+    if (record.payloadHashed != 0)
+        digests["payload"] = hexText({record.payload.digest, length}, length);
+    report_.json["digests"] = std::move(digests);
+}
+
+// What is wrong with a value is no reason against trust, which is about who says it; but it is worth a note.
+ordered_json Verification::properties(const DERItem& dictionary, const std::string& where) {
+    Report shown;
+    img4show::Findings findings(file_, shown);
+    img4show::PropertyReader reader(findings);
+    ordered_json json = reader.dictionary(dictionary, where);
+    if (!shown.ok && report_.ok)
+        note(shown.problem.substr(0, shown.problem.size() - 1));
+    if (reader.leftOut() != 0)
+        note(std::to_string(reader.leftOut()) + " further properties of " + where + " are not shown");
+    return json;
+}
+
+void Verification::addObjects(const DERItem& manb) {
+    ordered_json objects = ordered_json::array();
+    std::uint64_t count = 0;
+    for (DerItems items(manb); items.next();) {
+        const std::uint64_t code = items.item().tag & DERTagNumberMask;
+        if (items.item().tag == Img4PropertyTag(code) && items.item().tag != manifestPropertiesTag &&
+            ++count <= mostObjects)
+            objects.push_back(codeText(code));
+    }
+    report_.json["objects"] = std::move(objects);
+    if (count > mostObjects)
+        note(std::to_string(count - mostObjects) + " further objects are not shown");
+}
+
+void Verification::addProperties(const TrustEvaluation& evaluation) {
+    const Img4Record& record = evaluation.record;
+    if (record.manp.data == nullptr)
+        return;
+    report_.json["manifestProperties"] = properties(record.manp, "the manifest");
+    addObjects(record.manb);
+    if (record.objp.data == nullptr)
+        return;
+    report_.json["object"] = {{"name", codeText(*object_)}, {"properties", properties(record.objp, "the object")}};
+    if (record.payloadHashed != 0)
+        note("Whether the payload is this object's was not judged: compare the payload's digest with the one that the "
+             "object's properties demand");
+}
+
+void Verification::describe(const TrustEvaluation& evaluation) {
+    const Img4TrustProfileEntry& entry = *evaluation.profile->entry;
+    report_.json["profile"] = entry.name;
+    report_.json["root"] = entry.rootName;
+    if (evaluation.status != DERSuccess)
+        refuse(explainRefusal(evaluation));
+    addChain(evaluation.profile);
+    addConstraints(evaluation.record);
+    addDigests(evaluation);
+    addProperties(evaluation);
+    if (evaluation.status != DERSuccess)
+        return;
+    report_.json["trusted"] = true;
+    report_.json["result"] = "trusted under " + std::string(entry.name) +
+                             ": the chain ends in a known root, the manifest's signature verifies, and the leaf's "
+                             "constraints on the manifest " +
+                             (object_ ? "and on \"" + codeText(*object_) + "\" " : "") + "are met";
+}
+
+void Verification::run() {
+    report_.json["length"] = file_.length;
+    report_.json["trustDomain"] = domain_.name;
+    report_.json["trusted"] = false;
+    if (readFile()) {
+        certificates_ = certificatesOf(record_.manifest.certChain, &count_);
+        if (const auto evaluation = evaluate()) {
+            describe(*evaluation);
+        } else {
+            refuseUnknownRoot();
+            addChain(nullptr);
+        }
+    }
+    report_.json["notes"] = std::move(notes_);
+    report_.text = verifyText(report_.json);
+}
+
+} // namespace
+
+Report verifyImg4(const DERItem& file, const TrustDomain& domain, std::optional<std::uint32_t> object) {
+    Report report;
+    Verification(file, domain, object, report).run();
+    return report;
+}
+
+std::uint32_t objectCode(const std::string& text) {
+    const auto isPrintable = [](char character) { return character >= 0x20 && character <= 0x7E; };
+    if (text.size() != 4 || !std::all_of(text.begin(), text.end(), isPrintable))
+        throw UsageError("--object takes the four characters of an object's code, such as sepi");
+    return Img4FourCC(text[0], text[1], text[2], text[3]);
+}
