@@ -1,6 +1,7 @@
 #include "tests/img4/TrustDomain.h"
 
 #include <functional>
+#include <iterator>
 
 #include <gtest/gtest.h>
 #include <openssl/bn.h>
@@ -179,8 +180,8 @@ const BlockCase blockCases[] = {
     {"first octet left out", false, [](Block& b, const Bytes&, const Bytes&) { b.start = {0x01}; }},
     {"other digest algorithm", false,
      [](Block& b, const Bytes& digest, const Bytes& oid) {
-         Bytes other = oid;
-         other.back() ^= 0x03;
+         Bytes other(oid.begin(), std::prev(oid.end()));
+         other.push_back(oid.back() ^ 0x03);
          b.digestInfo = sequence({sequence({other, null}), octets(digest)});
      }},
     {"digest in a BIT STRING", false,
