@@ -1,0 +1,201 @@
+"""The stores of examples/remote-store on loopback: nginx alone, and nginx in front of Swift's S3 layer.
+
+As a program, `stores.py FOLDER` starts nginx alone, prints in JSON what a device description needs, and stops when its
+standard input ends.
+"""
+import getpass
+import hashlib
+import json
+import os
+import pathlib
+import select
+import shutil
+import signal
+import socket
+import subprocess
+import sys
+import tempfile
+import urllib.parse
+import xml.etree.ElementTree
+
+SOURCE = pathlib.Path(__file__).resolve().parents[2]
+EXAMPLES = SOURCE / "examples/remote-store"
+HOST, CA_HOST = "orlo-ds.tevari.example", "orlo-ca.tevari.example"
+TRUST_OBJECT = b"the trust object of the test\n"
+
+
+def free_ports(count):
+    """Ports that are all free at the same time."""
+    probes = [socket.socket() for _ in range(count)]
+    try:
+        for probe in probes:
+            probe.bind(("127.0.0.1", 0))
+        return [probe.getsockname()[1] for probe in probes]
+    finally:
+        for probe in probes:
+            probe.close()
+
+
+def openssl(*words):
+    subprocess.run(["openssl", *[str(word) for word in words]], check=True, stderr=subprocess.DEVNULL)
+
+
+class Authority:
+    """A certificate authority of the test's own and what it certifies, in `folder`."""
+
+    def __init__(self, folder):
+        self.folder = folder
+        self.certificate = folder / "ca.pem"
+        openssl("req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-days", "2",
+                "-subj", "/CN=Authority of the test", "-keyout", folder / "ca.key", "-out", self.certificate)
+
+    def certify(self, name, host=HOST, days=2):
+        """Makes <name>.key and <name>.pem; a negative number of days makes a certificate that has expired."""
+        key, request, certificate = (self.folder / f"{name}.{suffix}" for suffix in ("key", "csr", "pem"))
+        openssl("req", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-subj", "/CN=store",
+                "-addext", f"subjectAltName=DNS:{host}", "-keyout", key, "-out", request)
+        openssl("x509", "-req", "-in", request, "-CA", self.certificate, "-CAkey", self.folder / "ca.key",
+                "-CAcreateserial", "-copy_extensions", "copy", "-days", days, "-out", certificate)
+        return certificate, key
+
+
+class Server:
+    """A process that is not a child of this one."""
+
+    def __init__(self, pid):
+        self.pid = pid
+        self.ended = os.pidfd_open(pid)
+
+    def stop(self, how=signal.SIGTERM):
+        if self.ended is None:
+            return
+        try:
+            signal.pidfd_send_signal(self.ended, how)
+        except ProcessLookupError:
+            pass
+        select.select([self.ended], [], [])
+        os.close(self.ended)
+        self.ended = None
+
+
+class NginxStore:
+    """nginx as the store and as the server of the trust object. `extra` goes into the server of the store."""
+
+    configuration = "nginx-store.conf"
+
+    def __init__(self, folder=None, extra="", certificate_host=HOST, certificate_days=2):
+        self.folder = folder or pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
+        self.store_port, self.ca_port, *ports = free_ports(7)
+        names = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
+        self.values = {
+            "FOLDER": self.folder, "STORE": self.store_port, "CA": self.ca_port, "USER": getpass.getuser(),
+            "DIGEST": hashlib.sha256(TRUST_OBJECT).hexdigest(), **dict(zip(names, ports)),
+        }
+        self.authority = Authority(self.folder)
+        self.authority.certify("store", certificate_host, certificate_days)
+        (self.folder / "trust-object").write_bytes(TRUST_OBJECT)
+        (self.folder / "store").mkdir()
+        self.servers = []
+        try:
+            self.start(extra)
+        except BaseException:
+            self.close()
+            raise
+
+    def start(self, extra):
+        configuration = self.configure(self.configuration)
+        if extra:
+            text = configuration.read_text()
+            configuration.write_text(text.replace("        root ", extra + "        root "))
+        # nginx goes to the background once it listens. Its worker writes the records as the user of the test.
+        as_user = ["-g", "user root;"] if os.geteuid() == 0 else []
+        subprocess.run(["/usr/sbin/nginx", *as_user, "-c", configuration], check=True, stderr=subprocess.DEVNULL)
+        self.nginx = Server(int((self.folder / "nginx.pid").read_text()))
+        self.servers.append(self.nginx)
+
+    def configure(self, name):
+        """A copy of a file of the example with its places filled in."""
+        text = (EXAMPLES / name).read_text()
+        for place, value in self.values.items():
+            text = text.replace(f"@{place}@", str(value))
+        path = self.folder / name
+        path.write_text(text)
+        return path
+
+    def describe(self, root, **changes):
+        """The "store" of a device description; the files that it names are put below the device root `root`."""
+        shutil.copy(self.authority.certificate, root / "store-ca.pem")
+        return {
+            "backend": "remote", "caFile": "/store-ca.pem",
+            "connectTo": {f"{HOST}:8443": f"127.0.0.1:{self.store_port}",
+                          f"{CA_HOST}:8443": f"127.0.0.1:{self.store_port}",
+                          f"{CA_HOST}:8080": f"127.0.0.1:{self.ca_port}"}, **changes,
+        }
+
+    def requests(self):
+        """Method, path, status, grants and connection of each request so far."""
+        return [line.split(" ") for line in (self.folder / "requests.log").read_text().splitlines()]
+
+    def stored(self):
+        """What the store holds: name and bytes."""
+        store = self.folder / "store"
+        return {str(path.relative_to(store)): path.read_bytes() for path in store.rglob("*") if path.is_file()}
+
+    def close(self):
+        for server in reversed(self.servers):
+            server.stop()
+        shutil.rmtree(self.folder)
+
+
+class SwiftStore(NginxStore):
+    """Swift with its S3 layer behind nginx."""
+
+    configuration = "nginx-s3.conf"
+    bucket, region, access_key, secret = "orlo-records", "eu-bench-1", "orlo:bench", "a-secret/of+the=test"
+
+    def start(self, extra):
+        self.values |= {"SECRET": self.secret, "SUFFIX": os.urandom(8).hex()}
+        ports = [self.values[kind] for kind in ("ACCOUNT", "CONTAINER", "OBJECT")]
+        for folder in ("devices/d1", "recon"):
+            (self.folder / folder).mkdir(parents=True)
+        self.configure("swift.conf")
+        subprocess.run([str(word) for word in (EXAMPLES / "swift-rings", self.folder, *ports)], check=True)
+        starting = [
+            subprocess.Popen([SOURCE / "scripts/start-service", EXAMPLES / "swift-server", kind,
+                              self.configure(f"swift-{kind}.conf")], stdout=subprocess.PIPE, text=True)
+            for kind in ("account", "container", "object", "proxy")
+        ]
+        for starter in starting:
+            pid = starter.communicate()[0]
+            if starter.returncode == 0:
+                self.servers.append(Server(int(pid)))
+        assert len(self.servers) == len(starting), "one of Swift's servers did not start"
+        super().start(extra)
+        self.s3("PUT")
+
+    def s3(self, method, path=""):
+        """The body of the answer to a signed request about the bucket, past nginx."""
+        user = ":".join(urllib.parse.quote(text, safe="") for text in (self.access_key, self.secret))
+        url = f"http://{user}@127.0.0.1:{self.values['PROXY']}/{self.bucket}{path}"
+        return subprocess.run(
+            ["curl", "-sSf", "-X", method, "--aws-sigv4", f"aws:amz:{self.region}:s3", "-H",
+             "x-amz-content-sha256: UNSIGNED-PAYLOAD", url], check=True, stdout=subprocess.PIPE,
+        ).stdout
+
+    def describe(self, root, **changes):
+        key_file = root / "store-key"
+        key_file.write_text(f"{self.access_key}\n{self.secret}\n")
+        key_file.chmod(0o600)
+        s3 = {"region": self.region, "bucket": self.bucket, "accessKeyFile": "/store-key"}
+        return super().describe(root, **{"s3": s3 | changes.pop("s3", {})}, **changes)
+
+    def stored(self):
+        names = [key.text for key in xml.etree.ElementTree.fromstring(self.s3("GET")).iterfind(".//{*}Key")]
+        return {name: self.s3("GET", "/" + urllib.parse.quote(name, safe="/~")) for name in names}
+
+
+if __name__ == "__main__":
+    store = NginxStore(pathlib.Path(sys.argv[1]))
+    print(json.dumps(store.describe(pathlib.Path(sys.argv[2]))), flush=True)
+    sys.stdin.read()
+    store.close()
