@@ -8,6 +8,7 @@ import hashlib
 import json
 import os
 import pathlib
+import re
 import select
 import shutil
 import signal
@@ -49,11 +50,11 @@ class Authority:
         openssl("req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-days", "2",
                 "-subj", "/CN=Authority of the test", "-keyout", folder / "ca.key", "-out", self.certificate)
 
-    def certify(self, name, host=HOST, days=2):
+    def certify(self, name, hosts=(HOST, CA_HOST), days=2):
         """Makes <name>.key and <name>.pem; a negative number of days makes a certificate that has expired."""
         key, request, certificate = (self.folder / f"{name}.{suffix}" for suffix in ("key", "csr", "pem"))
         openssl("req", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-subj", "/CN=store",
-                "-addext", f"subjectAltName=DNS:{host}", "-keyout", key, "-out", request)
+                "-addext", "subjectAltName=" + ",".join("DNS:" + host for host in hosts), "-keyout", key, "-out", request)
         openssl("x509", "-req", "-in", request, "-CA", self.certificate, "-CAkey", self.folder / "ca.key",
                 "-CAcreateserial", "-copy_extensions", "copy", "-days", days, "-out", certificate)
         return certificate, key
@@ -78,12 +79,47 @@ class Server:
         self.ended = None
 
 
+class ForwardProxy:
+    """tinyproxy on loopback, with further `lines` of configuration."""
+
+    def __init__(self, folder, *lines):
+        self.port, = free_ports(1)
+        configuration = folder / "tinyproxy.conf"
+        usual = (f"Port {self.port}", "Listen 127.0.0.1", "Allow 127.0.0.1", "LogLevel Info")
+        configuration.write_text("\n".join((*usual, *lines, "")))
+        self.process = subprocess.Popen(["tinyproxy", "-d", "-c", configuration], stdout=subprocess.PIPE,
+                                        stderr=subprocess.DEVNULL, text=True)
+        self.tunnels_until("Accepting connections")
+
+    def tunnels_until(self, sign):
+        """How many tunnels the log tells of before the line with `sign`."""
+        count = 0
+        for line in self.process.stdout:
+            if sign in line:
+                return count
+            count += ": CONNECT " in line
+        raise AssertionError("tinyproxy has ended")
+
+    def tunnels(self):
+        """How many tunnels were asked for since the last call. A request of this one marks the place in the log."""
+        with socket.create_connection(("127.0.0.1", self.port)) as marker:
+            marker.sendall(b"CONNECT 127.0.0.1:1 HTTP/1.0\r\n\r\n")
+            marker.recv(1000)
+        return self.tunnels_until(": CONNECT 127.0.0.1:1 ")
+
+    def close(self):
+        if self.process.poll() is None:
+            self.process.terminate()
+            self.process.communicate()
+
+
 class NginxStore:
-    """nginx as the store and as the server of the trust object. `extra` goes into the server of the store."""
+    """nginx as the store and as the server of the trust object. `extra` goes into the server of the store, `certificate`
+    to Authority.certify."""
 
     configuration = "nginx-store.conf"
 
-    def __init__(self, folder=None, extra="", certificate_host=HOST, certificate_days=2):
+    def __init__(self, folder=None, extra="", **certificate):
         self.folder = folder or pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
         self.store_port, self.ca_port, *ports = free_ports(7)
         names = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
@@ -92,7 +128,7 @@ class NginxStore:
             "DIGEST": hashlib.sha256(TRUST_OBJECT).hexdigest(), **dict(zip(names, ports)),
         }
         self.authority = Authority(self.folder)
-        self.authority.certify("store", certificate_host, certificate_days)
+        self.authority.certify("store", **certificate)
         (self.folder / "trust-object").write_bytes(TRUST_OBJECT)
         (self.folder / "store").mkdir()
         self.servers = []
@@ -134,7 +170,9 @@ class NginxStore:
 
     def requests(self):
         """Method, path, status, grants and connection of each request so far."""
-        return [line.split(" ") for line in (self.folder / "requests.log").read_text().splitlines()]
+        lines = (self.folder / "requests.log").read_text().splitlines()
+        plain = [re.sub(r"\\x([0-9A-F]{2})", lambda escape: chr(int(escape[1], 16)), line) for line in lines]
+        return [line.split(" ") for line in plain]
 
     def stored(self):
         """What the store holds: name and bytes."""
@@ -148,10 +186,10 @@ class NginxStore:
 
 
 class SwiftStore(NginxStore):
-    """Swift with its S3 layer behind nginx."""
+    """Swift with its S3 layer behind nginx. use_bucket has to come first."""
 
     configuration = "nginx-s3.conf"
-    bucket, region, access_key, secret = "orlo-records", "eu-bench-1", "orlo:bench", "a-secret/of+the=test"
+    region, access_key, secret = "eu-bench-1", "orlo:bench", "a-secret/of+the=test"
 
     def start(self, extra):
         self.values |= {"SECRET": self.secret, "SUFFIX": os.urandom(8).hex()}
@@ -171,6 +209,10 @@ class SwiftStore(NginxStore):
                 self.servers.append(Server(int(pid)))
         assert len(self.servers) == len(starting), "one of Swift's servers did not start"
         super().start(extra)
+
+    def use_bucket(self, name):
+        """Makes a bucket, which is the store from now on."""
+        self.bucket = name
         self.s3("PUT")
 
     def s3(self, method, path=""):

@@ -90,19 +90,18 @@ bool Failure::mayPass() const {
     return std::find(std::begin(passing), std::end(passing), code_) != std::end(passing);
 }
 
-Url::Url(const std::string& text) : url_(curl_url()) {
-    if (text.find('\0') != std::string::npos)
-        throw Failure(CURLE_URL_MALFORMAT, curl_easy_strerror(CURLE_URL_MALFORMAT));
-    set(CURLUPART_URL, text, CURLU_NON_SUPPORT_SCHEME);
+Url::Url(std::string text) : text_(std::move(text)), url_(curl_url()) {
+    if (!url_ || text_.find('\0') != std::string::npos ||
+        curl_url_set(url_.get(), CURLUPART_URL, text_.c_str(), CURLU_NON_SUPPORT_SCHEME) != CURLUE_OK)
+        check(CURLE_URL_MALFORMAT);
 }
 
 Url Url::under(std::string_view path) const {
-    Url longer(curl_url_dup(url_.get()));
-    std::string whole = this->path();
-    while (whole.ends_with('/'))
-        whole.pop_back();
-    longer.set(CURLUPART_PATH, whole.append(path), 0);
-    return longer;
+    const std::size_t end = std::min(text_.find_first_of("?#"), text_.size());
+    std::string longer = text_.substr(0, end);
+    while (!path.empty() && longer.ends_with('/'))
+        longer.pop_back();
+    return Url(longer.append(path).append(text_, end));
 }
 
 std::string Url::part(CURLUPart which) const {
@@ -111,11 +110,6 @@ std::string Url::part(CURLUPart which) const {
         return {};
     const std::unique_ptr<char, decltype(&curl_free)> owner(text, curl_free);
     return text;
-}
-
-void Url::set(CURLUPart which, const std::string& text, unsigned flags) {
-    if (!url_ || curl_url_set(url_.get(), which, text.c_str(), flags) != CURLUE_OK)
-        throw Failure(CURLE_URL_MALFORMAT, curl_easy_strerror(CURLE_URL_MALFORMAT));
 }
 
 std::string proxyFor(const std::string& scheme, const Value& description) {

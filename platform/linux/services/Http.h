@@ -39,12 +39,12 @@ private:
 class Url {
 public:
     // Raises Failure for any other text.
-    explicit Url(const std::string& text);
+    explicit Url(std::string text);
 
     // The URL with `path`, which begins with a slash and is percent-encoded where it has to be, at the end of its own.
     Url under(std::string_view path) const;
 
-    std::string text() const { return part(CURLUPART_URL); }
+    const std::string& text() const { return text_; }
     std::string scheme() const { return part(CURLUPART_SCHEME); }
     std::string user() const { return part(CURLUPART_USER); }
     std::string path() const { return part(CURLUPART_PATH); }
@@ -53,10 +53,9 @@ private:
     struct Release {
         void operator()(CURLU* url) const { curl_url_cleanup(url); }
     };
-    explicit Url(CURLU* url) : url_(url) {}
     std::string part(CURLUPart which) const;
-    void set(CURLUPart which, const std::string& text, unsigned flags);
 
+    std::string text_; // as given: libcurl would change the case of what is percent-encoded, which a signature covers
     std::unique_ptr<CURLU, Release> url_;
 };
 

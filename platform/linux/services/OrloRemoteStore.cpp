@@ -263,7 +263,7 @@ private:
         try {
             const http::Url url = http::Url(server).under(path);
             if (!url.user().empty())
-                throw http::Failure(CURLE_URL_MALFORMAT, "The URL names a user");
+                throw OrloStoreFailure(QDOrloErrorTransport, "A server's URL has to do without user and password");
             request.url = url.text();
             request.proxy = proxyFor(options, url);
             request.limits = {.whole = std::chrono::seconds(timeoutSeconds.in(options))};
