@@ -1,0 +1,187 @@
+// What the remote store costs on top of HTTPS: puts and gets of records in one session of the data-store library,
+// beside the curl command line with as many requests on one connection, both to the same nginx on loopback. Either
+// makes its connection anew for each run, and the session fetches the trust object first.
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <optional>
+#include <string>
+
+#include <benchmark/benchmark.h>
+
+#include "platform/OrloDataStore.h"
+#include "platform/linux/system/Json.h"
+
+namespace {
+
+constexpr int requests = 500;
+constexpr const char* host = "https://orlo-ds.tevari.example:8443";
+
+[[noreturn]] void fail(const char* what) {
+    std::fprintf(stderr, "bench-remote-store: %s\n", what);
+    std::exit(EXIT_FAILURE);
+}
+
+void require(bool holds, const char* what) {
+    if (!holds)
+        fail(what);
+}
+
+// The folder of this run: "store" is the server's, "device" the device root.
+std::filesystem::path folder;
+
+// nginx as the store; it ends with this object, which closes its standard input.
+class Server {
+public:
+    Server() {
+        for (const char* part : {"store", "device/etc/veltra"})
+            std::filesystem::create_directories(folder / part);
+        const std::string announcement = folder / "announcement";
+        require(std::system(("mkfifo " + announcement).c_str()) == 0, "no FIFO");
+        const std::string command =
+            "tests/service/stores.py " + (folder / "store").string() + " " + (folder / "device").string();
+        process_ = popen(("exec python3 " + command + " >" + announcement).c_str(), "w");
+        std::string line;
+        std::getline(std::ifstream(announcement), line);
+        description_ = jsonToValue(line).value_or(Value());
+        require(description_.dictionary(), "no server");
+        std::ofstream(folder / "device/etc/veltra/device.json") << R"({"store": )" << line << "}";
+    }
+    ~Server() { pclose(process_); }
+    Server(const Server&) = delete;
+    Server& operator=(const Server&) = delete;
+
+    // What leads curl to the server.
+    std::string curlOptions() const {
+        std::string options = "--cacert " + (folder / "store/ca.pem").string();
+        for (const auto& [from, to] : *description_["connectTo"].dictionary())
+            options += " --connect-to " + from + ":" + *to.text();
+        return options;
+    }
+
+private:
+    std::FILE* process_;
+    Value description_;
+};
+
+std::string instance(int number) {
+    return "B" + std::to_string(number);
+}
+
+class Session {
+public:
+    Session() : session_(QDOrloCreateWithOptions(options())) {
+        Value::Data object;
+        require(
+            QDOrloDataCopyTrustObject(session_, "http://orlo-ca.tevari.example:8080/orlotrustobject", &object, nullptr),
+            "no trust object");
+        digest_.resize(32);
+        QDSupportDigestSha256(object.data(), static_cast<std::uint32_t>(object.size()), digest_.data());
+        QDOrloSetOption(session_, "TrustObjectDigest", digest_);
+    }
+    ~Session() { QDSupportSafeRelease(session_); }
+    Session(const Session&) = delete;
+    Session& operator=(const Session&) = delete;
+
+    std::string digest() const { return *QDOrloCreateInstanceString(digest_).text(); }
+
+    void put(int number, const Value::Data& record) {
+        permit(OrloActionPut, number);
+        require(QDOrloDataPut(session_, "psd2", instance(number), record, nullptr), "put");
+    }
+
+    Value::Data get(int number) {
+        permit(OrloActionGet, number);
+        auto record = QDOrloDataCopy(session_, "psd2", instance(number), nullptr);
+        require(record.has_value(), "get");
+        return std::move(*record);
+    }
+
+private:
+    static Value options() {
+        return Value::Dictionary{{"APTicket", Value::Data{1}}, {"DataVersion", 1}, {"DSURL", host}};
+    }
+
+    void permit(OrloAction action, int number) {
+        QDOrloSetOption(session_, "Permissions",
+                        QDOrloDataCreatePermissionsString(session_, action, "psd2", instance(number)));
+    }
+
+    __QDOrlo* session_;
+    Value::Data digest_;
+};
+
+void countRequests(benchmark::State& state) {
+    state.counters["ns_per_item"] = benchmark::Counter(static_cast<double>(state.iterations()) * requests * 1e-9,
+                                                       benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
+}
+
+Value::Data recordOf(const benchmark::State& state) {
+    return Value::Data(static_cast<std::size_t>(state.range(0)), 0xA5);
+}
+
+void putAll(const Value::Data& record) {
+    Session session;
+    for (int number = 1; number <= requests; ++number)
+        session.put(number, record);
+}
+
+void putWithSession(benchmark::State& state) {
+    for (auto step : state)
+        putAll(recordOf(state));
+    countRequests(state);
+}
+
+void getWithSession(benchmark::State& state) {
+    const Value::Data record = recordOf(state);
+    putAll(record);
+    for (auto step : state) {
+        Session session;
+        for (int number = 1; number <= requests; ++number)
+            require(session.get(number) == record, "a record has changed");
+    }
+    countRequests(state);
+}
+
+// Runs curl with `options` on the URLs of all records.
+void runCurl(benchmark::State& state, const Server& server, const std::string& options) {
+    const Value::Data record = recordOf(state);
+    const std::string file = folder / "record";
+    std::ofstream(file, std::ios::binary).write(reinterpret_cast<const char*>(record.data()), std::ssize(record));
+    putAll(record);
+    const std::string command = "exec curl --silent --fail --output /dev/null " + server.curlOptions() +
+                                " --header 'Orlo-Trust-Object-Digest: " + Session().digest() +
+                                "' --header 'Orlo-Permissions: 1:psd2:B' " + options + " '" + host +
+                                "/v1/records/psd2/B[1-" + std::to_string(requests) + "]'";
+    for (auto step : state)
+        require(std::system(command.c_str()) == 0, "curl");
+    countRequests(state);
+}
+
+} // namespace
+
+int main(int count, char** arguments) {
+    benchmark::Initialize(&count, arguments);
+    char name[] = "/tmp/veltra-bench-XXXXXX";
+    require(mkdtemp(name), "no temporary folder");
+    folder = name;
+    setenv("VELTRA_DEVICE_ROOT", (folder / "device").c_str(), 1);
+    {
+        const Server server;
+        benchmark::RegisterBenchmark("remote-put/veltra", putWithSession)->Arg(4096)->UseRealTime();
+        benchmark::RegisterBenchmark(
+            "remote-put/curl",
+            [&](benchmark::State& state) { runCurl(state, server, "--upload-file " + (folder / "record").string()); })
+            ->Arg(4096)
+            ->UseRealTime();
+        benchmark::RegisterBenchmark("remote-get/veltra", getWithSession)->Arg(4096)->UseRealTime();
+        benchmark::RegisterBenchmark("remote-get/curl", [&](benchmark::State& state) { runCurl(state, server, ""); })
+            ->Arg(4096)
+            ->UseRealTime();
+        benchmark::RunSpecifiedBenchmarks();
+    }
+    std::filesystem::remove_all(folder);
+    return 0;
+}
