@@ -2,14 +2,18 @@
 // beside the curl command line with as many requests on one connection, both to the same nginx on loopback. Either
 // makes its connection anew for each run, and the session fetches the trust object first.
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <optional>
+#include <iostream>
 #include <string>
+#include <vector>
 
 #include <benchmark/benchmark.h>
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include "platform/OrloDataStore.h"
 #include "platform/linux/system/Json.h"
@@ -19,14 +23,34 @@ namespace {
 constexpr int requests = 500;
 constexpr const char* host = "https://orlo-ds.tevari.example:8443";
 
-[[noreturn]] void fail(const char* what) {
-    std::fprintf(stderr, "bench-remote-store: %s\n", what);
+void require(bool holds, const char* what) {
+    if (holds)
+        return;
+    std::cerr << "bench-remote-store: " << what << '\n';
     std::exit(EXIT_FAILURE);
 }
 
-void require(bool holds, const char* what) {
-    if (!holds)
-        fail(what);
+// Starts a program with the ends of pipes, or -1, as its standard input and output.
+pid_t start(std::vector<std::string> words, int input, int output) {
+    std::vector<char*> arguments;
+    for (std::string& word : words)
+        arguments.push_back(word.data());
+    arguments.push_back(nullptr);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    if (input >= 0)
+        posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
+    if (output >= 0)
+        posix_spawn_file_actions_adddup2(&actions, output, STDOUT_FILENO);
+    pid_t pid = -1;
+    require(posix_spawnp(&pid, arguments[0], &actions, nullptr, arguments.data(), environ) == 0, "cannot start");
+    posix_spawn_file_actions_destroy(&actions);
+    return pid;
+}
+
+int exitStatusOf(pid_t pid) {
+    int status = -1;
+    return waitpid(pid, &status, 0) == pid && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
 // The folder of this run: "store" is the server's, "device" the device root.
@@ -38,31 +62,39 @@ public:
     Server() {
         for (const char* part : {"store", "device/etc/veltra"})
             std::filesystem::create_directories(folder / part);
-        const std::string announcement = folder / "announcement";
-        require(std::system(("mkfifo " + announcement).c_str()) == 0, "no FIFO");
-        const std::string command =
-            "tests/service/stores.py " + (folder / "store").string() + " " + (folder / "device").string();
-        process_ = popen(("exec python3 " + command + " >" + announcement).c_str(), "w");
-        std::string line;
-        std::getline(std::ifstream(announcement), line);
-        description_ = jsonToValue(line).value_or(Value());
+        int input[2], output[2];
+        require(pipe2(input, O_CLOEXEC) == 0 && pipe2(output, O_CLOEXEC) == 0, "no pipes");
+        process_ =
+            start({"python3", "tests/service/stores.py", folder / "store", folder / "device"}, input[0], output[1]);
+        close(input[0]);
+        close(output[1]);
+        input_ = input[1];
+        std::string announcement;
+        for (char c = 0; read(output[0], &c, 1) == 1 && c != '\n';)
+            announcement += c;
+        close(output[0]);
+        description_ = jsonToValue(announcement).value_or(Value());
         require(description_.dictionary(), "no server");
-        std::ofstream(folder / "device/etc/veltra/device.json") << R"({"store": )" << line << "}";
+        std::ofstream(folder / "device/etc/veltra/device.json") << R"({"store": )" << announcement << "}";
     }
-    ~Server() { pclose(process_); }
+    ~Server() {
+        close(input_);
+        exitStatusOf(process_);
+    }
     Server(const Server&) = delete;
     Server& operator=(const Server&) = delete;
 
     // What leads curl to the server.
-    std::string curlOptions() const {
-        std::string options = "--cacert " + (folder / "store/ca.pem").string();
+    std::vector<std::string> curlOptions() const {
+        std::vector<std::string> options = {"--cacert", folder / "store/ca.pem"};
         for (const auto& [from, to] : *description_["connectTo"].dictionary())
-            options += " --connect-to " + from + ":" + *to.text();
+            options.insert(options.end(), {"--connect-to", from + ":" + *to.text()});
         return options;
     }
 
 private:
-    std::FILE* process_;
+    pid_t process_;
+    int input_;
     Value description_;
 };
 
@@ -146,17 +178,25 @@ void getWithSession(benchmark::State& state) {
 }
 
 // Runs curl with `options` on the URLs of all records.
-void runCurl(benchmark::State& state, const Server& server, const std::string& options) {
+void runCurl(benchmark::State& state, const Server& server, const std::vector<std::string>& options) {
     const Value::Data record = recordOf(state);
-    const std::string file = folder / "record";
-    std::ofstream(file, std::ios::binary).write(reinterpret_cast<const char*>(record.data()), std::ssize(record));
+    std::ofstream(folder / "record", std::ios::binary)
+        .write(reinterpret_cast<const char*>(record.data()), std::ssize(record));
     putAll(record);
-    const std::string command = "exec curl --silent --fail --output /dev/null " + server.curlOptions() +
-                                " --header 'Orlo-Trust-Object-Digest: " + Session().digest() +
-                                "' --header 'Orlo-Permissions: 1:psd2:B' " + options + " '" + host +
-                                "/v1/records/psd2/B[1-" + std::to_string(requests) + "]'";
+    std::vector<std::string> command = {"curl",
+                                        "--silent",
+                                        "--fail",
+                                        "--output",
+                                        "/dev/null",
+                                        "--header",
+                                        "Orlo-Trust-Object-Digest: " + Session().digest(),
+                                        "--header",
+                                        "Orlo-Permissions: 1:psd2:B"};
+    const std::string urls = std::string(host) + "/v1/records/psd2/B[1-" + std::to_string(requests) + "]";
+    for (const auto& more : {server.curlOptions(), options, {urls}})
+        command.insert(command.end(), more.begin(), more.end());
     for (auto step : state)
-        require(std::system(command.c_str()) == 0, "curl");
+        require(exitStatusOf(start(command, -1, -1)) == 0, "curl");
     countRequests(state);
 }
 
@@ -171,13 +211,14 @@ int main(int count, char** arguments) {
     {
         const Server server;
         benchmark::RegisterBenchmark("remote-put/veltra", putWithSession)->Arg(4096)->UseRealTime();
-        benchmark::RegisterBenchmark(
-            "remote-put/curl",
-            [&](benchmark::State& state) { runCurl(state, server, "--upload-file " + (folder / "record").string()); })
+        benchmark::RegisterBenchmark("remote-put/curl",
+                                     [&](benchmark::State& state) {
+                                         runCurl(state, server, {"--upload-file", folder / "record"});
+                                     })
             ->Arg(4096)
             ->UseRealTime();
         benchmark::RegisterBenchmark("remote-get/veltra", getWithSession)->Arg(4096)->UseRealTime();
-        benchmark::RegisterBenchmark("remote-get/curl", [&](benchmark::State& state) { runCurl(state, server, ""); })
+        benchmark::RegisterBenchmark("remote-get/curl", [&](benchmark::State& state) { runCurl(state, server, {}); })
             ->Arg(4096)
             ->UseRealTime();
         benchmark::RunSpecifiedBenchmarks();

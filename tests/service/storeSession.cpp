@@ -3,7 +3,6 @@
 // environment's.
 //   ["open", OPTIONS]  ["trust", URL]  ["grant", CLASS, INSTANCE]  ["put", CLASS, INSTANCE, PATH]
 //   ["get", CLASS, INSTANCE, PATH]  ["export", [CLASS...], [INSTANCE...]]
-#include <cstdio>
 #include <iostream>
 #include <optional>
 #include <string>
@@ -86,7 +85,7 @@ private:
 } // namespace
 
 int main() {
-    QDOrloLogSetHandler([](void*, const char* message) { std::fprintf(stderr, "%s\n", message); });
+    QDOrloLogSetHandler([](void*, const char* message) { std::cerr << message << std::endl; });
     Session session;
     for (std::string line; std::getline(std::cin, line);) {
         const std::optional<Value> words = jsonToValue(line);

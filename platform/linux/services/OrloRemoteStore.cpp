@@ -22,10 +22,12 @@ using std::chrono::milliseconds;
 
 constexpr std::size_t largestRecord = std::size_t{64} << 20;
 constexpr std::size_t largestTrustObject = std::size_t{1} << 20;
+constexpr std::size_t largestReply = std::size_t{1} << 20; // to a put, where nothing in it matters
 
 // An object store's keys have at most 1024 bytes and servers take header lines of at most 8 KiB, unless told otherwise.
 constexpr std::size_t longestName = 512;
 constexpr std::size_t longestQuoted = 64;
+constexpr std::size_t longestReason = 64;
 constexpr std::size_t longestGrants = 8000;
 
 constexpr milliseconds firstRest{200};
@@ -78,14 +80,24 @@ std::string segmentOf(std::string_view name) {
     return percentEncoded(name, isUnreserved);
 }
 
-// The session's grants as a header's value: nothing in them breaks the line or is taken for blanks around it.
-std::string grantsHeader(const OrloOptions& options) {
+std::string hexadecimal(const std::uint8_t* bytes, std::size_t length) {
+    return *QDOrloCreateInstanceString(Value::Data(bytes, bytes + length)).text();
+}
+
+// The headers by which a server can decide. Of the grants nothing breaks the line or is taken for blanks around it;
+// where there are none there is no such header, since one without a value would be signed but not sent.
+std::vector<std::string> headersFor(const OrloOptions& options, const OrloStoreBackend::Digest& trusted) {
+    std::vector<std::string> headers = {"Orlo-Trust-Object-Digest: " + hexadecimal(trusted.data(), trusted.size())};
     const std::string* grants = optionOf(options, "Permissions").text();
-    const std::string encoded =
-        percentEncoded(grants ? *grants : std::string(), [](char c) { return isVisible(c) && c != '%'; });
-    if (encoded.size() > longestGrants)
+    if (!grants || grants->empty())
+        return headers;
+    std::string encoded;
+    if (grants->size() <= longestGrants)
+        encoded = percentEncoded(*grants, [](char c) { return isVisible(c) && c != '%'; });
+    if (encoded.empty() || encoded.size() > longestGrants)
         throw OrloStoreFailure(QDOrloErrorNotPermitted, "The session's grants do not fit into a request");
-    return "Orlo-Permissions: " + encoded;
+    headers.push_back("Orlo-Permissions: " + encoded);
+    return headers;
 }
 
 std::string utcTime(const char* how) {
@@ -94,10 +106,6 @@ std::string utcTime(const char* how) {
     char text[32];
     gmtime_r(&now, &parts);
     return {text, std::strftime(text, sizeof text, how, &parts)};
-}
-
-std::string hexadecimal(const std::uint8_t* bytes, std::size_t length) {
-    return *QDOrloCreateInstanceString(Value::Data(bytes, bytes + length)).text();
 }
 
 std::string randomName() {
@@ -128,10 +136,8 @@ std::string_view reasonIn(const http::Answer& answer) {
     if (at == text.npos)
         return {};
     const std::string_view rest = text.substr(at + open.size());
-    const auto isLetter = [](char c) { return isUnreserved(c); };
-    const auto end =
-        std::find_if_not(rest.begin(), rest.begin() + std::min<std::ptrdiff_t>(64, std::ssize(rest)), isLetter);
-    return rest.substr(0, static_cast<std::size_t>(end - rest.begin()));
+    const auto end = std::find_if_not(rest.begin(), rest.end(), isUnreserved);
+    return rest.substr(0, std::min(longestReason, static_cast<std::size_t>(end - rest.begin())));
 }
 
 [[noreturn]] void failToTransport(const char* method, const std::string& url, const std::string& reason) {
@@ -221,9 +227,8 @@ private:
             .method = method,
             .url = {},
             .limits = {},
-            .maximumAnswer = largestTrustObject,
-            .headers = {grantsHeader(options),
-                        "Orlo-Trust-Object-Digest: " + hexadecimal(trusted_->data(), trusted_->size())},
+            .maximumAnswer = largestReply,
+            .headers = headersFor(options, *trusted_),
             .signature = settings_.objectStore ? &settings_.objectStore->signature : nullptr,
         };
     }
