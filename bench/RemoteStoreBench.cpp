@@ -53,19 +53,18 @@ int exitStatusOf(pid_t pid) {
     return waitpid(pid, &status, 0) == pid && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-// The folder of this run: "store" is the server's, "device" the device root.
+// The folder of this run, which is the device root too.
 std::filesystem::path folder;
 
 // nginx as the store; it ends with this object, which closes its standard input.
 class Server {
 public:
     Server() {
-        for (const char* part : {"store", "device/etc/veltra"})
-            std::filesystem::create_directories(folder / part);
+        std::filesystem::create_directories(folder / "etc/veltra");
+        std::ofstream(folder / "etc/veltra/device.json") << "{}";
         int input[2], output[2];
         require(pipe2(input, O_CLOEXEC) == 0 && pipe2(output, O_CLOEXEC) == 0, "no pipes");
-        process_ =
-            start({"python3", "tests/service/stores.py", folder / "store", folder / "device"}, input[0], output[1]);
+        process_ = start({"examples/remote-store/lab.py", "nginx", folder}, input[0], output[1]);
         close(input[0]);
         close(output[1]);
         input_ = input[1];
@@ -75,7 +74,6 @@ public:
         close(output[0]);
         description_ = jsonToValue(announcement).value_or(Value());
         require(description_.dictionary(), "no server");
-        std::ofstream(folder / "device/etc/veltra/device.json") << R"({"store": )" << announcement << "}";
     }
     ~Server() {
         close(input_);
@@ -86,7 +84,7 @@ public:
 
     // What leads curl to the server.
     std::vector<std::string> curlOptions() const {
-        std::vector<std::string> options = {"--cacert", folder / "store/ca.pem"};
+        std::vector<std::string> options = {"--cacert", folder / "store-ca.pem"};
         for (const auto& [from, to] : *description_["connectTo"].dictionary())
             options.insert(options.end(), {"--connect-to", from + ":" + *to.text()});
         return options;
@@ -207,7 +205,7 @@ int main(int count, char** arguments) {
     char name[] = "/tmp/veltra-bench-XXXXXX";
     require(mkdtemp(name), "no temporary folder");
     folder = name;
-    setenv("VELTRA_DEVICE_ROOT", (folder / "device").c_str(), 1);
+    setenv("VELTRA_DEVICE_ROOT", folder.c_str(), 1);
     {
         const Server server;
         benchmark::RegisterBenchmark("remote-put/veltra", putWithSession)->Arg(4096)->UseRealTime();

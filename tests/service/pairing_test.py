@@ -9,8 +9,9 @@ import subprocess
 import tempfile
 import unittest
 
+from forward_proxy import ForwardProxy
 from harness import Service
-from stores import ForwardProxy, free_ports
+from lab import free_ports
 
 TICKET = "the ticket"
 PATCH = b"\x00patch\xff" * 1000
@@ -41,6 +42,7 @@ http {{
     }}
 }}
 """
+
 
 class Network:
     """nginx as the pairing server and tinyproxy as the way to it."""

@@ -11,9 +11,10 @@ import time
 import unittest
 import urllib.parse
 
+from forward_proxy import ForwardProxy
 from harness import BIN, Service
 from hostile_server import Cutter, HostileServer
-from stores import CA_HOST, HOST, TRUST_OBJECT, Authority, ForwardProxy, NginxStore, SwiftStore
+from lab import CA_HOST, HOST, TRUST_OBJECT, Authority, NginxStore, SwiftStore
 
 SUCCESS = (0, None, None)
 CLASSES = (

@@ -83,7 +83,7 @@ struct Request {
     Limits limits;
     std::size_t maximumAnswer; // octets in the body of an answer with status 2xx
     std::string proxy = {};    // a URL, empty for none
-    // "Name: value", without line break
+    // "Name: value", without line break; one without a value would be signed but not sent
     std::vector<std::string> headers = {};
     // What is sent as application/octet-stream; the octets have to outlive the exchange.
     std::optional<std::span<const std::uint8_t>> body = {};

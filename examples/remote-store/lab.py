@@ -1,7 +1,9 @@
-"""The stores of examples/remote-store on loopback: nginx alone, and nginx in front of Swift's S3 layer.
+#!/usr/bin/env python3
+"""lab.py nginx|swift DEVICE-ROOT: runs a store of this folder on loopback until its standard input ends or it is
+interrupted, with certificates of its own, and has the device use it.
 
-As a program, `stores.py FOLDER` starts nginx alone, prints in JSON what a device description needs, and stops when its
-standard input ends.
+It writes the entry "store" into the device's description, takes the proxy out of it, since the servers are on this
+computer, and prints the entry once they serve. What was stored is gone at the end. The tests use the classes.
 """
 import getpass
 import hashlib
@@ -19,10 +21,9 @@ import tempfile
 import urllib.parse
 import xml.etree.ElementTree
 
-SOURCE = pathlib.Path(__file__).resolve().parents[2]
-EXAMPLES = SOURCE / "examples/remote-store"
+HERE = pathlib.Path(__file__).resolve().parent
 HOST, CA_HOST = "orlo-ds.tevari.example", "orlo-ca.tevari.example"
-TRUST_OBJECT = b"the trust object of the test\n"
+TRUST_OBJECT = b"the trust object of the lab\n"
 
 
 def free_ports(count):
@@ -42,13 +43,13 @@ def openssl(*words):
 
 
 class Authority:
-    """A certificate authority of the test's own and what it certifies, in `folder`."""
+    """A certificate authority of the lab's own and what it certifies, in `folder`."""
 
     def __init__(self, folder):
         self.folder = folder
         self.certificate = folder / "ca.pem"
         openssl("req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-days", "2",
-                "-subj", "/CN=Authority of the test", "-keyout", folder / "ca.key", "-out", self.certificate)
+                "-subj", "/CN=Authority of the lab", "-keyout", folder / "ca.key", "-out", self.certificate)
 
     def certify(self, name, hosts=(HOST, CA_HOST), days=2):
         """Makes <name>.key and <name>.pem; a negative number of days makes a certificate that has expired."""
@@ -79,48 +80,14 @@ class Server:
         self.ended = None
 
 
-class ForwardProxy:
-    """tinyproxy on loopback, with further `lines` of configuration."""
-
-    def __init__(self, folder, *lines):
-        self.port, = free_ports(1)
-        configuration = folder / "tinyproxy.conf"
-        usual = (f"Port {self.port}", "Listen 127.0.0.1", "Allow 127.0.0.1", "LogLevel Info")
-        configuration.write_text("\n".join((*usual, *lines, "")))
-        self.process = subprocess.Popen(["tinyproxy", "-d", "-c", configuration], stdout=subprocess.PIPE,
-                                        stderr=subprocess.DEVNULL, text=True)
-        self.tunnels_until("Accepting connections")
-
-    def tunnels_until(self, sign):
-        """How many tunnels the log tells of before the line with `sign`."""
-        count = 0
-        for line in self.process.stdout:
-            if sign in line:
-                return count
-            count += ": CONNECT " in line
-        raise AssertionError("tinyproxy has ended")
-
-    def tunnels(self):
-        """How many tunnels were asked for since the last call. A request of this one marks the place in the log."""
-        with socket.create_connection(("127.0.0.1", self.port)) as marker:
-            marker.sendall(b"CONNECT 127.0.0.1:1 HTTP/1.0\r\n\r\n")
-            marker.recv(1000)
-        return self.tunnels_until(": CONNECT 127.0.0.1:1 ")
-
-    def close(self):
-        if self.process.poll() is None:
-            self.process.terminate()
-            self.process.communicate()
-
-
 class NginxStore:
     """nginx as the store and as the server of the trust object. `extra` goes into the server of the store, `certificate`
     to Authority.certify."""
 
     configuration = "nginx-store.conf"
 
-    def __init__(self, folder=None, extra="", **certificate):
-        self.folder = folder or pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
+    def __init__(self, extra="", **certificate):
+        self.folder = pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
         self.store_port, self.ca_port, *ports = free_ports(7)
         names = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
         self.values = {
@@ -143,7 +110,7 @@ class NginxStore:
         if extra:
             text = configuration.read_text()
             configuration.write_text(text.replace("        root ", extra + "        root "))
-        # nginx goes to the background once it listens. Its worker writes the records as the user of the test.
+        # nginx goes to the background once it listens. Its worker writes the records as the user of the lab.
         as_user = ["-g", "user root;"] if os.geteuid() == 0 else []
         subprocess.run(["/usr/sbin/nginx", *as_user, "-c", configuration], check=True, stderr=subprocess.DEVNULL)
         self.nginx = Server(int((self.folder / "nginx.pid").read_text()))
@@ -151,7 +118,7 @@ class NginxStore:
 
     def configure(self, name):
         """A copy of a file of the example with its places filled in."""
-        text = (EXAMPLES / name).read_text()
+        text = (HERE / name).read_text()
         for place, value in self.values.items():
             text = text.replace(f"@{place}@", str(value))
         path = self.folder / name
@@ -186,10 +153,10 @@ class NginxStore:
 
 
 class SwiftStore(NginxStore):
-    """Swift with its S3 layer behind nginx. use_bucket has to come first."""
+    """Swift with its S3 layer behind nginx."""
 
     configuration = "nginx-s3.conf"
-    region, access_key, secret = "eu-bench-1", "orlo:bench", "a-secret/of+the=test"
+    region, access_key, secret = "eu-bench-1", "orlo:bench", "a-secret/of+the=lab"
 
     def start(self, extra):
         self.values |= {"SECRET": self.secret, "SUFFIX": os.urandom(8).hex()}
@@ -197,9 +164,9 @@ class SwiftStore(NginxStore):
         for folder in ("devices/d1", "recon"):
             (self.folder / folder).mkdir(parents=True)
         self.configure("swift.conf")
-        subprocess.run([str(word) for word in (EXAMPLES / "swift-rings", self.folder, *ports)], check=True)
+        subprocess.run([str(word) for word in (HERE / "swift-rings", self.folder, *ports)], check=True)
         starting = [
-            subprocess.Popen([SOURCE / "scripts/start-service", EXAMPLES / "swift-server", kind,
+            subprocess.Popen([HERE.parents[1] / "scripts/start-service", HERE / "swift-server", kind,
                               self.configure(f"swift-{kind}.conf")], stdout=subprocess.PIPE, text=True)
             for kind in ("account", "container", "object", "proxy")
         ]
@@ -209,6 +176,7 @@ class SwiftStore(NginxStore):
                 self.servers.append(Server(int(pid)))
         assert len(self.servers) == len(starting), "one of Swift's servers did not start"
         super().start(extra)
+        self.use_bucket("orlo-records")
 
     def use_bucket(self, name):
         """Makes a bucket, which is the store from now on."""
@@ -236,8 +204,25 @@ class SwiftStore(NginxStore):
         return {name: self.s3("GET", "/" + urllib.parse.quote(name, safe="/~")) for name in names}
 
 
+def main(kind, root):
+    root = pathlib.Path(root)
+    store = {"nginx": NginxStore, "swift": SwiftStore}[kind]()
+    try:
+        path = root / "etc/veltra/device.json"
+        description = json.loads(path.read_text())
+        description["store"] = store.describe(root)
+        description.get("reverseProxy", {}).pop("proxy", None)
+        path.write_text(json.dumps(description, indent=2) + "\n")
+        print(json.dumps(description["store"]), flush=True)
+        sys.stdin.read()
+    except KeyboardInterrupt:
+        pass
+    finally:
+        signal.signal(signal.SIGINT, signal.SIG_IGN)
+        store.close()
+
+
 if __name__ == "__main__":
-    store = NginxStore(pathlib.Path(sys.argv[1]))
-    print(json.dumps(store.describe(pathlib.Path(sys.argv[2]))), flush=True)
-    sys.stdin.read()
-    store.close()
+    if len(sys.argv) != 3 or sys.argv[1] not in ("nginx", "swift"):
+        sys.exit("usage: lab.py nginx|swift DEVICE-ROOT")
+    main(*sys.argv[1:])
