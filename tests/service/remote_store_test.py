@@ -12,14 +12,14 @@ import unittest
 import urllib.parse
 
 from forward_proxy import ForwardProxy
-from harness import BIN, Service
+from harness import BIN, HONEST_MEMORY, Service
 from hostile_server import Cutter, HostileServer
 from lab import CA_HOST, HOST, TRUST_OBJECT, Authority, NginxStore, SwiftStore
 
 SUCCESS = (0, None, None)
 CLASSES = (
-    "pfcl HmCl IfCl CtCl GpC2 tcrt dCfg bCfg ycrt AlsH PxTC pspc FCCl pcic pcii pcvc pcvi pcve pbas pmpc pdcl prf1 prf2 "
-    "psd1 psd2 pwcl psnv psdt preg"
+    "pfcl HmCl IfCl CtCl GpC2 tcrt dCfg bCfg ycrt AlsH PxTC pspc FCCl pcic pcii pcvc pcvi pcve pbas pmpc pdcl prf1 "
+    "prf2 psd1 psd2 pwcl psnv psdt preg"
 ).split()
 NOT_PERMITTED, NO_SUCH_RECORD, TRANSPORT, STORAGE = 1, 3, 4, 5
 DATA_STORE, TRUST_URL = f"https://{HOST}:8443", f"http://{CA_HOST}:8080/orlotrustobject"
@@ -36,8 +36,9 @@ class Session:
         # A proxy of the environment has no say.
         dead = {name: "http://127.0.0.1:1" for name in ("http_proxy", "https_proxy", "HTTPS_PROXY", "ALL_PROXY")}
         self.process = subprocess.Popen(
-            [BIN / "store-session"], stdin=subprocess.PIPE, stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, text=True,
-            env={**os.environ, **dead, "VELTRA_DEVICE_ROOT": str(self.root)},
+            [BIN / "store-session"], text=True, stdin=subprocess.PIPE, stdout=subprocess.PIPE,
+            stderr=subprocess.DEVNULL,
+            env={**os.environ, **dead, **HONEST_MEMORY, "VELTRA_DEVICE_ROOT": str(self.root)},
         )
         self.open(**options)
 
@@ -245,7 +246,8 @@ class PlainStore(RemoteTest, StoreCases):
                                                f"--> PUT {DATA_STORE}/v1/exports/.*\\.json: HTTP status 403$")
         self.store.nginx.stop()
         reason = f"Trust Object Copy from Server failed with Reason --> GET {TRUST_URL}: Failed to connect to "
-        for words, prefix, code in ((["get-psd2", "/tmp/out"], " ", 1008), (["export"], "Orlo Export Failed due to - ", 2007)):
+        for words, prefix, code in ((["get-psd2", "/tmp/out"], " ", 1008),
+                                    (["export"], "Orlo Export Failed due to - ", 2007)):
             error = self.answer(*words)[2]
             self.assertEqual((error["code"], error["description"].startswith(prefix + reason)), (code, True), error)
         self.assertEqual(self.store.stored(), {"v2/records/psd2/VAN0001": b"record"})
@@ -380,7 +382,7 @@ class Failures(RemoteTest):
                 "connectTo": {f"{HOST}:8443": here, f"{CA_HOST}:8443": here}}
 
     def test_each_misbehaviour_is_an_error_with_its_reason(self):
-        session = self.session(HTTPTimeout=1, HTTPMaxAttempts=1)
+        hasty, patient = self.session(HTTPTimeout=1), self.session(HTTPTimeout=60)
         both = (
             ("status-401", NOT_PERMITTED, "HTTP status 401"),
             ("status-403-AccessDenied", NOT_PERMITTED, "HTTP status 403 AccessDenied"),
@@ -409,6 +411,7 @@ class Failures(RemoteTest):
         for verb, behaviour, code, reason in rows:
             with self.subTest((verb, behaviour)):
                 begin = time.monotonic()
+                session = hasty if reason == "timed out" else patient
                 if verb == "get":
                     result, text = session.get(behaviour)
                 else:
@@ -417,10 +420,10 @@ class Failures(RemoteTest):
                 name = urllib.parse.quote(behaviour, safe="")
                 self.assertTrue(text.startswith(f"{verb.upper()} {DATA_STORE}/v1/records/psd2/{name}: "), text)
                 self.assertIn(reason, text)
-                self.assertLess(time.monotonic() - begin, 5)
+                self.assertLess(time.monotonic() - begin, 30)
         self.assertEqual({path for _, path in self.server.seen if path.endswith("plain")}, set(), "was redirected")
-        self.assertEqual(session.get("plain"), (0, ""))
-        self.assertLess(session.peak_megabytes(), 200)
+        self.assertEqual((hasty.get("plain"), patient.get("plain")), ((0, ""), (0, "")))
+        self.assertLess(patient.peak_megabytes(), 200)
 
     def test_only_what_may_pass_is_tried_again_and_only_so_often(self):
         rows = (
@@ -464,7 +467,7 @@ class Failures(RemoteTest):
 
     def test_the_trust_object_is_checked_before_anything_is_sent(self):
         url = f"https://{CA_HOST}:8443/"
-        session = self.session(HTTPTimeout=1)
+        session = self.session(HTTPTimeout=3)
         for behaviour, code in (("orlotrustobject", 0), ("status-404", TRANSPORT), ("status-200-x", 0),
                                 ("status-403", TRANSPORT), ("endless", TRANSPORT), ("stall", TRANSPORT)):
             self.assertEqual(session.run("trust", url + behaviour)[0], code, behaviour)
