@@ -33,6 +33,7 @@ void require(bool holds, const char* what) {
 // Starts a program with the ends of pipes, or -1, as its standard input and output.
 pid_t start(std::vector<std::string> words, int input, int output) {
     std::vector<char*> arguments;
+    arguments.reserve(words.size() + 1);
     for (std::string& word : words)
         arguments.push_back(word.data());
     arguments.push_back(nullptr);
