@@ -28,7 +28,7 @@
 #include "platform/Value.h"
 
 enum QDOrloErrorCode : std::int64_t {
-    QDOrloErrorNotPermitted = 1,        // no grant for the operation
+    QDOrloErrorNotPermitted = 1,        // no grant for the operation, or the server refuses it (HTTP status 401, 403)
     QDOrloErrorTrustObjectMismatch = 2, // no digest, or not that of the store's trust object
     QDOrloErrorNoSuchRecord = 3,
     QDOrloErrorTransport = 4, // a server could not be reached or did not do what it was asked for
@@ -56,9 +56,23 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler);
 // empty), "DataVersion" (an integer of 32 unsigned bits) and a store that can be opened. Unknown keys are kept and mean
 // nothing. Release it with QDSupportSafeRelease.
 //
-// On Linux the device description says which store: its "store" has "backend", of which there is "embedded" (the
-// default), and "path" (default "/var/lib/orlo/store.db"), the SQLite database below the device root. Folder and
-// database are made when they are missing. Records of different "DataVersion"s are different records.
+// On Linux the device description says which store: its "store" has "backend", "embedded" (the default) or "remote".
+// Records of different "DataVersion"s are different records.
+//
+// An embedded store is an SQLite database below the device root, "path" of the description's "store" (default
+// "/var/lib/orlo/store.db"). Folder and database are made when they are missing.
+//
+// A remote store is a server, or an S3-compatible object store when the description's "store" has "s3". How the servers
+// are reached stands there too: see platform/linux/services/OrloRemoteSettings.h. These options count:
+//   "DSURL"                    https URL of the server of records and exports
+//   "CAURL"                    https URL whose "/orlotrustobject" is asked when the trust object has not been fetched
+//   "EnableProxy"              true: http URLs are fetched through the device's proxy (ReverseProxy.h), if there is one
+//   "EnableProxySsl"           "ForHttps": if "EnableProxy" is true, so are https URLs
+//   "HTTPTimeout"              how many seconds an attempt may take: 1 to 3600, usually 30
+//   "HTTPMaxAttempts"          how often the trust object is asked for, and a record put or got: 1 to 10, usually once
+//   "MultiRequestMaxAttempts"  the same for an export
+// A larger number counts as the largest, and what is no number of 1 or more as the usual one. What is tried again are
+// failures of the network and answers with a status from 500 on.
 __QDOrlo* QDOrloCreateWithOptions(const Value& options);
 
 // Sets or replaces one option of the session.
@@ -80,7 +94,10 @@ bool QDOrloDataCopyTrustObject(__QDOrlo* session, std::string_view url, Value::D
                                std::optional<Error>* error);
 
 // Stores `data` as the record, in place of one that is there. After success the record outlasts a crash and a power
-// cut; after failure the store is as it was.
+// cut, as far as a remote store keeps its word. After failure the store is as it was, with one exception: when the
+// answer of a server got lost (QDOrloErrorTransport) it may have stored the record, as a whole, and putting it again
+// does no harm. A remote store takes no record of more than 64 MiB, nor one whose class or instance is "." or "..", has
+// a slash or a NUL in it, or more than 512 bytes (QDOrloErrorStorage).
 bool QDOrloDataPut(__QDOrlo* session, const Value& dataClass, const Value& dataInstance, const Value::Data& data,
                    std::optional<Error>* error);
 

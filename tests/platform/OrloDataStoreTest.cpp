@@ -275,6 +275,63 @@ TEST_F(OrloDataStore, makesNoSessionWithoutATicketOrAUsableStore) {
     EXPECT_EQ(root_.contents().count("/new/folder/my.db"), 1U);
 }
 
+TEST_F(OrloDataStore, makesNoSessionForARemoteStoreThatIsDescribedBadly) {
+    root_.write("/key", "id\nsecret\r\n\n");
+    root_.write("/open", "id\nsecret\n");
+    root_.write("/short", "id\n");
+    root_.write("/blank", "id\nsec ret\n");
+    root_.write("/long", "id\nsecret\nmore\n");
+    root_.write("/huge", std::string(5000, 'x'));
+    root_.write("/text", "-----BEGIN CERTIFICATE-----\nAAAA\n-----END CERTIFICATE-----\n");
+    for (const char* file : {"/key", "/short", "/blank", "/long", "/huge"})
+        std::filesystem::permissions(root_.host(file), std::filesystem::perms(0600));
+    std::filesystem::permissions(root_.host("/open"), std::filesystem::perms(0640));
+    const struct {
+        const char* store; // what stands in it beside the backend
+        const char* reason;
+    } rows[] = {
+        {R"("caFile": 7)", "caFile 7 cannot be read"},
+        {R"("caFile": "/missing")", "caFile /missing cannot be read"},
+        {R"("caFile": "/")", "caFile / cannot be read"},
+        {R"("caFile": "/text")", "caFile /text holds no PEM certificate"},
+        {R"("connectTo": [])", "connectTo is no object"},
+        {R"("connectTo": {"a:1": 7})", "a:1 to 7"},
+        {R"("connectTo": {"a": "b:1"})", "a to b:1"},
+        {R"("connectTo": {":1": "b:1"})", "connectTo"},
+        {R"("connectTo": {"a:1": "b:0"})", "connectTo"},
+        {R"("connectTo": {"a:1": "b:65536"})", "connectTo"},
+        {R"("connectTo": {"a:1": "b:1x"})", "connectTo"},
+        {R"("connectTo": {"a:1": "b:"})", "connectTo"},
+        {R"("connectTo": {"a:1": "b:c:1"})", "connectTo"},
+        {R"("connectTo": {"a:1": "[::1:1"})", "connectTo"},
+        {R"("connectTo": {"a:1:b": "b:1"})", "connectTo"},
+        {R"("s3": "bucket")", "region"},
+        {R"("s3": {"region": "eu:s3", "bucket": "b", "accessKeyFile": "/key"})", "region"},
+        {R"("s3": {"region": "eu", "accessKeyFile": "/key"})", "bucket"},
+        {R"("s3": {"region": "eu", "bucket": "a/b", "accessKeyFile": "/key"})", "bucket"},
+        {R"("s3": {"region": "eu", "bucket": "..", "accessKeyFile": "/key"})", "bucket"},
+        {R"("s3": {"region": "eu", "bucket": "b"})", "accessKeyFile"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/missing"})", "/missing cannot be read"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/open"})", "mode 0600"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/short"})", "two lines"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/blank"})", "two lines"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/long"})", "two lines"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/huge"})", "cannot be read"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.store);
+        describeStore(std::string(R"({"backend": "remote", )") + row.store + "}");
+        logged().clear();
+        EXPECT_EQ(open(), nullptr);
+        ASSERT_EQ(logged().size(), 1U);
+        EXPECT_NE(logged()[0].find(row.reason), std::string::npos) << logged()[0];
+        EXPECT_EQ(logged()[0].find("sec ret"), std::string::npos);
+    }
+    describeStore(R"({"backend": "remote", "connectTo": {"a-1.example:1": "[::1]:65535"},
+                      "s3": {"region": "eu-1", "bucket": "a.b_c-d", "accessKeyFile": "/key"}})");
+    EXPECT_NE(open(), nullptr);
+}
+
 TEST_F(OrloDataStore, neverFollowsALinkBesideTheDatabase) {
     const std::filesystem::path victim = root_.around() / "victim";
     for (const char* suffix : {"", "-wal", "-shm", ".trust"}) {

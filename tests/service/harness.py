@@ -12,6 +12,8 @@ import tempfile
 SOURCE = pathlib.Path(__file__).resolve().parents[2]
 BIN = pathlib.Path(os.environ["VELTRA_BIN"])
 NAME = "com.tevari.VeltraOrloServices"
+# The sanitizer keeps freed memory aside, which would hide what a test of memory looks for.
+HONEST_MEMORY = {"ASAN_OPTIONS": "detect_leaks=1:quarantine_size_mb=1:thread_local_quarantine_size_kb=64"}
 LOG = f"private/var/log/{NAME}.log"
 
 # A service that start-service leaves behind becomes a child of the tests, which can then tell how it ended.
@@ -49,8 +51,7 @@ class Service:
             "VELTRA_DEVICE_ROOT": str(self.root),
             "VELTRA_BUS": self.bus.address,
             "DBUS_SESSION_BUS_ADDRESS": self.bus.address,
-            # The sanitizer keeps freed memory aside, which would hide what a test of memory looks for.
-            "ASAN_OPTIONS": "detect_leaks=1:quarantine_size_mb=1:thread_local_quarantine_size_kb=64",
+            **HONEST_MEMORY,
         }
         self.start()
 

@@ -5,12 +5,13 @@ import pathlib
 import select
 import shutil
 import signal
-import socket
 import subprocess
 import tempfile
 import unittest
 
+from forward_proxy import ForwardProxy
 from harness import BIN, Service
+from lab import free_ports
 
 TICKET = "the ticket"
 PATCH = b"\x00patch\xff" * 1000
@@ -42,20 +43,6 @@ http {{
 }}
 """
 
-TINYPROXY = """
-Port {port}
-Listen 127.0.0.1
-Allow 127.0.0.1
-ConnectPort {https}
-LogLevel Info
-"""
-
-
-def free_port():
-    with socket.socket() as probe:
-        probe.bind(("127.0.0.1", 0))
-        return probe.getsockname()[1]
-
 
 class Network:
     """nginx as the pairing server and tinyproxy as the way to it."""
@@ -63,7 +50,7 @@ class Network:
     def __init__(self):
         self.folder = pathlib.Path(tempfile.mkdtemp(prefix="veltra-net-"))
         self.folder.chmod(0o755)  # nginx's worker runs as another user
-        self.http, self.https, self.port = free_port(), free_port(), free_port()
+        self.http, self.https = free_ports(2)
         subprocess.run(
             ["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-subj", "/CN=127.0.0.1", "-keyout",
              self.folder / "key.pem", "-out", self.folder / "cert.pem"], check=True, stderr=subprocess.DEVNULL,
@@ -75,20 +62,11 @@ class Network:
         # nginx goes to the background once it listens.
         subprocess.run(["/usr/sbin/nginx", "-c", self.folder / "nginx.conf"], check=True, stderr=subprocess.DEVNULL)
         self.server = os.pidfd_open(int((self.folder / "nginx.pid").read_text()))
-        self.configure("tinyproxy.conf", TINYPROXY)
-        self.proxy = subprocess.Popen(["tinyproxy", "-d", "-c", self.folder / "tinyproxy.conf"], stdout=subprocess.PIPE,
-                                      stderr=subprocess.DEVNULL, text=True)
-        while "Accepting connections" not in self.proxy.stdout.readline():
-            assert self.proxy.poll() is None, "tinyproxy did not start"
+        self.proxy = ForwardProxy(self.folder, f"ConnectPort {self.https}")
 
     def configure(self, name, text):
-        values = {"folder": self.folder, "http": self.http, "https": self.https, "port": self.port, "ticket": TICKET}
+        values = {"folder": self.folder, "http": self.http, "https": self.https, "ticket": TICKET}
         (self.folder / name).write_text(text.format(**values))
-
-    def stop_proxy(self):
-        if self.proxy.poll() is None:
-            self.proxy.terminate()
-            self.proxy.communicate()
 
     def posts(self):
         """Ends the server and tells which requests it had: method, path, body, and whether the proxy passed them on."""
@@ -110,7 +88,7 @@ class Network:
 
     def close(self):
         self.stop_server()
-        self.stop_proxy()
+        self.proxy.close()
         shutil.rmtree(self.folder)
 
 
@@ -138,7 +116,7 @@ class Pairing(unittest.TestCase):
     def describe(self, status=1, fail=None, **proxy):
         settings = {}
         for scheme in ("HTTP", "HTTPS"):
-            settings |= {scheme + "Enable": 1, scheme + "Proxy": "127.0.0.1", scheme + "Port": self.network.port}
+            settings |= {scheme + "Enable": 1, scheme + "Proxy": "127.0.0.1", scheme + "Port": self.network.proxy.port}
         description = {
             "answers": {"HWModelStr": "M12x"},
             "reverseProxy": {"events": [{"status": status, "afterMs": 0}], "proxy": settings | proxy},
@@ -181,7 +159,7 @@ class Pairing(unittest.TestCase):
             error = self.fails("provision", "http://a b")
             self.assertEqual(error, {"domain": "CorvoSCErrorDomain", "code": 500,
                                      "description": "Wafton URL not a valid URL:http://a b"})
-        self.network.stop_proxy()
+        self.network.proxy.close()
         with self.subTest("no proxy where the description says that there is one"):
             self.describe()
             self.assertEqual(self.fails("provision", self.url("corvo"))["code"], 7)

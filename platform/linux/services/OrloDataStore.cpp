@@ -35,6 +35,7 @@ constexpr struct {
     std::unique_ptr<OrloStoreBackend> (*open)(const Value& store);
 } backends[] = {
     {"embedded", openEmbeddedStore},
+    {"remote", openRemoteStore},
 };
 
 void libraryLog(std::string_view text) {
@@ -44,12 +45,6 @@ void libraryLog(std::string_view text) {
     std::string line;
     utf8::appendOnOneLine(line, text);
     handler(nullptr, line.c_str());
-}
-
-const Value& optionOf(const OrloOptions& options, std::string_view key) {
-    static const Value nothing;
-    const auto found = options.find(key);
-    return found == options.end() ? nothing : found->second;
 }
 
 bool isDataVersion(const Value& value) {

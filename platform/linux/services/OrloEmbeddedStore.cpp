@@ -26,18 +26,6 @@ INSERT INTO exports (data_version, ticket, exported_at) VALUES (?1, ?2, strftime
 constexpr const char* addExportPair =
     "INSERT INTO export_pairs (export_id, position, class, instance) VALUES (?1, ?2, ?3, ?4)";
 
-std::int64_t dataVersion(const OrloOptions& options) {
-    return *options.at("DataVersion").integer();
-}
-
-std::string ticketDigest(const OrloOptions& options) {
-    const Value::Data& ticket = *options.at("APTicket").data();
-    Value::Data digest(crypto::sha256Size);
-    if (!crypto::sha256(ticket.data(), ticket.size(), digest.data()))
-        throw OrloStoreFailure(QDOrloErrorStorage, "The AP ticket cannot be digested");
-    return *QDOrloCreateInstanceString(digest).text();
-}
-
 class EmbeddedStore : public OrloStoreBackend {
 public:
     EmbeddedStore(FileDescriptor directory, const std::string& name)
@@ -66,9 +54,9 @@ public:
     }
 
     void multiExport(const OrloOptions& options, const std::vector<OrloRecordName>& names) override {
-        const std::string ticket = ticketDigest(options);
+        const std::string ticket = ticketDigestOf(options);
         OrloTransaction transaction(database_);
-        OrloStatement(database_.handle(), addExport).bind(1, dataVersion(options)).bind(2, ticket).step();
+        OrloStatement(database_.handle(), addExport).bind(1, dataVersionOf(options)).bind(2, ticket).step();
         OrloStatement pair(database_.handle(), addExportPair);
         pair.bind(1, sqlite3_last_insert_rowid(database_.handle()));
         std::int64_t position = 0;
@@ -79,7 +67,7 @@ public:
 
 private:
     static OrloStatement& bindRecord(OrloStatement& statement, const OrloOptions& options, const OrloRecordName& name) {
-        return statement.bind(1, dataVersion(options)).bind(2, name.dataClass).bind(3, name.instance);
+        return statement.bind(1, dataVersionOf(options)).bind(2, name.dataClass).bind(3, name.instance);
     }
 
     // In this order: the database reaches its files through the directory, and the statements belong to it.

@@ -52,7 +52,19 @@ public:
     virtual void multiExport(const OrloOptions& options, const std::vector<OrloRecordName>& names) = 0;
 };
 
+// The option under `key`, or a value of nothing.
+const Value& optionOf(const OrloOptions& options, std::string_view key);
+
+// The data version and the SHA-256 of the AP ticket, in hexadecimal, of a session's options; the library has seen to it
+// that they are there. The second raises OrloStoreFailure.
+std::int64_t dataVersionOf(const OrloOptions& options);
+std::string ticketDigestOf(const OrloOptions& options);
+
 // A backend on the database that "path" of the description's "store" names.
 std::unique_ptr<OrloStoreBackend> openEmbeddedStore(const Value& store);
+
+// A backend on the servers that the session's options name, reached as "connectTo", "caFile" and "s3" of the
+// description's "store" say.
+std::unique_ptr<OrloStoreBackend> openRemoteStore(const Value& store);
 
 #endif

@@ -1,0 +1,228 @@
+#!/usr/bin/env python3
+"""lab.py nginx|swift DEVICE-ROOT: runs a store of this folder on loopback until its standard input ends or it is
+interrupted, with certificates of its own, and has the device use it.
+
+It writes the entry "store" into the device's description, takes the proxy out of it, since the servers are on this
+computer, and prints the entry once they serve. What was stored is gone at the end. The tests use the classes.
+"""
+import getpass
+import hashlib
+import json
+import os
+import pathlib
+import re
+import select
+import shutil
+import signal
+import socket
+import subprocess
+import sys
+import tempfile
+import urllib.parse
+import xml.etree.ElementTree
+
+HERE = pathlib.Path(__file__).resolve().parent
+HOST, CA_HOST = "orlo-ds.tevari.example", "orlo-ca.tevari.example"
+TRUST_OBJECT = b"the trust object of the lab\n"
+
+
+def free_ports(count):
+    """Ports that are all free at the same time."""
+    probes = [socket.socket() for _ in range(count)]
+    try:
+        for probe in probes:
+            probe.bind(("127.0.0.1", 0))
+        return [probe.getsockname()[1] for probe in probes]
+    finally:
+        for probe in probes:
+            probe.close()
+
+
+def openssl(*words):
+    subprocess.run(["openssl", *[str(word) for word in words]], check=True, stderr=subprocess.DEVNULL)
+
+
+class Authority:
+    """A certificate authority of the lab's own and what it certifies, in `folder`."""
+
+    def __init__(self, folder):
+        self.folder = folder
+        self.certificate = folder / "ca.pem"
+        openssl("req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-days", "2",
+                "-subj", "/CN=Authority of the lab", "-keyout", folder / "ca.key", "-out", self.certificate)
+
+    def certify(self, name, hosts=(HOST, CA_HOST), days=2):
+        """Makes <name>.key and <name>.pem; a negative number of days makes a certificate that has expired."""
+        key, request, certificate = (self.folder / f"{name}.{suffix}" for suffix in ("key", "csr", "pem"))
+        openssl("req", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-subj", "/CN=store",
+                "-addext", "subjectAltName=" + ",".join("DNS:" + host for host in hosts), "-keyout", key, "-out", request)
+        openssl("x509", "-req", "-in", request, "-CA", self.certificate, "-CAkey", self.folder / "ca.key",
+                "-CAcreateserial", "-copy_extensions", "copy", "-days", days, "-out", certificate)
+        return certificate, key
+
+
+class Server:
+    """A process that is not a child of this one."""
+
+    def __init__(self, pid):
+        self.pid = pid
+        self.ended = os.pidfd_open(pid)
+
+    def stop(self, how=signal.SIGTERM):
+        if self.ended is None:
+            return
+        try:
+            signal.pidfd_send_signal(self.ended, how)
+        except ProcessLookupError:
+            pass
+        select.select([self.ended], [], [])
+        os.close(self.ended)
+        self.ended = None
+
+
+class NginxStore:
+    """nginx as the store and as the server of the trust object. `extra` goes into the server of the store, `certificate`
+    to Authority.certify."""
+
+    configuration = "nginx-store.conf"
+
+    def __init__(self, extra="", **certificate):
+        self.folder = pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
+        self.store_port, self.ca_port, *ports = free_ports(7)
+        names = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
+        self.values = {
+            "FOLDER": self.folder, "STORE": self.store_port, "CA": self.ca_port, "USER": getpass.getuser(),
+            "DIGEST": hashlib.sha256(TRUST_OBJECT).hexdigest(), **dict(zip(names, ports)),
+        }
+        self.authority = Authority(self.folder)
+        self.authority.certify("store", **certificate)
+        (self.folder / "trust-object").write_bytes(TRUST_OBJECT)
+        (self.folder / "store").mkdir()
+        self.servers = []
+        try:
+            self.start(extra)
+        except BaseException:
+            self.close()
+            raise
+
+    def start(self, extra):
+        configuration = self.configure(self.configuration)
+        if extra:
+            text = configuration.read_text()
+            configuration.write_text(text.replace("        root ", extra + "        root "))
+        # nginx goes to the background once it listens. Its worker writes the records as the user of the lab.
+        as_user = ["-g", "user root;"] if os.geteuid() == 0 else []
+        subprocess.run(["/usr/sbin/nginx", *as_user, "-c", configuration], check=True, stderr=subprocess.DEVNULL)
+        self.nginx = Server(int((self.folder / "nginx.pid").read_text()))
+        self.servers.append(self.nginx)
+
+    def configure(self, name):
+        """A copy of a file of the example with its places filled in."""
+        text = (HERE / name).read_text()
+        for place, value in self.values.items():
+            text = text.replace(f"@{place}@", str(value))
+        path = self.folder / name
+        path.write_text(text)
+        return path
+
+    def describe(self, root, **changes):
+        """The "store" of a device description; the files that it names are put below the device root `root`."""
+        shutil.copy(self.authority.certificate, root / "store-ca.pem")
+        return {
+            "backend": "remote", "caFile": "/store-ca.pem",
+            "connectTo": {f"{HOST}:8443": f"127.0.0.1:{self.store_port}",
+                          f"{CA_HOST}:8443": f"127.0.0.1:{self.store_port}",
+                          f"{CA_HOST}:8080": f"127.0.0.1:{self.ca_port}"}, **changes,
+        }
+
+    def requests(self):
+        """Method, path, status, grants and connection of each request so far."""
+        lines = (self.folder / "requests.log").read_text().splitlines()
+        plain = [re.sub(r"\\x([0-9A-F]{2})", lambda escape: chr(int(escape[1], 16)), line) for line in lines]
+        return [line.split(" ") for line in plain]
+
+    def stored(self):
+        """What the store holds: name and bytes."""
+        store = self.folder / "store"
+        return {str(path.relative_to(store)): path.read_bytes() for path in store.rglob("*") if path.is_file()}
+
+    def close(self):
+        for server in reversed(self.servers):
+            server.stop()
+        shutil.rmtree(self.folder)
+
+
+class SwiftStore(NginxStore):
+    """Swift with its S3 layer behind nginx."""
+
+    configuration = "nginx-s3.conf"
+    region, access_key, secret = "eu-bench-1", "orlo:bench", "a-secret/of+the=lab"
+
+    def start(self, extra):
+        self.values |= {"SECRET": self.secret, "SUFFIX": os.urandom(8).hex()}
+        ports = [self.values[kind] for kind in ("ACCOUNT", "CONTAINER", "OBJECT")]
+        for folder in ("devices/d1", "recon"):
+            (self.folder / folder).mkdir(parents=True)
+        self.configure("swift.conf")
+        subprocess.run([str(word) for word in (HERE / "swift-rings", self.folder, *ports)], check=True)
+        starting = [
+            subprocess.Popen([HERE.parents[1] / "scripts/start-service", HERE / "swift-server", kind,
+                              self.configure(f"swift-{kind}.conf")], stdout=subprocess.PIPE, text=True)
+            for kind in ("account", "container", "object", "proxy")
+        ]
+        for starter in starting:
+            pid = starter.communicate()[0]
+            if starter.returncode == 0:
+                self.servers.append(Server(int(pid)))
+        assert len(self.servers) == len(starting), "one of Swift's servers did not start"
+        super().start(extra)
+        self.use_bucket("orlo-records")
+
+    def use_bucket(self, name):
+        """Makes a bucket, which is the store from now on."""
+        self.bucket = name
+        self.s3("PUT")
+
+    def s3(self, method, path=""):
+        """The body of the answer to a signed request about the bucket, past nginx."""
+        user = ":".join(urllib.parse.quote(text, safe="") for text in (self.access_key, self.secret))
+        url = f"http://{user}@127.0.0.1:{self.values['PROXY']}/{self.bucket}{path}"
+        return subprocess.run(
+            ["curl", "-sSf", "-X", method, "--aws-sigv4", f"aws:amz:{self.region}:s3", "-H",
+             "x-amz-content-sha256: UNSIGNED-PAYLOAD", url], check=True, stdout=subprocess.PIPE,
+        ).stdout
+
+    def describe(self, root, **changes):
+        key_file = root / "store-key"
+        key_file.write_text(f"{self.access_key}\n{self.secret}\n")
+        key_file.chmod(0o600)
+        s3 = {"region": self.region, "bucket": self.bucket, "accessKeyFile": "/store-key"}
+        return super().describe(root, **{"s3": s3 | changes.pop("s3", {})}, **changes)
+
+    def stored(self):
+        names = [key.text for key in xml.etree.ElementTree.fromstring(self.s3("GET")).iterfind(".//{*}Key")]
+        return {name: self.s3("GET", "/" + urllib.parse.quote(name, safe="/~")) for name in names}
+
+
+def main(kind, root):
+    root = pathlib.Path(root)
+    store = {"nginx": NginxStore, "swift": SwiftStore}[kind]()
+    try:
+        path = root / "etc/veltra/device.json"
+        description = json.loads(path.read_text())
+        description["store"] = store.describe(root)
+        description.get("reverseProxy", {}).pop("proxy", None)
+        path.write_text(json.dumps(description, indent=2) + "\n")
+        print(json.dumps(description["store"]), flush=True)
+        sys.stdin.read()
+    except KeyboardInterrupt:
+        pass
+    finally:
+        signal.signal(signal.SIGINT, signal.SIG_IGN)
+        store.close()
+
+
+if __name__ == "__main__":
+    if len(sys.argv) != 3 or sys.argv[1] not in ("nginx", "swift"):
+        sys.exit("usage: lab.py nginx|swift DEVICE-ROOT")
+    main(*sys.argv[1:])

@@ -1,0 +1,231 @@
+#include "platform/linux/services/Http.h"
+
+#include <algorithm>
+#include <mutex>
+#include <new>
+#include <utility>
+
+#include "platform/Crypto.h"
+#include "platform/Format.h"
+#include "platform/Utf8.h"
+
+namespace http {
+namespace {
+
+// Of an answer that is no success only the beginning is of interest, and of no answer more headers than these.
+constexpr std::size_t maximumRefusal = std::size_t{16} << 10;
+constexpr std::size_t maximumHeaders = std::size_t{64} << 10;
+
+constexpr CURLcode passing[] = {
+    CURLE_COULDNT_RESOLVE_PROXY,
+    CURLE_COULDNT_RESOLVE_HOST,
+    CURLE_COULDNT_CONNECT,
+    CURLE_PARTIAL_FILE,
+    CURLE_OPERATION_TIMEDOUT,
+    CURLE_SSL_CONNECT_ERROR,
+    CURLE_GOT_NOTHING,
+    CURLE_SEND_ERROR,
+    CURLE_RECV_ERROR,
+    CURLE_HTTP2,
+    CURLE_HTTP2_STREAM,
+};
+
+void check(CURLcode result) {
+    if (result != CURLE_OK)
+        throw Failure(result, curl_easy_strerror(result));
+}
+
+// An answer while it comes in.
+struct Incoming {
+    CURL* handle;
+    std::size_t maximum;
+    Answer answer{};
+    std::size_t headers = 0;
+    bool isTooLarge = false;
+    bool hasTooManyHeaders = false;
+    bool isCut = false; // the rest of a refusal is of no interest
+};
+
+// libcurl calls these two through C, which no exception may cross.
+std::size_t receive(char* bytes, std::size_t, std::size_t count, void* context) try {
+    auto& incoming = *static_cast<Incoming*>(context);
+    Answer& answer = incoming.answer;
+    curl_easy_getinfo(incoming.handle, CURLINFO_RESPONSE_CODE, &answer.status);
+    const std::size_t maximum = answer.isSuccess() ? incoming.maximum : maximumRefusal;
+    std::size_t needed = answer.body.size() + count;
+    curl_off_t announced = 0;
+    if (answer.body.empty() &&
+        curl_easy_getinfo(incoming.handle, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &announced) == CURLE_OK && announced > 0)
+        needed = std::max(needed, static_cast<std::size_t>(announced));
+    incoming.isTooLarge = needed > maximum && answer.isSuccess();
+    if (incoming.isTooLarge)
+        return 0;
+    const std::size_t taken = std::min(count, maximum - answer.body.size());
+    if (answer.body.empty())
+        answer.body.reserve(std::min(needed, maximum));
+    answer.body.insert(answer.body.end(), bytes, bytes + taken);
+    incoming.isCut = taken < count;
+    return taken;
+} catch (const std::bad_alloc&) {
+    return 0;
+}
+
+std::size_t receiveHeader(char*, std::size_t, std::size_t count, void* context) {
+    auto& incoming = *static_cast<Incoming*>(context);
+    incoming.headers += count;
+    incoming.hasTooManyHeaders = incoming.headers > maximumHeaders;
+    return incoming.hasTooManyHeaders ? 0 : count;
+}
+
+std::string hexadecimal(const std::uint8_t (&digest)[crypto::sha256Size]) {
+    std::string text;
+    for (const std::uint8_t byte : digest)
+        text += format("%02x", byte);
+    return text;
+}
+
+} // namespace
+
+bool Failure::mayPass() const {
+    return std::find(std::begin(passing), std::end(passing), code_) != std::end(passing);
+}
+
+Url::Url(std::string text) : text_(std::move(text)), url_(curl_url()) {
+    if (!url_ || text_.find('\0') != std::string::npos ||
+        curl_url_set(url_.get(), CURLUPART_URL, text_.c_str(), CURLU_NON_SUPPORT_SCHEME) != CURLUE_OK)
+        check(CURLE_URL_MALFORMAT);
+}
+
+Url Url::under(std::string_view path) const {
+    const std::size_t end = std::min(text_.find_first_of("?#"), text_.size());
+    std::string longer = text_.substr(0, end);
+    while (!path.empty() && longer.ends_with('/'))
+        longer.pop_back();
+    return Url(longer.append(path).append(text_, end));
+}
+
+std::string Url::part(CURLUPart which) const {
+    char* text = nullptr;
+    if (curl_url_get(url_.get(), which, &text, 0) != CURLUE_OK)
+        return {};
+    const std::unique_ptr<char, decltype(&curl_free)> owner(text, curl_free);
+    return text;
+}
+
+std::string proxyFor(const std::string& scheme, const Value& description) {
+    const std::string prefix = scheme == "https" ? "HTTPS" : "HTTP";
+    if (!description[prefix + "Enable"].boolean().value_or(false))
+        return "";
+    const std::string* host = description[prefix + "Proxy"].text();
+    const auto port = description[prefix + "Port"].integer();
+    if (!host || host->empty() || !port || *port < 1 || *port > 65535)
+        throw Failure(CURLE_COULDNT_RESOLVE_PROXY, "The proxy description names no host and port");
+    const bool bare = host->find(':') != std::string::npos && !host->starts_with('['); // an IPv6 address
+    return "http://" + (bare ? "[" + *host + "]" : *host) + ":" + std::to_string(*port);
+}
+
+Client::Client() {
+    static std::once_flag once;
+    std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
+    handle_.reset(curl_easy_init());
+    if (!handle_)
+        check(CURLE_FAILED_INIT);
+}
+
+void Client::connectTo(const std::vector<std::string>& entries) {
+    connectTo_.reset();
+    for (const std::string& entry : entries)
+        append(connectTo_, entry);
+}
+
+Answer Client::exchange(const Request& request) {
+    // What was set for the exchange before is forgotten; connections, host names and TLS sessions are not.
+    curl_easy_reset(handle_.get());
+    headers_.reset();
+    problem_[0] = '\0';
+    configure(request);
+    Incoming incoming{.handle = handle_.get(), .maximum = request.maximumAnswer};
+    set(CURLOPT_WRITEFUNCTION, receive);
+    set(CURLOPT_WRITEDATA, &incoming);
+    set(CURLOPT_HEADERFUNCTION, receiveHeader);
+    set(CURLOPT_HEADERDATA, &incoming);
+    const CURLcode result = curl_easy_perform(handle_.get());
+    if (incoming.isTooLarge)
+        throw Failure(result, format("The answer is larger than %lu bytes", request.maximumAnswer));
+    if (incoming.hasTooManyHeaders)
+        throw Failure(result, "The answer has too many headers");
+    if (result != CURLE_OK && !incoming.isCut)
+        throw Failure(result, utf8::repaired(*problem_ ? problem_ : curl_easy_strerror(result)));
+    check(curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &incoming.answer.status));
+    return std::move(incoming.answer);
+}
+
+void Client::append(List& list, const std::string& text) {
+    curl_slist* longer = curl_slist_append(list.get(), text.c_str());
+    if (!longer)
+        check(CURLE_OUT_OF_MEMORY);
+    static_cast<void>(list.release()); // it is the head of the longer one
+    list.reset(longer);
+}
+
+template <class Setting>
+void Client::set(CURLoption option, Setting setting) {
+    check(curl_easy_setopt(handle_.get(), option, setting));
+}
+
+void Client::configure(const Request& request) {
+    set(CURLOPT_URL, request.url.c_str());
+    set(CURLOPT_PATH_AS_IS, 1L);
+    set(CURLOPT_PROTOCOLS_STR, "http,https");
+    set(CURLOPT_PROXY, request.proxy.c_str());
+    set(CURLOPT_NOPROXY, "");
+    set(CURLOPT_ERRORBUFFER, problem_);
+    set(CURLOPT_NOSIGNAL, 1L);
+    set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(request.limits.connecting.count()));
+    set(CURLOPT_TIMEOUT_MS, static_cast<long>(request.limits.whole.count()));
+    set(CURLOPT_LOW_SPEED_LIMIT, 1L);
+    set(CURLOPT_LOW_SPEED_TIME, static_cast<long>(request.limits.silence.count()));
+    if (connectTo_)
+        set(CURLOPT_CONNECT_TO, connectTo_.get());
+    configureTrust();
+    configureBody(request);
+    for (const std::string& header : request.headers)
+        append(headers_, header);
+    if (request.signature)
+        sign(request);
+    set(CURLOPT_HTTPHEADER, headers_.get());
+}
+
+void Client::configureTrust() {
+    set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+    if (authorities_.empty())
+        return;
+    // These take the place of libcurl's file of authorities but not of its folder, which has the same ones.
+    curl_blob blob = {authorities_.data(), authorities_.size(), CURL_BLOB_NOCOPY};
+    set(CURLOPT_CAINFO_BLOB, &blob);
+}
+
+void Client::configureBody(const Request& request) {
+    set(CURLOPT_CUSTOMREQUEST, request.method);
+    if (!request.body)
+        return;
+    // A null pointer would make libcurl ask a callback for the octets.
+    set(CURLOPT_POSTFIELDS, request.body->empty() ? "" : reinterpret_cast<const char*>(request.body->data()));
+    set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(request.body->size()));
+    append(headers_, "Content-Type: application/octet-stream");
+}
+
+// libcurl signs every header of the list, and takes the body's digest from this one.
+void Client::sign(const Request& request) {
+    const Signature& signature = *request.signature;
+    std::uint8_t digest[crypto::sha256Size];
+    const std::span<const std::uint8_t> body = request.body.value_or(std::span<const std::uint8_t>());
+    if (!crypto::sha256(body.data(), body.size(), digest))
+        check(CURLE_OUT_OF_MEMORY);
+    append(headers_, "x-amz-content-sha256: " + hexadecimal(digest));
+    set(CURLOPT_AWS_SIGV4, ("aws:amz:" + signature.region + ":s3").c_str());
+    set(CURLOPT_USERNAME, signature.accessKey.c_str());
+    set(CURLOPT_PASSWORD, signature.secret.c_str());
+}
+
+} // namespace http

@@ -1,0 +1,138 @@
+// HTTP for the services that speak it: one client, on libcurl, with the same care everywhere. The certificate of a
+// server is always verified, a redirection is an answer and is not followed, no scheme but http and https is spoken,
+// the environment's proxy variables have no say, and an answer never takes more memory than the request allows.
+#ifndef VELTRA_PLATFORM_LINUX_HTTP_H
+#define VELTRA_PLATFORM_LINUX_HTTP_H
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <curl/curl.h>
+
+#include "platform/Value.h"
+
+namespace http {
+
+// An exchange that had no answer. The code is libcurl's, the text says what went wrong.
+class Failure : public std::runtime_error {
+public:
+    Failure(CURLcode code, const std::string& reason) : std::runtime_error(reason), code_(code) {}
+    CURLcode code() const { return code_; }
+
+    // Whether the same request may succeed at another time: the network failed, or the server did, but neither the
+    // request nor the server's identity was at fault.
+    bool mayPass() const;
+
+private:
+    CURLcode code_;
+};
+
+// A well-formed absolute URL.
+class Url {
+public:
+    // Raises Failure for any other text.
+    explicit Url(std::string text);
+
+    // The URL with `path`, which begins with a slash and is percent-encoded where it has to be, at the end of its own.
+    Url under(std::string_view path) const;
+
+    const std::string& text() const { return text_; }
+    std::string scheme() const { return part(CURLUPART_SCHEME); }
+    std::string user() const { return part(CURLUPART_USER); }
+    std::string path() const { return part(CURLUPART_PATH); }
+
+private:
+    struct Release {
+        void operator()(CURLU* url) const { curl_url_cleanup(url); }
+    };
+    std::string part(CURLUPart which) const;
+
+    std::string text_; // as given: libcurl would change the case of what is percent-encoded, which a signature covers
+    std::unique_ptr<CURLU, Release> url_;
+};
+
+// The URL of the proxy that a proxy description (RPCopyProxyDictionaryWithOptions) has for `scheme`, empty for none.
+// Raises Failure when it enables one that it does not name.
+std::string proxyFor(const std::string& scheme, const Value& description);
+
+// How long an exchange may take.
+struct Limits {
+    std::chrono::milliseconds whole;
+    std::chrono::milliseconds connecting = whole;
+    std::chrono::seconds silence = {}; // without a byte in either direction; 0 is as long as the whole
+};
+
+// AWS signature version 4 for an object store (service "s3"). The region has no colon.
+struct Signature {
+    std::string region;
+    std::string accessKey;
+    std::string secret;
+};
+
+struct Request {
+    const char* method;
+    std::string url;
+    Limits limits;
+    std::size_t maximumAnswer; // octets in the body of an answer with status 2xx
+    std::string proxy = {};    // a URL, empty for none
+    // "Name: value", without line break; one without a value would be signed but not sent
+    std::vector<std::string> headers = {};
+    // What is sent as application/octet-stream; the octets have to outlive the exchange.
+    std::optional<std::span<const std::uint8_t>> body = {};
+    const Signature* signature = nullptr;
+};
+
+struct Answer {
+    long status;
+    Value::Data body; // of a status other than 2xx its beginning at most
+
+    bool isSuccess() const { return status >= 200 && status <= 299; }
+};
+
+// Keeps the connections that it made for the exchanges after. Serves one thread at a time.
+class Client {
+public:
+    // Raises Failure, as exchange does.
+    Client();
+
+    // Trusts the authorities of these PEM certificates beside those of the system.
+    void trust(std::string pem) { authorities_ = std::move(pem); }
+
+    // Connects elsewhere: each entry is "HOST:PORT:CONNECT-TO-HOST:CONNECT-TO-PORT".
+    void connectTo(const std::vector<std::string>& entries);
+
+    Answer exchange(const Request& request);
+
+private:
+    struct Release {
+        void operator()(CURL* handle) const { curl_easy_cleanup(handle); }
+        void operator()(curl_slist* list) const { curl_slist_free_all(list); }
+    };
+    using List = std::unique_ptr<curl_slist, Release>;
+    static void append(List& list, const std::string& text);
+
+    template <class Setting>
+    void set(CURLoption option, Setting setting);
+    void configure(const Request& request);
+    void configureTrust();
+    void configureBody(const Request& request);
+    void sign(const Request& request);
+
+    std::string authorities_;
+    List connectTo_; // before the handle, which refers to it
+    List headers_;
+    char problem_[CURL_ERROR_SIZE] = "";
+    std::unique_ptr<CURL, Release> handle_;
+};
+
+} // namespace http
+
+#endif

@@ -1,0 +1,34 @@
+// What the device description's "store" says about a store on servers.
+#ifndef VELTRA_PLATFORM_LINUX_ORLO_REMOTE_SETTINGS_H
+#define VELTRA_PLATFORM_LINUX_ORLO_REMOTE_SETTINGS_H
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Value.h"
+#include "platform/linux/services/Http.h"
+
+struct OrloRemoteSettings {
+    // Where the records lie on an S3-compatible object store, and how its requests are signed.
+    struct ObjectStore {
+        std::string bucket;
+        http::Signature signature;
+    };
+
+    std::string authorities;            // PEM; empty for those of the system alone
+    std::vector<std::string> connectTo; // as http::Client takes them
+    std::optional<ObjectStore> objectStore;
+};
+
+// Reads these entries of `store`, each of which may be missing:
+//   "caFile"     a file of PEM certificates on the device, whose authorities are trusted beside the system's
+//   "connectTo"  an object: connections to the "host:port" of a name are made to the "host:port" of its value
+//   "s3"         an object of texts: "region" (letters, digits, "-", "_"), "bucket" (letters, digits, ".", "-", "_"),
+//                and "accessKeyFile", a file on the device that only its owner may read or write, of two lines: the
+//                access key and its secret
+// An IPv6 address stands in brackets. Raises OrloStoreFailure (QDOrloErrorStorage), which says what is wrong, for
+// anything else.
+OrloRemoteSettings readRemoteSettings(const Value& store);
+
+#endif

@@ -1,0 +1,309 @@
+// The remote backend: records and exports on HTTPS servers, plain ones or S3-compatible object stores.
+#include <algorithm>
+#include <chrono>
+#include <ctime>
+#include <optional>
+#include <string_view>
+#include <thread>
+#include <utility>
+
+#include <nlohmann/json.hpp>
+
+#include "platform/Format.h"
+#include "platform/ReverseProxy.h"
+#include "platform/Utf8.h"
+#include "platform/linux/services/Http.h"
+#include "platform/linux/services/OrloRemoteSettings.h"
+#include "platform/linux/services/OrloStoreBackend.h"
+
+namespace {
+
+using std::chrono::milliseconds;
+
+constexpr std::size_t largestRecord = std::size_t{64} << 20;
+constexpr std::size_t largestTrustObject = std::size_t{1} << 20;
+constexpr std::size_t largestReply = std::size_t{1} << 20; // to a put, where nothing in it matters
+
+// An object store's keys have at most 1024 bytes and servers take header lines of at most 8 KiB, unless told otherwise.
+constexpr std::size_t longestName = 512;
+constexpr std::size_t longestQuoted = 64;
+constexpr std::size_t longestReason = 64;
+constexpr std::size_t longestGrants = 8000;
+
+constexpr milliseconds firstRest{200};
+constexpr milliseconds longestRest{2000};
+
+// A number among the session's options: from 1 to `largest`, to which a larger one is cut; anything else is `usual`.
+struct NumberOption {
+    const char* key;
+    std::int64_t usual;
+    std::int64_t largest;
+
+    std::int64_t in(const OrloOptions& options) const {
+        const Value& value = optionOf(options, key);
+        const std::int64_t number = value.isBoolean() ? 0 : value.integer().value_or(0);
+        return number < 1 ? usual : std::min(number, largest);
+    }
+};
+constexpr NumberOption timeoutSeconds{"HTTPTimeout", 30, 3600};
+constexpr NumberOption attemptsOfOne{"HTTPMaxAttempts", 1, 10};
+constexpr NumberOption attemptsOfMany{"MultiRequestMaxAttempts", 1, 10};
+
+// `text` with every octet percent-encoded that `isKept` does not keep.
+template <class Kept>
+std::string percentEncoded(std::string_view text, Kept isKept) {
+    std::string encoded;
+    for (const char c : text)
+        encoded += isKept(c) ? std::string(1, c) : format("%%%02X", static_cast<unsigned char>(c));
+    return encoded;
+}
+
+// Kept is what RFC 3986 calls unreserved and no more, as the signature asks for.
+bool isUnreserved(char c) {
+    constexpr std::string_view marks = "-._~";
+    return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || marks.find(c) != marks.npos;
+}
+
+bool isVisible(char c) {
+    return c > ' ' && c < '\x7F';
+}
+
+// The name as one segment of a path. Servers decode a segment before they look at it, so that no encoding keeps a slash
+// or dots from leading elsewhere: such a name is refused.
+std::string segmentOf(std::string_view name) {
+    constexpr std::string_view separators("/\0", 2);
+    if (name == "." || name == ".." || name.find_first_of(separators) != name.npos || name.size() > longestName) {
+        std::string quoted;
+        utf8::appendQuoted(quoted, utf8::beginning(name, longestQuoted));
+        throw OrloStoreFailure(QDOrloErrorStorage, "A server can keep no record under the name " + quoted);
+    }
+    return percentEncoded(name, isUnreserved);
+}
+
+std::string hexadecimal(const std::uint8_t* bytes, std::size_t length) {
+    return *QDOrloCreateInstanceString(Value::Data(bytes, bytes + length)).text();
+}
+
+// The headers by which a server can decide. Of the grants nothing breaks the line or is taken for blanks around it;
+// where there are none there is no such header, since one without a value would be signed but not sent.
+std::vector<std::string> headersFor(const OrloOptions& options, const OrloStoreBackend::Digest& trusted) {
+    std::vector<std::string> headers = {"Orlo-Trust-Object-Digest: " + hexadecimal(trusted.data(), trusted.size())};
+    const std::string* grants = optionOf(options, "Permissions").text();
+    if (!grants || grants->empty())
+        return headers;
+    std::string encoded;
+    if (grants->size() <= longestGrants)
+        encoded = percentEncoded(*grants, [](char c) { return isVisible(c) && c != '%'; });
+    if (encoded.empty() || encoded.size() > longestGrants)
+        throw OrloStoreFailure(QDOrloErrorNotPermitted, "The session's grants do not fit into a request");
+    headers.push_back("Orlo-Permissions: " + encoded);
+    return headers;
+}
+
+std::string utcTime(const char* how) {
+    const std::time_t now = std::time(nullptr);
+    std::tm parts = {};
+    char text[32];
+    gmtime_r(&now, &parts);
+    return {text, std::strftime(text, sizeof text, how, &parts)};
+}
+
+std::string randomName() {
+    std::uint8_t bytes[8];
+    if (!crypto::randomBytes(bytes, sizeof bytes))
+        throw OrloStoreFailure(QDOrloErrorStorage, "There is no randomness for the name of an export");
+    return hexadecimal(bytes, sizeof bytes);
+}
+
+std::string exportText(const OrloOptions& options, const std::vector<OrloRecordName>& names) {
+    nlohmann::ordered_json records = nlohmann::ordered_json::array();
+    for (const OrloRecordName& name : names)
+        records.push_back({{"class", name.dataClass}, {"instance", name.instance}});
+    const nlohmann::ordered_json text = {
+        {"dataVersion", dataVersionOf(options)},
+        {"ticket", ticketDigestOf(options)},
+        {"exportedAt", utcTime("%Y-%m-%dT%H:%M:%SZ")},
+        {"records", std::move(records)},
+    };
+    return text.dump(-1, ' ', false, nlohmann::ordered_json::error_handler_t::replace) + "\n";
+}
+
+// The word for the reason that an object store gives in a refusal, or nothing.
+std::string_view reasonIn(const http::Answer& answer) {
+    constexpr std::string_view open = "<Code>";
+    const std::string_view text(reinterpret_cast<const char*>(answer.body.data()), answer.body.size());
+    const std::size_t at = text.find(open);
+    if (at == text.npos)
+        return {};
+    const std::string_view rest = text.substr(at + open.size());
+    const auto end = std::find_if_not(rest.begin(), rest.end(), isUnreserved);
+    return rest.substr(0, std::min(longestReason, static_cast<std::size_t>(end - rest.begin())));
+}
+
+[[noreturn]] void failToTransport(const char* method, const std::string& url, const std::string& reason) {
+    throw OrloStoreFailure(QDOrloErrorTransport, format("%s %s: %s", method, url, reason));
+}
+
+// What a status other than that of success means.
+[[noreturn]] void failWith(const http::Request& request, const http::Answer& answer) {
+    const std::string_view reason = reasonIn(answer);
+    const bool isRecordMissing = answer.status == 404 && !request.body && reason != "NoSuchBucket";
+    const bool isRefused = answer.status == 401 || answer.status == 403;
+    throw OrloStoreFailure(isRecordMissing ? QDOrloErrorNoSuchRecord
+                           : isRefused     ? QDOrloErrorNotPermitted
+                                           : QDOrloErrorTransport,
+                           format("%s %s: HTTP status %d%s%s", request.method, request.url, answer.status,
+                                  reason.empty() ? "" : " ", reason));
+}
+
+class RemoteStore : public OrloStoreBackend {
+public:
+    explicit RemoteStore(OrloRemoteSettings settings) : settings_(std::move(settings)) {
+        client_.trust(std::move(settings_.authorities));
+        client_.connectTo(settings_.connectTo);
+    }
+
+    Value::Data trustObject(const OrloOptions& options, std::string_view url) override {
+        return fetchTrustObject(options, std::string(url), "");
+    }
+
+    Digest trustObjectDigest(const OrloOptions& options) override {
+        if (!trusted_)
+            fetchTrustObject(options, endpoint(options, "CAURL"), "/orlotrustobject");
+        return *trusted_;
+    }
+
+    void put(const OrloOptions& options, const OrloRecordName& name, const Value::Data& data) override {
+        if (data.size() > largestRecord)
+            throw OrloStoreFailure(QDOrloErrorStorage, format("A record of %lu bytes is too large", data.size()));
+        putBytes(options, recordPath(options, name), data, attemptsOfOne);
+    }
+
+    Value::Data copy(const OrloOptions& options, const OrloRecordName& name) override {
+        http::Request request = dataStoreRequest("GET", options);
+        request.maximumAnswer = largestRecord;
+        http::Answer answer =
+            exchange(options, endpoint(options, "DSURL"), recordPath(options, name), request, attemptsOfOne);
+        if (answer.status != 200)
+            failWith(request, answer);
+        return std::move(answer.body);
+    }
+
+    void multiExport(const OrloOptions& options, const std::vector<OrloRecordName>& names) override {
+        const std::string text = exportText(options, names);
+        const std::string path = versionPath(options) + "/exports/" + ticketDigestOf(options) + "/" +
+                                 utcTime("%Y%m%dT%H%M%SZ") + "-" + randomName() + ".json";
+        putBytes(options, path, std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size()),
+                 attemptsOfMany);
+    }
+
+private:
+    Value::Data fetchTrustObject(const OrloOptions& options, const std::string& server, std::string_view path) {
+        http::Request request{.method = "GET", .url = {}, .limits = {}, .maximumAnswer = largestTrustObject};
+        http::Answer answer = exchange(options, server, path, request, attemptsOfOne);
+        if (answer.status != 200)
+            failToTransport(request.method, request.url, format("HTTP status %d", answer.status));
+        if (answer.body.empty())
+            failToTransport(request.method, request.url, "The trust object is empty");
+        Digest digest;
+        if (!crypto::sha256(answer.body.data(), answer.body.size(), digest.data()))
+            throw OrloStoreFailure(QDOrloErrorStorage, "The trust object cannot be digested");
+        trusted_ = digest;
+        return std::move(answer.body);
+    }
+
+    void putBytes(const OrloOptions& options, const std::string& path, std::span<const std::uint8_t> bytes,
+                  const NumberOption& attempts) {
+        constexpr long stored[] = {200, 201, 204};
+        http::Request request = dataStoreRequest("PUT", options);
+        request.body = bytes;
+        const http::Answer answer = exchange(options, endpoint(options, "DSURL"), path, request, attempts);
+        if (std::find(std::begin(stored), std::end(stored), answer.status) == std::end(stored))
+            failWith(request, answer);
+    }
+
+    http::Request dataStoreRequest(const char* method, const OrloOptions& options) const {
+        return {
+            .method = method,
+            .url = {},
+            .limits = {},
+            .maximumAnswer = largestReply,
+            .headers = headersFor(options, *trusted_),
+            .signature = settings_.objectStore ? &settings_.objectStore->signature : nullptr,
+        };
+    }
+
+    std::string versionPath(const OrloOptions& options) const {
+        const std::string bucket = settings_.objectStore ? "/" + settings_.objectStore->bucket : "";
+        return bucket + "/v" + std::to_string(dataVersionOf(options));
+    }
+
+    std::string recordPath(const OrloOptions& options, const OrloRecordName& name) const {
+        return versionPath(options) + "/records/" + segmentOf(name.dataClass) + "/" + segmentOf(name.instance);
+    }
+
+    // An endpoint of the session's options. Nothing but the trust object, which a digest vouches for, comes without
+    // TLS.
+    static std::string endpoint(const OrloOptions& options, const char* key) {
+        const std::string* url = optionOf(options, key).text();
+        if (!url || !url->starts_with("https://"))
+            throw OrloStoreFailure(QDOrloErrorTransport, format("The session's %s is no https URL", key));
+        return *url;
+    }
+
+    // The proxy for `url` as the session's options want it; the description of proxies is asked for once.
+    std::string proxyFor(const OrloOptions& options, const http::Url& url) {
+        const bool isWanted = optionOf(options, "EnableProxy").boolean().value_or(false);
+        if (!isWanted || (url.scheme() == "https" && optionOf(options, "EnableProxySsl") != Value("ForHttps")))
+            return {};
+        if (!proxies_)
+            proxies_ = RPCopyProxyDictionaryWithOptions(url.text(), Value::Dictionary{{"TestReachability", false}});
+        return http::proxyFor(url.scheme(), *proxies_);
+    }
+
+    // Sends the request, whose URL becomes that of `path` on `server`, as often as it may be and as is of use.
+    http::Answer exchange(const OrloOptions& options, const std::string& server, std::string_view path,
+                          http::Request& request, const NumberOption& attempts) {
+        request.url = server + std::string(path);
+        try {
+            const http::Url url = http::Url(server).under(path);
+            if (!url.user().empty())
+                throw OrloStoreFailure(QDOrloErrorTransport, "A server's URL has to do without user and password");
+            request.url = url.text();
+            request.proxy = proxyFor(options, url);
+            request.limits = {.whole = std::chrono::seconds(timeoutSeconds.in(options))};
+            milliseconds rest = firstRest;
+            for (std::int64_t left = attempts.in(options); left > 1; --left, rest = std::min(2 * rest, longestRest)) {
+                if (std::optional<http::Answer> answer = attempt(request))
+                    return std::move(*answer);
+                std::this_thread::sleep_for(rest);
+            }
+            return client_.exchange(request);
+        } catch (const http::Failure& failure) {
+            failToTransport(request.method, request.url, failure.what());
+        }
+    }
+
+    // The answer, or none when another attempt may bring a better one.
+    std::optional<http::Answer> attempt(const http::Request& request) try {
+        http::Answer answer = client_.exchange(request);
+        return answer.status < 500 ? std::optional(std::move(answer)) : std::nullopt;
+    } catch (const http::Failure& failure) {
+        if (!failure.mayPass())
+            throw;
+        return std::nullopt;
+    }
+
+    OrloRemoteSettings settings_;
+    http::Client client_;
+    std::optional<Value> proxies_;
+    std::optional<Digest> trusted_; // the digest of the trust object as it was last had
+};
+
+} // namespace
+
+std::unique_ptr<OrloStoreBackend> openRemoteStore(const Value& store) try {
+    return std::make_unique<RemoteStore>(readRemoteSettings(store));
+} catch (const http::Failure& failure) {
+    throw OrloStoreFailure(QDOrloErrorTransport, failure.what());
+}

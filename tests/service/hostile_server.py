@@ -1,0 +1,193 @@
+"""An HTTPS server that misbehaves in the way that the last segment of a request's path names."""
+import http.client
+import http.server
+import socket
+import ssl
+import threading
+
+CHUNK = b"10000\r\n" + bytes(0x10000) + b"\r\n"
+
+
+class Handler(http.server.BaseHTTPRequestHandler):
+    protocol_version = "HTTP/1.1"
+
+    def log_message(self, *_):
+        pass
+
+    def handle_request(self):
+        behaviour, *argument = self.path.rsplit("/", 1)[1].split("-")
+        with self.server.lock:
+            self.server.seen.append((self.command, self.path))
+            count = self.server.counts[self.path] = self.server.counts.get(self.path, 0) + 1
+        try:
+            getattr(self, behaviour, self.plain)(count, *argument)
+        except (OSError, ssl.SSLError):
+            self.close_connection = True
+
+    do_GET = do_PUT = handle_request
+
+    def body(self):
+        return self.rfile.read(int(self.headers.get("Content-Length", 0)))
+
+    def answer(self, status, body=b"", **headers):
+        self.send_response(status)
+        for name, value in {"Content-Length": len(body), **headers}.items():
+            self.send_header(name.replace("_", "-"), str(value))
+        self.end_headers()
+        self.wfile.write(body)
+
+    def drop(self):
+        self.connection.shutdown(socket.SHUT_RDWR)
+        self.close_connection = True
+
+    def plain(self, count, *_):
+        self.body()
+        with self.server.lock:
+            fails = self.server.failing > 0
+            self.server.failing -= fails
+        self.answer(503 if fails else 200, self.server.trust_object)
+
+    def status(self, count, status, reason=""):
+        self.body()
+        body = f"<Error><Code>{reason}</Code></Error>".encode() if reason else b""
+        self.answer(int(status), body, Location="/v1/records/psd2/plain")
+
+    def busy(self, count, failures, *_):
+        self.body()
+        self.answer(*((200, b"in the end") if count > int(failures) else (503,)))
+
+    def broken(self, count, failures):
+        self.body()
+        if count > int(failures):
+            self.answer(200, b"in the end")
+        else:
+            self.drop()
+
+    def stall(self, count):
+        while self.connection.recv(65536):  # until the client gives up
+            pass
+
+    def trickle(self, count):
+        self.send_response(200)
+        self.send_header("Content-Length", "1000")
+        self.end_headers()
+        while not self.server.closing.wait(0.2):
+            self.wfile.write(b"x")
+
+    def endless(self, count, status="200"):
+        self.send_response(int(status))
+        self.send_header("Transfer-Encoding", "chunked")
+        self.end_headers()
+        while True:
+            self.wfile.write(CHUNK)
+
+    def headers_(self, count):
+        self.send_response(200)
+        self.flush_headers()
+        while True:
+            self.wfile.write(b"X-Filler: " + b"x" * 1000 + b"\r\n")
+
+    def announced(self, count):
+        self.answer(200, b"a beginning", Content_Length=(64 << 20) + 1)
+        self.stall(count)
+
+    def half(self, count):
+        self.body()
+        self.answer(200, b"half", Content_Length=8)
+        self.drop()
+
+    def mid(self, count):
+        """Closes while the body of the request is under way."""
+        self.rfile.read(100000)
+        self.drop()
+
+    def noise(self, count):
+        self.wfile.write(b"\x00\xff no HTTP at all\r\n\r\n")
+        self.drop()
+
+    def idle(self, count):
+        """Answers and ends the connection without a word about it."""
+        self.plain(count)
+        self.drop()
+
+    def tamper(self, count, port):
+        """Passes the request on to another server with one bit of the body changed."""
+        body = bytearray(self.body())
+        body[0] ^= 1
+        onward = http.client.HTTPConnection("127.0.0.1", int(port))
+        onward.request(self.command, self.path, bytes(body), dict(self.headers.items()))
+        answer = onward.getresponse()
+        self.answer(answer.status, answer.read())
+        onward.close()
+
+
+class HostileServer(http.server.ThreadingHTTPServer):
+    daemon_threads = True
+
+    def __init__(self, certificate, key, trust_object):
+        super().__init__(("127.0.0.1", 0), Handler)
+        self.trust_object, self.seen, self.counts, self.failing = trust_object, [], {}, 0
+        self.lock, self.closing = threading.Lock(), threading.Event()
+        self.context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
+        self.context.load_cert_chain(certificate, key)
+        threading.Thread(target=self.serve_forever, daemon=True).start()
+
+    def finish_request(self, request, client_address):
+        try:
+            with self.context.wrap_socket(request, server_side=True) as secured:
+                super().finish_request(secured, client_address)
+        except OSError:
+            pass  # a client that does not like the certificate goes
+
+    def close(self):
+        self.closing.set()
+        self.shutdown()
+        self.server_close()
+
+
+class Cutter:
+    """Passes connections on to a port of this computer, and cuts the first `cuts` of them off after so many bytes."""
+
+    def __init__(self, port, after):
+        self.target, self.after, self.cuts = port, after, 0
+        self.listener = socket.create_server(("127.0.0.1", 0))
+        self.port = self.listener.getsockname()[1]
+        threading.Thread(target=self.serve, daemon=True).start()
+
+    def serve(self):
+        try:
+            while True:
+                client, _ = self.listener.accept()
+                server = socket.create_connection(("127.0.0.1", self.target))
+                limit = self.after if self.cuts > 0 else None
+                threading.Thread(target=self.join, args=(client, server, limit), daemon=True).start()
+        except OSError:
+            pass  # closed
+
+    def join(self, client, server, limit):
+        with client, server:
+            answers = threading.Thread(target=self.copy, args=(server, client, None))
+            answers.start()
+            self.copy(client, server, limit)
+            answers.join()
+
+    def copy(self, source, sink, limit):
+        passed = 0
+        try:
+            while bytes_ := source.recv(65536):
+                passed += len(bytes_)
+                if limit is not None and passed > limit:
+                    self.cuts -= 1
+                    break
+                sink.sendall(bytes_)
+        except OSError:
+            pass
+        for end in (source, sink):
+            try:
+                end.shutdown(socket.SHUT_RDWR)
+            except OSError:
+                pass
+
+    def close(self):
+        self.listener.shutdown(socket.SHUT_RDWR)
+        self.listener.close()

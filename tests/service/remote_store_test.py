@@ -1,0 +1,492 @@
+"""The data store on servers: a real nginx, Swift's S3 layer behind one, and servers that misbehave."""
+import hashlib
+import json
+import os
+import pathlib
+import socket
+import subprocess
+import tempfile
+import threading
+import time
+import unittest
+import urllib.parse
+
+from forward_proxy import ForwardProxy
+from harness import BIN, HONEST_MEMORY, Service
+from hostile_server import Cutter, HostileServer
+from lab import CA_HOST, HOST, TRUST_OBJECT, Authority, NginxStore, SwiftStore
+
+SUCCESS = (0, None, None)
+CLASSES = (
+    "pfcl HmCl IfCl CtCl GpC2 tcrt dCfg bCfg ycrt AlsH PxTC pspc FCCl pcic pcii pcvc pcvi pcve pbas pmpc pdcl prf1 "
+    "prf2 psd1 psd2 pwcl psnv psdt preg"
+).split()
+NOT_PERMITTED, NO_SUCH_RECORD, TRANSPORT, STORAGE = 1, 3, 4, 5
+DATA_STORE, TRUST_URL = f"https://{HOST}:8443", f"http://{CA_HOST}:8080/orlotrustobject"
+
+
+class Session:
+    """A session of the library with options of the test's choice, in a process of its own."""
+
+    def __init__(self, store, **options):
+        self.folder = tempfile.TemporaryDirectory(prefix="veltra-session-")
+        self.root = pathlib.Path(self.folder.name)
+        (self.root / "etc/veltra").mkdir(parents=True)
+        self.describe(store.describe(self.root))
+        # A proxy of the environment has no say.
+        dead = {name: "http://127.0.0.1:1" for name in ("http_proxy", "https_proxy", "HTTPS_PROXY", "ALL_PROXY")}
+        self.process = subprocess.Popen(
+            [BIN / "store-session"], text=True, stdin=subprocess.PIPE, stdout=subprocess.PIPE,
+            stderr=subprocess.DEVNULL,
+            env={**os.environ, **dead, **HONEST_MEMORY, "VELTRA_DEVICE_ROOT": str(self.root)},
+        )
+        self.open(**options)
+
+    def describe(self, store, **more):
+        (self.root / "etc/veltra/device.json").write_text(json.dumps({"store": store, **more}))
+
+    def run(self, *words):
+        """Code and text of the error; 0 is success."""
+        self.process.stdin.write(json.dumps(words) + "\n")
+        self.process.stdin.flush()
+        code, text = self.process.stdout.readline().rstrip("\n").split(" ", 1)
+        return int(code), text
+
+    def open(self, **options):
+        usual = {"APTicket": {"$data": "74"}, "DataVersion": 1, "DSURL": DATA_STORE, "CAURL": f"https://{CA_HOST}:8443",
+                 "TrustObjectDigest": {"$data": hashlib.sha256(TRUST_OBJECT).hexdigest()}, "HTTPTimeout": 10}
+        code, text = self.run("open", usual | options)
+        assert code == 0, text
+
+    def put(self, instance, record=b"record"):
+        (self.root / "record").write_bytes(record)
+        self.run("grant", "psd2", instance)
+        return self.run("put", "psd2", instance, "/record")
+
+    def get(self, instance):
+        self.run("grant", "psd2", instance)
+        return self.run("get", "psd2", instance, "/got")
+
+    def got(self):
+        return (self.root / "got").read_bytes()
+
+    def peak_megabytes(self):
+        for line in pathlib.Path(f"/proc/{self.process.pid}/status").read_text().splitlines():
+            if line.startswith("VmHWM:"):
+                return int(line.split()[1]) >> 10
+        raise AssertionError("no memory figure")
+
+    def close(self):
+        self.process.communicate()
+        assert self.process.returncode == 0, self.process.returncode
+        self.folder.cleanup()
+
+
+class RemoteTest(unittest.TestCase):
+    def start(self, store):
+        self.store = store
+        self.service = Service()
+        self.addCleanup(self.service.close)
+        self.describe(self.service)
+
+    def describe(self, service, vanter="VAN0001", **changes):
+        path = service.root / "etc/veltra/device.json"
+        description = json.loads(path.read_text())
+        description.pop("reverseProxy", None)
+        description["answers"]["VanterSerialNumber"] = vanter
+        description["store"] = self.store.describe(service.root, **changes)
+        path.write_text(json.dumps(description))
+
+    def session(self, store=None, **options):
+        session = Session(store or self.store, **options)
+        self.addCleanup(session.close)
+        return session
+
+    def answer(self, *words, service=None):
+        """What the plug-in answered, without the name: (status code, dictionary, error)."""
+        _, answer = (service or self.service).orloctl(*words)
+        response = answer["response"]
+        return response["statusCode"], response.get("response"), response.get("error")
+
+    def put(self, record, service=None):
+        service = service or self.service
+        (service.root / "tmp/in").write_bytes(record)
+        return self.answer("put-psd2", "/tmp/in", service=service)
+
+    def get(self):
+        return self.answer("get-psd2", "/tmp/out")
+
+    def error_of_get(self):
+        """Code and text of the library's error."""
+        status, _, error = self.get()
+        self.assertEqual((status, error["domain"]), (-1, "QDOrloErrorDomain"), error)
+        return error["code"], error["description"]
+
+
+class StoreCases:
+    """What holds for every store."""
+
+    def check_records(self):
+        for record in (os.urandom(16 << 20), b"", b"\0", b"short"):
+            with self.subTest(len(record)):
+                self.assertEqual(self.put(record), SUCCESS)
+                self.assertEqual(self.get(), SUCCESS)
+                self.assertEqual((self.service.root / "tmp/out").read_bytes(), record)
+        self.assertEqual(self.store.stored(), {"v2/records/psd2/VAN0001": b"short"})
+        self.describe(self.service, vanter="VAN0002")
+        code, text = self.error_of_get()
+        self.assertEqual(code, NO_SUCH_RECORD)
+        self.assertRegex(text, f"^GET {DATA_STORE}/.*/VAN0002: HTTP status 404")
+
+    def check_export(self):
+        lines = self.service.messages_of(lambda: self.assertEqual(self.answer("export", *CLASSES), SUCCESS))
+        gathered = next(line for line in lines if line.startswith("Generated data instance dict "))
+        instances = json.loads(gathered.removeprefix("Generated data instance dict "))
+        self.assertEqual(set(instances), set(CLASSES))
+        (name, text), = self.store.stored().items()
+        ticket = hashlib.sha256((self.service.root / "System/Library/Caches/apticket.der").read_bytes()).hexdigest()
+        self.assertRegex(name, f"^v1/exports/{ticket}/[0-9]{{8}}T[0-9]{{6}}Z-[0-9a-f]{{16}}\\.json$")
+        export = json.loads(text)
+        self.assertEqual({row["class"]: row["instance"] for row in export["records"]}, instances)
+        self.assertEqual((len(export["records"]), export["ticket"], export["dataVersion"]), (29, ticket, 1))
+        self.assertEqual(self.answer("call", "OrloExport", "ExportList:=[]"), SUCCESS)
+        exports = [json.loads(text)["records"] for text in self.store.stored().values()]
+        self.assertEqual(sorted(exports, key=len), [[], export["records"]])
+
+    def check_names(self, names):
+        """Each name is kept under itself, travels as RFC 3986 has it, and can neither leave its folder nor its line."""
+        session = self.session()
+        before = len(self.store.requests())
+        for name in names:
+            with self.subTest(name):
+                self.assertEqual(session.put(name, name.encode()), (0, ""))
+                self.assertEqual(session.get(name), (0, ""))
+                self.assertEqual(session.got(), name.encode())
+                method, path, status, grants, _ = self.store.requests()[-1]
+                self.assertEqual(path.rsplit("/", 1)[1], urllib.parse.quote(name, safe=""))
+                self.assertEqual(urllib.parse.unquote(grants.split(";")[1]), "1:psd2:" + name)
+        self.assertEqual(self.store.stored(), {f"v1/records/psd2/{name}": name.encode() for name in names})
+        connections = {line[4] for line in self.store.requests()[before:] if "/records/" in line[1]}
+        self.assertEqual(len(connections), 1, "a session makes one connection")
+
+    def check_two_services(self):
+        other = Service()
+        self.addCleanup(other.close)
+        self.describe(other)
+        records = [bytes([number]) * (200_000 + number) for number in range(12)]
+        outcomes = []
+
+        def work(service, mine):
+            for record in mine:
+                outcomes.append(self.put(record, service))
+
+        workers = [threading.Thread(target=work, args=arguments)
+                   for arguments in ((self.service, records[::2]), (other, records[1::2]))]
+        for worker in workers:
+            worker.start()
+        while any(worker.is_alive() for worker in workers):
+            if self.get() == SUCCESS:
+                self.assertIn((self.service.root / "tmp/out").read_bytes(), records)
+        for worker in workers:
+            worker.join()
+        self.assertEqual(outcomes, [SUCCESS] * 12)
+        (_, record), = self.store.stored().items()
+        self.assertIn(record, records[-2:])
+
+
+NAMES = ["S1", "a b", "100%", "a+b=c", "~-._", "...", "a%2Fb", "a:b", "?x=1&y", "#f", "é-日本", "a\\..\\b", "'\"<>"]
+
+
+class PlainStore(RemoteTest, StoreCases):
+    REFUSALS = """
+        location = /v2/records/psd2/BROKEN { return 500; }
+        location = /v2/records/psd2/MOVED { return 302 /v2/records/psd2/VAN0001; }
+"""
+
+    def setUp(self):
+        store = NginxStore(extra=self.REFUSALS)
+        self.addCleanup(store.close)
+        self.start(store)
+
+    def test_records(self):
+        self.check_records()
+
+    def test_export(self):
+        self.check_export()
+
+    def test_names(self):
+        self.check_names([*NAMES, "x" * 255, "line\r\nOrlo-Permissions: 1:psd2:S2", "\t"])
+        session = self.session()
+        before = len(self.store.requests())
+        for name in (".", "..", "../../x", "a/b", "/", "a\0b", "x" * 513):
+            with self.subTest(name[:10]):
+                self.assertEqual((session.put(name)[0], session.get(name)[0]), (STORAGE, STORAGE))
+        self.assertEqual(session.run("export", ["psd2"] * 700, ["x" * 12] * 700)[0], NOT_PERMITTED)
+        self.assertEqual(len(self.store.requests()), before + 1)  # the trust object was fetched
+
+    def test_two_services(self):
+        self.check_two_services()
+
+    def test_what_a_server_refuses_is_answered_with_its_reason(self):
+        self.assertEqual(self.put(b"record"), SUCCESS)
+        for name, status in (("BROKEN", 500), ("MOVED", 302)):
+            with self.subTest(name):
+                self.describe(self.service, vanter=name)
+                reason = f"{DATA_STORE}/v2/records/psd2/{name}: HTTP status {status}"
+                self.assertEqual(self.error_of_get(), (TRANSPORT, "GET " + reason))
+                lines = self.service.messages_of(lambda: self.assertEqual(self.put(b"x")[2]["code"], 1011))
+                self.assertIn("Put: PUT " + reason, lines)
+        self.describe(self.service)
+        (self.store.folder / "trust-object").write_bytes(b"another one")
+        code, text = self.error_of_get()
+        self.assertEqual((code, text), (NOT_PERMITTED, f"GET {DATA_STORE}/v2/records/psd2/VAN0001: HTTP status 403"))
+        error = self.answer("export")[2]
+        self.assertEqual((error["domain"], error["code"]), ("OrloExport", 2012))
+        self.assertRegex(error["description"], f"^Orlo Export Failed due to - Data Upload to server failed with Reason "
+                                               f"--> PUT {DATA_STORE}/v1/exports/.*\\.json: HTTP status 403$")
+        self.store.nginx.stop()
+        reason = f"Trust Object Copy from Server failed with Reason --> GET {TRUST_URL}: Failed to connect to "
+        for words, prefix, code in ((["get-psd2", "/tmp/out"], " ", 1008),
+                                    (["export"], "Orlo Export Failed due to - ", 2007)):
+            error = self.answer(*words)[2]
+            self.assertEqual((error["code"], error["description"].startswith(prefix + reason)), (code, True), error)
+        self.assertEqual(self.store.stored(), {"v2/records/psd2/VAN0001": b"record"})
+
+    def test_a_put_repeated_after_a_broken_connection_leaves_one_whole_record(self):
+        cutter = Cutter(self.store.store_port, after=300_000)
+        self.addCleanup(cutter.close)
+        record = os.urandom(2 << 20)
+        for attempts, outcome in ((1, TRANSPORT), (2, 0)):
+            cutter.cuts = 1
+            session = self.session(HTTPMaxAttempts=attempts)
+            session.describe(self.store.describe(session.root, connectTo={
+                f"{HOST}:8443": f"127.0.0.1:{cutter.port}", f"{CA_HOST}:8443": f"127.0.0.1:{self.store.store_port}"}))
+            session.open(HTTPMaxAttempts=attempts)
+            self.assertEqual(session.put("S1", record)[0], outcome)
+            self.assertEqual(cutter.cuts, 0)
+            self.assertEqual(self.store.stored(), {"v1/records/psd2/S1": record} if outcome == 0 else {})
+
+    def test_the_session_says_which_requests_pass_through_the_devices_proxy(self):
+        proxy = ForwardProxy(self.store.folder)
+        self.addCleanup(proxy.close)
+        session = self.session()
+        settings = {"HTTPEnable": 1, "HTTPProxy": "127.0.0.1", "HTTPPort": proxy.port,
+                    "HTTPSEnable": 1, "HTTPSProxy": "127.0.0.1", "HTTPSPort": proxy.port}
+        session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings})
+        for options, tunnels in (({}, 0), ({"EnableProxy": True}, 1), ({"EnableProxySsl": "ForHttps"}, 0),
+                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 2)):
+            with self.subTest(options):
+                session.open(**options)
+                self.assertEqual(session.run("trust", TRUST_URL), (0, ""))
+                self.assertEqual(session.put("S1"), (0, ""))
+                self.assertEqual(proxy.tunnels(), tunnels)
+        proxy.close()
+        session.open(EnableProxy=True)
+        self.assertEqual(session.run("trust", TRUST_URL)[0], TRANSPORT)
+        session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings | {"HTTPProxy": ""}})
+        session.open(EnableProxy=True)
+        self.assertEqual(session.run("trust", TRUST_URL),
+                         (TRANSPORT, f"GET {TRUST_URL}: The proxy description names no host and port"))
+
+
+class ObjectStore(RemoteTest, StoreCases):
+    @classmethod
+    def setUpClass(cls):
+        cls.swift = SwiftStore()
+        cls.addClassCleanup(cls.swift.close)
+
+    def setUp(self):
+        self.swift.use_bucket(f"orlo-records-{os.urandom(4).hex()}")
+        self.start(self.swift)
+
+    def test_records(self):
+        self.check_records()
+
+    def test_export(self):
+        self.check_export()
+
+    def test_names(self):
+        self.check_names([*NAMES, "x" * 512])
+
+    def test_two_services(self):
+        self.check_two_services()
+
+    def test_a_request_that_is_not_signed_as_it_should_be_stores_nothing(self):
+        tampering = HostileServer(*self.store.authority.certify("tampering"), TRUST_OBJECT)
+        self.addCleanup(tampering.close)
+        key = self.service.root / "store-key"
+
+        def with_secret(secret):
+            key.write_text(f"{self.store.access_key}\n{secret}\n")
+
+        self.describe(self.service, s3={"region": "mars-1"})
+        self.assertEqual(self.error_of_get()[0], TRANSPORT)
+        self.assertEqual(self.put(b"x")[2]["code"], 1011)
+        self.assertIn("HTTP status 400 AuthorizationHeaderMalformed", self.answer("export")[2]["description"])
+        self.describe(self.service)
+        with_secret("guessed")
+        code, text = self.error_of_get()
+        self.assertEqual((code, text.split(": ")[1]), (NOT_PERMITTED, "HTTP status 403 SignatureDoesNotMatch"))
+        self.assertEqual(self.put(b"x")[2]["code"], 1011)
+        self.assertIn("HTTP status 403 SignatureDoesNotMatch", self.answer("export")[2]["description"])
+        self.describe(self.service, vanter=f"tamper-{self.store.values['PROXY']}", connectTo={
+            f"{HOST}:8443": f"127.0.0.1:{tampering.server_port}", f"{CA_HOST}:8080": f"127.0.0.1:{self.store.ca_port}"})
+        lines = self.service.messages_of(lambda: self.assertEqual(self.put(b"x")[2]["code"], 1011))
+        self.assertTrue(any("HTTP status 400" in line for line in lines), lines)
+        self.describe(self.service, s3={"bucket": "no-such-bucket"})
+        code, text = self.error_of_get()
+        self.assertEqual((code, text.split(": ")[1]), (TRANSPORT, "HTTP status 404 NoSuchBucket"))
+        self.assertEqual(self.store.stored(), {})
+
+
+class Refusals(RemoteTest):
+    """Servers that are not who they should be."""
+
+    def test_a_certificate_that_does_not_hold_is_a_failure_that_says_why(self):
+        for certificate, reason in (
+            ({"hosts": ("elsewhere.example",)}, "no alternative certificate subject name matches"),
+            ({"days": -1}, "certificate has expired"),
+            ({}, "self-signed certificate|unable to get local issuer certificate"),
+        ):
+            with self.subTest(certificate):
+                store = NginxStore(**certificate)
+                self.addCleanup(store.close)
+                self.start(store)
+                if not certificate:
+                    self.describe(self.service, caFile=None)
+                code, text = self.error_of_get()
+                self.assertEqual(code, TRANSPORT)
+                self.assertRegex(text, f"^GET {DATA_STORE}/v2/records/psd2/VAN0001: .*({reason})")
+                self.assertEqual(self.put(b"x")[2]["code"], 1011)
+                self.assertRegex(self.answer("export")[2]["description"], f"with Reason --> PUT .*({reason})")
+                self.assertEqual(self.store.stored(), {})
+                self.assertEqual([line for line in self.store.requests() if line[1] != "/orlotrustobject"], [])
+
+
+class Failures(RemoteTest):
+    """Servers that misbehave; every exchange ends in bounded time and memory."""
+
+    def setUp(self):
+        self.folder = tempfile.TemporaryDirectory(prefix="veltra-hostile-")
+        self.addCleanup(self.folder.cleanup)
+        authority = Authority(pathlib.Path(self.folder.name))
+        self.server = HostileServer(*authority.certify("store"), TRUST_OBJECT)
+        self.addCleanup(self.server.close)
+        self.store = self
+        self.authority = authority
+
+    def describe(self, root):
+        (root / "ca.pem").write_bytes(self.authority.certificate.read_bytes())
+        here = f"127.0.0.1:{self.server.server_port}"
+        return {"backend": "remote", "caFile": "/ca.pem",
+                "connectTo": {f"{HOST}:8443": here, f"{CA_HOST}:8443": here}}
+
+    def test_each_misbehaviour_is_an_error_with_its_reason(self):
+        hasty, patient = self.session(HTTPTimeout=1), self.session(HTTPTimeout=60)
+        both = (
+            ("status-401", NOT_PERMITTED, "HTTP status 401"),
+            ("status-403-AccessDenied", NOT_PERMITTED, "HTTP status 403 AccessDenied"),
+            ("status-403-\u2028<", NOT_PERMITTED, "HTTP status 403"),
+            ("status-404-NoSuchBucket", TRANSPORT, "HTTP status 404 NoSuchBucket"),
+            ("status-301", TRANSPORT, "HTTP status 301"),
+            ("status-307", TRANSPORT, "HTTP status 307"),
+            ("status-206", TRANSPORT, "HTTP status 206"),
+            ("status-503", TRANSPORT, "HTTP status 503"),
+            ("stall", TRANSPORT, "timed out"),
+            ("trickle", TRANSPORT, "timed out"),
+            ("headers_", TRANSPORT, "The answer has too many headers"),
+            ("half", TRANSPORT, "closed"),
+            ("noise", TRANSPORT, "HTTP/0.9"),
+            ("endless-500", TRANSPORT, "HTTP status 500"),
+        )
+        rows = [("get", *row) for row in both] + [("put", *row) for row in both] + [
+            ("get", "status-404", NO_SUCH_RECORD, "HTTP status 404"),
+            ("put", "status-404", TRANSPORT, "HTTP status 404"),
+            ("get", "status-204", TRANSPORT, "HTTP status 204"),
+            ("get", "endless", TRANSPORT, "larger than 67108864 bytes"),
+            ("get", "announced", TRANSPORT, "larger than 67108864 bytes"),
+            ("put", "endless", TRANSPORT, "larger than 1048576 bytes"),
+            ("put", "mid", TRANSPORT, ""),
+        ]
+        for verb, behaviour, code, reason in rows:
+            with self.subTest((verb, behaviour)):
+                begin = time.monotonic()
+                session = hasty if reason == "timed out" else patient
+                if verb == "get":
+                    result, text = session.get(behaviour)
+                else:
+                    result, text = session.put(behaviour, bytes(4 << 20))
+                self.assertEqual(result, code, text)
+                name = urllib.parse.quote(behaviour, safe="")
+                self.assertTrue(text.startswith(f"{verb.upper()} {DATA_STORE}/v1/records/psd2/{name}: "), text)
+                self.assertIn(reason, text)
+                self.assertLess(time.monotonic() - begin, 30)
+        self.assertEqual({path for _, path in self.server.seen if path.endswith("plain")}, set(), "was redirected")
+        self.assertEqual((hasty.get("plain"), patient.get("plain")), ((0, ""), (0, "")))
+        self.assertLess(patient.peak_megabytes(), 200)
+
+    def test_only_what_may_pass_is_tried_again_and_only_so_often(self):
+        rows = (
+            ({}, "busy-1", TRANSPORT, 1),
+            ({}, "broken-1", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": 3}, "busy-2", 0, 3),
+            ({"HTTPMaxAttempts": 3}, "broken-2", 0, 3),
+            ({"HTTPMaxAttempts": 2}, "busy-3", TRANSPORT, 2),
+            ({"HTTPMaxAttempts": 2}, "broken-3", TRANSPORT, 2),
+            ({"HTTPMaxAttempts": 3}, "status-404", NO_SUCH_RECORD, 1),
+            ({"HTTPMaxAttempts": 3}, "status-403", NOT_PERMITTED, 1),
+            ({"HTTPMaxAttempts": 3}, "status-307", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": 3}, "announced", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": 0}, "busy-4", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": -5, "HTTPTimeout": -5}, "busy-5", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": True, "HTTPTimeout": True}, "busy-6", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": "9", "HTTPTimeout": "9"}, "busy-7", TRANSPORT, 1),
+            ({"HTTPMaxAttempts": 2**63 - 1, "HTTPTimeout": 2**63 - 1}, "busy-2-x", 0, 3),
+        )
+        session = self.session()
+        for options, behaviour, code, requests in rows:
+            with self.subTest((options, behaviour)):
+                session.open(**options)
+                before = len(self.server.seen)
+                self.assertEqual(session.get(behaviour)[0], code)
+                seen = [line for line in self.server.seen[before:] if line[1].endswith(behaviour)]
+                self.assertEqual(len(seen), requests)
+        session.open(HTTPMaxAttempts=4, MultiRequestMaxAttempts=3)
+        for failing, code in ((2, 0), (3, TRANSPORT)):
+            session.put("plain")  # fetches the trust object
+            before = len(self.server.seen)
+            self.server.failing = failing
+            self.assertEqual(session.run("export", ["psd2"], ["S1"])[0], code)
+            seen = self.server.seen[before:]
+            self.assertEqual((len(seen), len(set(seen))), (3, 1), "each attempt is for the same export")
+
+    def test_a_connection_that_the_server_ended_is_made_again(self):
+        session = self.session()
+        for behaviour in ("plain", "idle", "plain", "idle", "plain"):
+            self.assertEqual((session.put(behaviour), session.get(behaviour)), ((0, ""), (0, "")))
+
+    def test_the_trust_object_is_checked_before_anything_is_sent(self):
+        url = f"https://{CA_HOST}:8443/"
+        session = self.session(HTTPTimeout=3)
+        for behaviour, code in (("orlotrustobject", 0), ("status-404", TRANSPORT), ("status-200-x", 0),
+                                ("status-403", TRANSPORT), ("endless", TRANSPORT), ("stall", TRANSPORT)):
+            self.assertEqual(session.run("trust", url + behaviour)[0], code, behaviour)
+        self.server.trust_object = b""
+        self.assertEqual(session.run("trust", url), (TRANSPORT, f"GET {url}: The trust object is empty"))
+        self.server.trust_object = b"another one"
+        session.open()
+        self.assertEqual(session.put("plain")[0], 2)
+        for other in ("ftp://h/x", "file:///etc/hostname", "no url", "", "http://user:secret@h/"):
+            self.assertEqual(session.run("trust", other)[0], TRANSPORT, other)
+            self.assertNotIn("secret", session.run("trust", other)[1])
+        self.server.trust_object = TRUST_OBJECT
+        for other in ("http://" + HOST + ":8443", "https://user:secret@h:8443", "HTTPS", "", 7, None):
+            session.open(DSURL=other)
+            code, text = session.put("plain")
+            self.assertEqual(code, TRANSPORT, other)
+            self.assertNotIn("secret", text)
+        self.assertEqual([line for line in self.server.seen if line[0] == "PUT"], [])
+
+
+if __name__ == "__main__":
+    unittest.main()
