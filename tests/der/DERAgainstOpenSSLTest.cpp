@@ -1,18 +1,15 @@
 // What another implementation says about the same octets.
 #include <climits>
-#include <memory>
 #include <random>
 
 #include <gtest/gtest.h>
 #include <openssl/asn1.h>
-#include <openssl/evp.h>
-#include <openssl/rsa.h>
-#include <openssl/x509.h>
 
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "der/DERItemSpecs.h"
 #include "tests/der/Bytes.h"
+#include "tests/support/CertificateMaker.h"
 
 namespace {
 
@@ -88,131 +85,74 @@ TEST(DERAgainstOpenSSL, randomItemsAreWrittenAlikeAndReadBack) {
     }
 }
 
-struct Free {
-    void operator()(EVP_PKEY* key) const { EVP_PKEY_free(key); }
-    void operator()(X509* certificate) const { X509_free(certificate); }
-};
-using Key = std::unique_ptr<EVP_PKEY, Free>;
-using Certificate = std::unique_ptr<X509, Free>;
-
-template <typename Object>
-Bytes encodingOf(const Object* object, int (*encode)(const Object*, unsigned char**)) {
-    Bytes der(static_cast<std::size_t>(encode(object, nullptr)));
-    unsigned char* next = der.data();
-    encode(object, &next);
-    return der;
-}
-
-void addExtension(X509* certificate, int nid, bool critical) {
-    ASN1_OCTET_STRING* value = ASN1_OCTET_STRING_new();
-    ASN1_OCTET_STRING_set(value, reinterpret_cast<const unsigned char*>("\x03\x02\x02\x04"), 4);
-    X509_EXTENSION* extension = X509_EXTENSION_create_by_NID(nullptr, nid, critical ? 1 : 0, value);
-    X509_add_ext(certificate, extension, -1);
-    X509_EXTENSION_free(extension);
-    ASN1_OCTET_STRING_free(value);
-}
-
-Certificate selfSigned(EVP_PKEY* key) {
-    Certificate certificate(X509_new());
-    X509_set_version(certificate.get(), X509_VERSION_3);
-    ASN1_INTEGER_set(X509_get_serialNumber(certificate.get()), 0x123456);
-    X509_gmtime_adj(X509_getm_notBefore(certificate.get()), 0);
-    X509_gmtime_adj(X509_getm_notAfter(certificate.get()), 3600);
-    X509_set_pubkey(certificate.get(), key);
-    X509_NAME_add_entry_by_txt(X509_get_subject_name(certificate.get()), "CN", MBSTRING_ASC,
-                               reinterpret_cast<const unsigned char*>("Bench"), -1, -1, 0);
-    X509_set_issuer_name(certificate.get(), X509_get_subject_name(certificate.get()));
-    addExtension(certificate.get(), NID_key_usage, true);
-    addExtension(certificate.get(), NID_subject_key_identifier, false);
-    X509_sign(certificate.get(), key, EVP_sha256());
-    return certificate;
-}
-
-// The items of the first SEQUENCE inside `content`, by a table.
+// What `specs` make of the items in `content`.
 template <typename Record>
-DERReturn parseInner(const DERItem& content, std::uint16_t count, const DERItemSpec* specs, Record* record) {
-    return DERParseSequenceToObject(&content, count, specs, record, sizeof *record, sizeof *record);
+Record parsed(const DERItem& content, std::uint16_t count, const DERItemSpec* specs) {
+    Record record;
+    EXPECT_EQ(DERParseSequenceContent(&content, count, specs, &record, sizeof record), DERSuccess);
+    return record;
+}
+
+// The content of the first item in `items`, all of which is consumed.
+DERItem takeContent(DERItem* items) {
+    DERDecodedInfo first;
+    EXPECT_EQ(DERDecodeItem(items, &first), DERSuccess);
+    const std::uint8_t* const end = first.content.data + first.content.length;
+    *items = {end, items->length - static_cast<std::uint64_t>(end - items->data)};
+    return first.content;
 }
 
 TEST(DERAgainstOpenSSL, certificateIsTakenApartByTheTables) {
-    const Key key(EVP_RSA_gen(1024));
-    const Certificate certificate = selfSigned(key.get());
-    const Bytes der = encodingOf<X509>(certificate.get(), i2d_X509);
-
-    DERSignedCertCrl signedPart;
-    ASSERT_EQ(parseInner(itemOf(der), DERNumSignedCertCrlItemSpecs, DERSignedCertCrlItemSpecs, &signedPart),
-              DERSuccess);
-    DERTBSCert tbs;
-    ASSERT_EQ(parseInner(signedPart.tbs, DERNumTBSCertItemSpecs, DERTBSCertItemSpecs, &tbs), DERSuccess);
+    const Bytes der = certificatemaker::module({0x12, 0x34, 0x56}, certificatemaker::KeyKind::RSA2048).certificate;
+    DERItem rest = itemOf(der);
+    auto signedPart =
+        parsed<DERSignedCertCrl>(takeContent(&rest), DERNumSignedCertCrlItemSpecs, DERSignedCertCrlItemSpecs);
+    auto tbs = parsed<DERTBSCert>(takeContent(&signedPart.tbs), DERNumTBSCertItemSpecs, DERTBSCertItemSpecs);
     EXPECT_EQ(hexOf(tbs.version), "02 01 02");
     EXPECT_EQ(hexOf(tbs.serialNumber), "12 34 56");
     EXPECT_EQ(hexOf(tbs.issuer), hexOf(tbs.subject));
-    EXPECT_EQ(tbs.issuerUniqueID.data, nullptr);
-    EXPECT_EQ(tbs.subjectUniqueID.data, nullptr);
+    EXPECT_EQ(hexOf(tbs.issuerUniqueID), "absent");
+    EXPECT_EQ(hexOf(tbs.subjectUniqueID), "absent");
 
-    DERSequence names;
-    DERDecodedInfo name;
-    DERDecodeSeqContentInit(&tbs.subject, &names);
-    ASSERT_EQ(DERDecodeSeqNext(&names, &name), DERSuccess);
-    DERAttributeTypeAndValue attribute;
-    ASSERT_EQ(
-        parseInner(name.content, DERNumAttributeTypeAndValueItemSpecs, DERAttributeTypeAndValueItemSpecs, &attribute),
-        DERSuccess);
+    DERItem names = takeContent(&tbs.subject);
+    const auto attribute = parsed<DERAttributeTypeAndValue>(takeContent(&names), DERNumAttributeTypeAndValueItemSpecs,
+                                                            DERAttributeTypeAndValueItemSpecs);
     EXPECT_EQ(hexOf(attribute.type), "55 04 03");
-    EXPECT_EQ(hexOf(attribute.value), "0C 05 42 65 6E 63 68");
+    EXPECT_EQ(hexOf(attribute.value), "0C 06 4D 6F 64 75 6C 65");
 
-    DERAlgorithmId algorithm;
-    ASSERT_EQ(DERParseSequenceContent(&signedPart.signatureAlgorithm, DERNumAlgorithmIdItemSpecs,
-                                      DERAlgorithmIdItemSpecs, &algorithm, sizeof algorithm),
-              DERSuccess);
+    const auto algorithm =
+        parsed<DERAlgorithmId>(signedPart.signatureAlgorithm, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs);
     EXPECT_EQ(hexOf(algorithm.algorithm), "2A 86 48 86 F7 0D 01 01 0B");
     EXPECT_EQ(hexOf(algorithm.parameters), "05 00");
 
-    DERTag tag = 0;
-    DERSequence extensions;
-    ASSERT_EQ(DERDecodeSeqInit(&tbs.extensions, &tag, &extensions), DERSuccess);
-    const struct {
-        const char* id;
-        const char* critical;
-    } expected[] = {{"55 1D 0F", "FF"}, {"55 1D 0E", "absent"}};
-    for (const auto& row : expected) {
-        DERDecodedInfo item;
-        ASSERT_EQ(DERDecodeSeqNext(&extensions, &item), DERSuccess);
-        DERExtension extension;
-        ASSERT_EQ(DERParseSequenceContent(&item.content, DERNumExtensionItemSpecs, DERExtensionItemSpecs, &extension,
-                                          sizeof extension),
-                  DERSuccess);
-        EXPECT_EQ(hexOf(extension.extensionID), row.id);
-        EXPECT_EQ(hexOf(extension.critical), row.critical);
-        EXPECT_EQ(hexOf(extension.value), "03 02 02 04");
+    DERItem extensions = takeContent(&tbs.extensions);
+    for (const char* expected : {"55 1D 0F | FF | 03 02 07 80", "55 1D 13 | absent | 30 00"}) {
+        const auto extension =
+            parsed<DERExtension>(takeContent(&extensions), DERNumExtensionItemSpecs, DERExtensionItemSpecs);
+        EXPECT_EQ(hexOf(extension.extensionID) + " | " + hexOf(extension.critical) + " | " + hexOf(extension.value),
+                  expected);
     }
-}
 
-TEST(DERAgainstOpenSSL, publicKeyIsReadAndWrittenAlike) {
-    const Key key(EVP_RSA_gen(1024));
-    const Bytes spki = encodingOf<EVP_PKEY>(key.get(), i2d_PUBKEY);
-    DERSubjPubKeyInfo info;
-    ASSERT_EQ(parseInner(itemOf(spki), DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info), DERSuccess);
+    const auto info =
+        parsed<DERSubjPubKeyInfo>(tbs.subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs);
     DERItem bits;
     std::uint8_t unused = 0;
     ASSERT_EQ(DERParseBitString(&info.publicKey, &bits, &unused), DERSuccess);
     EXPECT_EQ(unused, 0);
-    EXPECT_EQ(hexOf(bits), hexOf(encodingOf<EVP_PKEY>(key.get(), i2d_PublicKey)));
-
-    DERRSAPubKeyPKCS1 numbers;
-    ASSERT_EQ(parseInner(bits, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs, &numbers), DERSuccess);
-    EXPECT_EQ(hexOf(numbers.publicExponent), "01 00 01");
-    ASSERT_EQ(numbers.modulus.length, 129U);
-    EXPECT_EQ(numbers.modulus.data[0], 0x00);
+    const std::string encodedKey = hexOf(bits);
+    auto key = parsed<DERRSAPubKeyPKCS1>(takeContent(&bits), DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs);
+    EXPECT_EQ(hexOf(key.publicExponent), "01 00 01");
+    ASSERT_EQ(key.modulus.length, 257U);
+    EXPECT_EQ(key.modulus.data[0], 0x00);
 
     // The bare number, whose highest bit is set, is written with the zero octet again.
-    numbers.modulus = {numbers.modulus.data + 1, 128};
-    Bytes written(bits.length);
+    key.modulus = {key.modulus.data + 1, 256};
+    Bytes written(512);
     std::uint64_t length = written.size();
-    ASSERT_EQ(DEREncodeSequence(DERTagSequence, &numbers, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs,
+    ASSERT_EQ(DEREncodeSequence(DERTagSequence, &key, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs,
                                 written.data(), &length),
               DERSuccess);
-    EXPECT_EQ(hexOf(written), hexOf(bits));
+    EXPECT_EQ(hexOf(written.data(), length), encodedKey);
 }
 
 } // namespace

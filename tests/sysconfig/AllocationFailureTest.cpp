@@ -185,7 +185,7 @@ TEST(AllocationFailure, makesANewObjectNone) {
         };
         EXPECT_TRUE(!run(failing, make) || sysConfig3IsValidHMAC(object.get()));
     });
-    // The object, two manifests of three HMACs, the hmacKey, and the computed HMACs.
+    // The object, two manifests of three HMACs, the key, and the computed HMACs.
     EXPECT_GE(failures, 1 + 2 * 4 + 1 + 3);
 }
 
