@@ -1,9 +1,5 @@
-// What another implementation says about the same octets.
-#include <climits>
-#include <random>
-
+// The tables, on a certificate that another implementation made.
 #include <gtest/gtest.h>
-#include <openssl/asn1.h>
 
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
@@ -12,78 +8,6 @@
 #include "tests/support/CertificateMaker.h"
 
 namespace {
-
-constexpr int classOf(DERTag tag) {
-    return static_cast<int>(tag >> 62 << 6);
-}
-constexpr int formOf(DERTag tag) {
-    return static_cast<int>(tag >> 61 & 1) * V_ASN1_CONSTRUCTED;
-}
-
-// OpenSSL reads the wider BER, so it need not refuse what we refuse; but what we accept it must read alike.
-void expectReadAlike(const Bytes& input, const DERDecodedInfo& decoded) {
-    const DERTag number = decoded.tag & DERTagNumberMask;
-    if (number > INT_MAX)
-        return;
-    const unsigned char* next = input.data();
-    long length = 0;
-    int tag = 0;
-    int tagClass = 0;
-    const int form = ASN1_get_object(&next, &length, &tag, &tagClass, static_cast<long>(input.size()));
-    ASSERT_EQ(form & 0x80, 0) << hexOf(input);
-    EXPECT_EQ(form, formOf(decoded.tag)) << hexOf(input);
-    EXPECT_EQ(static_cast<DERTag>(tag), number) << hexOf(input);
-    EXPECT_EQ(tagClass, classOf(decoded.tag)) << hexOf(input);
-    EXPECT_EQ(static_cast<std::uint64_t>(length), decoded.content.length) << hexOf(input);
-    EXPECT_EQ(next, decoded.content.data) << hexOf(input);
-}
-
-// A header is octets that matter to the decoder more often than chance would have it.
-TEST(DERAgainstOpenSSL, randomHeadersAreReadAlike) {
-    constexpr std::uint8_t telling[] = {0x00, 0x01, 0x1E, 0x1F, 0x7F, 0x80, 0x81, 0x82, 0x83, 0x84, 0x88, 0xFF};
-    std::mt19937_64 random(20240607);
-    int accepted = 0;
-    for (int round = 0; round < 100'000; ++round) {
-        Bytes input(1 + random() % 12 + (random() % 8 == 0 ? 300 : 0));
-        for (std::uint8_t& octet : input)
-            octet = random() % 3 == 0 ? static_cast<std::uint8_t>(random()) : telling[random() % sizeof telling];
-        const DERItem der = itemOf(input);
-        DERDecodedInfo decoded;
-        if (DERDecodeItem(&der, &decoded) != DERSuccess)
-            continue;
-        ++accepted;
-        expectReadAlike(input, decoded);
-    }
-    EXPECT_GT(accepted, 10'000);
-}
-
-TEST(DERAgainstOpenSSL, randomItemsAreWrittenAlikeAndReadBack) {
-    std::mt19937_64 random(20240608);
-    for (int round = 0; round < 5'000; ++round) {
-        const DERTag tag = (random() & ~DERTagNumberMask) | (random() >> (33 + random() % 31));
-        Bytes content((random() & 0xFFFF) >> (random() % 17));
-        for (std::uint8_t& octet : content)
-            octet = static_cast<std::uint8_t>(random());
-
-        const auto number = static_cast<int>(tag & DERTagNumberMask);
-        const auto length = static_cast<int>(content.size());
-        Bytes expected(static_cast<std::size_t>(ASN1_object_size(0, length, number)));
-        unsigned char* next = expected.data();
-        ASN1_put_object(&next, formOf(tag) != 0 ? 1 : 0, length, number, classOf(tag));
-        std::copy(content.begin(), content.end(), next);
-
-        Bytes encoded(DERLengthOfItem(tag, content.size()));
-        std::uint64_t written = encoded.size();
-        ASSERT_EQ(DEREncodeItem(tag, content.size(), content.data(), encoded.data(), &written), DERSuccess);
-        ASSERT_EQ(encoded, expected);
-
-        const DERItem der = itemOf(encoded);
-        DERDecodedInfo decoded;
-        ASSERT_EQ(DERDecodeItem(&der, &decoded), DERSuccess);
-        EXPECT_EQ(decoded.tag, tag);
-        EXPECT_EQ(Bytes(decoded.content.data, decoded.content.data + decoded.content.length), content);
-    }
-}
 
 // What `specs` make of the items in `content`.
 template <typename Record>
@@ -102,7 +26,7 @@ DERItem takeContent(DERItem* items) {
     return first.content;
 }
 
-TEST(DERAgainstOpenSSL, certificateIsTakenApartByTheTables) {
+TEST(DERItemSpecs, takeACertificateApart) {
     const Bytes der = certificatemaker::module({0x12, 0x34, 0x56}, certificatemaker::KeyKind::RSA2048).certificate;
     DERItem rest = itemOf(der);
     auto signedPart =
