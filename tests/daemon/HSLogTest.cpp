@@ -80,17 +80,14 @@ protected:
 TEST(HSLogTimestamp, carriesTheLocalTimeOnATwelveHourClock) {
     ::setenv("TZ", "UTC-2", 1); // two hours ahead of UTC
     ::tzset();
-    const struct {
-        std::time_t time;
-        const char* expected;
-    } rows[] = {
+    const std::pair<std::time_t, const char*> rows[] = {
         {1709640309, "2024-03-05 02:05:09"}, // 14:05:09
         {1709589600, "2024-03-05 12:00:00"}, // 00:00:00
         {1709632800, "2024-03-05 12:00:00"}, // 12:00:00
         {1704063599, "2024-01-01 12:59:59"}, // 00:59:59, still the old year in UTC
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(logTimestamp(row.time), row.expected);
+    for (const auto& [time, expected] : rows)
+        EXPECT_EQ(logTimestamp(time), expected);
     ::unsetenv("TZ");
     ::tzset();
 }

@@ -70,10 +70,7 @@ TEST(DERItem, isDecodedAlikeByAllThreeDecodersAndCutOffOnlyAsAPart) {
 }
 
 TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
-    const struct {
-        const char* why;
-        const char* der;
-    } rows[] = {
+    const std::pair<const char*, const char*> rows[] = {
         {"nothing", ""},
         {"no length", "05"},
         {"high tag without a digit and length", "1F 1F"},
@@ -94,9 +91,9 @@ TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
         {"all length octets missing", "04 81"},
         {"length octets missing after a high tag", "1F 1F 82 01"},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.why);
-        const Bytes input = bytes(row.der);
+    for (const auto& [why, octets] : rows) {
+        SCOPED_TRACE(why);
+        const Bytes input = bytes(octets);
         const DERItem der = itemOf(input);
         DERDecodedInfo decoded;
         std::uint64_t declared = 0;

@@ -200,14 +200,12 @@ TEST(Decode, keepsTheLastOfSeveralEntriesWithOneKey) {
 }
 
 TEST(Decode, replacesAnEmptyCommentAndKeepsOthers) {
-    const struct {
-        const char* comment;
-        const char* stored;
-    } rows[] = {{"", "."}, {"6E 6F 74 65", "note"}, {"00 61", "."}, {"61 00 62", "a"}};
-    for (const auto& row : rows) {
+    const std::pair<const char*, const char*> rows[] = {
+        {"", "."}, {"6E 6F 74 65", "note"}, {"00 61", "."}, {"61 00 62", "a"}};
+    for (const auto& [comment, stored] : rows) {
         const SysConfig3Ptr object =
-            decodeParts({.payload = setOf({payloadEntry(someData, "30 68 43 57", bytes(row.comment))})});
-        EXPECT_STREQ(sysConfig3PayloadEntryGetComment(sysConfig3GetHeadPayloadEntry(object.get())), row.stored);
+            decodeParts({.payload = setOf({payloadEntry(someData, "30 68 43 57", bytes(comment))})});
+        EXPECT_STREQ(sysConfig3PayloadEntryGetComment(sysConfig3GetHeadPayloadEntry(object.get())), stored);
     }
 }
 

@@ -83,16 +83,13 @@ TEST(Encode, refusesWhatExceeds32BitsOfLengthBeforeItAllocates) {
 // Records that only a fault could make.
 
 TEST(EncodeOfABrokenRecord, raisesAnExceptionAndPrefersDataThenAString) {
-    const struct {
-        sysconfig::Bytes data;
-        const char* list;
-    } rows[] = {{{keyBytes, 1}, "WCh0=data 6B"}, {{}, "WCh0=string text"}};
-    for (const auto& row : rows) {
+    const std::pair<sysconfig::Bytes, const char*> rows[] = {{{keyBytes, 1}, "WCh0=data 6B"}, {{}, "WCh0=string text"}};
+    for (const auto& [data, list] : rows) {
         const SysConfig3Ptr object = newObject();
         object->payload.appendWithoutIndex(
-            sysconfig::makeEntry(sysconfig::PayloadContent{keyWCh0, "c", row.data, "text", true}));
+            sysconfig::makeEntry(sysconfig::PayloadContent{keyWCh0, "c", data, "text", true}));
         const Recorder recorder;
-        EXPECT_EQ(payloadOf(decode(encode(object))), row.list);
+        EXPECT_EQ(payloadOf(decode(encode(object))), list);
         EXPECT_EQ(Recorder::formats,
                   Lines{"!_createDEREncodeSysConfigPayloadEntries: sysconfig payload entry must have exactly one of "
                         "data/string/deleted set. data: %p string: %p deleted: %d"});
@@ -112,17 +109,14 @@ TEST(EncodeOfABrokenRecord, refusesAPayloadEntryWithoutAValue) {
 }
 
 TEST(EncodeOfABrokenRecord, refusesAMetadataEntryWithoutExactlyOneValue) {
-    const struct {
-        sysconfig::MetadataContent content;
-        const char* exception;
-    } rows[] = {
+    const std::pair<sysconfig::MetadataContent, const char*> rows[] = {
         {{"k", {keyBytes, 1}, "text"}, "sysconfig metadata entry cannot have both string and data fields populated!"},
         {{"k", {}, {}}, "sysconfig metadata entry must have EITHER string OR data fields populated!"},
     };
-    for (const auto& row : rows) {
+    for (const auto& [content, exception] : rows) {
         const SysConfig3Ptr object = newObject();
-        object->metadata.appendWithoutIndex(sysconfig::makeEntry(row.content));
-        expectRefusal(object, {std::string("!_createDEREncodeSysConfigMetadataEntries: ") + row.exception,
+        object->metadata.appendWithoutIndex(sysconfig::makeEntry(content));
+        expectRefusal(object, {std::string("!_createDEREncodeSysConfigMetadataEntries: ") + exception,
                                "_freeDEREncodeSysConfigMetadataEntries: DERMetadata is NULL"});
     }
 }

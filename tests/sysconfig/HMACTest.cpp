@@ -132,17 +132,14 @@ TEST(HMACKey, makesAnObjectThatIsNewStaleOrValid) {
 }
 
 TEST(HMAC, tellsWhichStoredValueDoesNotMatch) {
-    const struct {
-        SysConfigData __SysConfig3ManifestEntry::*hmac;
-        const char* line;
-    } rows[] = {
+    const std::pair<SysConfigData __SysConfig3ManifestEntry::*, const char*> rows[] = {
         {&__SysConfig3ManifestEntry::payloadHMAC, "sysConfig3IsValidHMAC: Payload HMAC does not match."},
         {&__SysConfig3ManifestEntry::metadataHMAC, "sysConfig3IsValidHMAC: Metadata HMAC does not match."},
         {&__SysConfig3ManifestEntry::fullHMAC, "sysConfig3IsValidHMAC: Full HMAC does not match."},
     };
-    for (const auto& row : rows) {
+    for (const auto& [hmac, line] : rows) {
         const SysConfig3Ptr object = keyedObject();
-        SysConfigData& stored = object->manifest->*row.hmac;
+        SysConfigData& stored = object->manifest->*hmac;
         const Recorder recorder;
         stored.data[31] ^= 1;
         EXPECT_FALSE(sysConfig3IsValidHMAC(object.get()));
@@ -153,7 +150,7 @@ TEST(HMAC, tellsWhichStoredValueDoesNotMatch) {
         std::free(stored.data);
         stored = {};
         EXPECT_FALSE(sysConfig3IsValidHMAC(object.get()));
-        EXPECT_EQ(Recorder::lines, (Lines{row.line, row.line, row.line}));
+        EXPECT_EQ(Recorder::lines, (Lines{line, line, line}));
     }
 }
 
