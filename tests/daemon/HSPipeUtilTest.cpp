@@ -5,6 +5,7 @@
 #include <csignal>
 #include <cstring>
 #include <filesystem>
+#include <regex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -40,26 +41,13 @@ std::string text(int number) {
     return std::string(std::strerror(number)) + "\n";
 }
 
-// `line` with a star in place of the hexadecimal or decimal number behind the first `mark`.
-std::string withoutNumber(const std::string& line, std::string_view mark) {
-    const std::size_t start = line.find(mark);
-    if (start == std::string::npos)
-        return line;
-    const std::size_t number = start + mark.size();
-    const std::size_t end = std::min(line.find_first_not_of("0123456789abcdefx", number), line.size());
-    return line.substr(0, number) + "*" + line.substr(end);
-}
-
-// The recorded lines of HSPipeUtil, without what differs from run to run. Those of level 2 come without their
-// beginning.
+// The recorded lines of HSPipeUtil, with a star in place of line numbers and addresses. Those of level 2 come without
+// their beginning.
 Lines log() {
-    constexpr std::string_view info = "2 [HSPipeUtil] ";
+    static const std::regex info("^2 \\[HSPipeUtil\\] "), number("(at line |program \\()[0-9a-fx]+");
     Lines lines;
-    for (const std::string& line : recordedLog()) {
-        lines.push_back(withoutNumber(withoutNumber(line, "at line "), "program ("));
-        if (line.starts_with(info))
-            lines.back().erase(0, info.size());
-    }
+    for (const std::string& line : recordedLog())
+        lines.push_back(std::regex_replace(std::regex_replace(line, info, ""), number, "$1*"));
     return lines;
 }
 

@@ -69,10 +69,6 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
          {"allocSysConfig3: invalid version provided 0x00030004",
           "Unable to allocate sysconfig3vX object. Likely due to an unsupported magic: 0x62436667 or version: "
           "0x30004"}},
-        {"no version",
-         version(""),
-         {"allocSysConfig3: invalid version provided 0x00000000",
-          "Unable to allocate sysconfig3vX object. Likely due to an unsupported magic: 0x62436667 or version: 0x0"}},
         {"no payload", payload({}), {"Unable to decode payload with error 3"}},
         {"a SEQUENCE as payload", payload(bytes("30 00")), {"Tag was not the expected Payload tag 2000000000000010"}},
         {"a cut-off payload", payload(bytes("31 05 00")), {"Unable to decode payload with error 3"}},
@@ -86,7 +82,6 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
          payload(setOf({payloadEntry(joined({someData, item("05", {})}))})),
          {"Decode sequence error: 2"}},
         {"an empty entry", payload(setOf({bytes("30 00")})), {"Decode sequence error: 5"}},
-        {"no comment", payload(setOf({item("30", item("02", bytes("30 68 43 57")))})), {"Decode sequence error: 5"}},
         {"a deleted flag of 1", payload(setOf({payloadEntry(bytes("01 01 01"))})), {"Decode sequence error: 3"}},
         {"a cut-off entry after a good one", payload(setOf({miGB, bytes("30 7F")})), {"Decode sequence error: 3"}},
         {"a metadata entry without a key", metadata(setOf({item("30", someData)})), {"Decode sequence error: 2"}},

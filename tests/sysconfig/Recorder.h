@@ -63,12 +63,10 @@ public:
 private:
     // "allocSysConfig3: " of "struct __SysConfig3 *__singleallocSysConfig3(SysConfig3Magic, SysConfig3Version)".
     static std::string nameOf(std::string_view declaration) {
-        constexpr std::string_view single = "*__single";
+        constexpr std::string_view single = "__single";
         std::string_view name = declaration.substr(0, declaration.find('('));
-        name.remove_prefix(name.rfind(' ') + 1);
-        if (name.starts_with(single))
-            name.remove_prefix(single.size());
-        return std::string(name) + ": ";
+        name.remove_prefix(name.find_last_of(" *") + 1);
+        return std::string(name.substr(name.starts_with(single) ? single.size() : 0)) + ": ";
     }
 
     static void log(int level, const char* format, ...) SYSCONFIG3_PRINTF(2, 3) {
