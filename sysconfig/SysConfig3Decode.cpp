@@ -142,19 +142,6 @@ bool decodeMetadata(const DERItem& element, __SysConfig3* object) {
                       &object->metadata);
 }
 
-bool installManifest(const ManifestItems& items, __SysConfig3* object) {
-    const SysConfigData payloadHMAC = dataOf(items.payloadHMAC);
-    const SysConfigData metadataHMAC = dataOf(items.metadataHMAC);
-    const SysConfigData fullHMAC = dataOf(items.fullHMAC);
-    __SysConfig3ManifestEntry* const manifest =
-        allocSysConfig3Manifest(object->version, &payloadHMAC, &metadataHMAC, &fullHMAC);
-    if (manifest == nullptr)
-        return false;
-    const bool installed = _sysConfig3SetManifest(object, manifest);
-    deallocSysConfig3Manifest(manifest);
-    return installed;
-}
-
 bool decodeManifest(const DERItem& element, __SysConfig3* object) {
     DERItem content;
     if (!openElement(element, manifestElement, &content))
@@ -169,7 +156,8 @@ bool decodeManifest(const DERItem& element, __SysConfig3* object) {
         return true;
     }
     const bool empty = items.payloadHMAC.length == 0 && items.metadataHMAC.length == 0 && items.fullHMAC.length == 0;
-    return empty || installManifest(items, object);
+    return empty ||
+           installManifest(object, dataOf(items.payloadHMAC), dataOf(items.metadataHMAC), dataOf(items.fullHMAC));
 }
 
 } // namespace
