@@ -47,10 +47,9 @@ protected:
         if (const Value::Array* data = response_["Data"].array())
             for (const Value& entry : *data) {
                 const Value::Data& contents = *entry["LogFileData"].data();
-                entries.push_back(
-                    *entry["LogFileName"].text() + " " + *entry["isPanic"].text() + " " +
-                    std::to_string(*entry["LogFileSize"].integer()) + ": " +
-                    std::string(contents.begin(), contents.begin() + std::min(contents.size(), size_t{40})));
+                entries.push_back(*entry["LogFileName"].text() + " " + *entry["isPanic"].text() + " " +
+                                  std::to_string(*entry["LogFileSize"].integer()) + ": " +
+                                  std::string(contents.begin(), contents.end()).substr(0, 40));
             }
         std::ranges::sort(entries);
         return entries;

@@ -188,14 +188,14 @@ TEST(HMAC, saysWhatIsMissing) {
     EXPECT_EQ(Recorder::lines, Lines{});
     EXPECT_EQ(allocSysConfig3WithHMACKey(1, 0x30002, hmacKey), nullptr);
     EXPECT_EQ(allocSysConfig3WithHMACKey(bCfg, 0x30002, {keyBytes, 0}), nullptr);
-    constexpr char noKey[] = "Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u";
-    EXPECT_EQ(Recorder::formats, (Lines{"allocSysConfig3: invalid magic provided 0x%08X",
-                                        "allocSysConfig3WithHMACKey: Failed to allocate sysconfig.",
-                                        std::string("sysConfig3CreatePayloadHMAC: ") + noKey,
-                                        std::string("sysConfig3CreateMetadataHMAC: ") + noKey,
-                                        "sysConfig3CreateFullHMAC: Invalid HMAC key. sysconfig->hmacKey.data = %p, "
-                                        "sysconfig->hmacKey.length = %u",
-                                        "allocSysConfig3WithHMACKey: Failed to update HMAC."}));
+    const std::string noKey = "sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u";
+    const Lines expected = {"allocSysConfig3: invalid magic provided 0x%08X",
+                            "allocSysConfig3WithHMACKey: Failed to allocate sysconfig.",
+                            "sysConfig3CreatePayloadHMAC: Invalid HAMC key. " + noKey,
+                            "sysConfig3CreateMetadataHMAC: Invalid HAMC key. " + noKey,
+                            "sysConfig3CreateFullHMAC: Invalid HMAC key. " + noKey,
+                            "allocSysConfig3WithHMACKey: Failed to update HMAC."};
+    EXPECT_EQ(Recorder::formats, expected);
     EXPECT_EQ(out.data, nullptr);
 }
 
