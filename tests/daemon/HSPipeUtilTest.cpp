@@ -5,7 +5,6 @@
 #include <csignal>
 #include <cstring>
 #include <filesystem>
-#include <regex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -41,13 +40,23 @@ std::string text(int number) {
     return std::string(std::strerror(number)) + "\n";
 }
 
-// The recorded lines of HSPipeUtil, with a star in place of line numbers and addresses. Those of level 2 come without
-// their beginning.
+// `line` with a star in place of the hexadecimal or decimal number behind the first `mark`.
+std::string starred(std::string line, std::string_view mark) {
+    const std::size_t start = line.find(mark);
+    if (start == std::string::npos)
+        return line;
+    const std::size_t number = start + mark.size();
+    return line.replace(number, line.find_first_not_of("0123456789abcdefx", number) - number, "*");
+}
+
+// The recorded lines of HSPipeUtil, without what differs from run to run. Those of level 2 come without their
+// beginning.
 Lines log() {
-    static const std::regex info("^2 \\[HSPipeUtil\\] "), number("(at line |program \\()[0-9a-fx]+");
+    constexpr std::string_view info = "2 [HSPipeUtil] ";
     Lines lines;
     for (const std::string& line : recordedLog())
-        lines.push_back(std::regex_replace(std::regex_replace(line, info, ""), number, "$1*"));
+        lines.push_back(
+            starred(starred(line.substr(line.starts_with(info) ? info.size() : 0), "at line "), "program ("));
     return lines;
 }
 
