@@ -263,7 +263,7 @@ TEST_F(HSPipeUtilTest, aChildThatIgnoresItsInputDecidesByItsExitStatus) {
         EXPECT_EQ(after.sa_handler, before.sa_handler);
         EXPECT_EQ(after.sa_flags, before.sa_flags);
     }
-    std::signal(SIGPIPE, SIG_DFL);
+    EXPECT_NE(std::signal(SIGPIPE, SIG_DFL), SIG_ERR);
 }
 
 TEST_F(HSPipeUtilTest, anyOutputBecomesText) {
