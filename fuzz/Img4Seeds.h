@@ -2,12 +2,10 @@
 #ifndef VELTRA_FUZZ_IMG4_SEEDS_H
 #define VELTRA_FUZZ_IMG4_SEEDS_H
 
-#include "fuzz/SeedFile.h"
+#include "fuzz/Seeds.h"
 #include "tests/support/Img4Maker.h"
 
-#include <string>
-
-inline bool writeImg4Seeds(const std::string& folder) {
+inline int writeImg4Seeds(int argc, char** argv) {
     using namespace img4maker;
     Manifest second;
     second.version = 2;
@@ -16,12 +14,10 @@ inline bool writeImg4Seeds(const std::string& folder) {
     Payload packed;
     packed.compression = compression(0, 512);
     packed.properties = payloadProperties({property("entP", integer(1)), property("uuiD", octets(filler(4)))});
-    return writeSeed(folder, "container", exampleContainer()) && writeSeed(folder, "ticket", exampleTicket()) &&
-           writeSeed(folder, "second-version", manifest(second)) &&
-           writeSeed(folder, "unsigned", unsignedManifest(second)) && writeSeed(folder, "payload", payload(packed)) &&
-           writeSeed(folder, "small-container",
-                     container(payload({}), manifest(second), restoreInfo({property("rcnt", integer(3))}))) &&
-           writeSeed(folder, "many-objects", largeManifest(5));
+    return writeSeeds(argc, argv,
+                      {exampleContainer(), exampleTicket(), manifest(second), unsignedManifest(second), payload(packed),
+                       largeManifest(5),
+                       container(payload({}), manifest(second), restoreInfo({property("rcnt", integer(3))}))});
 }
 
 #endif

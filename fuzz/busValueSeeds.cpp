@@ -1,13 +1,10 @@
 // One seed for each type at the top of a request, and some that nest.
-#include <fstream>
-#include <string>
+#include "fuzz/Seeds.h"
 
-int main(int, char** arguments) {
-    const std::string folder = arguments[1];
-    for (int type = 0; type < 21; ++type) {
-        std::ofstream file(folder + "/type-" + std::to_string(type), std::ios::binary);
-        for (int depth = 0; depth < 6; ++depth)
-            file << '\1' << static_cast<char>(depth) << static_cast<char>(type) << "\1\2\3\4\5\6\7\10" << '\2';
-    }
-    return 0;
+int main(int argc, char** argv) {
+    std::vector<std::string> seeds(21);
+    for (std::size_t type = 0; type < seeds.size(); ++type)
+        for (char depth = 0; depth < 6; ++depth)
+            seeds[type] += std::string{'\1', depth, static_cast<char>(type)} + "\1\2\3\4\5\6\7\10" + '\2';
+    return writeSeeds(argc, argv, seeds);
 }

@@ -3,11 +3,9 @@
 
 int main(int count, char** arguments) {
     using namespace certificatemaker;
-    if (count != 2)
-        return 2;
     const Module first = module({0x01});
     const Module second = module({0xFF, 0x7F, 0x00, 0x00}, KeyKind::Ed25519);
-    return writeSeeds<Bytes>(arguments[1], {first.certificate, second.certificate, certsOnlyMessage({}),
-                                            certsOnlyMessage({first.certificate, second.certificate}),
-                                            signedMessage(first), dataMessage()});
+    return writeSeeds(count, arguments,
+                      {first.certificate, second.certificate, certsOnlyMessage({}),
+                       certsOnlyMessage({first.certificate, second.certificate}), signedMessage(first), dataMessage()});
 }

@@ -1,5 +1,5 @@
 #include "der/DEREncode.h"
-#include "fuzz/SeedFile.h"
+#include "fuzz/Seeds.h"
 
 namespace {
 
@@ -22,8 +22,6 @@ Bytes joined(const std::vector<Bytes>& parts) {
 } // namespace
 
 int main(int argc, char** argv) {
-    if (argc != 2)
-        return 2;
     const Bytes integer = item(DERTagInteger, {0x00, 0xFF, 0xFE, 0xFD, 0xFC, 0xFB, 0xFA, 0xF9, 0xF8});
     const Bytes primitives = joined({integer, item(DERTagBoolean, {0xFF}), item(DERTagBitString, {0x03, 0xF8}),
                                      item(DERTagIA5String, {'k', 'e', 'y'})});
@@ -32,9 +30,5 @@ int main(int argc, char** argv) {
     const Bytes longContent = item(DERTagOctetString, Bytes(300, 0x5A));
     Bytes cutOff = longContent;
     cutOff.resize(20);
-    const bool good = writeSeed(argv[1], "integer", integer) && writeSeed(argv[1], "primitives", primitives) &&
-                      writeSeed(argv[1], "nested", nested) && writeSeed(argv[1], "long-content", longContent) &&
-                      writeSeed(argv[1], "cut-off", cutOff) &&
-                      writeSeed(argv[1], "largest-tag", item(DERTagNumberMask, {}));
-    return good ? 0 : 1;
+    return writeSeeds(argc, argv, {integer, primitives, nested, longContent, cutOff, item(DERTagNumberMask, {})});
 }

@@ -1,6 +1,6 @@
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
-#include "fuzz/SeedFile.h"
+#include "fuzz/Seeds.h"
 #include "fuzz/derRecordInput.h"
 
 namespace {
@@ -40,19 +40,14 @@ Bytes seed(const std::vector<SeedRow>& rows) {
 } // namespace
 
 int main(int argc, char** argv) {
-    if (argc != 2)
-        return 2;
     const Bytes two = {0x12, 0x34};
-    const Bytes plain = seed({{1, 0, two}, {2, 0, two}, {4, 0, {0x05, 0x00}}});
-    const Bytes optional = seed({{6, DEROptionOptional, {}},
-                                 {1, 0, two},
-                                 {0, DEROptionOptional, {0xFF}},
-                                 {7, DEROptionOptional | DEROptionSaveDER, {0x05, 0x00}}});
-    const Bytes anyTag = seed({{3, 0, {0x2A}}, {2, DEROptionOptional | DEROptionAnyTag | DEROptionSaveDER, two}});
-    const Bytes skipped = seed({{1, DEROptionSkip | farAway, two}, {5, DEROptionSaveDER, {0x03, 0xF8}}});
-    const Bytes encoder = seed({{1, signedInteger, {0x80}}, {4, writeDER | DEROptionSaveDER, {0x02, 0x01, 0x05}}});
-    const bool good = writeSeed(argv[1], "plain", plain) && writeSeed(argv[1], "optional", optional) &&
-                      writeSeed(argv[1], "any-tag", anyTag) && writeSeed(argv[1], "skipped", skipped) &&
-                      writeSeed(argv[1], "encoder-options", encoder);
-    return good ? 0 : 1;
+    return writeSeeds(argc, argv,
+                      {seed({{1, 0, two}, {2, 0, two}, {4, 0, {0x05, 0x00}}}),
+                       seed({{6, DEROptionOptional, {}},
+                             {1, 0, two},
+                             {0, DEROptionOptional, {0xFF}},
+                             {7, DEROptionOptional | DEROptionSaveDER, {0x05, 0x00}}}),
+                       seed({{3, 0, {0x2A}}, {2, DEROptionOptional | DEROptionAnyTag | DEROptionSaveDER, two}}),
+                       seed({{1, DEROptionSkip | farAway, two}, {5, DEROptionSaveDER, {0x03, 0xF8}}}),
+                       seed({{1, signedInteger, {0x80}}, {4, writeDER | DEROptionSaveDER, {0x02, 0x01, 0x05}}})});
 }

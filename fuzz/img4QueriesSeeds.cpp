@@ -1,5 +1,5 @@
 #include "fuzz/Img4Seeds.h"
 
 int main(int argc, char** argv) {
-    return argc == 2 && writeImg4Seeds(argv[1]) ? 0 : 1;
+    return writeImg4Seeds(argc, argv);
 }

@@ -1,34 +1,29 @@
-#include <string>
+#include <vector>
 
-#include "fuzz/SeedFile.h"
+#include "fuzz/Seeds.h"
 #include "tests/support/SignedManifestMaker.h"
 
 namespace {
 
 using namespace signedmanifest;
+using namespace img4maker;
 
-// A sound manifest and container of the profile, and a manifest whose leaf constrains in every way.
-bool writeSeeds(const std::string& folder, const Img4TrustProfileEntry& entry) {
-    using namespace img4maker;
-    const Signer signer(TEST_TRUST_DOMAIN, entry);
-    const Bytes manifest = signer.manifest(standardManifest(), signer.standardChain());
-    const Bytes leaf =
-        signer.issue(signer.leaf({object("MANP", {mustBePresent("brdI"), mustBeAbsent("xxxx")}),
-                                  object("OBJP", {property("eksp", boolean(true))}), object("manx", {})}));
-    return writeSeed(folder, std::string("manifest-") + entry.name, manifest) &&
-           writeSeed(folder, std::string("container-") + entry.name, container(payload({}), manifest, {})) &&
-           writeSeed(folder, std::string("constrained-") + entry.name,
-                     signer.manifest(standardManifest(), signer.chainWith(leaf)));
+// For each profile a sound manifest and container, and a manifest whose leaf constrains in every way.
+std::vector<Bytes> seeds() {
+    std::vector<Bytes> all;
+    for (unsigned i = 0; i < Img4NumTrustProfiles; ++i) {
+        const Signer signer(TEST_TRUST_DOMAIN, Img4TrustProfiles[i]);
+        const List constraints = {object("MANP", {mustBePresent("ABCD"), mustBeAbsent("NONE")}),
+                                  object("OBJP", {property("eksp", boolean(true))}), object("manx", {})};
+        all.push_back(signer.manifest(standardManifest(), signer.standardChain()));
+        all.push_back(container(payload({}), all.back(), {}));
+        all.push_back(signer.manifest(standardManifest(), signer.chainWith(signer.issue(signer.leaf(constraints)))));
+    }
+    return all;
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
-    if (argc != 2)
-        return 1;
-    for (const Img4TrustProfileEntry* entry = Img4TrustProfiles; entry != Img4TrustProfiles + Img4NumTrustProfiles;
-         ++entry)
-        if (!writeSeeds(argv[1], *entry))
-            return 1;
-    return 0;
+    return writeSeeds(argc, argv, seeds());
 }

@@ -2,8 +2,6 @@
 #include "platform/KeyedArchive.h"
 
 int main(int count, char** arguments) {
-    if (count != 2)
-        return 2;
     const Value everything = Value::Dictionary{
         {"array", Value::Array{1, -1, 256, 1 << 20, std::int64_t{1} << 40, true, false}},
         {"data", Value::Data(300, 0x55)},
@@ -13,6 +11,6 @@ int main(int count, char** arguments) {
     Value nested = 1;
     for (int i = 0; i < 31; ++i)
         nested = Value::Array{std::move(nested)};
-    return writeSeeds<Value::Data>(arguments[1],
-                                   {archiveEncode("k", everything), archiveEncode("k", nested), archiveEncode("k", 7)});
+    return writeSeeds(count, arguments,
+                      {archiveEncode("k", everything), archiveEncode("k", nested), archiveEncode("k", 7)});
 }

@@ -1,4 +1,4 @@
-#include "fuzz/SeedFile.h"
+#include "fuzz/Seeds.h"
 #include "sysconfig/SysConfig3Ptr.h"
 
 namespace {
@@ -21,19 +21,13 @@ SysConfig3Ptr filledObject(SysConfig3Version version) {
     SysConfig3Ptr object = newObject(version);
     const std::uint8_t data[] = {1, 2, 3};
     const std::string longText(200, 'x');
-    const PayloadEntryPtr payload[] = {
-        PayloadEntryPtr(allocSysConfig3PayloadEntryWithData(0x57436830, nullptr, data, sizeof data)),
-        PayloadEntryPtr(allocSysConfig3PayloadEntryWithString(0x4D694742, "note", longText.c_str())),
-        PayloadEntryPtr(allocSysConfig3PayloadEntryDeleted(0x01020304, nullptr)),
-    };
-    const MetadataEntryPtr metadata[] = {
-        MetadataEntryPtr(allocSysConfig3MetadataEntry("name", nullptr, 0, "value")),
-        MetadataEntryPtr(allocSysConfig3MetadataEntry(longText.c_str(), data, sizeof data, nullptr)),
-    };
-    for (const PayloadEntryPtr& entry : payload)
-        sysConfig3AddPayloadEntry(object.get(), entry.get());
-    for (const MetadataEntryPtr& entry : metadata)
-        sysConfig3AddMetadataEntry(object.get(), entry.get());
+    for (auto* entry : {allocSysConfig3PayloadEntryWithData(0x57436830, nullptr, data, sizeof data),
+                        allocSysConfig3PayloadEntryWithString(0x4D694742, "note", longText.c_str()),
+                        allocSysConfig3PayloadEntryDeleted(0x01020304, nullptr)})
+        sysConfig3AddPayloadEntry(object.get(), PayloadEntryPtr(entry).get());
+    for (auto* entry : {allocSysConfig3MetadataEntry("name", nullptr, 0, "value"),
+                        allocSysConfig3MetadataEntry(longText.c_str(), data, sizeof data, nullptr)})
+        sysConfig3AddMetadataEntry(object.get(), MetadataEntryPtr(entry).get());
     return object;
 }
 
@@ -51,16 +45,13 @@ Bytes seed(const SysConfig3Ptr& object, const Bytes& script) {
 } // namespace
 
 int main(int argc, char** argv) {
-    if (argc != 2)
-        return 2;
     const Bytes script = {0, 0, 5, 1, 0,   2,   'a', 'b', 0, 4,   1, 0, 0, 0,
                           1, 1, 3, 3, 'k', 'e', 'y', 0,   1, 'v', 1, 0, 3, 0};
-    bool good = true;
+    std::vector<Bytes> seeds;
     for (const SysConfig3Version version : {0x30001U, 0x30002U, 0x30003U}) {
-        const std::string name = std::to_string(version & 0xF);
-        good = good && writeSeed(argv[1], "empty-" + name, seed(newObject(version), {})) &&
-               writeSeed(argv[1], "filled-" + name, seed(filledObject(version), {})) &&
-               writeSeed(argv[1], "changed-" + name, seed(filledObject(version), script));
+        seeds.push_back(seed(newObject(version), {}));
+        seeds.push_back(seed(filledObject(version), {}));
+        seeds.push_back(seed(filledObject(version), script));
     }
-    return good ? 0 : 1;
+    return writeSeeds(argc, argv, seeds);
 }

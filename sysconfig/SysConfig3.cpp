@@ -33,13 +33,7 @@ constexpr SysConfig3Version endOfVersions = 0x30004;
 bool installPlaceholderManifest(__SysConfig3* object) {
     std::uint8_t octet = 0x00;
     const SysConfigData placeholder = {&octet, sizeof octet};
-    __SysConfig3ManifestEntry* const manifest =
-        allocSysConfig3Manifest(object->version, &placeholder, &placeholder, &placeholder);
-    if (manifest == nullptr)
-        return false;
-    const bool installed = _sysConfig3SetManifest(object, manifest);
-    deallocSysConfig3Manifest(manifest);
-    return installed;
+    return sysconfig::installManifest(object, placeholder, placeholder, placeholder);
 }
 
 template <typename Entry>

@@ -86,77 +86,69 @@ SysConfigData dataOf(const DERItem& item) {
     return {const_cast<std::uint8_t*>(item.data), static_cast<std::uint32_t>(item.length)};
 }
 
-// Ends the decoding of a list whose entries were walked with the given result.
-template <typename List>
-bool finishList(DERReturn walked, List* list, const HashSeed& seed) {
-    constexpr char operation[] = "struct __SysConfig3 *__singledecodeSysConfig3(const uint8_t *, uint32_t)";
-    if (walked != DERSuccess) {
-        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(walked));
+// The one item that an element of the blob holds, and the formats that report anything else.
+struct Element {
+    DERTag tag;
+    const char* undecodable;
+    const char* otherTag;
+};
+
+constexpr Element payloadElement = {DERTagSet, "Unable to decode payload with error %d",
+                                    "Tag was not the expected Payload tag %llX"};
+constexpr Element metadataElement = {DERTagSet, "Unable to decode metadata with error %d",
+                                     "Tag was not the expected metadata tag %llX"};
+constexpr Element manifestElement = {DERTagSequence, "Unable to decode manifest with error %d",
+                                     "Tag was not the expected manifest tag %llX"};
+
+bool openElement(const DERItem& element, const Element& expected, DERItem* content) {
+    DERDecodedInfo item;
+    if (const DERReturn result = DERDecodeItem(&element, &item); result != DERSuccess) {
+        logHook()(messageLevel, expected.undecodable, static_cast<int>(result));
         return false;
     }
-    if (list->indexAll(seed))
+    if (item.tag != expected.tag) {
+        logHook()(messageLevel, expected.otherTag, static_cast<unsigned long long>(item.tag));
+        return false;
+    }
+    *content = item.content;
+    return true;
+}
+
+// Fills a list of the object with the entries of an element.
+template <typename List>
+bool decodeList(const DERItem& element, const Element& expected, DERDecodeSequenceCallback addEntry,
+                __SysConfig3* object, List* list) {
+    constexpr char operation[] = "struct __SysConfig3 *__singledecodeSysConfig3(const uint8_t *, uint32_t)";
+    DERItem entries;
+    if (!openElement(element, expected, &entries))
+        return false;
+    if (const DERReturn result = DERDecodeSequenceContentWithBlock(&entries, addEntry, object); result != DERSuccess) {
+        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result));
+        return false;
+    }
+    if (list->indexAll(object->seed))
         return true;
     logHook()(messageLevel, "%s malloc failed.", operation);
     return false;
 }
 
 bool decodePayload(const DERItem& element, __SysConfig3* object) {
-    DERDecodedInfo set;
-    if (const DERReturn result = DERDecodeItem(&element, &set); result != DERSuccess) {
-        logHook()(messageLevel, "Unable to decode payload with error %d", static_cast<int>(result));
-        return false;
-    }
-    if (set.tag != DERTagSet) {
-        logHook()(messageLevel, "Tag was not the expected Payload tag %llX", static_cast<unsigned long long>(set.tag));
-        return false;
-    }
-    const DERReturn result =
-        DERDecodeSequenceContentWithBlock(&set.content, _DERDecodeSysConfig3ParseAndPopulatePayloadSequence, object);
-    return finishList(result, &object->payload, object->seed);
+    return decodeList(element, payloadElement, _DERDecodeSysConfig3ParseAndPopulatePayloadSequence, object,
+                      &object->payload);
 }
 
 bool decodeMetadata(const DERItem& element, __SysConfig3* object) {
-    DERDecodedInfo set;
-    if (const DERReturn result = DERDecodeItem(&element, &set); result != DERSuccess) {
-        logHook()(messageLevel, "Unable to decode metadata with error %d", static_cast<int>(result));
-        return false;
-    }
-    if (set.tag != DERTagSet) {
-        logHook()(messageLevel, "Tag was not the expected metadata tag %llX", static_cast<unsigned long long>(set.tag));
-        return false;
-    }
-    const DERReturn result =
-        DERDecodeSequenceContentWithBlock(&set.content, _DERDecodeSysConfig3ParseAndPopulateMetadataSequence, object);
-    return finishList(result, &object->metadata, object->seed);
-}
-
-bool installManifest(const ManifestItems& items, __SysConfig3* object) {
-    const SysConfigData payloadHMAC = dataOf(items.payloadHMAC);
-    const SysConfigData metadataHMAC = dataOf(items.metadataHMAC);
-    const SysConfigData fullHMAC = dataOf(items.fullHMAC);
-    __SysConfig3ManifestEntry* const manifest =
-        allocSysConfig3Manifest(object->version, &payloadHMAC, &metadataHMAC, &fullHMAC);
-    if (manifest == nullptr)
-        return false;
-    const bool installed = _sysConfig3SetManifest(object, manifest);
-    deallocSysConfig3Manifest(manifest);
-    return installed;
+    return decodeList(element, metadataElement, _DERDecodeSysConfig3ParseAndPopulateMetadataSequence, object,
+                      &object->metadata);
 }
 
 bool decodeManifest(const DERItem& element, __SysConfig3* object) {
-    DERDecodedInfo sequence;
-    if (const DERReturn result = DERDecodeItem(&element, &sequence); result != DERSuccess) {
-        logHook()(messageLevel, "Unable to decode manifest with error %d", static_cast<int>(result));
+    DERItem content;
+    if (!openElement(element, manifestElement, &content))
         return false;
-    }
-    if (sequence.tag != DERTagSequence) {
-        logHook()(messageLevel, "Tag was not the expected manifest tag %llX",
-                  static_cast<unsigned long long>(sequence.tag));
-        return false;
-    }
     ManifestItems items;
     const DERReturn result =
-        DERParseSequenceContentToObject(&sequence.content, DERDecodeSysConfig3ManifestItemSpecs_count,
+        DERParseSequenceContentToObject(&content, DERDecodeSysConfig3ManifestItemSpecs_count,
                                         DERDecodeSysConfig3ManifestItemSpecs, &items, sizeof items, sizeof items);
     if (result != DERSuccess) {
         // A blob whose HMACs cannot be read is still worth having: the object keeps the manifest it was made with.
@@ -164,7 +156,8 @@ bool decodeManifest(const DERItem& element, __SysConfig3* object) {
         return true;
     }
     const bool empty = items.payloadHMAC.length == 0 && items.metadataHMAC.length == 0 && items.fullHMAC.length == 0;
-    return empty || installManifest(items, object);
+    return empty ||
+           installManifest(object, dataOf(items.payloadHMAC), dataOf(items.metadataHMAC), dataOf(items.fullHMAC));
 }
 
 } // namespace

@@ -6,9 +6,6 @@ namespace {
 
 using namespace sysconfig;
 
-// Feeds one of the three streams of an object to an HMAC.
-using Stream = void (*)(const __SysConfig3* object, crypto::HMACSHA256* context);
-
 void payloadStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
     _updatePayloadHMAC(object->payload.first, context);
 }
@@ -22,6 +19,33 @@ void fullStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
     metadataStream(object, context);
 }
 
+// One of the three HMACs of an object: the stream that it covers, its place in the manifest, the operation that creates
+// it, and the formats of two messages.
+struct Kind {
+    void (*feedStream)(const __SysConfig3* object, crypto::HMACSHA256* context);
+    SysConfigData __SysConfig3ManifestEntry::*stored;
+    const char* creation;
+    const char* noKey;
+    const char* noMatch;
+};
+
+constexpr Kind payloadKind = {
+    payloadStream, &__SysConfig3ManifestEntry::payloadHMAC,
+    "bool sysConfig3CreatePayloadHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)",
+    "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
+    "%s Payload HMAC does not match."};
+constexpr Kind metadataKind = {
+    metadataStream, &__SysConfig3ManifestEntry::metadataHMAC,
+    "bool sysConfig3CreateMetadataHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)",
+    "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
+    "%s Metadata HMAC does not match."};
+constexpr Kind fullKind = {
+    fullStream, &__SysConfig3ManifestEntry::fullHMAC,
+    "bool sysConfig3CreateFullHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)",
+    "%s Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
+    "%s Full HMAC does not match."};
+constexpr const Kind* kinds[] = {&payloadKind, &metadataKind, &fullKind};
+
 bool hasKey(const __SysConfig3* object) {
     return object->hmacKey.data != nullptr && object->hmacKey.length > 0;
 }
@@ -30,16 +54,20 @@ const void* keyAddress(const __SysConfig3* object) {
     return object->hmacKey.data;
 }
 
-// The common end of the create operations. On failure out->data is null and out->length the length that it would have.
-bool createHMAC(const __SysConfig3* object, Stream stream, SysConfigData* out, const char* operation) {
+// On running out of memory out->data is null and out->length the length that it would have.
+bool createHMAC(const __SysConfig3* object, const Kind& kind, SysConfigData* out) {
+    if (!hasKey(object)) {
+        logHook()(messageLevel, kind.noKey, kind.creation, keyAddress(object), object->hmacKey.length);
+        return false;
+    }
     if (out == nullptr) {
-        logHook()(messageLevel, "%s hmac is NULL", operation);
+        logHook()(messageLevel, "%s hmac is NULL", kind.creation);
         return false;
     }
     crypto::HMACSHA256 context;
     std::uint8_t result[crypto::sha256Size];
     context.init(object->hmacKey.data, object->hmacKey.length);
-    stream(object, &context);
+    kind.feedStream(object, &context);
     *out = {static_cast<std::uint8_t*>(std::malloc(sizeof result)), sizeof result};
     if (out->data != nullptr && context.final(result)) {
         std::memcpy(out->data, result, sizeof result);
@@ -47,28 +75,36 @@ bool createHMAC(const __SysConfig3* object, Stream stream, SysConfigData* out, c
     }
     std::free(out->data);
     out->data = nullptr;
-    logHook()(messageLevel, "%s malloc failed.", operation);
+    logHook()(messageLevel, "%s malloc failed.", kind.creation);
     return false;
 }
 
 // Replaces a stored HMAC by a newly computed one, unless that cannot be computed.
-bool replaceHMAC(const __SysConfig3* object, bool (*create)(const __SysConfig3*, SysConfigData*),
-                 SysConfigData* stored) {
+bool replaceHMAC(__SysConfig3* object, const Kind& kind) {
     SysConfigData computed = {};
-    if (!create(object, &computed))
+    if (!createHMAC(object, kind, &computed))
         return false;
-    std::free(stored->data);
-    *stored = computed;
+    SysConfigData& stored = object->manifest->*kind.stored;
+    std::free(stored.data);
+    stored = computed;
     return true;
 }
 
-bool matches(const __SysConfig3* object, bool (*create)(const __SysConfig3*, SysConfigData*),
-             const SysConfigData& stored) {
+bool matches(const __SysConfig3* object, const Kind& kind) {
+    const __SysConfig3ManifestEntry& manifest = *object->manifest;
     SysConfigData computed = {};
-    const bool equal =
-        create(object, &computed) && _sysConfig3HMACsAreEqual(object->manifest->version, &stored, &computed);
+    const bool equal = createHMAC(object, kind, &computed) &&
+                       _sysConfig3HMACsAreEqual(manifest.version, &(manifest.*kind.stored), &computed);
     std::free(computed.data);
     return equal;
+}
+
+// Recomputes the HMACs that cover a list, where the version has them.
+void listHasChanged(__SysConfig3* object, const Kind& list) {
+    if (!sysConfig3HMACIsSupported(object->version))
+        return;
+    replaceHMAC(object, list);
+    replaceHMAC(object, fullKind);
 }
 
 void feed(crypto::HMACSHA256* context, std::string_view text) {
@@ -101,17 +137,11 @@ bool sysconfig::hasNoStaleHMAC(const __SysConfig3* object, const char* operation
 }
 
 void sysconfig::payloadHasChanged(__SysConfig3* object) {
-    if (!sysConfig3HMACIsSupported(object->version))
-        return;
-    replaceHMAC(object, sysConfig3CreatePayloadHMAC, &object->manifest->payloadHMAC);
-    replaceHMAC(object, sysConfig3CreateFullHMAC, &object->manifest->fullHMAC);
+    listHasChanged(object, payloadKind);
 }
 
 void sysconfig::metadataHasChanged(__SysConfig3* object) {
-    if (!sysConfig3HMACIsSupported(object->version))
-        return;
-    replaceHMAC(object, sysConfig3CreateMetadataHMAC, &object->manifest->metadataHMAC);
-    replaceHMAC(object, sysConfig3CreateFullHMAC, &object->manifest->fullHMAC);
+    listHasChanged(object, metadataKind);
 }
 
 void _updatePayloadHMAC(const __SysConfig3PayloadEntry* first, crypto::HMACSHA256* context) {
@@ -178,44 +208,18 @@ __SysConfig3* allocSysConfig3WithHMACKey(SysConfig3Magic magic, SysConfig3Versio
 }
 
 bool sysConfig3CreatePayloadHMAC(const __SysConfig3* object, SysConfigData* out) {
-    constexpr char operation[] =
-        "bool sysConfig3CreatePayloadHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)";
-    if (object == nullptr)
-        return false;
-    if (!hasKey(object)) {
-        logHook()(messageLevel, "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-                  operation, keyAddress(object), object->hmacKey.length);
-        return false;
-    }
-    return createHMAC(object, payloadStream, out, operation);
+    return object != nullptr && createHMAC(object, payloadKind, out);
 }
 
 bool sysConfig3CreateMetadataHMAC(const __SysConfig3* object, SysConfigData* out) {
-    constexpr char operation[] =
-        "bool sysConfig3CreateMetadataHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)";
-    if (object == nullptr)
-        return false;
-    if (!hasKey(object)) {
-        logHook()(messageLevel, "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-                  operation, keyAddress(object), object->hmacKey.length);
-        return false;
-    }
-    return createHMAC(object, metadataStream, out, operation);
+    return object != nullptr && createHMAC(object, metadataKind, out);
 }
 
 bool sysConfig3CreateFullHMAC(const __SysConfig3* object, SysConfigData* out) {
-    constexpr char operation[] =
-        "bool sysConfig3CreateFullHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
-        return false;
-    }
-    if (!hasKey(object)) {
-        logHook()(messageLevel, "%s Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-                  operation, keyAddress(object), object->hmacKey.length);
-        return false;
-    }
-    return createHMAC(object, fullStream, out, operation);
+    if (object != nullptr)
+        return createHMAC(object, fullKind, out);
+    logHook()(messageLevel, "%s sysconfig is NULL.", fullKind.creation);
+    return false;
 }
 
 bool sysConfig3UpdateHMAC(__SysConfig3* object) {
@@ -228,11 +232,10 @@ bool sysConfig3UpdateHMAC(__SysConfig3* object) {
         logHook()(messageLevel, "%s This SysConfig version (0x%X) does not support HMAC.", operation, object->version);
         return false;
     }
-    __SysConfig3ManifestEntry* const manifest = object->manifest;
-    const bool payload = replaceHMAC(object, sysConfig3CreatePayloadHMAC, &manifest->payloadHMAC);
-    const bool metadata = replaceHMAC(object, sysConfig3CreateMetadataHMAC, &manifest->metadataHMAC);
-    const bool full = replaceHMAC(object, sysConfig3CreateFullHMAC, &manifest->fullHMAC);
-    return payload && metadata && full;
+    bool complete = true;
+    for (const Kind* kind : kinds)
+        complete = replaceHMAC(object, *kind) && complete;
+    return complete;
 }
 
 bool sysConfig3IsValidHMAC(const __SysConfig3* object) {
@@ -248,15 +251,12 @@ bool sysConfig3IsValidHMAC(const __SysConfig3* object) {
                   keyAddress(object), static_cast<int>(object->hmacKey.length));
         return false;
     }
-    const __SysConfig3ManifestEntry& manifest = *object->manifest;
-    const bool payload = matches(object, sysConfig3CreatePayloadHMAC, manifest.payloadHMAC);
-    if (!payload)
-        logHook()(messageLevel, "%s Payload HMAC does not match.", operation);
-    const bool metadata = matches(object, sysConfig3CreateMetadataHMAC, manifest.metadataHMAC);
-    if (!metadata)
-        logHook()(messageLevel, "%s Metadata HMAC does not match.", operation);
-    const bool full = matches(object, sysConfig3CreateFullHMAC, manifest.fullHMAC);
-    if (!full)
-        logHook()(messageLevel, "%s Full HMAC does not match.", operation);
-    return payload && metadata && full;
+    bool valid = true;
+    for (const Kind* kind : kinds) {
+        if (matches(object, *kind))
+            continue;
+        logHook()(messageLevel, kind->noMatch, operation);
+        valid = false;
+    }
+    return valid;
 }

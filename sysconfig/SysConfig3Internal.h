@@ -224,6 +224,12 @@ Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, co
     return entry;
 }
 
+// Manifests
+
+// Installs a new manifest of the object's version with copies of the HMACs. False when memory is lacking.
+bool installManifest(__SysConfig3* object, const SysConfigData& payloadHMAC, const SysConfigData& metadataHMAC,
+                     const SysConfigData& fullHMAC);
+
 // HMACs
 
 // True when the object's version has no HMACs or they are valid. Otherwise reports it for `operation`.

@@ -33,6 +33,15 @@ bool viewHMAC(const __SysConfig3ManifestEntry* manifest, SysConfigData __SysConf
 
 } // namespace
 
+bool sysconfig::installManifest(__SysConfig3* object, const SysConfigData& payloadHMAC,
+                                const SysConfigData& metadataHMAC, const SysConfigData& fullHMAC) {
+    __SysConfig3ManifestEntry* const manifest =
+        allocSysConfig3Manifest(object->version, &payloadHMAC, &metadataHMAC, &fullHMAC);
+    const bool installed = manifest != nullptr && _sysConfig3SetManifest(object, manifest);
+    deallocSysConfig3Manifest(manifest);
+    return installed;
+}
+
 std::string_view sysconfig::viewOf(const char* text, std::size_t maximum) {
     if (text == nullptr)
         return {};

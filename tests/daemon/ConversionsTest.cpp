@@ -25,10 +25,7 @@ TEST(Conversions, bytesBecomeTwoLowerCaseDigitsEach) {
 }
 
 TEST(Conversions, pairsOfDigitsBecomeCharacters) {
-    const struct {
-        const char* text;
-        Value expected;
-    } rows[] = {
+    const std::pair<const char*, Value> rows[] = {
         {"", ""},
         {"4142", "AB"},
         {"4a4B", "JK"},
@@ -43,53 +40,45 @@ TEST(Conversions, pairsOfDigitsBecomeCharacters) {
         {"é141", std::string("\0A", 2)}, // characters are counted, not bytes
         {"é1", std::string("\0", 1)},
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(stringFromHexString(row.text), row.expected) << row.text;
+    for (const auto& [text, expected] : rows)
+        EXPECT_EQ(stringFromHexString(text), expected) << text;
 }
 
 TEST(Conversions, pairsOfDigitsBecomeBytes) {
-    const struct {
-        const char* text;
-        Data expected;
-    } rows[] = {
+    const std::pair<const char*, Data> rows[] = {
         {"0x1F 2a", {0x1F, 0x2A}}, {"0X1f0x2A", {0x1F, 0x2A}}, {" 0x ", {}}, {"1g", {0x01}},
         {"\t1", {0x01}},           {"00xx", {0x00}}, // what the removal of "0x" brings together stays
         {"00Xx", {0x00}},                            // "0x" goes before "0X"
         {"0 x", {0x00}},                             // blanks go last
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(hexString2Binary(row.text), row.expected) << row.text;
+    for (const auto& [text, expected] : rows)
+        EXPECT_EQ(hexString2Binary(text), expected) << text;
 }
 
 TEST(Conversions, textThatIsNoPairsOfDigitsRaises) {
     constexpr char oddReason[] = "Text does not have 2-digit hex chars for every byte";
     constexpr char digitReason[] = "Text has illegal hexadecimal characters";
-    const struct {
-        const char* text;
-        const char* reason;
-    } rows[] = {
+    const std::pair<const char*, const char*> rows[] = {
         {"ABC", oddReason},    {"zzz", oddReason},    {"0x1", oddReason},  {"1 ", oddReason},   {"zz", digitReason},
         {"12g1", digitReason}, {"\t\n", digitReason}, {"-1", digitReason}, {"éé", digitReason},
     };
-    for (const auto& row : rows) {
+    for (const auto& [text, reason] : rows) {
         try {
-            hexString2Binary(row.text);
-            ADD_FAILURE() << row.text;
+            hexString2Binary(text);
+            ADD_FAILURE() << text;
         } catch (const ConversionFailure& failure) {
             EXPECT_EQ(failure.name(), "IllegalInput");
-            EXPECT_STREQ(failure.what(), row.reason) << row.text;
+            EXPECT_STREQ(failure.what(), reason) << text;
         }
     }
 }
 
 // The test vectors of RFC 4648, section 10.
 TEST(Conversions, base64IsPaddedAndInOneLine) {
-    const struct {
-        const char* text;
-        const char* expected;
-    } rows[] = {{"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"}, {"foobar", "Zm9vYmFy"}, {"\xFB\xFF", "+/8="}};
-    for (const auto& row : rows)
-        EXPECT_EQ(base64EncodedString(bytes(row.text)), row.expected);
+    const std::pair<const char*, const char*> rows[] = {{"", ""},        {"f", "Zg=="},          {"fo", "Zm8="},
+                                                        {"foo", "Zm9v"}, {"foobar", "Zm9vYmFy"}, {"\xFB\xFF", "+/8="}};
+    for (const auto& [text, expected] : rows)
+        EXPECT_EQ(base64EncodedString(bytes(text)), expected);
     constexpr std::size_t groups = 1400000;
     EXPECT_TRUE(base64EncodedString(Data(groups * 3 + 1)) == std::string(groups * 4 + 2, 'A') + "==");
 }

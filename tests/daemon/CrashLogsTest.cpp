@@ -97,6 +97,7 @@ TEST_F(CrashLogs, filesAreChosenByTheEndOfTheirNamesAndDirectoriesInOrder) {
 
 TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
     const std::string good = R"json({"os_version": "Quennel 3.1 (21A55)", "x": [1.5, {"os_version": 7}]})json";
+    const std::string nested(1'000'000, '['), closed(nested.size(), ']');
     const struct {
         const char* build; // null: no version list
         std::string report;
@@ -118,15 +119,17 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
         {"21A55", R"({"os_version": "21A55")", false},
         {"21A55", R"({"os_version": "21A55"} x)", false},
         {"21A55", good + "\n\xC3\xA9", false}, // no ASCII text
+        {"21A55", R"({"x": )" + nested, false},
+        {"21A55", R"({"x": )" + nested + closed + R"(, "os_version": "21A55"})", true},
     };
     for (const auto& row : rows) {
         fs::remove_all(root_.host("/System"));
         if (row.build)
             runningBuild(row.build);
         root_.write(logs + "panic-full-1.ips", row.report);
-        EXPECT_EQ(check_panic_version(logs + "panic-full-1.ips"), row.collected) << row.report;
+        EXPECT_EQ(check_panic_version(logs + "panic-full-1.ips"), row.collected) << row.report.substr(0, 80);
         const Lines entries = collect();
-        EXPECT_EQ(entries.size(), row.collected ? 1U : 0U) << row.report;
+        EXPECT_EQ(entries.size(), row.collected ? 1U : 0U) << row.report.substr(0, 80);
         EXPECT_TRUE(logged(row.collected ? "Panic Version and System Version matches. Sending to HOST"
                                          : "Panic Version and System Version does not match. Skipping"));
         if (row.collected) {
@@ -136,16 +139,6 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
     root_.write("/System/Library/Quennel/SystemVersion.plist", "<plist><dict>");
     EXPECT_FALSE(check_panic_version(logs + "panic-full-1.ips"));
     EXPECT_FALSE(check_panic_version("/missing"));
-}
-
-TEST_F(CrashLogs, aDeeplyNestedPanicHeaderIsRefusedInNoTime) {
-    runningBuild("21A55");
-    const std::string nested(1'000'000, '[');
-    root_.write(logs + "panic.ips", R"({"x": )" + nested);
-    EXPECT_FALSE(check_panic_version(logs + "panic.ips"));
-    root_.write(logs + "panic.ips",
-                R"({"x": )" + nested + std::string(nested.size(), ']') + R"(, "os_version": "21A55"})");
-    EXPECT_TRUE(check_panic_version(logs + "panic.ips"));
 }
 
 TEST_F(CrashLogs, whatIsNoReadableFileNeitherHangsNorBreaksTheCollection) {

@@ -1,5 +1,6 @@
 #include "Daemon/HSLog.h"
 
+#include <algorithm>
 #include <cstdlib>
 #include <sstream>
 #include <string>
@@ -53,36 +54,48 @@ void consoleLog(std::string_view) {}
 
 namespace {
 
-// The line without its timestamp, when it has one.
-std::string withoutTimestamp(const std::string& line) {
-    constexpr std::string_view shape = "dddd-dd-dd dd:dd:dd-";
-    bool found = line.size() >= shape.size();
-    for (std::size_t i = 0; found && i < shape.size(); ++i)
-        found = shape[i] == 'd' ? line[i] >= '0' && line[i] <= '9' : line[i] == shape[i];
-    return found ? line.substr(shape.size()) : "no timestamp: " + line;
+// The line with a T in place of its timestamp.
+std::string timed(std::string line) {
+    constexpr std::string_view shape = "0000-00-00 00:00:00-";
+    std::string digits = line;
+    std::ranges::replace_if(
+        digits, [](char character) { return character >= '0' && character <= '9'; }, '0');
+    const std::size_t start = digits.find(shape);
+    return start == std::string::npos ? line : line.replace(start, shape.size(), "T-");
 }
 
-TEST(HSLog, timestampsCarryTheLocalTimeOnATwelveHourClock) {
+class HSLog : public testing::Test {
+protected:
+    HSLog() { root.makeDirectory("/private/var/log"); }
+
+    // The log file's lines, timed.
+    std::vector<std::string> fileLines() const {
+        std::vector<std::string> lines;
+        std::istringstream file(root.read(path));
+        for (std::string line; std::getline(file, line);)
+            lines.push_back(timed(line));
+        return lines;
+    }
+
+    const TemporaryRoot root;
+};
+
+TEST(HSLogTimestamp, carriesTheLocalTimeOnATwelveHourClock) {
     ::setenv("TZ", "UTC-2", 1); // two hours ahead of UTC
     ::tzset();
-    const struct {
-        std::time_t time;
-        const char* expected;
-    } rows[] = {
+    const std::pair<std::time_t, const char*> rows[] = {
         {1709640309, "2024-03-05 02:05:09"}, // 14:05:09
         {1709589600, "2024-03-05 12:00:00"}, // 00:00:00
         {1709632800, "2024-03-05 12:00:00"}, // 12:00:00
         {1704063599, "2024-01-01 12:59:59"}, // 00:59:59, still the old year in UTC
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(logTimestamp(row.time), row.expected);
+    for (const auto& [time, expected] : rows)
+        EXPECT_EQ(logTimestamp(time), expected);
     ::unsetenv("TZ");
     ::tzset();
 }
 
-TEST(HSLog, beforeLogInitNothingIsWritten) {
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, beforeLogInitNothingIsWritten) {
     inOwnProcess([&] {
         newLog(LogLevelError, "%@", {"line"});
         EXPECT_EQ(root.read(path), "(missing)");
@@ -90,40 +103,27 @@ TEST(HSLog, beforeLogInitNothingIsWritten) {
     });
 }
 
-TEST(HSLog, linesGoToTheSystemLogByLevelAndToTheFileAlways) {
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, linesGoToTheSystemLogByLevelAndToTheFileAlways) {
     inOwnProcess([&] {
         logInit("test");
         logInit("second"); // does nothing
         debugDisabled = true;
-        std::string expectedFile;
+        std::vector<std::string> expectedFile, expectedLog;
         for (int level = -1; level <= 5; ++level) {
             newLog(level, "[%@:%d] %@\n", {"main", level, Value("Gerät")});
-            expectedFile += "[main:" + std::to_string(level) + "] Gerät\n";
+            expectedFile.push_back(format("T-[main:%d] Gerät", level));
         }
-        std::istringstream lines(root.read(path));
-        std::string file;
-        for (std::string line; std::getline(lines, line);)
-            file += withoutTimestamp(line) + "\n";
-        EXPECT_EQ(file, expectedFile);
-
-        ASSERT_EQ(systemLog.size(), 3u);
-        const char* const types[] = {"Default", "Info", "Error"};
-        const int levels[] = {1, 2, 4};
-        for (std::size_t i = 0; i < 3; ++i) {
-            const std::string prefix = "test/device " + std::string(types[i]) + " ";
-            ASSERT_EQ(systemLog[i].substr(0, prefix.size()), prefix);
-            EXPECT_EQ(withoutTimestamp(systemLog[i].substr(prefix.size())),
-                      "[main:" + std::to_string(levels[i]) + "] Gerät\n");
-        }
+        EXPECT_EQ(fileLines(), expectedFile);
         EXPECT_EQ(root.contents().size(), 4u); // the file and its three directories
+
+        for (const auto& [type, level] : {std::pair("Default", 1), std::pair("Info", 2), std::pair("Error", 4)})
+            expectedLog.push_back(format("test/device %s T-[main:%d] Gerät\n", type, level));
+        std::ranges::transform(systemLog, systemLog.begin(), timed);
+        EXPECT_EQ(systemLog, expectedLog);
     });
 }
 
-TEST(HSLog, withoutANameThereIsNoFile) {
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, withoutANameThereIsNoFile) {
     inOwnProcess([&] {
         logInit(nullptr);
         newLog(LogLevelInfo, "line\n", {});
@@ -133,27 +133,23 @@ TEST(HSLog, withoutANameThereIsNoFile) {
     });
 }
 
-TEST(HSLog, aHandleThatCannotBeMadeIsReportedOnceAndTheFileGoesOn) {
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, aHandleThatCannotBeMadeIsReportedOnceAndTheFileGoesOn) {
     inOwnProcess([&] {
         creationFails = true;
         logInit("test");
         newLog(LogLevelError, "line\n", {});
         EXPECT_EQ(systemLog, std::vector<std::string>{"default Error Couldn't create tlog_t"});
-        EXPECT_EQ(withoutTimestamp(root.read(path)), "line\n");
+        EXPECT_EQ(fileLines(), std::vector<std::string>{"T-line"});
     });
 }
 
-TEST(HSLog, theFileMayGoAndBecomeAnythingWithoutHarm) {
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, theFileMayGoAndBecomeAnythingWithoutHarm) {
     inOwnProcess([&] {
         logInit("test");
         newLog(LogLevelInfo, "first\n", {});
         std::filesystem::remove(root.host(path));
         newLog(LogLevelInfo, "second\n", {});
-        EXPECT_EQ(withoutTimestamp(root.read(path)), "second\n");
+        EXPECT_EQ(fileLines(), std::vector<std::string>{"T-second"});
 
         std::filesystem::remove(root.host(path));
         root.write("/etc/passwd", "root");
@@ -171,41 +167,34 @@ TEST(HSLog, theFileMayGoAndBecomeAnythingWithoutHarm) {
     });
 }
 
-TEST(HSLog, linesOfDifferentThreadsStayWhole) {
-    constexpr int threads = 4, lines = 200;
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, linesOfDifferentThreadsStayWhole) {
+    constexpr std::size_t threads = 4, lines = 200;
     inOwnProcess([&] {
         std::vector<std::thread> writers;
         writers.reserve(threads);
-        for (int writer = 0; writer < threads; ++writer) {
+        for (std::size_t writer = 0; writer < threads; ++writer) {
             writers.emplace_back([writer] {
                 logInit("test");
-                for (int line = 0; line < lines; ++line)
-                    newLog(0, "%@\n", {std::string(5000, static_cast<char>('a' + writer))});
+                for (std::size_t line = 0; line < lines; ++line)
+                    newLog(0, "%@\n", {std::string(5000, "abcd"[writer])});
             });
         }
         for (std::thread& writer : writers)
             writer.join();
-        std::istringstream file(root.read(path));
-        int found = 0;
-        for (std::string line; std::getline(file, line); ++found) {
-            line = withoutTimestamp(line);
-            EXPECT_TRUE(line == std::string(5000, line[0])) << line;
-        }
-        EXPECT_EQ(found, threads * lines);
+        const std::vector<std::string> written = fileLines();
+        for (const std::string& line : written)
+            EXPECT_TRUE(line == "T-" + std::string(5000, line.back())) << line;
+        EXPECT_EQ(written.size(), threads * lines);
     });
 }
 
-TEST(HSLog, aSourceNamesItsFileAndTheLineOfTheCall) {
-    const TemporaryRoot root;
-    root.makeDirectory("/private/var/log");
+TEST_F(HSLog, aSourceNamesItsFileAndTheLineOfTheCall) {
     inOwnProcess([&] {
         constexpr LogSource zplog{"ZPDevice"};
         logInit("test");
         zplog.info("%s is %d%%", "it", 7);
         const int line = __LINE__ - 1;
-        EXPECT_EQ(withoutTimestamp(root.read(path)), "[ZPDevice:" + std::to_string(line) + "] it is 7%\n");
+        EXPECT_EQ(fileLines(), std::vector{format("T-[ZPDevice:%d] it is 7%%", line)});
         zplog.error("100% of %@");
         EXPECT_NE(systemLog[0].find("Info"), std::string::npos);
         EXPECT_NE(systemLog[1].find("Error"), std::string::npos);

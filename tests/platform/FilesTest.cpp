@@ -54,10 +54,7 @@ TEST(Files, pathsAreResolvedInsideTheRoot) {
     root.link("/etc/loop", "loop");
     root.link("/etc/magic", "/proc/self/root/secret");
 
-    const struct {
-        std::string_view path;
-        std::optional<std::string> contents;
-    } rows[] = {
+    const std::pair<std::string_view, std::optional<std::string>> rows[] = {
         {"/etc/real", "real"},        {"etc/real", "real"},
         {"/../secret", "inside"},     {"/etc/../../../secret", "inside"},
         {"/etc/absolute", "real"},    {"/etc/relative", "inside"},
@@ -65,8 +62,8 @@ TEST(Files, pathsAreResolvedInsideTheRoot) {
         {"/etc/loop", std::nullopt},  {"/etc/magic", std::nullopt},
         {"", std::nullopt},           {std::string_view("/secret\0", 8), std::nullopt},
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(readText(row.path), row.contents) << row.path;
+    for (const auto& [path, contents] : rows)
+        EXPECT_EQ(readText(path), contents) << path;
 }
 
 TEST(Files, onlyRegularFilesAreReadAndNothingIsWaitedFor) {
@@ -74,11 +71,9 @@ TEST(Files, onlyRegularFilesAreReadAndNothingIsWaitedFor) {
     root.makeDirectory("/directory");
     ASSERT_EQ(::mkfifo(root.host("/fifo").c_str(), 0600), 0);
     root.write("/empty", "");
-    EXPECT_EQ(readText("/directory"), std::nullopt);
-    EXPECT_EQ(readText("/fifo"), std::nullopt);
-    EXPECT_EQ(readText("/missing"), std::nullopt);
     EXPECT_EQ(readText("/empty"), "");
-
+    for (const char* path : {"/directory", "/fifo", "/missing"})
+        EXPECT_EQ(readText(path), std::nullopt) << path;
     ::setenv("VELTRA_DEVICE_ROOT", "/", 1);
     EXPECT_EQ(readText("/dev/zero"), std::nullopt);
 }
@@ -138,26 +133,10 @@ TEST(Files, replaceRefusesWhatIsNoRegularFileAndLeavesEverythingAsItWas) {
     root.link("/linked", "tmp");
     const auto before = root.contents();
 
-    const std::string longName = "/tmp/" + std::string(256, 'n');
-    const std::string_view paths[] = {
-        "/tmp/directory",
-        "/tmp/fifo",
-        "/tmp/link",
-        "/tmp/dangling",
-        "/tmp/toHost",
-        "/linked/file",
-        "/linked/new",
-        "/missing/file",
-        "/tmp/file/x",
-        "/tmp/",
-        "/tmp/..",
-        "/tmp/.",
-        "/",
-        "",
-        longName,
-        std::string_view("/tmp/new\0", 9),
-    };
-    for (const std::string_view path : paths)
+    const std::string longName = "/tmp/" + std::string(256, 'n'), cutName("/tmp/new\0", 9);
+    for (const std::string& path : std::initializer_list<std::string>{
+             "/tmp/directory", "/tmp/fifo", "/tmp/link", "/tmp/dangling", "/tmp/toHost", "/linked/file", "/linked/new",
+             "/missing/file", "/tmp/file/x", "/tmp/", "/tmp/..", "/tmp/.", "/", "", longName, cutName})
         EXPECT_FALSE(files::replace(path, bytes("new"))) << path;
     EXPECT_EQ(root.contents(), before);
 }

@@ -74,10 +74,7 @@ TEST(KeyedArchive, bytesThatAreNoArchiveMakeNoDecoder) {
 
 TEST(KeyedArchive, everythingElseIsADecodingFailure) {
     using namespace std::string_literals;
-    const struct {
-        const char* what;
-        std::string value;
-    } rows[] = {
+    const std::pair<const char*, std::string> rows[] = {
         {"half float", "\xF9\x3C\x00"s},
         {"float", "\xFA\x3F\x80\x00\x00"s},
         {"double", "\xFB\x3F\xF0\x00\x00\x00\x00\x00\x00"s},
@@ -116,8 +113,8 @@ TEST(KeyedArchive, everythingElseIsADecodingFailure) {
         {"nothing at all", ""},
         {"octets behind the archive", "\x01\x01"s},
     };
-    for (const auto& row : rows)
-        EXPECT_THROW(decode(archiveOf(row.value)), ArchiveFailure) << row.what;
+    for (const auto& [what, value] : rows)
+        EXPECT_THROW(decode(archiveOf(value)), ArchiveFailure) << what;
 }
 
 } // namespace

@@ -18,10 +18,7 @@ std::optional<Value> read(const std::string& text) {
 
 TEST(PropertyList, elementsBecomeValues) {
     const std::string deep = "<array>";
-    const struct {
-        std::string element;
-        std::optional<Value> value;
-    } rows[] = {
+    const std::pair<std::string, std::optional<Value>> rows[] = {
         {"<dict><key>a</key><string>x &amp; y</string><key>b</key><array><true/><false/></array></dict>",
          Dictionary{{"a", "x & y"}, {"b", Array{true, false}}}},
         {"<dict/>", Dictionary{}},
@@ -45,9 +42,8 @@ TEST(PropertyList, elementsBecomeValues) {
         {"<array>", std::nullopt},
         {"", std::nullopt},
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(read("<?xml version=\"1.0\"?><plist version=\"1.0\">" + row.element + "</plist>"), row.value)
-            << row.element;
+    for (const auto& [element, value] : rows)
+        EXPECT_EQ(read("<?xml version=\"1.0\"?><plist version=\"1.0\">" + element + "</plist>"), value) << element;
     EXPECT_FALSE(read("<dict/>"));
 }
 

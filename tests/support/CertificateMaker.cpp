@@ -8,6 +8,7 @@
 #include <openssl/evp.h>
 #include <openssl/pem.h>
 #include <openssl/x509.h>
+#include <openssl/x509v3.h>
 
 namespace certificatemaker {
 
@@ -86,6 +87,12 @@ void setSerialNumber(X509* certificate, const Bytes& content) {
     require(X509_set_serialNumber(certificate, number.get()) == 1);
 }
 
+void addExtension(X509* certificate, int kind, const char* value) {
+    const Owner<X509_EXTENSION, X509_EXTENSION_free> extension(
+        require(X509V3_EXT_conf_nid(nullptr, nullptr, kind, value)));
+    require(X509_add_ext(certificate, extension.get(), -1) == 1);
+}
+
 Bytes encode(const Message& message) {
     return encode<CMS_ContentInfo>(message.get(), i2d_CMS_ContentInfo);
 }
@@ -104,6 +111,8 @@ Module module(const Bytes& serialNumber, KeyKind kind) {
     X509_gmtime_adj(X509_getm_notAfter(certificate.get()), 3600);
     require(X509_set_version(certificate.get(), X509_VERSION_3) == 1);
     require(X509_set_pubkey(certificate.get(), key.get()) == 1);
+    addExtension(certificate.get(), NID_key_usage, "critical,digitalSignature");
+    addExtension(certificate.get(), NID_basic_constraints, "CA:FALSE");
     require(X509_sign(certificate.get(), key.get(), kind == KeyKind::Ed25519 ? nullptr : EVP_sha256()) > 0);
     return {pem(key.get()), encode<X509>(certificate.get(), i2d_X509)};
 }

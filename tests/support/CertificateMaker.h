@@ -17,8 +17,8 @@ enum class KeyKind {
     Ed25519,
 };
 
-// A private key as PEM text, and a certificate for it, in DER, whose serialNumber has these content octets. A key is
-// made afresh each time.
+// A private key as PEM text, and a certificate for it, in DER, whose serialNumber has these content octets. It is for
+// digital signatures and no authority's. A key is made afresh each time.
 struct Module {
     std::string key;
     Bytes certificate;

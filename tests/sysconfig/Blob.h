@@ -14,6 +14,9 @@ constexpr SysConfig3Magic bCfg = 0x62436667;
 constexpr std::uint32_t keyWCh0 = 0x57436830;
 constexpr std::uint32_t keyMiGB = 0x4D694742;
 
+inline std::uint8_t keyBytes[] = {'k', 'e', 'y'};
+inline const SysConfigData hmacKey = {keyBytes, sizeof keyBytes};
+
 inline Bytes joined(std::initializer_list<Bytes> parts) {
     Bytes all;
     for (const Bytes& part : parts)
@@ -55,10 +58,14 @@ inline sysconfig::SysConfig3Ptr decode(const Bytes& blob) {
     return sysconfig::SysConfig3Ptr(decodeSysConfig3(blob.data(), static_cast<std::uint32_t>(blob.size())));
 }
 
+inline sysconfig::SysConfig3Ptr decodeParts(const BlobParts& parts) {
+    return decode(parts.whole());
+}
+
 // The encoded object, empty when it cannot be encoded.
-inline Bytes encode(const __SysConfig3* object) {
+inline Bytes encode(const sysconfig::SysConfig3Ptr& object) {
     SysConfigData out = {};
-    if (!encodeSysConfig3(object, &out))
+    if (!encodeSysConfig3(object.get(), &out))
         return {};
     const sysconfig::BytesPtr owner(out.data);
     return {out.data, out.data + out.length};
@@ -77,8 +84,8 @@ inline sysconfig::PayloadEntryPtr payloadString(std::uint32_t key, const char* s
     return sysconfig::PayloadEntryPtr(allocSysConfig3PayloadEntryWithString(key, comment, string));
 }
 
-inline sysconfig::PayloadEntryPtr payloadDeleted(std::uint32_t key) {
-    return sysconfig::PayloadEntryPtr(allocSysConfig3PayloadEntryDeleted(key, nullptr));
+inline sysconfig::PayloadEntryPtr payloadDeleted(std::uint32_t key, const char* comment = nullptr) {
+    return sysconfig::PayloadEntryPtr(allocSysConfig3PayloadEntryDeleted(key, comment));
 }
 
 inline sysconfig::MetadataEntryPtr metadataData(const char* key, const Bytes& data) {
@@ -90,51 +97,57 @@ inline sysconfig::MetadataEntryPtr metadataString(const char* key, const char* s
     return sysconfig::MetadataEntryPtr(allocSysConfig3MetadataEntry(key, nullptr, 0, string));
 }
 
-// The payload list in order, "WCh0=data 01 02, MiGB=string text".
-inline std::string payloadOf(const __SysConfig3* object) {
+inline bool add(const sysconfig::SysConfig3Ptr& object, const sysconfig::PayloadEntryPtr& entry) {
+    return sysConfig3AddPayloadEntry(object.get(), entry.get());
+}
+
+inline bool add(const sysconfig::SysConfig3Ptr& object, const sysconfig::MetadataEntryPtr& entry) {
+    return sysConfig3AddMetadataEntry(object.get(), entry.get());
+}
+
+// What a list shows of an entry's value, "=data 01 02" or "=string text".
+inline std::string valueText(bool hasData, const SysConfigData& data, const char* string) {
+    return (hasData ? "=data " + hexOf(data.data, data.length) : "") +
+           (string != nullptr ? std::string("=string ") + string : "");
+}
+
+// The payload list in order, "WCh0=data 01 02, MiGB=string text, ABCD=deleted".
+inline std::string payloadOf(const sysconfig::SysConfig3Ptr& object) {
     std::string list;
-    for (const auto* entry = sysConfig3GetHeadPayloadEntry(object); entry != nullptr;
+    for (const auto* entry = sysConfig3GetHeadPayloadEntry(object.get()); entry != nullptr;
          entry = sysConfig3PayloadEntryGetNextEntry(entry)) {
-        const std::uint32_t key = sysConfig3PayloadEntryGetKey(entry);
-        if (!list.empty())
-            list += ", ";
-        for (int shift = 24; shift >= 0; shift -= 8)
-            list += static_cast<char>(key >> shift);
         SysConfigData data = {};
-        if (sysConfig3PayloadEntryGetData(entry, &data))
-            list += "=data " + hexOf(data.data, data.length);
-        if (const char* string = sysConfig3PayloadEntryGetString(entry))
-            list += std::string("=string ") + string;
-        if (sysConfig3PayloadEntryGetDeleted(entry))
-            list += "=deleted";
+        const bool hasData = sysConfig3PayloadEntryGetData(entry, &data);
+        list += list.empty() ? "" : ", ";
+        for (int shift = 24; shift >= 0; shift -= 8)
+            list += static_cast<char>(sysConfig3PayloadEntryGetKey(entry) >> shift);
+        list += valueText(hasData, data, sysConfig3PayloadEntryGetString(entry));
+        list += sysConfig3PayloadEntryGetDeleted(entry) ? "=deleted" : "";
     }
     return list;
 }
 
 // The metadata list in order, "key=data 01 02, other=string text".
-inline std::string metadataOf(const __SysConfig3* object) {
+inline std::string metadataOf(const sysconfig::SysConfig3Ptr& object) {
     std::string list;
-    for (const auto* entry = sysConfig3GetHeadMetadataEntry(object); entry != nullptr;
+    for (const auto* entry = sysConfig3GetHeadMetadataEntry(object.get()); entry != nullptr;
          entry = sysConfig3MetadataEntryGetNextEntry(entry)) {
-        if (!list.empty())
-            list += ", ";
-        list += sysConfig3MetadataEntryGetKey(entry);
         SysConfigData data = {};
-        if (sysConfig3MetadataEntryGetData(entry, &data))
-            list += "=data " + hexOf(data.data, data.length);
-        if (const char* string = sysConfig3MetadataEntryGetString(entry))
-            list += std::string("=string ") + string;
+        const bool hasData = sysConfig3MetadataEntryGetData(entry, &data);
+        list += list.empty() ? "" : ", ";
+        list += sysConfig3MetadataEntryGetKey(entry);
+        list += valueText(hasData, data, sysConfig3MetadataEntryGetString(entry));
     }
     return list;
 }
 
 // The manifest, "00 | 00 | absent".
-inline std::string manifestOf(const __SysConfig3* object) {
+inline std::string manifestOf(const sysconfig::SysConfig3Ptr& object) {
     std::string list;
     for (const auto get :
          {sysConfig3ManifestGetPayloadHMAC, sysConfig3ManifestGetMetadataHMAC, sysConfig3ManifestGetFullHMAC}) {
         SysConfigData hmac = {};
-        get(sysConfig3GetManifest(object), &hmac);
+        get(sysConfig3GetManifest(object.get()), &hmac);
         list += list.empty() ? "" : " | ";
         list += hmac.data == nullptr ? "absent" : hexOf(hmac.data, hmac.length);
     }

@@ -1,7 +1,6 @@
 // Keys and HMACs. The expected values were made with an independent tool:
 //     printf '<message>' | openssl mac -digest SHA256 -macopt hexkey:6B6579 HMAC
 #include <string>
-#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -12,10 +11,6 @@
 namespace {
 
 using sysconfig::SysConfig3Ptr;
-using Lines = std::vector<std::string>;
-
-std::uint8_t keyBytes[] = {'k', 'e', 'y'};
-const SysConfigData key = {keyBytes, sizeof keyBytes};
 
 const char* const ofNothing = "5D5D139563C95B5967B9BD9A8C9B233A9DEDB45072794CD232DC1B74832607D0";
 // 30 68 43 57 2E 01 02
@@ -31,7 +26,9 @@ const char* const ofAll = "12DDDEE5C9B199D6893AD8D1ED940968F6B6831E8576173A74A0F
 // 30 68 43 57 2E
 const char* const ofDeleted = "471FE7DE8F0B79A3BBEE50736025292D6352A7B6B3BAAA3AB628C61BBC48EF17";
 
-std::string withoutBlanks(std::string text) {
+// The manifest, "<payload>|<metadata>|<full>".
+std::string hmacsOf(const SysConfig3Ptr& object) {
+    std::string text = manifestOf(object);
     std::erase(text, ' ');
     return text;
 }
@@ -41,29 +38,28 @@ std::string hmacs(const char* payload, const char* metadata, const char* full) {
 }
 
 SysConfig3Ptr keyedObject() {
-    return SysConfig3Ptr(allocSysConfig3WithHMACKey(bCfg, 0x30002, key));
+    return SysConfig3Ptr(allocSysConfig3WithHMACKey(bCfg, 0x30002, hmacKey));
 }
 
 TEST(HMAC, coversTheEntriesInOrder) {
     const Recorder recorder;
     const SysConfig3Ptr object = keyedObject();
     const auto expect = [&](const char* payload, const char* metadata, const char* full) {
-        EXPECT_EQ(withoutBlanks(manifestOf(object.get())), hmacs(payload, metadata, full));
+        EXPECT_EQ(hmacsOf(object), hmacs(payload, metadata, full));
         EXPECT_TRUE(sysConfig3IsValidHMAC(object.get()));
     };
     expect(ofNothing, ofNothing, ofNothing);
-    EXPECT_TRUE(sysConfig3AddPayloadEntry(object.get(), payloadData(keyWCh0, {1, 2}).get()));
+    EXPECT_TRUE(add(object, payloadData(keyWCh0, {1, 2})));
     expect(ofWCh0, ofNothing, ofWCh0);
-    EXPECT_TRUE(sysConfig3AddPayloadEntry(object.get(), payloadString(keyMiGB, "text", "note").get()));
+    EXPECT_TRUE(add(object, payloadString(keyMiGB, "text", "note")));
     expect(ofBoth, ofNothing, ofBoth);
-    EXPECT_TRUE(sysConfig3AddMetadataEntry(object.get(), metadataString("name", "value").get()));
-    EXPECT_TRUE(sysConfig3AddMetadataEntry(object.get(), metadataData("blob", {7, 8}).get()));
+    EXPECT_TRUE(add(object, metadataString("name", "value")));
+    EXPECT_TRUE(add(object, metadataData("blob", {7, 8})));
     expect(ofBoth, ofMetadata, ofAll);
 
     EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), "name"));
     EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), "blob"));
-    expect(ofBoth, ofNothing, ofBoth);
-    EXPECT_TRUE(sysConfig3AddPayloadEntry(object.get(), payloadData(keyWCh0, {1, 2}).get()));
+    EXPECT_TRUE(add(object, payloadData(keyWCh0, {1, 2})));
     expect(ofBothReversed, ofNothing, ofBothReversed);
     EXPECT_TRUE(sysConfig3DeletePayloadEntryForKey(object.get(), keyMiGB));
     expect(ofWCh0, ofNothing, ofWCh0);
@@ -71,29 +67,25 @@ TEST(HMAC, coversTheEntriesInOrder) {
 }
 
 TEST(HMAC, coversKeyAndCommentOfADeletedEntry) {
-    BlobParts parts;
-    parts.version = bytes("02 00 03 00");
-    parts.payload = bytes("31 0E 30 0C 02 04 30 68 43 57 16 01 2E 01 01 FF");
-    const SysConfig3Ptr object = decode(parts.whole());
-    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), key));
+    const SysConfig3Ptr object = decodeParts(
+        {.version = bytes("02 00 03 00"), .payload = bytes("31 0E 30 0C 02 04 30 68 43 57 16 01 2E 01 01 FF")});
+    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), hmacKey));
     EXPECT_TRUE(sysConfig3UpdateHMAC(object.get()));
-    EXPECT_EQ(withoutBlanks(manifestOf(object.get())), hmacs(ofDeleted, ofNothing, ofDeleted));
-}
-
-TEST(HMAC, isSupportedByVersion30002Only) {
-    EXPECT_FALSE(sysConfig3HMACIsSupported(0x30001));
-    EXPECT_TRUE(sysConfig3HMACIsSupported(0x30002));
-    EXPECT_FALSE(sysConfig3HMACIsSupported(0x30003));
+    EXPECT_EQ(hmacsOf(object), hmacs(ofDeleted, ofNothing, ofDeleted));
 }
 
 TEST(HMAC, isMadeInABufferOfTheCaller) {
     const SysConfig3Ptr object = keyedObject();
+    add(object, payloadData(keyWCh0, {1, 2}));
+    add(object, metadataString("name", "value"));
+    std::string created;
     for (const auto create : {sysConfig3CreatePayloadHMAC, sysConfig3CreateMetadataHMAC, sysConfig3CreateFullHMAC}) {
         SysConfigData out = {};
         ASSERT_TRUE(create(object.get(), &out));
         const sysconfig::BytesPtr owner(out.data);
-        EXPECT_EQ(withoutBlanks(hexOf(out.data, out.length)), ofNothing);
+        created += (created.empty() ? "" : " | ") + hexOf(out.data, out.length);
     }
+    EXPECT_EQ(created, manifestOf(object));
 }
 
 TEST(HMACKey, makesAnObjectThatIsNewStaleOrValid) {
@@ -103,63 +95,51 @@ TEST(HMACKey, makesAnObjectThatIsNewStaleOrValid) {
                            "sysConfig3IsValidHMAC: Metadata HMAC does not match.",
                            "sysConfig3IsValidHMAC: Full HMAC does not match."};
     const SysConfig3Ptr object = newObject(0x30002);
-    const auto payload = payloadData(keyWCh0, {1, 2});
-    const auto metadata = metadataString("k", "v");
-    const auto expectRefusals = [&](const Lines& reasons) {
-        const struct {
-            const char* operation;
-            bool result;
-        } changes[] = {
-            {"sysConfig3AddPayloadEntry", sysConfig3AddPayloadEntry(object.get(), payload.get())},
-            {"sysConfig3AddMetadataEntry", sysConfig3AddMetadataEntry(object.get(), metadata.get())},
-            {"sysConfig3DeletePayloadEntryForKey", sysConfig3DeletePayloadEntryForKey(object.get(), keyMiGB)},
-            {"sysConfig3DeleteMetadataEntryForKey", sysConfig3DeleteMetadataEntryForKey(object.get(), "m")},
-        };
-        Lines expected;
-        for (const auto& change : changes) {
-            EXPECT_FALSE(change.result) << change.operation;
-            expected.insert(expected.end(), reasons.begin(), reasons.end());
-            expected.push_back(std::string(change.operation) + ": Failed to validate HMAC.");
-        }
-        EXPECT_EQ(Recorder::take(), expected);
-        EXPECT_EQ(payloadOf(object.get()) + metadataOf(object.get()), "MiGB=data 05m=string v");
-    };
     ASSERT_TRUE(_sysConfig3AddPayloadEntry(object.get(), payloadData(keyMiGB, {5}).get()));
     ASSERT_TRUE(_sysConfig3AddMetadataEntry(object.get(), metadataString("m", "v").get()));
-
+    const auto expectChanges = [&](bool allowed) {
+        for (const bool changed : {add(object, payloadData(keyWCh0, {1, 2})), add(object, metadataString("k", "v")),
+                                   sysConfig3DeletePayloadEntryForKey(object.get(), keyWCh0),
+                                   sysConfig3DeleteMetadataEntryForKey(object.get(), "k")})
+            EXPECT_EQ(changed, allowed);
+    };
+    const auto expectRefusals = [&](const Lines& reasons) {
+        Recorder::take();
+        expectChanges(false);
+        Lines expected;
+        for (const char* operation : {"sysConfig3AddPayloadEntry", "sysConfig3AddMetadataEntry",
+                                      "sysConfig3DeletePayloadEntryForKey", "sysConfig3DeleteMetadataEntryForKey"}) {
+            expected.insert(expected.end(), reasons.begin(), reasons.end());
+            expected.push_back(operation + std::string(": Failed to validate HMAC."));
+        }
+        EXPECT_EQ(Recorder::take(), expected);
+        EXPECT_EQ(payloadOf(object) + metadataOf(object), "MiGB=data 05m=string v");
+    };
     const Recorder recorder;
     expectRefusals(noKey);
-    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), key));
+    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), hmacKey));
     expectRefusals(noMatch);
-    EXPECT_EQ(manifestOf(object.get()), "00 | 00 | 00");
+    EXPECT_EQ(manifestOf(object), "00 | 00 | 00");
     EXPECT_TRUE(sysConfig3UpdateHMAC(object.get()));
-    EXPECT_TRUE(sysConfig3AddPayloadEntry(object.get(), payload.get()));
-    EXPECT_TRUE(sysConfig3AddMetadataEntry(object.get(), metadata.get()));
+    expectChanges(true);
     EXPECT_EQ(Recorder::take(), Lines{});
-    EXPECT_TRUE(sysConfig3DeletePayloadEntryForKey(object.get(), keyWCh0));
-    EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), "k"));
     EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), {}));
     expectRefusals(noKey);
-    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), key));
+    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), hmacKey));
     EXPECT_TRUE(sysConfig3IsValidHMAC(object.get()));
-    std::uint8_t otherKey = 1;
-    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), {&otherKey, 1}));
-    Recorder::take();
+    EXPECT_TRUE(sysConfig3SetHMACKey(object.get(), {keyBytes, 1}));
     expectRefusals(noMatch);
 }
 
 TEST(HMAC, tellsWhichStoredValueDoesNotMatch) {
-    const struct {
-        SysConfigData __SysConfig3ManifestEntry::*hmac;
-        const char* line;
-    } rows[] = {
+    const std::pair<SysConfigData __SysConfig3ManifestEntry::*, const char*> rows[] = {
         {&__SysConfig3ManifestEntry::payloadHMAC, "sysConfig3IsValidHMAC: Payload HMAC does not match."},
         {&__SysConfig3ManifestEntry::metadataHMAC, "sysConfig3IsValidHMAC: Metadata HMAC does not match."},
         {&__SysConfig3ManifestEntry::fullHMAC, "sysConfig3IsValidHMAC: Full HMAC does not match."},
     };
-    for (const auto& row : rows) {
+    for (const auto& [hmac, line] : rows) {
         const SysConfig3Ptr object = keyedObject();
-        SysConfigData& stored = object->manifest->*row.hmac;
+        SysConfigData& stored = object->manifest->*hmac;
         const Recorder recorder;
         stored.data[31] ^= 1;
         EXPECT_FALSE(sysConfig3IsValidHMAC(object.get()));
@@ -170,78 +150,52 @@ TEST(HMAC, tellsWhichStoredValueDoesNotMatch) {
         std::free(stored.data);
         stored = {};
         EXPECT_FALSE(sysConfig3IsValidHMAC(object.get()));
-        EXPECT_EQ(Recorder::lines, (Lines{row.line, row.line, row.line}));
+        EXPECT_EQ(Recorder::lines, (Lines{line, line, line}));
     }
 }
 
 TEST(HMAC, saysWhatIsMissing) {
-    static __SysConfig3* keyless;
-    static __SysConfig3* laterVersion;
-    const SysConfig3Ptr newOne = newObject(0x30002);
-    const SysConfig3Ptr later = newObject(0x30003);
-    const SysConfig3Ptr keyed = keyedObject();
-    static const __SysConfig3* ready;
-    keyless = newOne.get();
-    laterVersion = later.get();
-    ready = keyed.get();
-    static SysConfigData out;
-    const struct {
-        bool (*fails)();
-        Lines formats;
-        std::string lastLine;
-    } rows[] = {
-        {[] { return allocSysConfig3WithHMACKey(bCfg, 0x30003, key) == nullptr; },
-         {"%s Requested version (0x%X) does not support HMAC."},
+    const SysConfig3Ptr keyless = newObject(0x30002), later = newObject(0x30003), ready = keyedObject();
+    SysConfigData out = {};
+    const Recorder recorder;
+    const Refusal refusals[] = {
+        {!allocSysConfig3WithHMACKey(bCfg, 0x30003, hmacKey),
+         "allocSysConfig3WithHMACKey: Requested version (0x%X) does not support HMAC.",
          "allocSysConfig3WithHMACKey: Requested version (0x30003) does not support HMAC."},
-        {[] { return allocSysConfig3WithHMACKey(1, 0x30002, key) == nullptr; },
-         {"%s invalid magic provided 0x%08X", "%s Failed to allocate sysconfig."},
-         "allocSysConfig3WithHMACKey: Failed to allocate sysconfig."},
-        {[] {
-             return allocSysConfig3WithHMACKey(bCfg, 0x30002, {keyBytes, 0}) == nullptr;
-         },
-         {"%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-          "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-          "%s Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-          "%s Failed to update HMAC."},
-         "allocSysConfig3WithHMACKey: Failed to update HMAC."},
-        {[] { return !sysConfig3SetHMACKey(nullptr, key); },
-         {"%s sysconfig is NULL."},
-         "sysConfig3SetHMACKey: sysconfig is NULL."},
-        {[] { return !sysConfig3UpdateHMAC(nullptr); },
-         {"%s sysconfig is NULL."},
-         "sysConfig3UpdateHMAC: sysconfig is NULL."},
-        {[] { return !sysConfig3UpdateHMAC(laterVersion); },
-         {"%s This SysConfig version (0x%X) does not support HMAC."},
+        {!sysConfig3SetHMACKey(nullptr, hmacKey), "sysConfig3SetHMACKey: sysconfig is NULL."},
+        {!sysConfig3UpdateHMAC(nullptr), "sysConfig3UpdateHMAC: sysconfig is NULL."},
+        {!sysConfig3UpdateHMAC(later.get()),
+         "sysConfig3UpdateHMAC: This SysConfig version (0x%X) does not support HMAC.",
          "sysConfig3UpdateHMAC: This SysConfig version (0x30003) does not support HMAC."},
-        {[] { return !sysConfig3IsValidHMAC(nullptr); },
-         {"%s sysconfig is NULL."},
-         "sysConfig3IsValidHMAC: sysconfig is NULL."},
-        {[] { return !sysConfig3IsValidHMAC(keyless); },
-         {"Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %d. Did you register HMAC key?"},
+        {!sysConfig3IsValidHMAC(nullptr), "sysConfig3IsValidHMAC: sysconfig is NULL."},
+        {!sysConfig3IsValidHMAC(keyless.get()),
+         "Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %d. Did you register HMAC key?",
          "Invalid HMAC key. sysconfig->hmacKey.data = (nil), sysconfig->hmacKey.length = 0. Did you register HMAC "
          "key?"},
-        {[] { return !sysConfig3CreatePayloadHMAC(nullptr, &out); }, {}, ""},
-        {[] { return !sysConfig3CreateMetadataHMAC(nullptr, &out); }, {}, ""},
-        {[] { return !sysConfig3CreateFullHMAC(nullptr, &out); },
-         {"%s sysconfig is NULL."},
-         "sysConfig3CreateFullHMAC: sysconfig is NULL."},
-        {[] { return !sysConfig3CreatePayloadHMAC(keyless, nullptr); },
-         {"%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u"},
+        {!sysConfig3CreateFullHMAC(nullptr, &out), "sysConfig3CreateFullHMAC: sysconfig is NULL."},
+        {!sysConfig3CreatePayloadHMAC(keyless.get(), nullptr),
+         "sysConfig3CreatePayloadHMAC: Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
          "sysConfig3CreatePayloadHMAC: Invalid HAMC key. sysconfig->hmacKey.data = (nil), sysconfig->hmacKey.length = "
          "0"},
-        {[] { return !sysConfig3CreateMetadataHMAC(ready, nullptr); },
-         {"%s hmac is NULL"},
-         "sysConfig3CreateMetadataHMAC: hmac is NULL"},
-        {[] { return !sysConfig3CreateFullHMAC(ready, nullptr); },
-         {"%s hmac is NULL"},
-         "sysConfig3CreateFullHMAC: hmac is NULL"},
+        {!sysConfig3CreateMetadataHMAC(ready.get(), nullptr), "sysConfig3CreateMetadataHMAC: hmac is NULL"},
+        {!sysConfig3CreateFullHMAC(ready.get(), nullptr), "sysConfig3CreateFullHMAC: hmac is NULL"},
     };
-    for (const auto& row : rows) {
-        const Recorder recorder;
-        EXPECT_TRUE(row.fails()) << row.lastLine;
-        EXPECT_EQ(Recorder::formats, row.formats);
-        EXPECT_EQ(Recorder::lines.empty() ? "" : Recorder::lines.back(), row.lastLine);
-    }
+    Recorder::expect(refusals);
+
+    Recorder::take();
+    EXPECT_FALSE(sysConfig3CreatePayloadHMAC(nullptr, &out));
+    EXPECT_FALSE(sysConfig3CreateMetadataHMAC(nullptr, &out));
+    EXPECT_EQ(Recorder::lines, Lines{});
+    EXPECT_EQ(allocSysConfig3WithHMACKey(1, 0x30002, hmacKey), nullptr);
+    EXPECT_EQ(allocSysConfig3WithHMACKey(bCfg, 0x30002, {keyBytes, 0}), nullptr);
+    const std::string noKey = "sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u";
+    const Lines expected = {"allocSysConfig3: invalid magic provided 0x%08X",
+                            "allocSysConfig3WithHMACKey: Failed to allocate sysconfig.",
+                            "sysConfig3CreatePayloadHMAC: Invalid HAMC key. " + noKey,
+                            "sysConfig3CreateMetadataHMAC: Invalid HAMC key. " + noKey,
+                            "sysConfig3CreateFullHMAC: Invalid HMAC key. " + noKey,
+                            "allocSysConfig3WithHMACKey: Failed to update HMAC."};
+    EXPECT_EQ(Recorder::formats, expected);
     EXPECT_EQ(out.data, nullptr);
 }
 

@@ -15,19 +15,16 @@ using sysconfig::SysConfig3Ptr;
 TEST(SipHash, givesThePublishedValues) {
     // Of the algorithm's reference vectors: key octets 00 to 0F, message octets 00, 01, 02 and so on.
     constexpr std::uint64_t key[2] = {0x0706050403020100, 0x0F0E0D0C0B0A0908};
-    const struct {
-        std::size_t length;
-        std::uint64_t hash;
-    } rows[] = {{0, 0x726FDB47DD0E0E31},
-                {1, 0x74F839C593DC67FD},
-                {7, 0xAB0200F58B01D137},
-                {8, 0x93F5F5799A932462},
-                {15, 0xA129CA6149BE45E5}};
+    const std::pair<std::size_t, std::uint64_t> rows[] = {{0, 0x726FDB47DD0E0E31},
+                                                          {1, 0x74F839C593DC67FD},
+                                                          {7, 0xAB0200F58B01D137},
+                                                          {8, 0x93F5F5799A932462},
+                                                          {15, 0xA129CA6149BE45E5}};
     std::string message;
     for (char octet = 0; octet < 15; ++octet)
         message += octet;
-    for (const auto& row : rows)
-        EXPECT_EQ(sysconfig::sipHash(key, std::string_view(message).substr(0, row.length)), row.hash) << row.length;
+    for (const auto& [length, hash] : rows)
+        EXPECT_EQ(sysconfig::sipHash(key, std::string_view(message).substr(0, length)), hash) << length;
 }
 
 // The number of entries that looking up every key once would pass.
@@ -50,9 +47,7 @@ BlobParts withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint3
                                        static_cast<std::uint8_t>(key >> 8), static_cast<std::uint8_t>(key >> 16),
                                        static_cast<std::uint8_t>(key >> 24), 0x16, 0x00, 0x01, 0x01, 0xFF});
     }
-    BlobParts parts;
-    parts.payload = item("31", entries);
-    return parts;
+    return {.payload = item("31", entries)};
 }
 
 TEST(Index, standsAMillionKeysOfAnAdversary) {
@@ -67,7 +62,7 @@ TEST(Index, standsAMillionKeysOfAnAdversary) {
         {"equal in the middle", [](std::uint32_t i) { return (i & 0xFFF) | (i >> 12 | 0x100) << 22; }},
     };
     for (const auto& row : rows) {
-        const SysConfig3Ptr object = decode(withPayloadKeys(count, row.keyOf).whole());
+        const SysConfig3Ptr object = decodeParts(withPayloadKeys(count, row.keyOf));
         ASSERT_EQ(sysConfig3GetPayloadEntryCount(object.get()), count) << row.what;
         // An entry costs 1, and chance collisions add a half to that.
         EXPECT_LT(costOfAllLookups(object->payload), 2 * count) << row.what;
@@ -75,8 +70,8 @@ TEST(Index, standsAMillionKeysOfAnAdversary) {
 }
 
 TEST(Index, keepsOneOfAMillionEntriesWithOneKey) {
-    const SysConfig3Ptr object = decode(withPayloadKeys(1000000, [](std::uint32_t) { return keyWCh0; }).whole());
-    EXPECT_EQ(payloadOf(object.get()), "WCh0=deleted");
+    const SysConfig3Ptr object = decodeParts(withPayloadKeys(1000000, [](std::uint32_t) { return keyWCh0; }));
+    EXPECT_EQ(payloadOf(object), "WCh0=deleted");
     EXPECT_EQ(costOfAllLookups(object->payload), 1U);
 }
 
@@ -87,9 +82,7 @@ TEST(Index, spreadsMetadataKeysToo) {
         const Bytes entry = item("30", joined({item("16", text(std::to_string(i << 8))), bytes("16 00")}));
         entries.insert(entries.end(), entry.begin(), entry.end());
     }
-    BlobParts parts;
-    parts.metadata = item("31", entries);
-    const SysConfig3Ptr object = decode(parts.whole());
+    const SysConfig3Ptr object = decodeParts({.metadata = item("31", entries)});
     ASSERT_EQ(sysConfig3GetMetadataEntryCount(object.get()), count);
     EXPECT_LT(costOfAllLookups(object->metadata), 2 * count);
 }
