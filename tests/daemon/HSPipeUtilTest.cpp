@@ -221,8 +221,8 @@ int unusedDescriptors() {
 
 TEST_F(HSPipeUtilTest, withoutDescriptorsForThePipesNothingIsRunAndNoneStaysOpen) {
     script("exit 0");
-    const std::string noPipe = "2 [HSPipeUtil] pipe failed while preparing to execute /usr/bin/program: ";
-    const std::string noStart = "2 [HSPipeUtil] posix_spawn /usr/bin/program failed: ";
+    const std::string noPipe = "pipe failed while preparing to execute /usr/bin/program: ";
+    const std::string noStart = "posix_spawn /usr/bin/program failed: ";
     const struct {
         bool withInput;
         int unused;
@@ -250,9 +250,8 @@ TEST_F(HSPipeUtilTest, aChildThatCannotBeWaitedForIsAFailureWithItsOutput) {
             EXPECT_EQ(error_.text,
                       std::string("Error executing command") + (withInput ? " with data" : "") + ", result = -1\n");
             EXPECT_EQ(output(), "out\n");
-            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] waitpid failed for /usr/bin/program: " + text(ECHILD)),
-                      1);
-            EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] child exited\n"), 0);
+            EXPECT_EQ(std::ranges::count(log(), "waitpid failed for /usr/bin/program: " + text(ECHILD)), 1);
+            EXPECT_EQ(std::ranges::count(log(), "child exited\n"), 0);
         }
     });
 }
@@ -263,7 +262,7 @@ TEST_F(HSPipeUtilTest, aChildThatWritesMoreThanMemoryHoldsDecidesByItsEnd) {
     inOwnProcess([&] {
         limitMemory(std::size_t{100} << 20);
         EXPECT_EQ(run(), 7);
-        EXPECT_EQ(std::ranges::count(log(), "2 [HSPipeUtil] /usr/bin/program was terminated by signal 13\n"), 1);
+        EXPECT_EQ(std::ranges::count(log(), "/usr/bin/program was terminated by signal 13\n"), 1);
         EXPECT_GT(response_["Output"].text()->size(), std::size_t{10} << 20);
         EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
 

@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <gtest/gtest.h>
+#include <malloc.h>
 
 // Runs `body` in a child process, for what a process does once or cannot take back. Its expectations count as those of
 // the calling test.
@@ -32,6 +33,7 @@ inline void limitMemory(std::size_t bytes) {
     ASSERT_GT(pages, 0U);
     const rlim_t limit = pages * static_cast<std::size_t>(::getpagesize()) + bytes;
     const rlimit limits{limit, limit};
+    ::mallopt(M_ARENA_MAX, 1); // a new thread would take address space for a heap of its own
     ASSERT_EQ(::setrlimit(RLIMIT_AS, &limits), 0);
 }
 #endif
