@@ -82,7 +82,7 @@ DERReturn Img4DecodeEvaluateCertificateProperties(const Img4Record* record) {
         case manifestPropertiesTag:
             return constrain(record->manp, element);
         case objectPropertiesTag:
-            return isPresent(record->objp) ? constrain(record->objp, element) : DERSuccess;
+            return hasContent(record->objp) ? constrain(record->objp, element) : DERSuccess;
         case measurementTag:
             return DERSuccess;
         default:

@@ -152,8 +152,8 @@ IMG4_API DERReturn Img4DecodeEvaluateDictionaryProperties(const DERItem* diction
 //
 // The leaf certificate limits what its key may sign. manifest.certProperties is the whole encoding of a SET of
 // properties, whose values are SETs of properties in turn: "MANP" constrains manp, "OBJP" constrains objp (and nothing
-// when there is no objp), "manx" belongs to measurements and binds nothing here. A constraint binds the property with
-// its tag:
+// when that is absent or empty), "manx" belongs to measurements and binds nothing here. A constraint binds the property
+// with its tag:
 //   BOOLEAN, INTEGER, OCTET STRING   the property must be there, with this very value
 //   [0] constructed                  the property must be there, with any value
 //   [1] constructed                  the property must not be there
@@ -193,8 +193,8 @@ IMG4_API DERReturn Img4DecodeComputeDigest(const DERItem* data, uint8_t* out, ui
 // memory has run out, after which the state has no digest and needs no Final, though one does no harm. DERParamError
 // also says that an operation is out of turn.
 typedef struct Img4DigestState {
-    void* running; // null unless between Init and Final
-    uint64_t hashLength;
+    void* running;       // null unless between Init and Final
+    uint64_t hashLength; // of the profile given to Init; the other operations take no profile of another length
     uint8_t hash[Img4LongestDigest];
 } Img4DigestState;
 

@@ -16,16 +16,20 @@ constexpr DERItem oidSha256 = {sha256Octets, sizeof sha256Octets};
 constexpr DERItem oidSha384 = {sha384Octets, sizeof sha384Octets};
 constexpr DERItem oidSha512 = {sha512Octets, sizeof sha512Octets};
 
-constexpr Img4DigestImplementation sha1 = {crypto::Digest::SHA1};
-constexpr Img4DigestImplementation sha256 = {crypto::Digest::SHA256};
-constexpr Img4DigestImplementation sha384 = {crypto::Digest::SHA384};
-constexpr Img4DigestImplementation sha512 = {crypto::Digest::SHA512};
+constexpr Img4DigestImplementation sha1 = {crypto::Digest::SHA1, crypto::sha1Size};
+constexpr Img4DigestImplementation sha256 = {crypto::Digest::SHA256, crypto::sha256Size};
+constexpr Img4DigestImplementation sha384 = {crypto::Digest::SHA384, crypto::sha384Size};
+constexpr Img4DigestImplementation sha512 = {crypto::Digest::SHA512, crypto::sha512Size};
 
 static_assert(Img4HashLength == crypto::sha1Size && Img4MaxDigestLength == crypto::sha384Size &&
               Img4LongestDigest == crypto::sha512Size);
 
+// Null also when the description claims another length than its implementation has: callers size their buffers by it.
 const Img4DigestImplementation* digestOf(const Img4TrustProfile* profile) {
-    return profile != nullptr && profile->digestInfo != nullptr ? profile->digestInfo->implementation : nullptr;
+    if (profile == nullptr || profile->digestInfo == nullptr)
+        return nullptr;
+    const Img4DigestImplementation* implementation = profile->digestInfo->implementation;
+    return implementation != nullptr && implementation->size == profile->digestInfo->length ? implementation : nullptr;
 }
 
 } // namespace
@@ -60,14 +64,18 @@ DERReturn Img4DecodeDigestInit(Img4DigestState* state, const Img4TrustProfile* p
     if (state == nullptr)
         return DERParamError;
     *state = Img4DigestState{};
-    if (implementation == nullptr || profile->digestInfo->length > sizeof state->hash)
+    if (implementation == nullptr)
         return DERParamError;
     state->running = crypto::startDigest(implementation->algorithm);
-    return state->running != nullptr ? DERSuccess : Img4Failure;
+    if (state->running == nullptr)
+        return Img4Failure;
+    state->hashLength = implementation->size;
+    return DERSuccess;
 }
 
 DERReturn Img4DecodeDigestUpdate(Img4DigestState* state, const DERItem* data, const Img4TrustProfile* profile) {
-    if (state == nullptr || state->running == nullptr || data == nullptr || ::digestOf(profile) == nullptr)
+    if (state == nullptr || state->running == nullptr || data == nullptr ||
+        img4::digestOf(profile, state->hashLength) == nullptr)
         return DERParamError;
     crypto::RunningDigest* running = static_cast<crypto::RunningDigest*>(state->running);
     if (data->length == 0 || crypto::updateDigest(running, bytesOf(*data)))
@@ -83,16 +91,18 @@ DERReturn Img4DecodeDigestFinal(Img4DigestState* state, const Img4TrustProfile* 
         return DERParamError;
     const bool done = crypto::finishDigest(static_cast<crypto::RunningDigest*>(state->running), state->hash);
     state->running = nullptr;
-    if (::digestOf(profile) == nullptr)
+    const bool isOfProfile = img4::digestOf(profile, state->hashLength) != nullptr;
+    if (!done || !isOfProfile)
+        *state = Img4DigestState{};
+    if (!isOfProfile)
         return DERParamError;
-    state->hashLength = done ? profile->digestInfo->length : 0;
     return done ? DERSuccess : Img4Failure;
 }
 
 DERReturn Img4DecodeDigestReturnHash(const Img4DigestState* state, uint8_t* out, uint64_t length,
                                      const Img4TrustProfile* profile) {
-    if (state == nullptr || state->hashLength == 0 || out == nullptr || ::digestOf(profile) == nullptr ||
-        state->hashLength != profile->digestInfo->length)
+    if (state == nullptr || state->running != nullptr || state->hashLength == 0 || out == nullptr ||
+        img4::digestOf(profile, state->hashLength) == nullptr)
         return DERParamError;
     if (length < state->hashLength)
         return DERBufferOverflow;

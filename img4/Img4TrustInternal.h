@@ -8,6 +8,7 @@
 
 struct Img4DigestImplementation {
     crypto::Digest algorithm;
+    uint64_t size; // octets
 };
 
 // The built-in domain, made from the DER files of its folder when the library is built.

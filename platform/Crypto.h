@@ -62,8 +62,8 @@ private:
 
 // Whether `signature` is the RSASSA-PKCS1-v1_5 signature (RFC 8017 8.2.2) over the message with the digest `hash`,
 // which `algorithm` has made, under the public key of `modulus` and `exponent`, both big-endian and without leading
-// zeros. The signature must be as long as the modulus. False for numbers of more than 8192 bits, and when memory has
-// run out.
+// zeros. The signature must be as long as the modulus. False for a modulus of more than 8192 bits, for an exponent
+// longer than it, and when memory has run out.
 bool verifyRSASignature(Digest algorithm, Bytes hash, Bytes modulus, Bytes exponent, Bytes signature) noexcept;
 
 enum class Curve {

@@ -220,21 +220,29 @@ Img4TrustProfile profileWith(const Img4TrustProfile& like, const Img4DigestInfo&
 const Img4DigestInfo* const digestInfos[] = {&kQDSupportDigestInfoSha1, &kQDSupportDigestInfoSha256,
                                              &kQDSupportDigestInfoSha384, &kQDSupportDigestInfoSha512};
 
-TEST(Img4RSASignature, isOverTheExactBlock) {
-    for (const Img4DigestInfo* info : digestInfos) {
-        const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, *info);
-        const Bytes digest = digestOfMessage(profile);
-        const Bytes key = publicKeyBits(rsaKey());
-        EXPECT_TRUE(accepts(verify_signature_rsa, profile, key, sign(rsaKey(), info->length, message), digest));
-        for (const BlockCase& row : blockCases) {
-            SCOPED_TRACE(std::to_string(info->length) + ", " + row.name);
-            Block block;
-            block.digestInfo = sequence({sequence({oid(*info->oid), null}), octets(digest)});
-            row.change(block, digest, oid(*info->oid));
-            const Bytes signature = signRaw(rsaKey(), encode(block, 256));
-            EXPECT_EQ(accepts(verify_signature_rsa, profile, key, signature, digest), row.accepted);
-        }
+void checkBlocks(const Key& key, const Img4DigestInfo& info) {
+    const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, info);
+    const Bytes digest = digestOfMessage(profile);
+    const Bytes bits = publicKeyBits(key);
+    const std::size_t size = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
+    EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info.length, message), digest));
+    for (const BlockCase& row : blockCases) {
+        SCOPED_TRACE(std::to_string(info.length) + " at " + std::to_string(size) + ", " + row.name);
+        Block block;
+        block.digestInfo = sequence({sequence({oid(*info.oid), null}), octets(digest)});
+        row.change(block, digest, oid(*info.oid));
+        const Bytes signature = signRaw(key, encode(block, size));
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature, digest), row.accepted);
     }
+}
+
+const Bytes longExponent = {0x01, 0, 0, 0, 0, 0, 0, 0, 0x0D};
+
+TEST(Img4RSASignature, isOverTheExactBlock) {
+    // OpenSSL itself does not verify with exponents of more than 64 bits under moduli of more than 3072.
+    for (const Key& key : {rsaKey(), makeMultiPrimeRSAKey(3080, longExponent)})
+        for (const Img4DigestInfo* info : digestInfos)
+            checkBlocks(key, *info);
 }
 
 TEST(Img4RSASignature, isANumberBelowTheModulusOfItsLength) {
@@ -332,11 +340,14 @@ TEST(Img4RSASignature, needsAModulusWithinTheVerifiersLimits) {
         unsigned bits;
         bool accepted;
         bool acceptedBy3k;
+        Bytes exponent = {0x01, 0x00, 0x01};
     };
     // The upper limits are tried with more than two primes, which are found sooner; to a verifier they look alike.
-    for (const Row& row : {Row{1016, false, false}, Row{1024, true, true}, Row{3072, true, true},
-                           Row{3073, true, false}, Row{4096, true, false}, Row{4097, false, false}}) {
-        const Key key = row.bits > 2048 ? makeMultiPrimeRSAKey(row.bits) : makeRSAKey(row.bits);
+    for (const Row& row :
+         {Row{1016, false, false}, Row{1024, true, true}, Row{3072, true, true}, Row{3073, true, false},
+          Row{4096, true, false}, Row{4097, false, false}, Row{2048, true, true, {0x03}},
+          Row{3072, true, true, longExponent}, Row{4096, true, false, {0x03}}, Row{4096, true, false, longExponent}}) {
+        const Key key = row.bits > 1024 ? makeMultiPrimeRSAKey(row.bits, row.exponent) : makeRSAKey(row.bits);
         const Bytes bits = publicKeyBits(key);
         const Bytes signature = sign(key, digest.size(), message);
         EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature, digest), row.accepted) << row.bits;

@@ -724,7 +724,7 @@ TEST(Img4Constraints, needPropertiesToBind) {
     record.manifest.certProperties = viewOf(ofObject);
     EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "no object was evaluated";
     record.objp = {broken.data(), 0};
-    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DEREndOfSequence) << "an object without properties";
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "an object without properties";
 
     record.manifest.certProperties = viewOf(ofManifest);
     record.manp = viewOf(broken);

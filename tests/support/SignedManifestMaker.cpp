@@ -4,6 +4,7 @@
 #include <iterator>
 #include <stdexcept>
 
+#include <openssl/bn.h>
 #include <openssl/ec.h>
 #include <openssl/pem.h>
 #include <openssl/rsa.h>
@@ -60,12 +61,14 @@ Key makeRSAKey(unsigned bits) {
     return own(EVP_RSA_gen(bits));
 }
 
-Key makeMultiPrimeRSAKey(unsigned bits) {
+Key makeMultiPrimeRSAKey(unsigned bits, const Bytes& exponent) {
     constexpr int primes = 3;
     EVP_PKEY* key = nullptr;
     const std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free)> maker(
         EVP_PKEY_CTX_new_from_name(nullptr, "RSA", nullptr), EVP_PKEY_CTX_free);
-    if (EVP_PKEY_keygen_init(maker.get()) != 1 ||
+    const std::unique_ptr<BIGNUM, decltype(&BN_free)> e(
+        BN_bin2bn(exponent.data(), static_cast<int>(exponent.size()), nullptr), BN_free);
+    if (EVP_PKEY_keygen_init(maker.get()) != 1 || EVP_PKEY_CTX_set1_rsa_keygen_pubexp(maker.get(), e.get()) != 1 ||
         EVP_PKEY_CTX_set_rsa_keygen_bits(maker.get(), static_cast<int>(bits)) != 1 ||
         EVP_PKEY_CTX_set_rsa_keygen_primes(maker.get(), primes) != 1 || EVP_PKEY_generate(maker.get(), &key) != 1)
         throw std::runtime_error("cannot make a key");

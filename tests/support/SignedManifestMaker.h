@@ -20,7 +20,8 @@ using Key = std::shared_ptr<EVP_PKEY>;
 
 Key readKey(const std::string& pemFile);
 Key makeRSAKey(unsigned bits);
-Key makeMultiPrimeRSAKey(unsigned bits); // of three primes, found sooner than two
+// Of three primes, found sooner than two. The public exponent is big-endian.
+Key makeMultiPrimeRSAKey(unsigned bits, const Bytes& exponent = {0x01, 0x00, 0x01});
 Key makeECKey(const char* curve);
 Bytes readFile(const std::string& path);
 

@@ -257,8 +257,11 @@ void Verification::addProperties(const TrustEvaluation& evaluation) {
         return;
     report_.json["manifestProperties"] = properties(record.manp, "the manifest");
     addObjects(record.manb);
-    if (record.objp.data == nullptr)
+    if (record.objp.data == nullptr) {
+        if (record.payloadHashed != 0)
+            note("No object was named, so nothing says that the payload belongs to this manifest");
         return;
+    }
     report_.json["object"] = {{"name", codeText(*object_)}, {"properties", properties(record.objp, "the object")}};
     if (record.payloadHashed != 0)
         note("Whether the payload is this object's was not judged: compare the payload's digest with the one that the "

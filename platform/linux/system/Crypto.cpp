@@ -7,10 +7,12 @@
 #include <cstring>
 #include <memory>
 
+#include <openssl/bn.h>
 #include <openssl/core_names.h>
 #include <openssl/crypto.h>
 #include <openssl/err.h>
 #include <openssl/evp.h>
+#include <openssl/objects.h>
 #include <openssl/params.h>
 #include <openssl/rsa.h>
 #include <sys/random.h>
@@ -175,7 +177,7 @@ public:
     Importer(const Importer&) = delete;
     Importer& operator=(const Importer&) = delete;
 
-    Key import(OSSL_PARAM* params) && noexcept {
+    Key importKey(OSSL_PARAM* params) && noexcept {
         EVP_PKEY* key = nullptr;
         if (context_ == nullptr || EVP_PKEY_fromdata(context_.get(), &key, EVP_PKEY_PUBLIC_KEY, params) != 1)
             return nullptr;
@@ -214,13 +216,11 @@ private:
 };
 
 Key importRSAKey(Bytes modulus, Bytes exponent) noexcept {
-    if (modulus.length > NativeNumber::capacity || exponent.length > NativeNumber::capacity)
-        return nullptr;
     NativeNumber n(modulus);
     NativeNumber e(exponent);
     OSSL_PARAM params[] = {n.parameter(OSSL_PKEY_PARAM_RSA_N), e.parameter(OSSL_PKEY_PARAM_RSA_E),
                            OSSL_PARAM_construct_end()};
-    return Importer(rsaKeys).import(params);
+    return Importer(rsaKeys).importKey(params);
 }
 
 struct CurveDescription {
@@ -240,7 +240,59 @@ Key importPoint(Curve curve, Bytes point) noexcept {
         OSSL_PARAM_construct_utf8_string(OSSL_PKEY_PARAM_GROUP_NAME, const_cast<char*>(description.name), 0),
         OSSL_PARAM_construct_octet_string(OSSL_PKEY_PARAM_PUB_KEY, const_cast<std::uint8_t*>(point.data), point.length),
         OSSL_PARAM_construct_end()};
-    return Importer(ecKeys).import(params);
+    return Importer(ecKeys).importKey(params);
+}
+
+// The library takes exponents of more than 64 bits only with moduli of at most 3072.
+bool isBeyondLibrary(Bytes modulus, Bytes exponent) noexcept {
+    return exponent.length > OPENSSL_RSA_MAX_PUBEXP_BITS / 8 && modulus.length > OPENSSL_RSA_SMALL_MODULUS_BITS / 8;
+}
+
+using Number = std::unique_ptr<BIGNUM, Release<BIGNUM, BN_free>>;
+using NumberContext = std::unique_ptr<BN_CTX, Release<BN_CTX, BN_CTX_free>>;
+
+Number number(Bytes octets) noexcept {
+    return Number(BN_bin2bn(octets.data, static_cast<int>(octets.length), nullptr));
+}
+
+// Writes the encoded message of RFC 8017 9.2 for a digest into the `size` octets at `out`.
+bool encodeMessage(const EVP_MD* md, Bytes hash, unsigned char* out, std::size_t size) noexcept {
+    const ASN1_OBJECT* const id = OBJ_nid2obj(EVP_MD_get_type(md));
+    const std::size_t idLength = OBJ_length(id);
+    // Short-form lengths serve: no digest here, and none of their identifiers, is longer.
+    const auto octet = [](std::size_t length) { return static_cast<unsigned char>(length); };
+    const unsigned char beforeId[] = {
+        0x30, octet(8 + idLength + hash.length), 0x30, octet(4 + idLength), 0x06, octet(idLength)};
+    const unsigned char beforeHash[] = {0x05, 0x00, 0x04, octet(hash.length)};
+    const std::size_t infoLength = sizeof beforeId + idLength + sizeof beforeHash + hash.length;
+    constexpr std::size_t leastPadding = 8 + 3;
+    if (size < infoLength + leastPadding)
+        return false;
+    unsigned char* const info = out + size - infoLength;
+    std::fill(out, info, std::uint8_t{0xFF});
+    out[0] = 0x00;
+    out[1] = 0x01;
+    info[-1] = 0x00;
+    unsigned char* next = std::copy(std::begin(beforeId), std::end(beforeId), info);
+    next = std::copy_n(OBJ_get0_data(id), idLength, next);
+    next = std::copy(std::begin(beforeHash), std::end(beforeHash), next);
+    std::copy_n(hash.data, hash.length, next);
+    return true;
+}
+
+// RFC 8017 5.2.2 and 8.2.2 by the library's arithmetic, for keys of at most NativeNumber::capacity octets.
+bool verifyByArithmetic(const EVP_MD* md, Bytes hash, Bytes modulus, Bytes exponent, Bytes signature) noexcept {
+    const Number n = number(modulus);
+    const Number e = number(exponent);
+    const Number s = number(signature);
+    const Number message(BN_new());
+    const NumberContext context(BN_CTX_new());
+    unsigned char found[NativeNumber::capacity];
+    unsigned char expected[NativeNumber::capacity];
+    return n && e && s && message && context && BN_cmp(s.get(), n.get()) < 0 &&
+           BN_mod_exp(message.get(), s.get(), e.get(), n.get(), context.get()) == 1 &&
+           BN_bn2binpad(message.get(), found, static_cast<int>(modulus.length)) >= 0 &&
+           encodeMessage(md, hash, expected, modulus.length) && std::memcmp(found, expected, modulus.length) == 0;
 }
 
 } // namespace
@@ -251,6 +303,10 @@ bool verifyRSASignature(Digest algorithm, Bytes hash, Bytes modulus, Bytes expon
     if (md == nullptr || hash.length != description.size || signature.length != modulus.length)
         return false;
     const QuietErrors quiet;
+    if (modulus.length > NativeNumber::capacity || exponent.length > modulus.length)
+        return false;
+    if (isBeyondLibrary(modulus, exponent))
+        return verifyByArithmetic(md, hash, modulus, exponent, signature);
     const Key key = importRSAKey(modulus, exponent);
     const KeyContext verifier(key != nullptr ? EVP_PKEY_CTX_new_from_pkey(nullptr, key.get(), nullptr) : nullptr);
     return verifier != nullptr && EVP_PKEY_verify_init(verifier.get()) == 1 &&
