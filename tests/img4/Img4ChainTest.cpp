@@ -110,7 +110,10 @@ const LeafCase leafCases[] = {
     {"other signature algorithm", Img4ChainSignatureAlgorithm,
      [](Certificate& leaf, const Signer&) {
          leaf.signatureAlgorithm = algorithm(item(DERTagObjectIdentifier, sha512Rsa), null);
+         leaf.digestLength = 64;
      }},
+    {"signature over the digest of another algorithm", Img4ChainSignature,
+     [](Certificate& leaf, const Signer&) { leaf.digestLength = 64; }},
     {"signature algorithm of another curve's digest", Img4ChainSignatureAlgorithm,
      [](Certificate& leaf, const Signer&) {
          leaf.signatureAlgorithm = algorithm(item(DERTagObjectIdentifier, sha512Ecdsa));

@@ -203,6 +203,12 @@ const Forgery forgeries[] = {
          fields.signature = sign(s.leafKey(), 48, body);
          return manifest(fields);
      }},
+    {"leaf's key changed in its last octet, which takes a point off its curve",
+     [](const Signer& s) {
+         Certificate leaf = s.leaf();
+         leaf.publicKeyInfo.back() ^= 1;
+         return s.manifest(standardManifest(), s.chainWith(s.issue(leaf)));
+     }},
     {"no chain", [](const Signer& s) { return s.manifest(standardManifest(), {}); }},
     {"leaf's key exceeds what the verifier allows",
      [](const Signer& s) {
@@ -286,21 +292,26 @@ struct Stop {
     const char* failing;
     std::uint8_t manifestHashed;
     bool certProperties;
+    bool bodyDigest;
     bool dictionaries;
     std::uint8_t payloadHashed;
 };
 
 const Stop stops[] = {
-    {"digest ", 0, false, false, 0},
-    {"digest chain ", 1, false, false, 0},
-    {"digest chain digest ", 1, true, false, 0},
-    {"digest chain digest signature ", 1, true, false, 0},
-    {"digest chain digest signature digest ", 1, true, true, 0},
-    {"", 1, true, true, 1},
+    {"digest ", 0, false, false, false, 0},
+    {"digest chain ", 1, false, false, false, 0},
+    {"digest chain digest ", 1, true, false, false, 0},
+    {"digest chain digest signature ", 1, true, true, false, 0},
+    {"digest chain digest signature digest ", 1, true, true, true, 0},
+    {"", 1, true, true, true, 1},
 };
 
 TEST(Img4Trust, stopsAtTheFirstStepThatFails) {
     const Bytes manifest = soundManifest();
+    Img4Record bare;
+    ASSERT_EQ(Img4DecodeInitManifest(manifest.data(), manifest.size(), &bare), DERSuccess);
+    const Bytes manifestDigest = digestBy(*fastEntry().profile, bare.manifestRaw);
+    const Bytes bodyDigest = digestBy(*fastEntry().profile, bare.manifest.body);
     for (const Stop& row : stops) {
         SCOPED_TRACE(row.failing);
         Decoded decoded(manifest);
@@ -315,6 +326,10 @@ TEST(Img4Trust, stopsAtTheFirstStepThatFails) {
             EXPECT_EQ(scripted.calls, scripted.failing);
         }
         EXPECT_EQ(record.manifestHashed, row.manifestHashed);
+        // What was computed before the failure stays.
+        EXPECT_EQ(std::memcmp(record.manifest.digest, manifestDigest.data(), manifestDigest.size()) == 0,
+                  row.manifestHashed != 0);
+        EXPECT_EQ(std::memcmp(record.manifest.bodyDigest, bodyDigest.data(), bodyDigest.size()) == 0, row.bodyDigest);
         EXPECT_EQ(record.manifest.certProperties.data != nullptr, row.certProperties);
         EXPECT_EQ(record.manb.data != nullptr, row.dictionaries);
         EXPECT_EQ(record.objp.data != nullptr, row.dictionaries);
@@ -357,11 +372,13 @@ TEST(Img4Trust, evaluatesManifestsWithoutPayloadOrObject) {
     EXPECT_EQ(Img4DecodePerformTrustEvaluation(objectCode, &record, judge, fastEntry().profile, &context), DERSuccess);
     EXPECT_EQ(record.payloadHashed, 0);
 
-    ASSERT_EQ(Img4DecodeInitManifest(bare.data(), bare.size(), &record), DERSuccess);
-    EXPECT_EQ(Img4DecodePerformTrustEvaluation(fourCC("none"), &record, judge, fastEntry().profile, &context),
+    Decoded decoded(bare);
+    EXPECT_EQ(Img4DecodePerformTrustEvaluation(fourCC("none"), &decoded.record, judge, fastEntry().profile, &context),
               DEREndOfSequence);
-    EXPECT_NE(record.manb.data, nullptr);
-    EXPECT_EQ(record.objp.data, nullptr);
+    EXPECT_NE(decoded.record.manb.data, nullptr);
+    EXPECT_EQ(decoded.record.objp.data, nullptr);
+    EXPECT_EQ(decoded.record.manifestHashed, 1);
+    EXPECT_EQ(decoded.record.payloadHashed, 0);
 
     // A version-2 manifest that holds its objects in a SET has a sound signature and no dictionaries.
     Manifest second = standardManifest();

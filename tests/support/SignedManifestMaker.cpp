@@ -191,8 +191,9 @@ Bytes Signer::issue(const Certificate& fields, const Key& issuer) const {
     const Bytes tbs = sequence({context(0, integer(2)), integer(4711), fields.signatureAlgorithm, fields.issuer,
                                 sequence({time("260101000000Z"), time("460101000000Z")}), fields.subject,
                                 fields.publicKeyInfo, fields.extensions});
-    return sequence({tbs, fields.signatureAlgorithm,
-                     bitString(sign(issuer, entry_.profile->digestInfo->length, tbs), fields.unusedBits)});
+    const std::uint64_t digestLength =
+        fields.digestLength == 0 ? entry_.profile->digestInfo->length : fields.digestLength;
+    return sequence({tbs, fields.signatureAlgorithm, bitString(sign(issuer, digestLength, tbs), fields.unusedBits)});
 }
 
 Bytes Signer::manifest(Manifest fields, const List& chain) const {

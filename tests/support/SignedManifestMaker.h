@@ -56,7 +56,8 @@ struct Certificate {
     Bytes subject;
     Bytes publicKeyInfo;
     Bytes extensions;
-    std::uint8_t unusedBits = 0; // of the signature
+    std::uint8_t unusedBits = 0;    // of the signature
+    std::uint64_t digestLength = 0; // of the digest that is signed; 0 for the profile's
 };
 
 // Signs for one profile of a domain.
