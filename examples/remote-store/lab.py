@@ -7,6 +7,7 @@ computer, and prints the entry once they serve. What was stored is gone at the e
 """
 import getpass
 import hashlib
+import http.client
 import json
 import os
 import pathlib
@@ -110,11 +111,20 @@ class NginxStore:
         if extra:
             text = configuration.read_text()
             configuration.write_text(text.replace("        root ", extra + "        root "))
-        # nginx goes to the background once it listens. Its worker writes the records as the user of the lab.
+        # nginx goes to the background once it listens, and then writes its process id, before it answers anything. Its
+        # worker writes the records as the user of the lab.
         as_user = ["-g", "user root;"] if os.geteuid() == 0 else []
         subprocess.run(["/usr/sbin/nginx", *as_user, "-c", configuration], check=True, stderr=subprocess.DEVNULL)
+        self.get_page(self.ca_port)
         self.nginx = Server(int((self.folder / "nginx.pid").read_text()))
         self.servers.append(self.nginx)
+
+    @staticmethod
+    def get_page(port, path="/"):
+        connection = http.client.HTTPConnection("127.0.0.1", port)
+        connection.request("GET", path)
+        connection.getresponse().read()
+        connection.close()
 
     def configure(self, name):
         """A copy of a file of the example with its places filled in."""
@@ -139,7 +149,7 @@ class NginxStore:
         """Method, path, status, grants and connection of each request so far."""
         lines = (self.folder / "requests.log").read_text().splitlines()
         plain = [re.sub(r"\\x([0-9A-F]{2})", lambda escape: chr(int(escape[1], 16)), line) for line in lines]
-        return [line.split(" ") for line in plain]
+        return [line.split(" ") for line in plain][1:]  # without that of the start
 
     def stored(self):
         """What the store holds: name and bytes."""

@@ -287,7 +287,7 @@ TEST_F(OrloDataStore, makesNoSessionForARemoteStoreThatIsDescribedBadly) {
         std::filesystem::permissions(root_.host(file), std::filesystem::perms(0600));
     std::filesystem::permissions(root_.host("/open"), std::filesystem::perms(0640));
     const struct {
-        const char* store; // what stands in it beside the backend
+        std::string store; // what stands in it beside the backend
         const char* reason;
     } rows[] = {
         {R"("caFile": 7)", "caFile 7 cannot be read"},
@@ -307,6 +307,7 @@ TEST_F(OrloDataStore, makesNoSessionForARemoteStoreThatIsDescribedBadly) {
         {R"("connectTo": {"a:1:b": "b:1"})", "connectTo"},
         {R"("s3": "bucket")", "region"},
         {R"("s3": {"region": "eu:s3", "bucket": "b", "accessKeyFile": "/key"})", "region"},
+        {R"("s3": {"region": ")" + std::string(64, 'e') + R"(", "bucket": "b", "accessKeyFile": "/key"})", "region"},
         {R"("s3": {"region": "eu", "accessKeyFile": "/key"})", "bucket"},
         {R"("s3": {"region": "eu", "bucket": "a/b", "accessKeyFile": "/key"})", "bucket"},
         {R"("s3": {"region": "eu", "bucket": "..", "accessKeyFile": "/key"})", "bucket"},
@@ -320,7 +321,7 @@ TEST_F(OrloDataStore, makesNoSessionForARemoteStoreThatIsDescribedBadly) {
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.store);
-        describeStore(std::string(R"({"backend": "remote", )") + row.store + "}");
+        describeStore(R"({"backend": "remote", )" + row.store + "}");
         logged().clear();
         EXPECT_EQ(open(), nullptr);
         ASSERT_EQ(logged().size(), 1U);

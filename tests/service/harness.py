@@ -119,11 +119,14 @@ class Service:
         act()
         return [line.split("] ", 1)[1] for line in self.log()[before:] if line]
 
-    def resident_kilobytes(self):
+    def resident_kilobytes(self, figure="VmRSS:"):
         for line in pathlib.Path(f"/proc/{self.pid}/status").read_text().splitlines():
-            if line.startswith("VmRSS:"):
+            if line.startswith(figure):
                 return int(line.split()[1])
         raise AssertionError("the service has no memory figure")
+
+    def peak_kilobytes(self):
+        return self.resident_kilobytes("VmHWM:")
 
     def wait_end(self, seconds=None):
         """The exit status, or the number of the signal that ended the service as a negative number; None when it still

@@ -15,7 +15,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
         pass
 
     def handle_request(self):
-        behaviour, *argument = self.path.rsplit("/", 1)[1].split("-")
+        behaviour, *argument = (self.server.instead or self.path.rsplit("/", 1)[1]).split("-")
         with self.server.lock:
             self.server.seen.append((self.command, self.path))
             count = self.server.counts[self.path] = self.server.counts.get(self.path, 0) + 1
@@ -96,6 +96,14 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.answer(200, b"half", Content_Length=8)
         self.drop()
 
+    def cut(self, count):
+        """Half of an answer that does not say where it ends."""
+        self.body()
+        self.send_response(200)
+        self.end_headers()
+        self.wfile.write(b"half")
+        self.close_connection = True
+
     def mid(self, count):
         """Closes while the body of the request is under way."""
         self.rfile.read(100000)
@@ -110,10 +118,10 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.plain(count)
         self.drop()
 
-    def tamper(self, count, port):
-        """Passes the request on to another server with one bit of the body changed."""
+    def relay(self, count, port, changed_bit):
+        """Passes the request on to another server, with one bit of the body changed or none."""
         body = bytearray(self.body())
-        body[0] ^= 1
+        body[0] ^= int(changed_bit)
         onward = http.client.HTTPConnection("127.0.0.1", int(port))
         onward.request(self.command, self.path, bytes(body), dict(self.headers.items()))
         answer = onward.getresponse()
@@ -122,17 +130,24 @@ class Handler(http.server.BaseHTTPRequestHandler):
 
 
 class HostileServer(http.server.ThreadingHTTPServer):
+    """Speaks plain HTTP without a certificate. `instead`, when set, is the behaviour for every path."""
+
     daemon_threads = True
 
     def __init__(self, certificate, key, trust_object):
         super().__init__(("127.0.0.1", 0), Handler)
+        self.instead = None
         self.trust_object, self.seen, self.counts, self.failing = trust_object, [], {}, 0
         self.lock, self.closing = threading.Lock(), threading.Event()
-        self.context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
-        self.context.load_cert_chain(certificate, key)
+        self.context = None
+        if certificate:
+            self.context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
+            self.context.load_cert_chain(certificate, key)
         threading.Thread(target=self.serve_forever, daemon=True).start()
 
     def finish_request(self, request, client_address):
+        if not self.context:
+            return super().finish_request(request, client_address)
         try:
             with self.context.wrap_socket(request, server_side=True) as secured:
                 super().finish_request(secured, client_address)

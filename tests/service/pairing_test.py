@@ -11,7 +11,7 @@ import unittest
 
 from forward_proxy import ForwardProxy
 from harness import BIN, Service
-from lab import free_ports
+from lab import NginxStore, free_ports
 
 TICKET = "the ticket"
 PATCH = b"\x00patch\xff" * 1000
@@ -59,8 +59,9 @@ class Network:
         with open(self.folder / "huge/provision", "wb") as huge:
             huge.truncate(17 << 20)
         self.configure("nginx.conf", NGINX)
-        # nginx goes to the background once it listens.
+        # nginx goes to the background once it listens, and then writes its process id, before it answers anything.
         subprocess.run(["/usr/sbin/nginx", "-c", self.folder / "nginx.conf"], check=True, stderr=subprocess.DEVNULL)
+        NginxStore.get_page(self.http, "/sink")
         self.server = os.pidfd_open(int((self.folder / "nginx.pid").read_text()))
         self.proxy = ForwardProxy(self.folder, f"ConnectPort {self.https}")
 

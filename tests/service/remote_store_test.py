@@ -215,10 +215,10 @@ class PlainStore(RemoteTest, StoreCases):
         self.check_export()
 
     def test_names(self):
-        self.check_names([*NAMES, "x" * 255, "line\r\nOrlo-Permissions: 1:psd2:S2", "\t"])
+        self.check_names([*NAMES, "c/d", "x" * 255, "line\r\nOrlo-Permissions: 1:psd2:S2", "\t"])
         session = self.session()
         before = len(self.store.requests())
-        for name in (".", "..", "../../x", "a/b", "/", "a\0b", "x" * 513):
+        for name in (".", "..", "../../x", "a/../b", "a/.", "/", "/a", "a/", "a//b", "a\0b", "x" * 513):
             with self.subTest(name[:10]):
                 self.assertEqual((session.put(name)[0], session.get(name)[0]), (STORAGE, STORAGE))
         self.assertEqual(session.run("export", ["psd2"] * 700, ["x" * 12] * 700)[0], NOT_PERMITTED)
@@ -329,14 +329,18 @@ class ObjectStore(RemoteTest, StoreCases):
         self.assertEqual((code, text.split(": ")[1]), (NOT_PERMITTED, "HTTP status 403 SignatureDoesNotMatch"))
         self.assertEqual(self.put(b"x")[2]["code"], 1011)
         self.assertIn("HTTP status 403 SignatureDoesNotMatch", self.answer("export")[2]["description"])
-        self.describe(self.service, vanter=f"tamper-{self.store.values['PROXY']}", connectTo={
-            f"{HOST}:8443": f"127.0.0.1:{tampering.server_port}", f"{CA_HOST}:8080": f"127.0.0.1:{self.store.ca_port}"})
+        connect_to = {f"{HOST}:8443": f"127.0.0.1:{tampering.server_port}",
+                      f"{CA_HOST}:8080": f"127.0.0.1:{self.store.ca_port}"}
+        unchanged, changed = (f"relay-{self.store.values['PROXY']}-{bit}" for bit in (0, 1))
+        self.describe(self.service, vanter=changed, connectTo=connect_to)
         lines = self.service.messages_of(lambda: self.assertEqual(self.put(b"x")[2]["code"], 1011))
-        self.assertTrue(any("HTTP status 400" in line for line in lines), lines)
+        self.assertTrue(any("HTTP status 400 BadDigest" in line for line in lines), lines)
+        self.describe(self.service, vanter=unchanged, connectTo=connect_to)
+        self.assertEqual(self.put(b"x"), SUCCESS)
         self.describe(self.service, s3={"bucket": "no-such-bucket"})
         code, text = self.error_of_get()
         self.assertEqual((code, text.split(": ")[1]), (TRANSPORT, "HTTP status 404 NoSuchBucket"))
-        self.assertEqual(self.store.stored(), {})
+        self.assertEqual(self.store.stored(), {f"v2/records/psd2/{unchanged}": b"x"})
 
 
 class Refusals(RemoteTest):
@@ -403,6 +407,7 @@ class Failures(RemoteTest):
             ("get", "status-404", NO_SUCH_RECORD, "HTTP status 404"),
             ("put", "status-404", TRANSPORT, "HTTP status 404"),
             ("get", "status-204", TRANSPORT, "HTTP status 204"),
+            ("get", "cut", TRANSPORT, "The answer does not say where it ends"),
             ("get", "endless", TRANSPORT, "larger than 67108864 bytes"),
             ("get", "announced", TRANSPORT, "larger than 67108864 bytes"),
             ("put", "endless", TRANSPORT, "larger than 1048576 bytes"),
@@ -424,6 +429,37 @@ class Failures(RemoteTest):
         self.assertEqual({path for _, path in self.server.seen if path.endswith("plain")}, set(), "was redirected")
         self.assertEqual((hasty.get("plain"), patient.get("plain")), ((0, ""), (0, "")))
         self.assertLess(patient.peak_megabytes(), 200)
+
+    def test_the_service_answers_with_the_reason_and_stays_small(self):
+        trust = HostileServer(None, None, TRUST_OBJECT)
+        self.addCleanup(trust.close)
+        service = self.service = Service()
+        self.addCleanup(service.close)
+        path = service.root / "etc/veltra/device.json"
+        description = json.loads(path.read_text())
+        del description["reverseProxy"]
+        description["store"] = self.describe(service.root)
+        description["store"]["connectTo"][f"{CA_HOST}:8080"] = f"127.0.0.1:{trust.server_port}"
+        path.write_text(json.dumps(description))
+        record = f"{DATA_STORE}/v2/records/psd2/VAN0001"
+        for behaviour, reason in (("endless", "larger than"), ("announced", "larger than"), ("half", "closed"),
+                                  ("noise", "HTTP/0.9")):
+            with self.subTest(behaviour):
+                self.server.instead = behaviour
+                code, text = self.error_of_get()
+                self.assertEqual((code, text.startswith(f"GET {record}: "), reason in text), (TRANSPORT, True, True))
+                self.assertEqual(self.put(b"x")[2]["code"], 1011)
+                error = self.answer("export")[2]
+                self.assertEqual((error["code"], reason in error["description"]), (2012, True), error)
+        for behaviour, reason in (("endless", "larger than 1048576 bytes"), ("half", "closed"), ("cut", "where it ends")):
+            with self.subTest(behaviour):
+                trust.instead = behaviour
+                for words, code in ((["get-psd2", "/tmp/out"], 1008), (["put-psd2", "/tmp/in"], 1008), (["export"], 2007)):
+                    error = self.answer(*words)[2]
+                    self.assertEqual((error["code"], reason in error["description"]), (code, True), error)
+        self.server.instead = trust.instead = None
+        self.assertEqual(self.put(b"x"), SUCCESS)
+        self.assertLess(service.peak_kilobytes(), 300 << 10)
 
     def test_only_what_may_pass_is_tried_again_and_only_so_often(self):
         rows = (
@@ -480,7 +516,8 @@ class Failures(RemoteTest):
             self.assertEqual(session.run("trust", other)[0], TRANSPORT, other)
             self.assertNotIn("secret", session.run("trust", other)[1])
         self.server.trust_object = TRUST_OBJECT
-        for other in ("http://" + HOST + ":8443", "https://user:secret@h:8443", "HTTPS", "", 7, None):
+        for other in ("http://" + HOST + ":8443", "https://user:secret@h:8443", "https://:secret@h",
+                      "https://user:secret@h:999999", "HTTPS", "", 7, None):
             session.open(DSURL=other)
             code, text = session.put("plain")
             self.assertEqual(code, TRANSPORT, other)

@@ -43,7 +43,8 @@ struct Incoming {
     std::size_t headers = 0;
     bool isTooLarge = false;
     bool hasTooManyHeaders = false;
-    bool isCut = false; // the rest of a refusal is of no interest
+    bool hasMarkedEnd = false; // a length, or chunks of which the last one says so
+    bool isCut = false;        // the rest of a refusal is of no interest
 };
 
 // libcurl calls these two through C, which no exception may cross.
@@ -70,8 +71,10 @@ std::size_t receive(char* bytes, std::size_t, std::size_t count, void* context) 
     return 0;
 }
 
-std::size_t receiveHeader(char*, std::size_t, std::size_t count, void* context) {
+std::size_t receiveHeader(char* bytes, std::size_t, std::size_t count, void* context) {
     auto& incoming = *static_cast<Incoming*>(context);
+    for (const std::string_view name : {"content-length:", "transfer-encoding:"})
+        incoming.hasMarkedEnd |= count > name.size() && curl_strnequal(bytes, name.data(), name.size()) != 0;
     incoming.headers += count;
     incoming.hasTooManyHeaders = incoming.headers > maximumHeaders;
     return incoming.hasTooManyHeaders ? 0 : count;
@@ -157,6 +160,11 @@ Answer Client::exchange(const Request& request) {
     if (result != CURLE_OK && !incoming.isCut)
         throw Failure(result, utf8::repaired(*problem_ ? problem_ : curl_easy_strerror(result)));
     check(curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &incoming.answer.status));
+    long version = 0;
+    check(curl_easy_getinfo(handle_.get(), CURLINFO_HTTP_VERSION, &version));
+    if (request.endMustBeMarked && version < CURL_HTTP_VERSION_2 && !incoming.hasMarkedEnd &&
+        incoming.answer.isSuccess())
+        throw Failure(CURLE_PARTIAL_FILE, "The answer does not say where it ends");
     return std::move(incoming.answer);
 }
 
@@ -181,6 +189,7 @@ void Client::configure(const Request& request) {
     set(CURLOPT_NOPROXY, "");
     set(CURLOPT_ERRORBUFFER, problem_);
     set(CURLOPT_NOSIGNAL, 1L);
+    set(CURLOPT_QUICK_EXIT, 1L); // a name server that is silent does not outlast the time-out
     set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(request.limits.connecting.count()));
     set(CURLOPT_TIMEOUT_MS, static_cast<long>(request.limits.whole.count()));
     set(CURLOPT_LOW_SPEED_LIMIT, 1L);

@@ -88,6 +88,8 @@ struct Request {
     // What is sent as application/octet-stream; the octets have to outlive the exchange.
     std::optional<std::span<const std::uint8_t>> body = {};
     const Signature* signature = nullptr;
+    // Refuses an answer of HTTP/1 that goes on until the connection ends: half of it would look like the whole.
+    bool endMustBeMarked = false;
 };
 
 struct Answer {

@@ -8,6 +8,7 @@
 
 #include <fcntl.h>
 #include <openssl/bio.h>
+#include <openssl/err.h>
 #include <openssl/pem.h>
 #include <sys/stat.h>
 
@@ -21,6 +22,7 @@ namespace {
 constexpr std::size_t largestCaFile = std::size_t{1} << 20;
 constexpr std::size_t largestKeyFile = std::size_t{4} << 10;
 constexpr std::size_t longestName = 255;
+constexpr std::size_t longestRegion = 63; // libcurl signs for no longer one
 
 constexpr std::string_view letters = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
 constexpr std::string_view digits = "0123456789";
@@ -69,10 +71,15 @@ std::vector<std::string> readConnectTo(const Value& described) {
     return entries;
 }
 
+// Whether there are certificates and all of them can be read.
 bool hasCertificates(const Value::Data& pem) {
     const openssl::QuietErrors quiet;
     const openssl::Owner<BIO, BIO_free_all> bytes(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
-    return bytes && openssl::Owner<X509, X509_free>(PEM_read_bio_X509(bytes.get(), nullptr, nullptr, nullptr));
+    bool hasOne = false;
+    while (bytes && openssl::Owner<X509, X509_free>(PEM_read_bio_X509(bytes.get(), nullptr, nullptr, nullptr)))
+        hasOne = true;
+    // The end of the file, and not a certificate that cannot be read.
+    return hasOne && ERR_GET_REASON(ERR_peek_last_error()) == PEM_R_NO_START_LINE;
 }
 
 std::string readAuthorities(const Value& path) {
@@ -84,7 +91,7 @@ std::string readAuthorities(const Value& path) {
         fail("The store's caFile " + path.description() +
              " cannot be read: " + (path.text() ? error.text : std::string("it is no path")));
     if (!hasCertificates(*pem))
-        fail("The store's caFile " + path.description() + " holds no PEM certificate");
+        fail("The store's caFile " + path.description() + " holds no PEM certificate, or one that cannot be read");
     return {pem->begin(), pem->end()};
 }
 
@@ -120,7 +127,7 @@ bool isVisible(std::string_view text) {
 OrloRemoteSettings::ObjectStore readObjectStore(const Value& described) {
     const std::string *region = described["region"].text(), *bucket = described["bucket"].text(),
                       *keyFile = described["accessKeyFile"].text();
-    if (!region || !isMadeOf(*region, "-_"))
+    if (!region || !isMadeOf(*region, "-_") || region->size() > longestRegion)
         fail("The store's s3 has no region");
     if (!bucket || !isMadeOf(*bucket, ".-_") || bucket->front() == '.')
         fail("The store's s3 has no bucket");

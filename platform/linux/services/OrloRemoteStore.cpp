@@ -68,11 +68,20 @@ bool isVisible(char c) {
     return c > ' ' && c < '\x7F';
 }
 
-// The name as one segment of a path. Servers decode a segment before they look at it, so that no encoding keeps a slash
-// or dots from leading elsewhere: such a name is refused.
+// Whether the name stays below its folder on a server that decodes a path before it looks at its segments, as many do.
+bool staysBelow(std::string_view name) {
+    for (std::size_t start = 0, end = 0; end < name.size(); start = end + 1) {
+        end = std::min(name.find('/', start), name.size());
+        const std::string_view step = name.substr(start, end - start);
+        if (step.empty() || step == "." || step == "..")
+            return false;
+    }
+    return !name.empty() && name.back() != '/';
+}
+
+// The name as one segment of a path.
 std::string segmentOf(std::string_view name) {
-    constexpr std::string_view separators("/\0", 2);
-    if (name == "." || name == ".." || name.find_first_of(separators) != name.npos || name.size() > longestName) {
+    if (!staysBelow(name) || name.find('\0') != name.npos || name.size() > longestName) {
         std::string quoted;
         utf8::appendQuoted(quoted, utf8::beginning(name, longestQuoted));
         throw OrloStoreFailure(QDOrloErrorStorage, "A server can keep no record under the name " + quoted);
@@ -182,6 +191,7 @@ public:
     Value::Data copy(const OrloOptions& options, const OrloRecordName& name) override {
         http::Request request = dataStoreRequest("GET", options);
         request.maximumAnswer = largestRecord;
+        request.endMustBeMarked = true;
         http::Answer answer =
             exchange(options, endpoint(options, "DSURL"), recordPath(options, name), request, attemptsOfOne);
         if (answer.status != 200)
@@ -200,6 +210,7 @@ public:
 private:
     Value::Data fetchTrustObject(const OrloOptions& options, const std::string& server, std::string_view path) {
         http::Request request{.method = "GET", .url = {}, .limits = {}, .maximumAnswer = largestTrustObject};
+        request.endMustBeMarked = true;
         http::Answer answer = exchange(options, server, path, request, attemptsOfOne);
         if (answer.status != 200)
             failToTransport(request.method, request.url, format("HTTP status %d", answer.status));
@@ -264,11 +275,11 @@ private:
     // Sends the request, whose URL becomes that of `path` on `server`, as often as it may be and as is of use.
     http::Answer exchange(const OrloOptions& options, const std::string& server, std::string_view path,
                           http::Request& request, const NumberOption& attempts) {
+        if (server.find('@') != server.npos)
+            throw OrloStoreFailure(QDOrloErrorTransport, "A server's URL has to do without user and password");
         request.url = server + std::string(path);
         try {
             const http::Url url = http::Url(server).under(path);
-            if (!url.user().empty())
-                throw OrloStoreFailure(QDOrloErrorTransport, "A server's URL has to do without user and password");
             request.url = url.text();
             request.proxy = proxyFor(options, url);
             request.limits = {.whole = std::chrono::seconds(timeoutSeconds.in(options))};
