@@ -118,15 +118,27 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.plain(count)
         self.drop()
 
+    def pass_on(self, body, port):
+        onward = http.client.HTTPConnection("127.0.0.1", int(port))
+        onward.request(self.command, self.path, body, dict(self.headers.items()))
+        answer = onward.getresponse()
+        contents = answer.read()
+        onward.close()
+        return answer.status, contents
+
     def relay(self, count, port, changed_bit):
         """Passes the request on to another server, with one bit of the body changed or none."""
         body = bytearray(self.body())
         body[0] ^= int(changed_bit)
-        onward = http.client.HTTPConnection("127.0.0.1", int(port))
-        onward.request(self.command, self.path, bytes(body), dict(self.headers.items()))
-        answer = onward.getresponse()
-        self.answer(answer.status, answer.read())
-        onward.close()
+        self.answer(*self.pass_on(bytes(body), port))
+
+    def lost(self, count, port, *_):
+        """Passes the request on too, but the first answer never arrives."""
+        answer = self.pass_on(self.body(), port)
+        if count == 1:
+            self.drop()
+        else:
+            self.answer(*answer)
 
 
 class HostileServer(http.server.ThreadingHTTPServer):

@@ -311,6 +311,21 @@ class ObjectStore(RemoteTest, StoreCases):
     def test_two_services(self):
         self.check_two_services()
 
+    def test_a_put_whose_answer_was_lost_leaves_one_whole_record(self):
+        relay = HostileServer(*self.store.authority.certify("relay"), TRUST_OBJECT)
+        self.addCleanup(relay.close)
+        session = self.session()
+        session.describe(self.store.describe(session.root, connectTo={
+            f"{HOST}:8443": f"127.0.0.1:{relay.server_port}", f"{CA_HOST}:8443": f"127.0.0.1:{self.store.store_port}"}))
+        record, stored = os.urandom(1 << 20), {}
+        for attempts, outcome in ((1, TRANSPORT), (2, 0)):
+            name = f"lost-{self.store.values['PROXY']}-{attempts}"
+            session.open(HTTPMaxAttempts=attempts)
+            self.assertEqual(session.put(name, record)[0], outcome)
+            self.assertEqual(len([path for _, path in relay.seen if path.endswith(name)]), attempts)
+            stored[f"v1/records/psd2/{name}"] = record
+            self.assertEqual(self.store.stored(), stored)
+
     def test_a_request_that_is_not_signed_as_it_should_be_stores_nothing(self):
         tampering = HostileServer(*self.store.authority.certify("tampering"), TRUST_OBJECT)
         self.addCleanup(tampering.close)
