@@ -1,5 +1,4 @@
-#include "img4/Img4Internal.h"
-#include "img4/Img4Trust.h"
+#include "img4/Img4TrustInternal.h"
 
 #include <cstring>
 
@@ -54,11 +53,11 @@ DERReturn copyDigest(const Img4Record* record, Source (*sourceOf)(const Img4Reco
 } // namespace
 
 DERReturn Img4DecodeCopyPayloadHash(const Img4Record* record, uint8_t* out, uint64_t length) {
-    return copyHash(record, payloadOf, out, length, sha1_digest, nullptr);
+    return copyHash(record, payloadOf, out, length, hashWithSHA1, nullptr);
 }
 
 DERReturn Img4DecodeCopyManifestHash(const Img4Record* record, uint8_t* out, uint64_t length) {
-    return copyHash(record, manifestOf, out, length, sha1_digest, nullptr);
+    return copyHash(record, manifestOf, out, length, hashWithSHA1, nullptr);
 }
 
 DERReturn Img4DecodeCopyPayloadHashWithCallback(const Img4Record* record, uint8_t* out, uint64_t length,

@@ -128,10 +128,11 @@ IMG4_API DERReturn Img4DecodeEvaluateTrustWithCallbacks(uint32_t object, Img4Rec
                                                         Img4CertificateCheck checkCertificate,
                                                         Img4DigestFunction digest, void* context);
 
-// The parts that Img4DecodeEvaluateTrust consists of. `context` is not used.
+// The parts that Img4DecodeEvaluateTrust consists of; as callbacks they need a function around them that takes the
+// context.
 IMG4_API DERReturn img4_verify_signature_with_chain(const DERItem* chain, const DERItem* signature,
-                                                    const uint8_t* digest, DERItem* certProperties, void* context);
-IMG4_API DERReturn sha1_digest(const uint8_t* data, uint64_t length, uint8_t* out, void* context);
+                                                    const uint8_t* digest, DERItem* certProperties);
+IMG4_API DERReturn sha1_digest(const uint8_t* data, uint64_t length, uint8_t* out);
 
 // Properties
 
@@ -169,7 +170,7 @@ IMG4_API DERReturn Img4DecodeEvaluateCertificateProperties(const Img4Record* rec
 struct Img4DigestImplementation;
 
 typedef struct Img4DigestInfo {
-    uint64_t length; // octets
+    uint64_t length; // octets; a description with another length than its implementation has is DERParamError
     const DERItem* oid;
     const struct Img4DigestImplementation* implementation;
 } Img4DigestInfo;

@@ -44,10 +44,14 @@ const Img4DigestImplementation* img4::digestOf(const Img4TrustProfile* profile, 
     return implementation != nullptr && profile->digestInfo->length == length ? implementation : nullptr;
 }
 
-DERReturn sha1_digest(const uint8_t* data, uint64_t length, uint8_t* out, void* /*context*/) {
+DERReturn sha1_digest(const uint8_t* data, uint64_t length, uint8_t* out) {
     if (data == nullptr || out == nullptr)
         return DERParamError;
     return crypto::sha1(data, static_cast<std::size_t>(length), out) ? DERSuccess : Img4Failure;
+}
+
+DERReturn img4::hashWithSHA1(const uint8_t* data, uint64_t length, uint8_t* out, void* /*context*/) {
+    return sha1_digest(data, length, out);
 }
 
 DERReturn Img4DecodeComputeDigest(const DERItem* data, uint8_t* out, uint64_t length, const Img4TrustProfile* profile) {

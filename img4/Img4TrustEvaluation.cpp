@@ -183,10 +183,19 @@ DERReturn Img4DecodeEvaluateDictionaryProperties(const DERItem* dictionary, uint
     return result == DEREndOfSequence ? DERSuccess : result;
 }
 
+namespace {
+
+DERReturn verifyWithChain(const DERItem* chain, const DERItem* signature, const uint8_t* digest,
+                          DERItem* certProperties, void* /*context*/) {
+    return img4_verify_signature_with_chain(chain, signature, digest, certProperties);
+}
+
+} // namespace
+
 DERReturn Img4DecodeEvaluateTrust(uint32_t object, Img4Record* record, Img4PropertyCallback evaluateProperty,
                                   void* context) {
-    return Img4DecodeEvaluateTrustWithCallbacks(object, record, evaluateProperty, img4_verify_signature_with_chain,
-                                                Img4DecodeEvaluateCertificateProperties, sha1_digest, context);
+    return Img4DecodeEvaluateTrustWithCallbacks(object, record, evaluateProperty, verifyWithChain,
+                                                Img4DecodeEvaluateCertificateProperties, hashWithSHA1, context);
 }
 
 namespace {
@@ -253,7 +262,7 @@ DERReturn Img4DecodeEvaluateTrustWithCallbacks(uint32_t object, Img4Record* reco
 }
 
 DERReturn img4_verify_signature_with_chain(const DERItem* chain, const DERItem* signature, const uint8_t* digest,
-                                           DERItem* certProperties, void* /*context*/) {
+                                           DERItem* certProperties) {
     const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa1kSha1;
     DERItem leafKey = {};
     if (const DERReturn result = verify_chain_img4_v1(chain, &leafKey, certProperties, &profile); result != DERSuccess)

@@ -41,6 +41,9 @@ bool isWholeItem(const DERItem& encoding, DERTag tag, DERItem* content);
 // The digest of `profile`, or null when it has none that makes `length` octets.
 const Img4DigestImplementation* digestOf(const Img4TrustProfile* profile, uint64_t length);
 
+// sha1_digest as a callback.
+DERReturn hashWithSHA1(const uint8_t* data, uint64_t length, uint8_t* out, void* context);
+
 struct NamedCurve {
     const DERItem* oid;
     crypto::Curve curve;

@@ -1,7 +1,8 @@
 // Cryptographic primitives, by published algorithm. Backed by a maintained library; nothing here is home-made.
 //
 // Every operation may be called from any thread on objects of its own. Byte arguments are only read during the call. An
-// operation that returns false has run out of memory or has met a broken library; its output is then all zero.
+// operation that returns false has run out of memory or has met a broken library; its output is then all zero. What the
+// library keeps for later calls is released when the process ends, so do not load and unload it over and over.
 #ifndef VELTRA_PLATFORM_CRYPTO_H
 #define VELTRA_PLATFORM_CRYPTO_H
 
@@ -75,6 +76,9 @@ enum class Curve {
 // digest `hash` under the public key `point` on `curve`, in uncompressed form (ANSI X9.63 4.3.6). A point that is not
 // on the curve verifies nothing, nor does one in another form. False also when memory has run out.
 bool verifyECDSASignature(Curve curve, Bytes point, Bytes hash, Bytes signature) noexcept;
+
+// Whether `point` is a public key on `curve`, in uncompressed form. False also when memory has run out.
+bool isPublicKey(Curve curve, Bytes point) noexcept;
 
 // Fills `out` with `length` octets of a cryptographically secure random source.
 bool randomBytes(void* out, std::size_t length) noexcept;

@@ -604,15 +604,21 @@ TEST(Img4TrustBySHA1, needsItsArguments) {
         Judge context;
         return Img4DecodeEvaluateTrustWithCallbacks(objectCode, record, by, verify, check, digest, &context);
     };
-    const auto verify = img4_verify_signature_with_chain;
+    const Img4SignatureWithChainVerifier verify = [](const DERItem* chain, const DERItem* signature,
+                                                     const std::uint8_t* digest, DERItem* properties, void*) {
+        return img4_verify_signature_with_chain(chain, signature, digest, properties);
+    };
+    const Img4DigestFunction sha1 = [](const std::uint8_t* data, std::uint64_t length, std::uint8_t* out, void*) {
+        return sha1_digest(data, length, out);
+    };
     const auto check = Img4DecodeEvaluateCertificateProperties;
-    EXPECT_EQ(evaluate(nullptr, judge, verify, check, sha1_digest), DERParamError);
-    EXPECT_EQ(evaluate(&none, judge, verify, check, sha1_digest), DERParamError);
-    EXPECT_EQ(evaluate(&decoded.record, nullptr, verify, check, sha1_digest), DERParamError);
-    EXPECT_EQ(evaluate(&decoded.record, judge, nullptr, check, sha1_digest), DERParamError);
-    EXPECT_EQ(evaluate(&decoded.record, judge, verify, nullptr, sha1_digest), DERParamError);
+    EXPECT_EQ(evaluate(nullptr, judge, verify, check, sha1), DERParamError);
+    EXPECT_EQ(evaluate(&none, judge, verify, check, sha1), DERParamError);
+    EXPECT_EQ(evaluate(&decoded.record, nullptr, verify, check, sha1), DERParamError);
+    EXPECT_EQ(evaluate(&decoded.record, judge, nullptr, check, sha1), DERParamError);
+    EXPECT_EQ(evaluate(&decoded.record, judge, verify, nullptr, sha1), DERParamError);
     EXPECT_EQ(evaluate(&decoded.record, judge, verify, check, nullptr), DERParamError);
-    EXPECT_EQ(evaluate(&decoded.record, judge, verify, check, sha1_digest), DERSuccess);
+    EXPECT_EQ(evaluate(&decoded.record, judge, verify, check, sha1), DERSuccess);
 }
 
 // The walk
@@ -807,6 +813,26 @@ TEST(Img4TrustDigests, areThoseOfFIPS180) {
             EXPECT_EQ(out, Bytes(length));
         }
     }
+}
+
+TEST(Img4TrustDigests, areThoseOfOneDescriptionFromInitToReturnHash) {
+    const Img4TrustProfile& profile = kImg4DecodeSecureBootEc256Sha256;
+    const Img4TrustProfile& other = kImg4DecodeSecureBootEc384Sha384;
+    const DERItem piece = {profile.digestInfo->oid->data, profile.digestInfo->oid->length};
+    std::uint8_t out[Img4LongestDigest];
+    Img4DigestState state;
+    ASSERT_EQ(Img4DecodeDigestInit(&state, &profile), DERSuccess);
+    EXPECT_EQ(Img4DecodeDigestUpdate(&state, &piece, &other), DERParamError);
+    EXPECT_EQ(Img4DecodeDigestReturnHash(&state, out, sizeof out, &profile), DERParamError) << "before its end";
+    EXPECT_EQ(Img4DecodeDigestFinal(&state, &other), DERParamError);
+    EXPECT_EQ(Img4DecodeDigestReturnHash(&state, out, sizeof out, &profile), DERParamError);
+
+    // One that claims fewer octets than its implementation writes.
+    const Img4DigestInfo tooShort = {20, profile.digestInfo->oid, other.digestInfo->implementation};
+    Img4TrustProfile wrong = profile;
+    wrong.digestInfo = &tooShort;
+    EXPECT_EQ(Img4DecodeComputeDigest(&piece, out, tooShort.length, &wrong), DERParamError);
+    EXPECT_EQ(Img4DecodeDigestInit(&state, &wrong), DERParamError);
 }
 
 TEST(Img4TrustDigests, areKeptByTheRecordAfterAnEvaluation) {

@@ -68,7 +68,8 @@ TEST(VerifyImg4, trustsWhatEveryProfileSignsAndFindsThatProfile) {
 }
 
 TEST(VerifyImg4, showsWhatTheManifestSaysAndTheLeafDemands) {
-    const Report alone = verify(soundManifest(ec384), testDomain());
+    const Report alone = verify(container(payload({}), soundManifest(ec384), {}), testDomain());
+    EXPECT_NE(alone.text.find("No object was named"), std::string::npos) << alone.text;
     EXPECT_EQ(alone.json["objects"], ordered_json({"boot", "sepi"}));
     EXPECT_FALSE(alone.json.contains("object"));
     ASSERT_EQ(alone.json["constraints"].size(), 2U);
@@ -202,6 +203,12 @@ const RefusalCase refusalCases[] = {
      "No known root has signed this chain: its first certificate (\"CN=Manifest Signing of a Test\") names the issuer "
      "\"CN=Nobody\"",
      [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.issuer = distinguishedName("Nobody"); }); }},
+    {"signature",
+     "does not verify under the key of the leaf (\"CN=Manifest Signing of a Test\"): the key is no "
+     "uncompressed point of its curve",
+     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.publicKeyInfo.back() ^= 1; }); }},
+    {"signature", ": the key has an unsound exponent", // 65536
+     [] { return withLeaf(rsa3k, [](Certificate& leaf) { leaf.publicKeyInfo.back() ^= 1; }); }},
     {"chain", "is signed with ecdsa-with-SHA256, and the profile demands ecdsa-with-SHA384",
      [] {
          return withLeaf(ec384, [](Certificate& leaf) { leaf.signatureAlgorithm = algorithm(oid(oidSha256Ecdsa)); });

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "der/DERDecode.h"
+#include "platform/Crypto.h"
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Findings.h"
 
@@ -167,6 +168,35 @@ std::optional<std::size_t> modulusBits(const Key& key) {
     return static_cast<std::size_t>(modulus.length - 1) * 8 + static_cast<std::size_t>(std::bit_width(modulus.data[0]));
 }
 
+bool isPositive(const DERItem& number) {
+    return number.length != 0 && (number.data[0] & 0x80) == 0;
+}
+
+bool isOdd(const DERItem& number) {
+    return (number.data[number.length - 1] & 1) != 0;
+}
+
+// RFC 8017 3.1.
+std::string rsaFault(const Key& key) {
+    DERRSAPubKeyPKCS1 numbers;
+    if (DERParseSequence(&key.bits, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs, &numbers,
+                         sizeof numbers) != DERSuccess)
+        return "is no RSAPublicKey";
+    const DERItem &modulus = numbers.modulus, &exponent = numbers.publicExponent;
+    if (!isPositive(modulus) || !isPositive(exponent))
+        return "has a number that is not positive";
+    if (!isOdd(modulus))
+        return "has an even modulus";
+    const bool isOne = exponent.length == 1 && exponent.data[0] == 1;
+    return !isOdd(exponent) || isOne || exponent.length > modulus.length ? "has an unsound exponent" : "";
+}
+
+// Whether the key is a point of the curve that its length stands for.
+bool isPoint(const Key& key) {
+    const crypto::Bytes point = {key.bits.data, static_cast<std::size_t>(key.bits.length)};
+    return crypto::isPublicKey(crypto::Curve::P256, point) || crypto::isPublicKey(crypto::Curve::P384, point);
+}
+
 std::string rsaText(const Key& key) {
     constexpr std::uint8_t null[] = {0x05, 0x00};
     const DERItem& parameters = key.algorithm.parameters;
@@ -239,6 +269,16 @@ std::string keyText(const DERItem& subjectPublicKeyInfo) {
 std::optional<std::size_t> rsaBits(const DERItem& subjectPublicKeyInfo) {
     const auto key = readKey(subjectPublicKeyInfo);
     return key && numbersOf(key->algorithm.algorithm) == rsaKey ? modulusBits(*key) : std::nullopt;
+}
+
+std::string keyFault(const DERItem& subjectPublicKeyInfo) {
+    const auto key = readKey(subjectPublicKeyInfo);
+    if (!key)
+        return "is malformed";
+    const std::string kind = numbersOf(key->algorithm.algorithm);
+    if (kind == rsaKey)
+        return rsaFault(*key);
+    return kind == ecKey && !isPoint(*key) ? "is no uncompressed point of its curve" : "";
 }
 
 std::string algorithmName(const DERItem& oid) {

@@ -29,6 +29,9 @@ std::string keyText(const DERItem& subjectPublicKeyInfo);
 // The size of an RSA key's modulus; nothing for other keys.
 std::optional<std::size_t> rsaBits(const DERItem& subjectPublicKeyInfo);
 
+// Why no signature verifies under the key, as in "the key <fault>"; empty for a sound RSA or EC key and for any other.
+std::string keyFault(const DERItem& subjectPublicKeyInfo);
+
 // An algorithm's object identifier: "sha384WithRSAEncryption" where the name is known, else numbers with dots. The
 // second form takes the content of an AlgorithmIdentifier.
 std::string algorithmName(const DERItem& oid);

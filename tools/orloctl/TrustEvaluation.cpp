@@ -92,20 +92,21 @@ std::string quoted(const std::string& text) {
     return "\"" + text + "\"";
 }
 
-// Why a signature of that form cannot verify under the key, whatever it was made over; `otherwise` when it could, as
-// long as the key is one: an even modulus, an exponent of 1 or a point off its curve verifies nothing.
+// Why a signature of that form cannot verify under the key, whatever it was made over; `otherwise` when it could.
 std::string signatureRemark(const DERItem& key, const DERItem& signature, const Img4TrustProfile& profile,
                             const char* otherwise) {
     const auto bits = rsaBits(key);
     const std::size_t most = profile.verifySignature == verify_signature_rsa3k ? 3072 : 4096;
+    if (const std::string fault = keyFault(key); !fault.empty())
+        return ": the key " + fault;
     if (!bits)
-        return otherwise + std::string(", or the key is unsound");
+        return otherwise;
     if (*bits < 1024 || *bits > most)
         return ", which has " + std::to_string(*bits) + " bits, and the profile takes 1024 to " + std::to_string(most);
     if (const std::size_t octets = (*bits + 7) / 8; octets != signature.length)
         return ": it has " + std::to_string(signature.length) + " octets, and those of the key have " +
                std::to_string(octets);
-    return otherwise + std::string(", or the key is unsound");
+    return otherwise;
 }
 
 // Finds the words for a refused chain.
