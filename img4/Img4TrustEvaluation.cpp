@@ -68,6 +68,15 @@ DERReturn storeDigest(uint8_t* flag, Compute compute) {
     return result;
 }
 
+// By the flow's computeDigest. A record without payload has nothing to digest.
+template <typename Flow>
+DERReturn digestPayload(Img4Record& record, const Flow& flow) {
+    if (!hasContent(record.payload.data))
+        return DERSuccess;
+    return storeDigest(&record.payloadHashed,
+                       [&] { return flow.computeDigest(record.payloadRaw, record.payload.digest); });
+}
+
 // Evaluates the manifest alone when `object` is null.
 DERReturn Evaluation::run(const uint32_t* object) const {
     DERReturn result =
@@ -83,12 +92,8 @@ DERReturn Evaluation::run(const uint32_t* object) const {
         return result;
     if (verified && (result = profile.evaluateCertificateProperties(&record)) != DERSuccess)
         return result;
-    if (hasContent(record.payload.data)) {
-        result =
-            storeDigest(&record.payloadHashed, [&] { return computeDigest(record.payloadRaw, record.payload.digest); });
-        if (result != DERSuccess)
-            return result;
-    }
+    if ((result = digestPayload(record, *this)) != DERSuccess)
+        return result;
     result = Img4DecodeEvaluateManifestProperties(&record, callbacks.evaluateProperty, context);
     if (object == nullptr || result != DERSuccess)
         return result;
@@ -234,12 +239,8 @@ DERReturn Parts::run(uint32_t object, Img4Record& record) const {
     record.objp = found.value;
     if ((result = checkCertificate(&record)) != DERSuccess)
         return result;
-    if (hasContent(record.payload.data)) {
-        result =
-            storeDigest(&record.payloadHashed, [&] { return computeDigest(record.payloadRaw, record.payload.digest); });
-        if (result != DERSuccess)
-            return result;
-    }
+    if ((result = digestPayload(record, *this)) != DERSuccess)
+        return result;
     if ((result = Img4DecodeEvaluateManifestProperties(&record, evaluateProperty, context)) != DERSuccess)
         return result;
     if ((result = Img4DecodeEvaluateObjectProperties(&record, evaluateProperty, context)) != DERSuccess)
