@@ -110,6 +110,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.drop()
 
     def noise(self, count):
+        self.body()
         self.wfile.write(b"\x00\xff no HTTP at all\r\n\r\n")
         self.drop()
 
