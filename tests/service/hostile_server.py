@@ -96,9 +96,11 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.answer(200, b"half", Content_Length=8)
         self.drop()
 
-    def cut(self, count):
-        """Half of an answer that does not say where it ends."""
+    def cut(self, count, hint=""):
+        """Half of an answer that does not say where it ends, after an interim one that seems to."""
         self.body()
+        if hint:
+            self.wfile.write(b"HTTP/1.1 103 Early Hints\r\nContent-Length: 4\r\n\r\n")
         self.send_response(200)
         self.end_headers()
         self.wfile.write(b"half")

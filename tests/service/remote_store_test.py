@@ -423,6 +423,7 @@ class Failures(RemoteTest):
             ("put", "status-404", TRANSPORT, "HTTP status 404"),
             ("get", "status-204", TRANSPORT, "HTTP status 204"),
             ("get", "cut", TRANSPORT, "The answer does not say where it ends"),
+            ("get", "cut-hint", TRANSPORT, "The answer does not say where it ends"),
             ("get", "endless", TRANSPORT, "larger than 67108864 bytes"),
             ("get", "announced", TRANSPORT, "larger than 67108864 bytes"),
             ("put", "endless", TRANSPORT, "larger than 1048576 bytes"),

@@ -73,8 +73,13 @@ std::size_t receive(char* bytes, std::size_t, std::size_t count, void* context) 
 
 std::size_t receiveHeader(char* bytes, std::size_t, std::size_t count, void* context) {
     auto& incoming = *static_cast<Incoming*>(context);
-    for (const std::string_view name : {"content-length:", "transfer-encoding:"})
-        incoming.hasMarkedEnd |= count > name.size() && curl_strnequal(bytes, name.data(), name.size()) != 0;
+    const auto beginsWith = [&](std::string_view prefix) {
+        return count > prefix.size() && curl_strnequal(bytes, prefix.data(), prefix.size()) != 0;
+    };
+    // The headers of a proxy's answer to CONNECT and of an interim answer come in here before those that count.
+    if (beginsWith("HTTP/"))
+        incoming.hasMarkedEnd = false;
+    incoming.hasMarkedEnd |= beginsWith("content-length:") || beginsWith("transfer-encoding:");
     incoming.headers += count;
     incoming.hasTooManyHeaders = incoming.headers > maximumHeaders;
     return incoming.hasTooManyHeaders ? 0 : count;
