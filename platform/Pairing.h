@@ -4,7 +4,8 @@
 // answer to the patch-load callback as the ticket, and posts the callback's result, in decimal, to <url>/pair/result.
 // The proxy description decides the way: for an https URL the entries "HTTPSEnable", "HTTPSProxy" and "HTTPSPort", for
 // an http URL those with "HTTP"; without them the server is addressed directly. The certificate of an https server is
-// always verified, no redirection is followed, and a server that stops answering is given up after a minute.
+// always verified, no redirection is followed, and a server that stops answering is given up after a minute. A ticket
+// whose length the server does not state ends with the connection: servers should state it.
 //
 // A failure is an Error of domain "BWCErrorDomain": the HTTP status when it is not 2xx, the transport's code
 // (libcurl's) when the exchange fails, and -1 when the callback's result is not 0, which the server is told first.

@@ -35,6 +35,6 @@ std::optional<Value::Data> base64Decode(std::string_view text) {
         if (EVP_DecodeBlock(out.data() + at / 4 * 3, place, length) != length / 4 * 3)
             return std::nullopt;
     }
-    out.resize(out.size() - padding);
+    out.erase(out.end() - static_cast<std::ptrdiff_t>(padding), out.end());
     return out;
 }

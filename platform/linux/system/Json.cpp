@@ -62,20 +62,23 @@ private:
     bool atKey_ = false;
 };
 
+// The parser takes a NUL for the end of the text and would leave unread what follows.
+bool hasNul(std::string_view text) { return text.find('\0') != std::string_view::npos; }
+
 } // namespace
 
 std::optional<Value> jsonToValue(std::string_view text, std::string* refusal) {
     ValueBuilder builder(true);
-    if (nlohmann::json::sax_parse(text.begin(), text.end(), &builder))
+    if (!hasNul(text) && nlohmann::json::sax_parse(text.begin(), text.end(), &builder))
         return builder.take();
     if (refusal)
-        *refusal = builder.refusal();
+        *refusal = hasNul(text) ? "a NUL character" : builder.refusal();
     return std::nullopt;
 }
 
 std::optional<std::string> jsonTextMember(std::string_view text, std::string_view key) {
     TextMemberReader reader(key);
-    if (!nlohmann::json::sax_parse(text.begin(), text.end(), &reader))
+    if (hasNul(text) || !nlohmann::json::sax_parse(text.begin(), text.end(), &reader))
         return std::nullopt;
     return reader.take();
 }
