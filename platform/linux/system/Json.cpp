@@ -63,7 +63,9 @@ private:
 };
 
 // The parser takes a NUL for the end of the text and would leave unread what follows.
-bool hasNul(std::string_view text) { return text.find('\0') != std::string_view::npos; }
+bool hasNul(std::string_view text) {
+    return text.find('\0') != std::string_view::npos;
+}
 
 } // namespace
 
