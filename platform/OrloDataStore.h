@@ -97,7 +97,7 @@ bool QDOrloDataCopyTrustObject(__QDOrlo* session, std::string_view url, Value::D
 // cut, as far as a remote store keeps its word. After failure the store is as it was, with one exception: when the
 // answer of a server got lost (QDOrloErrorTransport) it may have stored the record, as a whole, and putting it again
 // does no harm. A remote store takes no record of more than 64 MiB, nor one whose class or instance is "." or "..", has
-// a slash or a NUL in it, or more than 512 bytes (QDOrloErrorStorage).
+// a NUL in it, a slash with nothing, "." or ".." on either side, or more than 512 bytes (QDOrloErrorStorage).
 bool QDOrloDataPut(__QDOrlo* session, const Value& dataClass, const Value& dataInstance, const Value::Data& data,
                    std::optional<Error>* error);
 

@@ -96,12 +96,16 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.answer(200, b"half", Content_Length=8)
         self.drop()
 
-    def cut(self, count, hint=""):
-        """Half of an answer that does not say where it ends, after an interim one that seems to."""
+    def cut(self, count, seeming=""):
+        """Half of an answer that does not say where it ends, though it, or an interim one before it, may seem to."""
         self.body()
-        if hint:
+        if seeming == "hint":
             self.wfile.write(b"HTTP/1.1 103 Early Hints\r\nContent-Length: 4\r\n\r\n")
         self.send_response(200)
+        if seeming == "coding":
+            self.send_header("Transfer-Encoding", "identity")
+        if seeming == "length":
+            self.send_header("Content-Length", "9" * 30)
         self.end_headers()
         self.wfile.write(b"half")
         self.close_connection = True

@@ -1,8 +1,11 @@
 #include "platform/linux/services/Http.h"
 
 #include <algorithm>
+#include <charconv>
 #include <mutex>
 #include <new>
+#include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "platform/Crypto.h"
@@ -71,15 +74,38 @@ std::size_t receive(char* bytes, std::size_t, std::size_t count, void* context) 
     return 0;
 }
 
+bool beginsWith(std::string_view text, std::string_view prefix) {
+    return text.size() >= prefix.size() && curl_strnequal(text.data(), prefix.data(), prefix.size()) != 0;
+}
+
+std::string_view trimmed(std::string_view text) {
+    const std::size_t first = text.find_first_not_of(" \t\r\n");
+    return first == text.npos ? "" : text.substr(first, text.find_last_not_of(" \t\r\n") - first + 1);
+}
+
+// Whether the header says where the body ends, to libcurl too: with a length that it can represent, or with chunked as
+// the last transfer coding (RFC 9112 6.3).
+bool marksEnd(std::string_view header) {
+    constexpr std::string_view length = "content-length:";
+    constexpr std::string_view coding = "transfer-encoding:";
+    constexpr std::string_view chunked = "chunked";
+    if (beginsWith(header, length)) {
+        const std::string_view value = trimmed(header.substr(length.size()));
+        curl_off_t octets = 0;
+        return std::from_chars(value.data(), value.data() + value.size(), octets).ec == std::errc();
+    }
+    const std::string_view value = trimmed(header);
+    return beginsWith(header, coding) && value.size() > chunked.size() &&
+           beginsWith(value.substr(value.size() - chunked.size()), chunked);
+}
+
 std::size_t receiveHeader(char* bytes, std::size_t, std::size_t count, void* context) {
     auto& incoming = *static_cast<Incoming*>(context);
-    const auto beginsWith = [&](std::string_view prefix) {
-        return count > prefix.size() && curl_strnequal(bytes, prefix.data(), prefix.size()) != 0;
-    };
+    const std::string_view header(bytes, count);
     // The headers of a proxy's answer to CONNECT and of an interim answer come in here before those that count.
-    if (beginsWith("HTTP/"))
+    if (beginsWith(header, "HTTP/"))
         incoming.hasMarkedEnd = false;
-    incoming.hasMarkedEnd |= beginsWith("content-length:") || beginsWith("transfer-encoding:");
+    incoming.hasMarkedEnd |= marksEnd(header);
     incoming.headers += count;
     incoming.hasTooManyHeaders = incoming.headers > maximumHeaders;
     return incoming.hasTooManyHeaders ? 0 : count;
@@ -169,7 +195,7 @@ Answer Client::exchange(const Request& request) {
     check(curl_easy_getinfo(handle_.get(), CURLINFO_HTTP_VERSION, &version));
     if (request.endMustBeMarked && version < CURL_HTTP_VERSION_2 && !incoming.hasMarkedEnd &&
         incoming.answer.isSuccess())
-        throw Failure(CURLE_PARTIAL_FILE, "The answer does not say where it ends");
+        throw Failure(CURLE_WEIRD_SERVER_REPLY, "The answer does not say where it ends");
     return std::move(incoming.answer);
 }
 
