@@ -48,10 +48,10 @@ bool isCertsOnly(CMS_ContentInfo* message) {
 }
 
 // Whether these octets are the certificate's DER encoding. The library reads lengths of BER too (X.690 8.1.3), which
-// DER does not have.
+// DER does not have, and keeps the octets of what is signed, which are therefore encoded afresh.
 bool isEncodedAs(X509* x509, const std::uint8_t* bytes, std::size_t length) {
     unsigned char* encoding = nullptr;
-    const int encodedLength = i2d_X509(x509, &encoding);
+    const int encodedLength = i2d_re_X509_tbs(x509, nullptr) < 0 ? -1 : i2d_X509(x509, &encoding);
     const bool isSame = encodedLength >= 0 && static_cast<std::size_t>(encodedLength) == length &&
                         std::equal(bytes, bytes + length, encoding);
     OPENSSL_free(encoding);
