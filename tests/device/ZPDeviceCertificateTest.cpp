@@ -68,28 +68,46 @@ TEST_F(ZPDeviceCertificate, theCertificateComesFromTheFirstServiceThatIsThere) {
         std::optional<Error> error;
         Value certificate;
         Lines log;
+        Lines console;
     };
     const std::map<std::string, Value, std::less<>> holder{{"AccessoryCertificate", certificate}};
     const Error null = error("tcrt is NULL in IOReg");
     const Lines nullLog{"4 [ZPDevice] tcrt is NULL in IOReg"};
+    const std::string operation = "-[ZPDevice getTcrtCertificate:] - ";
+    const std::string askedFirst = "-[ZPDevice getService:service:] - Entering for service " + relay;
+    const std::string askedSecond = "-[ZPDevice getService:service:] - Entering for service " + authenticator;
+    const std::string entering = operation + "Entering";
+    const std::string service = operation + "IO Service Found ";
+    const std::string property = operation + "tcrt Found in IOReg";
+    const Lines foundOnFirst{entering, askedFirst, service, property};
+    const Lines serviceOnly{entering, askedFirst, service};
+    const Lines nothing{entering, askedFirst, askedSecond};
     const Row rows[] = {
-        {"first", {{relay, holder}, {authenticator, {}}}, {}, {}, certificate, {}},
-        {"second", {{authenticator, holder}}, {}, {}, certificate, {noService}},
-        {"empty", {{relay, {{"AccessoryCertificate", Value::Data{}}}}}, {}, {}, Value::Data{}, {}},
-        {"none on the first", {{relay, {}}, {authenticator, holder}}, {}, null, "before", nullLog},
-        {"no data", {{relay, {{"AccessoryCertificate", "text"}}}}, {}, null, "before", nullLog},
+        {"first", {{relay, holder}, {authenticator, {}}}, {}, {}, certificate, {}, foundOnFirst},
+        {"second",
+         {{authenticator, holder}},
+         {},
+         {},
+         certificate,
+         {noService},
+         {entering, askedFirst, askedSecond, service, property}},
+        {"empty", {{relay, {{"AccessoryCertificate", Value::Data{}}}}}, {}, {}, Value::Data{}, {}, foundOnFirst},
+        {"none on the first", {{relay, {}}, {authenticator, holder}}, {}, null, "before", nullLog, serviceOnly},
+        {"no data", {{relay, {{"AccessoryCertificate", "text"}}}}, {}, null, "before", nullLog, serviceOnly},
         {"no service",
          {},
          {},
          error("cannot get service"),
          "before",
-         {noService, noService, "4 [ZPDevice] cannot get service. Giving up."}},
+         {noService, noService, "4 [ZPDevice] cannot get service. Giving up."},
+         nothing},
         {"nothing matches the second",
          {},
          {authenticator},
          error("can't create matching dict"),
          "before",
-         {noService, "4 [ZPDevice] can't create matching dict", "4 [ZPDevice] cannot get service. Giving up."}},
+         {noService, "4 [ZPDevice] can't create matching dict", "4 [ZPDevice] cannot get service. Giving up."},
+         nothing},
     };
     for (const Row& row : rows) {
         services_ = {};
@@ -100,21 +118,18 @@ TEST_F(ZPDeviceCertificate, theCertificateComesFromTheFirstServiceThatIsThere) {
         EXPECT_EQ(device_.getTcrtCertificate(&found), row.error) << row.what;
         EXPECT_EQ(found, row.certificate) << row.what;
         EXPECT_EQ(recordedLog(), row.log) << row.what;
+        EXPECT_EQ(recordedConsole(), row.console) << row.what;
         EXPECT_EQ(device_.getTcrtCertificate(nullptr), row.error) << row.what;
         EXPECT_TRUE(services_.heldServices.empty()) << row.what;
     }
 }
 
-TEST_F(ZPDeviceCertificate, theRegistryIsSearchedInOrderAndTheConsoleSaysWhat) {
+TEST_F(ZPDeviceCertificate, theRegistryIsSearchedInOrder) {
     services_.registry[authenticator]["AccessoryCertificate"] = certificate;
     EXPECT_FALSE(device_.getTcrtCertificate(nullptr));
     EXPECT_EQ(services_.calls,
               (Lines{"serviceMatching " + relay, "getMatchingService " + relay, "serviceMatching " + authenticator,
                      "getMatchingService " + authenticator, "searchProperty IOService AccessoryCertificate 1"}));
-    const std::string operation = "-[ZPDevice getTcrtCertificate:] - ";
-    const std::string entering = "-[ZPDevice getService:service:] - Entering for service ";
-    EXPECT_EQ(recordedConsole(), (Lines{operation + "Entering", entering + relay, entering + authenticator,
-                                        operation + "IO Service Found ", operation + "tcrt Found in IOReg"}));
 }
 
 TEST_F(ZPDeviceCertificate, theSerialNumberIsThatOfTheFirstCertificateOrOfTheOnlyOne) {

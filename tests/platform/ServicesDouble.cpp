@@ -199,7 +199,7 @@ Value RPCopyProxyDictionaryWithOptions(const std::string& url, const Value& opti
 }
 
 SystemLog* getLogHandle(int number) {
-    return number == 1 ? systemLogDefault() : nullptr;
+    return number == 1 ? systemLogCreate("host", "framework") : nullptr;
 }
 
 void pauseFor(std::chrono::milliseconds duration) {

@@ -11,7 +11,7 @@ class SystemLog {};
 
 namespace {
 
-SystemLog pluginLog, defaultLog;
+SystemLog pluginLog, frameworkLog, defaultLog;
 std::mutex mutex;
 std::vector<std::string> lines;
 std::vector<std::string> consoleLines;
@@ -26,8 +26,8 @@ std::string withoutTimeAndNumber(std::string_view line) {
 
 } // namespace
 
-SystemLog* systemLogCreate(std::string_view, std::string_view) {
-    return &pluginLog;
+SystemLog* systemLogCreate(std::string_view, std::string_view category) {
+    return category == "framework" ? &frameworkLog : &pluginLog;
 }
 
 SystemLog* systemLogDefault() {
@@ -39,9 +39,10 @@ bool systemLogTypeEnabled(const SystemLog*, SystemLogType) {
 }
 
 void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message) {
-    const std::string level = std::to_string(static_cast<int>(type) + 1);
+    const std::string level = std::to_string(static_cast<int>(type) + 1) + " ";
+    const std::string handle = log == &frameworkLog || log == &pluginLog ? "" : "to no handle of ours: ";
     const std::lock_guard lock(mutex);
-    lines.push_back(level + " " + (log == &pluginLog ? withoutTimeAndNumber(message) : std::string(message)));
+    lines.push_back(level + handle + (log == &pluginLog ? withoutTimeAndNumber(message) : std::string(message)));
 }
 
 // "<operation>:<number> - <message>" loses its number; every other line stays as it is.

@@ -13,7 +13,7 @@ void recordLog();
 std::vector<std::string> recordedConsole();
 
 // The lines since recordLog, as "<level> [<file>] <message>", without time and line number; those that were written to
-// the system log's default handle as "<level> <message>".
+// the framework's handle of the system log as "<level> <message>". What went to neither handle is marked.
 std::vector<std::string> recordedLog();
 
 #endif
