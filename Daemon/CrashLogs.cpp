@@ -139,7 +139,7 @@ bool check_panic_version(std::string_view path) try {
     const std::optional<Value::Data> report = files::readWhole(path, anySize);
     const Value systemVersion = systemVersionList();
     const std::string* build = systemVersion["ProductBuildVersion"].text();
-    if (!report || report->empty() || !build)
+    if (!report || report->empty() || !build || build->empty()) // every text would contain an empty identifier
         return false;
     const std::string_view text(reinterpret_cast<const char*>(report->data()), report->size());
     if (std::ranges::any_of(text, [](char byte) { return static_cast<unsigned char>(byte) >= 0x80; }))

@@ -108,6 +108,7 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
         {"21A5", good + "\n", true},
         {"21A56", good + "\n", false},
         {nullptr, good + "\n", false},
+        {"", good + "\n", false},
         {"21A55", "\n" + good, false},
         {"21A55", "21A55\n", false},
         {"21A55", "", false},
@@ -119,6 +120,7 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
         {"21A55", R"({"os_version": "21A55")", false},
         {"21A55", R"({"os_version": "21A55"} x)", false},
         {"21A55", good + "\n\xC3\xA9", false}, // no ASCII text
+        {"21A55", good + '\0' + "\n", false},
         {"21A55", R"({"x": )" + nested, false},
         {"21A55", R"({"x": )" + nested + closed + R"(, "os_version": "21A55"})", true},
     };

@@ -33,6 +33,7 @@ TEST(Json, textsBecomeValues) {
         {R"({"a": 1, "a": 2})", std::nullopt},
         {"\"\xFF\"", std::nullopt},
         {"[1] 2", std::nullopt},
+        {std::string("[1]\0", 4), std::nullopt},
         {"[1", std::nullopt},
         {"", std::nullopt},
     };
