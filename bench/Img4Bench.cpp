@@ -10,7 +10,7 @@
 #include <mbedtls/asn1.h>
 
 #include "img4/Img4.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 namespace {
 

@@ -18,7 +18,7 @@
 #include "der/DERDecode.h"
 #include "der/DERItemSpecs.h"
 #include "img4/Img4Trust.h"
-#include "tests/support/SignedManifestMaker.h"
+#include "tools/makers/SignedManifestMaker.h"
 
 namespace {
 

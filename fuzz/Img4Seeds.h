@@ -3,7 +3,7 @@
 #define VELTRA_FUZZ_IMG4_SEEDS_H
 
 #include "fuzz/Seeds.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 inline int writeImg4Seeds(int argc, char** argv) {
     using namespace img4maker;

@@ -1,5 +1,5 @@
 #include "fuzz/Seeds.h"
-#include "tests/support/CertificateMaker.h"
+#include "tools/makers/CertificateMaker.h"
 
 int main(int count, char** arguments) {
     using namespace certificatemaker;

@@ -1,5 +1,5 @@
 #include "fuzz/Seeds.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 int main(int argc, char** argv) {
     using namespace img4maker;

@@ -3,7 +3,7 @@
 #include <vector>
 
 #include "fuzz/Seeds.h"
-#include "tests/support/SignedManifestMaker.h"
+#include "tools/makers/SignedManifestMaker.h"
 
 namespace {
 

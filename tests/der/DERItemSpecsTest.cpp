@@ -5,7 +5,7 @@
 #include "der/DEREncode.h"
 #include "der/DERItemSpecs.h"
 #include "tests/der/Bytes.h"
-#include "tests/support/CertificateMaker.h"
+#include "tools/makers/CertificateMaker.h"
 
 namespace {
 

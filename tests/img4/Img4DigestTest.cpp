@@ -1,6 +1,6 @@
 #include "img4/Img4.h"
 #include "platform/Crypto.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <algorithm>
 #include <array>

@@ -2,7 +2,7 @@
 // exact size each time.
 #include "img4/Img4.h"
 #include "tests/support/Img4Answers.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <algorithm>
 #include <memory>

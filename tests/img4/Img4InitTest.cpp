@@ -1,5 +1,5 @@
 #include "img4/Img4.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <cstring>
 #include <string>

@@ -1,5 +1,5 @@
 // The maker's files are DER to another reader too.
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 #include "tests/support/OpenSSLTool.h"
 
 #include <string>

@@ -1,7 +1,7 @@
 // The properties of one dictionary, read through every family of getters. The families look up alike and differ in what
 // a failure does to the out-value.
 #include "img4/Img4.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <functional>
 #include <string>

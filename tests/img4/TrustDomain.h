@@ -2,7 +2,7 @@
 #ifndef VELTRA_TESTS_IMG4_TRUST_DOMAIN_H
 #define VELTRA_TESTS_IMG4_TRUST_DOMAIN_H
 
-#include "tests/support/SignedManifestMaker.h"
+#include "tools/makers/SignedManifestMaker.h"
 
 #include <cstring>
 #include <map>

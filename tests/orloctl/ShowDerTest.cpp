@@ -3,8 +3,8 @@
 #include <algorithm>
 #include <sstream>
 
-#include "tests/support/Img4Maker.h"
 #include "tests/support/OpenSSLTool.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <gtest/gtest.h>
 

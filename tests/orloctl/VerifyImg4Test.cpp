@@ -1,6 +1,6 @@
 #include "tools/orloctl/VerifyImg4.h"
 
-#include "tests/support/SignedManifestMaker.h"
+#include "tools/makers/SignedManifestMaker.h"
 
 #include <functional>
 #include <map>

@@ -6,7 +6,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/support/CertificateMaker.h"
+#include "tools/makers/CertificateMaker.h"
 
 namespace {
 

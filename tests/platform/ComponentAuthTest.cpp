@@ -8,8 +8,8 @@
 #include <gtest/gtest.h>
 
 #include "platform/HardwareRegistry.h"
-#include "tests/support/CertificateMaker.h"
 #include "tests/support/TemporaryRoot.h"
+#include "tools/makers/CertificateMaker.h"
 
 namespace {
 

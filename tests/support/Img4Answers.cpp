@@ -2,7 +2,7 @@
 
 #include "der/DERDecode.h"
 #include "img4/Img4.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <cstdlib>
 #include <iostream>

@@ -1,7 +1,7 @@
 // Makes certificates and CMS messages for tests and fuzz seeds. They are encoded by the library that the services read
 // them with; what a test needs beyond that is made by changing octets.
-#ifndef VELTRA_TESTS_SUPPORT_CERTIFICATEMAKER_H
-#define VELTRA_TESTS_SUPPORT_CERTIFICATEMAKER_H
+#ifndef VELTRA_TOOLS_MAKERS_CERTIFICATEMAKER_H
+#define VELTRA_TOOLS_MAKERS_CERTIFICATEMAKER_H
 
 #include <cstdint>
 #include <string>

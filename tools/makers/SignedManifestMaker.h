@@ -1,11 +1,11 @@
 // Makes signed manifests and their chains of certificates for every trust profile, sound ones and broken ones, from a
 // domain that scripts/make-trust-domain has made. Certificates are put together field by field, so that a test can
 // change any of them and still have the whole signed.
-#ifndef VELTRA_TESTS_SUPPORT_SIGNEDMANIFESTMAKER_H
-#define VELTRA_TESTS_SUPPORT_SIGNEDMANIFESTMAKER_H
+#ifndef VELTRA_TOOLS_MAKERS_SIGNEDMANIFESTMAKER_H
+#define VELTRA_TOOLS_MAKERS_SIGNEDMANIFESTMAKER_H
 
 #include "img4/Img4Trust.h"
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include <memory>
 #include <string>

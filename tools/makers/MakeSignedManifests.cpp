@@ -4,7 +4,7 @@
 #include <fstream>
 #include <iostream>
 
-#include "tests/support/SignedManifestMaker.h"
+#include "tools/makers/SignedManifestMaker.h"
 
 namespace {
 

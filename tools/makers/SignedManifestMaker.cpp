@@ -1,4 +1,4 @@
-#include "tests/support/SignedManifestMaker.h"
+#include "tools/makers/SignedManifestMaker.h"
 
 #include <fstream>
 #include <iterator>

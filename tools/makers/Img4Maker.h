@@ -1,8 +1,8 @@
 // Makes Img4 containers, payloads and manifests, sound ones and broken ones, for tests, fuzz seeds and the example
 // device. The octets are the DER encoder's, put together from the inside out: every function returns one whole encoding
 // and takes the encodings of what it holds.
-#ifndef VELTRA_TESTS_SUPPORT_IMG4MAKER_H
-#define VELTRA_TESTS_SUPPORT_IMG4MAKER_H
+#ifndef VELTRA_TOOLS_MAKERS_IMG4MAKER_H
+#define VELTRA_TOOLS_MAKERS_IMG4MAKER_H
 
 #include "der/DERTypes.h"
 

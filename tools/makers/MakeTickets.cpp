@@ -2,7 +2,7 @@
 #include <filesystem>
 #include <fstream>
 
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 namespace {
 

@@ -1,4 +1,4 @@
-#include "tests/support/Img4Maker.h"
+#include "tools/makers/Img4Maker.h"
 
 #include "der/DEREncode.h"
 

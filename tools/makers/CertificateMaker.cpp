@@ -1,4 +1,4 @@
-#include "tests/support/CertificateMaker.h"
+#include "tools/makers/CertificateMaker.h"
 
 #include <cstdlib>
 #include <memory>
