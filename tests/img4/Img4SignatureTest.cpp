@@ -1,7 +1,7 @@
 #include "tests/img4/TrustDomain.h"
 
-#include <functional>
-#include <iterator>
+#include <utility>
+#include <vector>
 
 #include <gtest/gtest.h>
 #include <openssl/bn.h>
@@ -93,8 +93,8 @@ struct Block {
     Bytes start = {0x00, 0x01};
     std::size_t paddingLength = 0; // 0: as much as fills the block
     Bytes separator = {0x00};
-    Bytes digestInfo;
-    Bytes rest;
+    Bytes digestInfo = {};
+    Bytes rest = {};
     std::uint8_t padding = 0xFF;
 };
 
@@ -115,96 +115,51 @@ Bytes longSequence(const Bytes& content) {
 
 struct BlockCase {
     const char* name;
-    bool accepted;
-    std::function<void(Block&, const Bytes& digest, const Bytes& oid)> change;
+    Block block;
+    bool accepted = false;
 };
 
-const BlockCase blockCases[] = {
-    {"sound", true, [](Block&, const Bytes&, const Bytes&) {}},
-    {"no NULL", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid}), octets(digest)});
-     }},
-    {"other parameters", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid, octets({})}), octets(digest)});
-     }},
-    {"octets in the NULL", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid, Bytes{0x05, 0x01, 0x00}}), octets(digest)});
-     }},
-    {"long length outside", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = longSequence(join({sequence({oid, null}), octets(digest)}));
-     }},
-    {"long length of the algorithm", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({longSequence(join({oid, null})), octets(digest)});
-     }},
-    {"long length of the digest", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence(
-             {sequence({oid, null}), join({Bytes{0x04, 0x81, static_cast<std::uint8_t>(digest.size())}, digest})});
-     }},
-    {"indefinite length", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = join({Bytes{0x30, 0x80}, sequence({oid, null}), octets(digest), Bytes{0x00, 0x00}});
-     }},
-    {"octets behind the digest", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid, null}), octets(digest), null});
-     }},
-    {"octets behind the algorithm's NULL", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid, null, null}), octets(digest)});
-     }},
-    {"octets behind the DigestInfo", false, [](Block& b, const Bytes&, const Bytes&) { b.rest = {0x00}; }},
-    {"short padding and octets behind", false, [](Block& b, const Bytes&, const Bytes&) { b.paddingLength = 8; }},
-    {"padding of seven octets", false, [](Block& b, const Bytes&, const Bytes&) { b.paddingLength = 7; }},
-    {"other octets in the padding", false, [](Block& b, const Bytes&, const Bytes&) { b.padding = 0xFE; }},
-    {"zeros as padding", false, [](Block& b, const Bytes&, const Bytes&) { b.padding = 0x00; }},
-    {"padding that ends in another octet", false, [](Block& b, const Bytes&, const Bytes&) { b.separator = {0x01}; }},
-    {"no end of the padding", false, [](Block& b, const Bytes&, const Bytes&) { b.separator = {}; }},
-    {"two ends of the padding", false,
-     [](Block& b, const Bytes&, const Bytes&) {
-         b.separator = {0x00, 0x00};
-     }},
-    {"padding of encryption", false,
-     [](Block& b, const Bytes&, const Bytes&) {
-         b.start = {0x00, 0x02};
-     }},
-    {"padding of type 0", false,
-     [](Block& b, const Bytes&, const Bytes&) {
-         b.start = {0x00, 0x00};
-     }},
-    {"first octet left out", false, [](Block& b, const Bytes&, const Bytes&) { b.start = {0x01}; }},
-    {"other digest algorithm", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         Bytes other(oid.begin(), std::prev(oid.end()));
-         other.push_back(oid.back() ^ 0x03);
-         b.digestInfo = sequence({sequence({other, null}), octets(digest)});
-     }},
-    {"digest in a BIT STRING", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid, null}), item(DERTagBitString, digest)});
-     }},
-    {"DigestInfo in a SET", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = set({sequence({oid, null}), octets(digest)});
-     }},
-    {"digest that lacks an octet", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         b.digestInfo = sequence({sequence({oid, null}), octets(Bytes(digest.begin(), digest.end() - 1))});
-     }},
-    {"digest alone", false, [](Block& b, const Bytes& digest, const Bytes&) { b.digestInfo = digest; }},
-    {"other digest", false,
-     [](Block& b, const Bytes& digest, const Bytes& oid) {
-         Bytes other = digest;
-         other.back() ^= 1;
-         b.digestInfo = sequence({sequence({oid, null}), octets(other)});
-     }},
-    {"nothing", false, [](Block& b, const Bytes&, const Bytes&) { b.digestInfo = {}; }},
-};
+// The blocks of this digest under the algorithm with this encoded OBJECT IDENTIFIER.
+std::vector<BlockCase> blockCases(const Bytes& digest, const Bytes& oid) {
+    const Bytes algorithm = sequence({oid, null});
+    const Bytes sound = sequence({algorithm, octets(digest)});
+    const auto with = [](const Bytes& digestInfo) { return Block{.digestInfo = digestInfo}; };
+    const auto changed = [](Bytes octets, std::uint8_t bits) {
+        octets.back() ^= bits;
+        return octets;
+    };
+    const Bytes longDigest = join({Bytes{0x04, 0x81, static_cast<std::uint8_t>(digest.size())}, digest});
+    return {
+        {"sound", with(sound), true},
+        {"no NULL", with(sequence({sequence({oid}), octets(digest)}))},
+        {"other parameters", with(sequence({sequence({oid, octets({})}), octets(digest)}))},
+        {"octets in the NULL", with(sequence({sequence({oid, Bytes{0x05, 0x01, 0x00}}), octets(digest)}))},
+        {"long length outside", with(longSequence(join({algorithm, octets(digest)})))},
+        {"long length of the algorithm", with(sequence({longSequence(join({oid, null})), octets(digest)}))},
+        {"long length of the digest", with(sequence({algorithm, longDigest}))},
+        {"indefinite length", with(join({Bytes{0x30, 0x80}, algorithm, octets(digest), Bytes{0x00, 0x00}}))},
+        {"octets behind the digest", with(sequence({algorithm, octets(digest), null}))},
+        {"octets behind the algorithm's NULL", with(sequence({sequence({oid, null, null}), octets(digest)}))},
+        {"other digest algorithm", with(sequence({sequence({changed(oid, 0x03), null}), octets(digest)}))},
+        {"digest in a BIT STRING", with(sequence({algorithm, item(DERTagBitString, digest)}))},
+        {"DigestInfo in a SET", with(set({algorithm, octets(digest)}))},
+        {"digest that lacks an octet", with(sequence({algorithm, octets(Bytes(digest.begin(), digest.end() - 1))}))},
+        {"digest alone", with(digest)},
+        {"other digest", with(sequence({algorithm, octets(changed(digest, 1))}))},
+        {"nothing", with({})},
+        {"octets behind the DigestInfo", {.digestInfo = sound, .rest = {0x00}}},
+        {"short padding and octets behind", {.paddingLength = 8, .digestInfo = sound}},
+        {"padding of seven octets", {.paddingLength = 7, .digestInfo = sound}},
+        {"other octets in the padding", {.digestInfo = sound, .padding = 0xFE}},
+        {"zeros as padding", {.digestInfo = sound, .padding = 0x00}},
+        {"padding that ends in another octet", {.separator = {0x01}, .digestInfo = sound}},
+        {"no end of the padding", {.separator = {}, .digestInfo = sound}},
+        {"two ends of the padding", {.separator = {0x00, 0x00}, .digestInfo = sound}},
+        {"padding of encryption", {.start = {0x00, 0x02}, .digestInfo = sound}},
+        {"padding of type 0", {.start = {0x00, 0x00}, .digestInfo = sound}},
+        {"first octet left out", {.start = {0x01}, .digestInfo = sound}},
+    };
+}
 
 const Key& rsaKey() {
     static const Key key = readKey(TEST_TRUST_DOMAIN "/keys/ROOT_CA_CERTIFICATE.pem");
@@ -226,14 +181,10 @@ void checkBlocks(const Key& key, const Img4DigestInfo& info) {
     const Bytes bits = publicKeyBits(key);
     const std::size_t size = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
     EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info.length, message), digest));
-    for (const BlockCase& row : blockCases) {
-        SCOPED_TRACE(std::to_string(info.length) + " at " + std::to_string(size) + ", " + row.name);
-        Block block;
-        block.digestInfo = sequence({sequence({oid(*info.oid), null}), octets(digest)});
-        row.change(block, digest, oid(*info.oid));
-        const Bytes signature = signRaw(key, encode(block, size));
-        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature, digest), row.accepted);
-    }
+    for (const BlockCase& row : blockCases(digest, oid(*info.oid)))
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, encode(row.block, size)), digest),
+                  row.accepted)
+            << info.length << " at " << size << ", " << row.name;
 }
 
 const Bytes longExponent = {0x01, 0, 0, 0, 0, 0, 0, 0, 0x0D};
@@ -400,216 +351,122 @@ Bytes negative(const Bytes& magnitude) {
     return octets;
 }
 
-struct PairCase {
-    const char* name;
-    bool accepted;
-    std::function<Bytes(const Sound&)> make;
-};
-
 Bytes pair(const Bytes& r, const Bytes& s) {
     return sequence({positiveInteger(r), positiveInteger(s)});
 }
 
-const PairCase pairCases[] = {
-    {"sound", true, [](const Sound& x) { return pair(x.r, x.s); }},
-    {"s on the other side of the order", true,
-     [](const Sound& x) { return pair(x.r, difference(x.order.get(), x.s)); }},
-    {"r and s swapped", false, [](const Sound& x) { return pair(x.s, x.r); }},
-    {"r = 0", false, [](const Sound& x) { return pair({}, x.s); }},
-    {"s = 0", false, [](const Sound& x) { return pair(x.r, {}); }},
-    {"r = s = 0", false, [](const Sound&) { return pair({}, {}); }},
-    {"r = s = 1", false, [](const Sound&) { return pair({1}, {1}); }},
-    {"r = 0, s = 1", false, [](const Sound&) { return pair({}, {1}); }},
-    {"r = order", false, [](const Sound& x) { return pair(octetsOf(x.order.get()), x.s); }},
-    {"s = order", false, [](const Sound& x) { return pair(x.r, octetsOf(x.order.get())); }},
-    {"r = field", false, [](const Sound& x) { return pair(octetsOf(x.field.get()), x.s); }},
-    {"r = s = order", false, [](const Sound& x) { return pair(octetsOf(x.order.get()), octetsOf(x.order.get())); }},
-    {"r = order - 1", false, [](const Sound& x) { return pair(difference(x.order.get(), {1}), x.s); }},
-    {"r plus order", false, [](const Sound& x) { return pair(sum(x.r, x.order.get()), x.s); }},
-    {"s plus order", false, [](const Sound& x) { return pair(x.r, sum(x.s, x.order.get())); }},
-    {"r much too long", false,
-     [](const Sound& x) {
-         return pair(join({Bytes{1}, Bytes(100), x.r}), x.s);
-     }},
-    {"r negative", false,
-     [](const Sound& x) {
-         return sequence({rawInteger(negative(x.r)), positiveInteger(x.s)});
-     }},
-    {"s negative", false,
-     [](const Sound& x) {
-         return sequence({positiveInteger(x.r), rawInteger(negative(x.s))});
-     }},
-    {"r minus order", false,
-     [](const Sound& x) {
-         return sequence({rawInteger(negative(difference(x.order.get(), x.r))), positiveInteger(x.s)});
-     }},
-    {"zeros before r", false,
-     [](const Sound& x) {
-         return sequence({rawInteger(join({Bytes{0, 0}, x.r})), positiveInteger(x.s)});
-     }},
-    {"zeros before s", false,
-     [](const Sound& x) {
-         return sequence({positiveInteger(x.r), rawInteger(join({Bytes{0, 0}, x.s}))});
-     }},
-    {"r empty", false,
-     [](const Sound& x) {
-         return sequence({rawInteger({}), positiveInteger(x.s)});
-     }},
-    {"s empty", false,
-     [](const Sound& x) {
-         return sequence({positiveInteger(x.r), rawInteger({})});
-     }},
-    {"r of two octets for zero", false,
-     [](const Sound& x) {
-         return sequence({rawInteger({0, 0}), positiveInteger(x.s)});
-     }},
-    {"s missing", false, [](const Sound& x) { return sequence({positiveInteger(x.r)}); }},
-    {"both missing", false, [](const Sound&) { return sequence({}); }},
-    {"third number", false,
-     [](const Sound& x) {
-         return sequence({positiveInteger(x.r), positiveInteger(x.s), positiveInteger({1})});
-     }},
-    {"NULL inside", false,
-     [](const Sound& x) {
-         return sequence({positiveInteger(x.r), positiveInteger(x.s), null});
-     }},
-    {"tagged element in front", false,
-     [](const Sound& x) {
-         return sequence({context(0, {}), positiveInteger(x.r), positiveInteger(x.s)});
-     }},
-    {"octets behind", false,
-     [](const Sound& x) {
-         return join({pair(x.r, x.s), null});
-     }},
-    {"zero octet behind", false,
-     [](const Sound& x) {
-         return join({pair(x.r, x.s), Bytes{0}});
-     }},
-    {"cut short", false,
-     [](const Sound& x) {
-         Bytes encoding = pair(x.r, x.s);
-         encoding.pop_back();
-         return encoding;
-     }},
-    {"r an OCTET STRING", false,
-     [](const Sound& x) {
-         return sequence({octets(x.r), positiveInteger(x.s)});
-     }},
-    {"r an ENUMERATED", false,
-     [](const Sound& x) {
-         Bytes r = positiveInteger(x.r);
-         r[0] = 0x0A;
-         return sequence({r, positiveInteger(x.s)});
-     }},
-    {"s a REAL", false,
-     [](const Sound& x) {
-         return sequence({positiveInteger(x.r), Bytes{0x09, 0x01, 0x42}});
-     }},
-    {"NULLs", false,
-     [](const Sound&) {
-         return sequence({null, null});
-     }},
-    {"SET", false,
-     [](const Sound& x) {
-         return set({positiveInteger(x.r), positiveInteger(x.s)});
-     }},
-    {"SEQUENCE in a SEQUENCE", false, [](const Sound& x) { return sequence({pair(x.r, x.s)}); }},
-    {"long length", false,
-     [](const Sound& x) {
-         return longSequence(join({positiveInteger(x.r), positiveInteger(x.s)}));
-     }},
-    {"long length of r", false,
-     [](const Sound& x) {
-         Bytes r = positiveInteger(x.r);
-         r.insert(r.begin() + 1, 0x81);
-         return sequence({r, positiveInteger(x.s)});
-     }},
-    {"indefinite length", false,
-     [](const Sound& x) {
-         return join({Bytes{0x30, 0x80}, positiveInteger(x.r), positiveInteger(x.s), Bytes{0x00, 0x00}});
-     }},
-    {"plain r and s", false,
-     [](const Sound& x) {
-         return join({x.r, x.s});
-     }},
-    {"one octet", false, [](const Sound&) { return Bytes{0x30}; }},
-    {"none", false, [](const Sound&) { return Bytes{}; }},
+struct PairCase {
+    const char* name;
+    Bytes encoding;
+    bool accepted = false;
 };
+
+std::vector<PairCase> pairCases(const Sound& sound) {
+    const Bytes &r = sound.r, &s = sound.s;
+    const Bytes R = positiveInteger(r), S = positiveInteger(s);
+    const BIGNUM* const n = sound.order.get();
+    const Bytes order = octetsOf(n), field = octetsOf(sound.field.get());
+    const Bytes whole = pair(r, s);
+    const Bytes enumerated = item(0x0A, Bytes(R.begin() + 2, R.end()));
+    const Bytes longR = join({Bytes{0x02, 0x81}, Bytes(R.begin() + 1, R.end())});
+    return {
+        {"sound", whole, true},
+        {"s on the other side of the order", pair(r, difference(n, s)), true},
+        {"r and s swapped", pair(s, r)},
+        {"r = 0", pair({}, s)},
+        {"s = 0", pair(r, {})},
+        {"r = s = 0", pair({}, {})},
+        {"r = s = 1", pair({1}, {1})},
+        {"r = 0, s = 1", pair({}, {1})},
+        {"r = order", pair(order, s)},
+        {"s = order", pair(r, order)},
+        {"r = field", pair(field, s)},
+        {"r = s = order", pair(order, order)},
+        {"r = order - 1", pair(difference(n, {1}), s)},
+        {"r plus order", pair(sum(r, n), s)},
+        {"s plus order", pair(r, sum(s, n))},
+        {"r much too long", pair(join({Bytes{1}, Bytes(100), r}), s)},
+        {"r negative", sequence({rawInteger(negative(r)), S})},
+        {"s negative", sequence({R, rawInteger(negative(s))})},
+        {"r minus order", sequence({rawInteger(negative(difference(n, r))), S})},
+        {"zeros before r", sequence({rawInteger(join({Bytes{0, 0}, r})), S})},
+        {"zeros before s", sequence({R, rawInteger(join({Bytes{0, 0}, s}))})},
+        {"r empty", sequence({rawInteger({}), S})},
+        {"s empty", sequence({R, rawInteger({})})},
+        {"r of two octets for zero", sequence({rawInteger({0, 0}), S})},
+        {"s missing", sequence({R})},
+        {"both missing", sequence({})},
+        {"third number", sequence({R, S, positiveInteger({1})})},
+        {"NULL inside", sequence({R, S, null})},
+        {"tagged element in front", sequence({context(0, {}), R, S})},
+        {"octets behind", join({whole, null})},
+        {"zero octet behind", join({whole, Bytes{0}})},
+        {"cut short", Bytes(whole.begin(), whole.end() - 1)},
+        {"r an OCTET STRING", sequence({octets(r), S})},
+        {"r an ENUMERATED", sequence({enumerated, S})},
+        {"s a REAL", sequence({R, Bytes{0x09, 0x01, 0x42}})},
+        {"NULLs", sequence({null, null})},
+        {"SET", set({R, S})},
+        {"SEQUENCE in a SEQUENCE", sequence({whole})},
+        {"long length", longSequence(join({R, S}))},
+        {"long length of r", sequence({longR, S})},
+        {"indefinite length", join({Bytes{0x30, 0x80}, R, S, Bytes{0x00, 0x00}})},
+        {"plain r and s", join({r, s})},
+        {"one octet", {0x30}},
+        {"none", {}},
+    };
+}
 
 TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDER) {
     for (const CurveUnderTest& curve : curves) {
         const Key key = makeECKey(curve.name);
         const Bytes digest = digestOfMessage(*curve.profile);
-        const Sound sound = soundSignature(key, *curve.profile);
-        for (const PairCase& row : pairCases)
-            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), row.make(sound), digest),
+        for (const PairCase& row : pairCases(soundSignature(key, *curve.profile)))
+            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), row.encoding, digest),
                       row.accepted)
                 << curve.name << ", " << row.name;
     }
 }
-
-struct PointCase {
-    const char* name;
-    std::function<Bytes(Bytes point, const Key& key)> make;
-};
 
 Bytes withForm(Bytes point, std::uint8_t form) {
     point.front() = form;
     return point;
 }
 
-Bytes parityOf(const Bytes& point) {
-    return {static_cast<std::uint8_t>(point.back() & 1)};
+std::vector<std::pair<const char*, Bytes>> refusedPoints(const Key& key) {
+    const Bytes point = publicKeyBits(key);
+    const std::size_t half = point.size() / 2;
+    const Bytes x(point.begin() + 1, point.end() - static_cast<long>(half));
+    const Bytes y(point.end() - static_cast<long>(half), point.end());
+    const Number p = parameter(key, OSSL_PKEY_PARAM_EC_P);
+    const Bytes field = octetsOf(p.get(), half);
+    const Bytes negatedY = octetsOf(number(difference(p.get(), y)).get(), half);
+    const std::uint8_t parity = y.back() & 1;
+    const bool isP256 = half == 32;
+    Bytes offCurve = point;
+    offCurve.back() ^= 1;
+    return {
+        {"not on the curve", offCurve},
+        {"hybrid", withForm(point, 0x06 | parity)},
+        {"compressed", join({Bytes{static_cast<std::uint8_t>(0x02 | parity)}, x})},
+        {"form of a compressed point", withForm(point, 0x02)},
+        {"infinity", {0x00}},
+        {"infinity of full length", Bytes(point.size())},
+        {"origin", withForm(Bytes(point.size()), 0x04)},
+        {"coordinates of the field's size", join({Bytes{0x04}, field, field})},
+        {"coordinates swapped", join({Bytes{0x04}, y, x})},
+        {"bare coordinates", join({x, y})},
+        {"octet behind", join({point, Bytes{0}})},
+        {"octet missing", Bytes(point.begin(), point.end() - 1)},
+        {"in an OCTET STRING", octets(point)},
+        {"whole SubjectPublicKeyInfo", publicKeyInfo(key)},
+        {"of the other curve", publicKeyBits(makeECKey(isP256 ? "P-384" : "P-256"))},
+        {"of P-521", publicKeyBits(makeECKey("P-521"))},
+        {"of another key", publicKeyBits(makeECKey(isP256 ? "P-256" : "P-384"))},
+        {"of the key's negation", join({Bytes{0x04}, x, negatedY})},
+        {"none", {}},
+    };
 }
-
-const PointCase refusedPoints[] = {
-    {"not on the curve",
-     [](Bytes point, const Key&) {
-         point.back() ^= 1;
-         return point;
-     }},
-    {"hybrid", [](const Bytes& point,
-                  const Key&) { return withForm(point, static_cast<std::uint8_t>(0x06 + parityOf(point).front())); }},
-    {"compressed",
-     [](const Bytes& point, const Key&) {
-         return withForm(Bytes(point.begin(), point.begin() + 1 + static_cast<long>(point.size() / 2)),
-                         static_cast<std::uint8_t>(0x02 + parityOf(point).front()));
-     }},
-    {"form of a compressed point", [](const Bytes& point, const Key&) { return withForm(point, 0x02); }},
-    {"infinity", [](const Bytes&, const Key&) { return Bytes{0x00}; }},
-    {"infinity of full length", [](const Bytes& point, const Key&) { return Bytes(point.size()); }},
-    {"origin", [](const Bytes& point, const Key&) { return withForm(Bytes(point.size()), 0x04); }},
-    {"coordinates of the field's size",
-     [](const Bytes& point, const Key& key) {
-         const Bytes p = octetsOf(parameter(key, OSSL_PKEY_PARAM_EC_P).get(), point.size() / 2);
-         return join({Bytes{0x04}, p, p});
-     }},
-    {"coordinates swapped",
-     [](const Bytes& point, const Key&) {
-         const auto middle = point.begin() + 1 + static_cast<long>(point.size() / 2);
-         return join({Bytes{0x04}, Bytes(middle, point.end()), Bytes(point.begin() + 1, middle)});
-     }},
-    {"bare coordinates", [](const Bytes& point, const Key&) { return Bytes(point.begin() + 1, point.end()); }},
-    {"octet behind",
-     [](const Bytes& point, const Key&) {
-         return join({point, Bytes{0}});
-     }},
-    {"octet missing", [](const Bytes& point, const Key&) { return Bytes(point.begin(), point.end() - 1); }},
-    {"in an OCTET STRING", [](const Bytes& point, const Key&) { return octets(point); }},
-    {"whole SubjectPublicKeyInfo", [](const Bytes&, const Key& key) { return publicKeyInfo(key); }},
-    {"of the other curve",
-     [](const Bytes& point, const Key&) { return publicKeyBits(makeECKey(point.size() == 65 ? "P-384" : "P-256")); }},
-    {"of P-521", [](const Bytes&, const Key&) { return publicKeyBits(makeECKey("P-521")); }},
-    {"of another key",
-     [](const Bytes& point, const Key&) { return publicKeyBits(makeECKey(point.size() == 65 ? "P-256" : "P-384")); }},
-    {"of the key's negation",
-     [](const Bytes& point, const Key& key) {
-         const auto middle = point.begin() + 1 + static_cast<long>(point.size() / 2);
-         const Bytes y = difference(parameter(key, OSSL_PKEY_PARAM_EC_P).get(), Bytes(middle, point.end()));
-         return join({Bytes(point.begin(), middle), octetsOf(number(y).get(), point.size() / 2)});
-     }},
-    {"none", [](const Bytes&, const Key&) { return Bytes{}; }},
-};
 
 TEST(Img4ECDSASignature, needsAnUncompressedPointOnItsCurve) {
     for (const CurveUnderTest& curve : curves) {
@@ -617,10 +474,9 @@ TEST(Img4ECDSASignature, needsAnUncompressedPointOnItsCurve) {
         const Bytes digest = digestOfMessage(*curve.profile);
         const Bytes signature = sign(key, digest.size(), message);
         ASSERT_TRUE(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), signature, digest));
-        for (const PointCase& row : refusedPoints)
-            EXPECT_FALSE(
-                accepts(verify_signature_ecdsa, *curve.profile, row.make(publicKeyBits(key), key), signature, digest))
-                << curve.name << ", " << row.name;
+        for (const auto& [name, point] : refusedPoints(key))
+            EXPECT_FALSE(accepts(verify_signature_ecdsa, *curve.profile, point, signature, digest))
+                << curve.name << ", " << name;
     }
 }
 
