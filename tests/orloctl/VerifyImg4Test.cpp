@@ -2,8 +2,9 @@
 
 #include "tools/makers/SignedManifestMaker.h"
 
-#include <functional>
+#include <algorithm>
 #include <map>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -91,7 +92,7 @@ TEST(VerifyImg4, showsWhatTheManifestSaysAndTheLeafDemands) {
 struct RefusalCase {
     const char* step;
     const char* problem;
-    std::function<Bytes()> make;
+    Bytes bytes;
     const char* profile = nullptr; // all of them
     const char* object = "";
 };
@@ -114,12 +115,24 @@ Bytes withObject(const Bytes& encoding) {
     return constrained({}, fields);
 }
 
-// A sound manifest of `profile` whose leaf was changed before it was issued.
-Bytes withLeaf(const char* profile, const std::function<void(Certificate&)>& change) {
+// A sound manifest that this leaf of the profile has signed.
+Bytes signedBy(const Certificate& leaf, const char* profile = ec384) {
     const Signer& signer = signerOf(profile);
-    Certificate leaf = signer.leaf({});
-    change(leaf);
     return signer.manifest(standardManifest(), signer.chainWith(signer.issue(leaf)));
+}
+
+// A sound manifest of `profile` whose leaf has this in a field.
+Bytes withLeaf(const char* profile, Bytes Certificate::*field, const Bytes& value) {
+    Certificate leaf = signerOf(profile).leaf({});
+    leaf.*field = value;
+    return signedBy(leaf, profile);
+}
+
+// The key of the profile's leaf with its last octet changed.
+Bytes otherKey(const char* profile) {
+    Bytes key = signerOf(profile).leaf({}).publicKeyInfo;
+    key.back() ^= 1;
+    return key;
 }
 
 // `bytes` with the first octet of `text` in it changed.
@@ -170,133 +183,114 @@ Bytes shortened(Bytes bytes) {
     return bytes;
 }
 
-const RefusalCase refusalCases[] = {
-    {"file", "The file is empty", [] { return Bytes{}; }},
-    {"file", "content is cut short", [] { return shortened(soundManifest(ec384)); }},
-    {"file", "has neither a signature nor a chain", [] { return unsignedManifest({}); }},
-    {"file", "is a bare payload", [] { return payload({}); }},
-    {"file", "The container has no manifest", [] { return container(payload({}), {}, {}); }},
+std::vector<RefusalCase> refusalCases() {
+    Certificate unusedBits = signerOf(ec384).leaf({});
+    unusedBits.unusedBits = 1;
+    return {
+        {"file", "The file is empty", Bytes{}},
+        {"file", "content is cut short", shortened(soundManifest(ec384))},
+        {"file", "has neither a signature nor a chain", unsignedManifest({})},
+        {"file", "is a bare payload", payload({})},
+        {"file", "The container has no manifest", container(payload({}), {}, {})},
 
-    {"chain", "The chain has 1 certificate, the root included, and the profile demands 2",
-     [] { return withChain(ec384, {}); }, ec384},
-    {"chain", "The chain has 3 certificates, the root included, and the profile demands 2",
-     [] { return withChain(ec384, twice(signerOf(ec384).standardChain())); }},
-    {"chain", "Certificate 1 is no certificate", [] { return withChain(ec384, {sequence({integer(1)})}); }},
-    {"chain", "Certificate 1 is no strict DER: the length is indefinite",
-     [] {
-         return withChain(ec384, {{0x30, 0x80}});
-     }},
-    {"chain", "Certificate 1 is longer than 131071 octets",
-     [] { return withChain(ec384, {sequence({octets(filler(131071))})}); }},
-    {"chain",
-     "Certificate 1 (\"CN=Tevari Manifest Signing,O=Tevari\") has the key EC P-256, and the profile demands EC on "
-     "P-384",
-     [] { return soundManifest(ec256); }, ec384},
-    {"chain",
-     "names the issuer \"CN=Tevari RSA 4096 Root CA,O=Tevari\", and the one before it is \"CN=Tevari RSA 3072 Root "
-     "CA,O=Tevari\"",
-     [] { return soundManifest(rsa4k); }, rsa3k},
-    {"chain",
-     "Certificate 2 (\"CN=Manifest Signing of a Test\") names the issuer \"CN=Nobody\", and the one before it is \"CN=",
-     [] { return withLeaf(localPolicy, [](Certificate& leaf) { leaf.issuer = distinguishedName("Nobody"); }); }},
-    {"chain",
-     "No known root has signed this chain: its first certificate (\"CN=Manifest Signing of a Test\") names the issuer "
-     "\"CN=Nobody\"",
-     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.issuer = distinguishedName("Nobody"); }); }},
-    {"signature",
-     "does not verify under the key of the leaf (\"CN=Manifest Signing of a Test\"): the key is no "
-     "uncompressed point of its curve",
-     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.publicKeyInfo.back() ^= 1; }); }},
-    {"signature", ": the key has an unsound exponent", // 65536
-     [] { return withLeaf(rsa3k, [](Certificate& leaf) { leaf.publicKeyInfo.back() ^= 1; }); }},
-    {"chain", "is signed with ecdsa-with-SHA256, and the profile demands ecdsa-with-SHA384",
-     [] {
-         return withLeaf(ec384, [](Certificate& leaf) { leaf.signatureAlgorithm = algorithm(oid(oidSha256Ecdsa)); });
-     }},
-    {"chain", "is signed with sha384WithRSAEncryption and parameters, which it must not have",
-     [] {
-         return withLeaf(rsa3k,
-                         [](Certificate& leaf) { leaf.signatureAlgorithm = algorithm(oid(oidSha384Rsa), integer(1)); });
-     }},
-    {"chain",
-     "The signature on certificate 1 (\"CN=Uevari Manifest Signing,O=Tevari\") does not verify under the key of the "
-     "root (\"CN=Tevari Local P-384 Root CA,O=Tevari\"): the certificate was changed",
-     [] { return changedAt(soundManifest(ec384), "Tevari Manifest Signing"); }},
-    {"chain", "is no BIT STRING of whole octets",
-     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.unusedBits = 1; }); }},
-    {"chain",
-     "does not carry the common name of the secure-boot authority, \"Tevari Secure Boot Certification Authority\"",
-     withoutAuthority},
-    {"chain", "has a malformed or empty list of extensions",
-     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.extensions = extensions({}); }); }},
+        {"chain", "The chain has 1 certificate, the root included, and the profile demands 2", withChain(ec384, {}),
+         ec384},
+        {"chain", "The chain has 3 certificates, the root included, and the profile demands 2",
+         withChain(ec384, twice(signerOf(ec384).standardChain()))},
+        {"chain", "Certificate 1 is no certificate", withChain(ec384, {sequence({integer(1)})})},
+        {"chain", "Certificate 1 is no strict DER: the length is indefinite", withChain(ec384, {{0x30, 0x80}})},
+        {"chain", "Certificate 1 is longer than 131071 octets", withChain(ec384, {sequence({octets(filler(131071))})})},
+        {"chain",
+         R"(Certificate 1 ("CN=Tevari Manifest Signing,O=Tevari") has the key EC P-256, and the profile demands )"
+         "EC on P-384",
+         soundManifest(ec256), ec384},
+        {"chain",
+         R"(names the issuer "CN=Tevari RSA 4096 Root CA,O=Tevari", and the one before it is "CN=Tevari RSA )"
+         R"(3072 Root CA,O=Tevari")",
+         soundManifest(rsa4k), rsa3k},
+        {"chain",
+         R"(Certificate 2 ("CN=Manifest Signing of a Test") names the issuer "CN=Nobody", and the one before it )"
+         R"(is "CN=)",
+         withLeaf(localPolicy, &Certificate::issuer, distinguishedName("Nobody"))},
+        {"chain",
+         R"(No known root has signed this chain: its first certificate ("CN=Manifest Signing of a Test") names )"
+         R"(the issuer "CN=Nobody")",
+         withLeaf(ec384, &Certificate::issuer, distinguishedName("Nobody"))},
+        {"signature",
+         R"(does not verify under the key of the leaf ("CN=Manifest Signing of a Test"): the key is no )"
+         "uncompressed point of its curve",
+         withLeaf(ec384, &Certificate::publicKeyInfo, otherKey(ec384))},
+        {"signature", ": the key has an unsound exponent", // 65536
+         withLeaf(rsa3k, &Certificate::publicKeyInfo, otherKey(rsa3k))},
+        {"chain", "is signed with ecdsa-with-SHA256, and the profile demands ecdsa-with-SHA384",
+         withLeaf(ec384, &Certificate::signatureAlgorithm, algorithm(oid(oidSha256Ecdsa)))},
+        {"chain", "is signed with sha384WithRSAEncryption and parameters, which it must not have",
+         withLeaf(rsa3k, &Certificate::signatureAlgorithm, algorithm(oid(oidSha384Rsa), integer(1)))},
+        {"chain",
+         R"(The signature on certificate 1 ("CN=Uevari Manifest Signing,O=Tevari") does not verify under the )"
+         R"(key of the root ("CN=Tevari Local P-384 Root CA,O=Tevari"): the certificate was changed)",
+         changedAt(soundManifest(ec384), "Tevari Manifest Signing")},
+        {"chain", "is no BIT STRING of whole octets", signedBy(unusedBits)},
+        {"chain",
+         R"(does not carry the common name of the secure-boot authority, "Tevari Secure Boot Certification Authority")",
+         withoutAuthority()},
+        {"chain", "has a malformed or empty list of extensions",
+         withLeaf(ec384, &Certificate::extensions, extensions({}))},
 
-    {"signature",
-     "does not verify under the key of the leaf (\"CN=Tevari Manifest Signing,O=Tevari\"): the manifest's body was "
-     "changed",
-     [] { return changedAt(soundManifest(ec384), "text"); }},
-    {"signature", "(\"CN=Tevari Manifest Signing,O=Tevari\"): it has 511 octets, and those of the key have 512",
-     [] { return withSignature(rsa4k, filler(511)); }},
+        {"signature",
+         R"(does not verify under the key of the leaf ("CN=Tevari Manifest Signing,O=Tevari"): the manifest's )"
+         "body was changed",
+         changedAt(soundManifest(ec384), "text")},
+        {"signature", R"(("CN=Tevari Manifest Signing,O=Tevari"): it has 511 octets, and those of the key have 512)",
+         withSignature(rsa4k, filler(511))},
 
-    {"dictionaries", "The manifest's body has no \"MANB\"", [] { return withBody(set({object("MANX", {})})); }},
-    {"dictionaries", "\"MANB\" of the manifest's body is SET instead of SEQUENCE",
-     [] { return withBody(manifestBody(standardManifest()), 2); }},
-    {"dictionaries", "\"MANB\" has no \"MANP\"", [] { return withBody(set({object("MANB", {})})); }},
+        {"dictionaries", R"(The manifest's body has no "MANB")", withBody(set({object("MANX", {})}))},
+        {"dictionaries", R"("MANB" of the manifest's body is SET instead of SEQUENCE)",
+         withBody(manifestBody(standardManifest()), 2)},
+        {"dictionaries", R"("MANB" has no "MANP")", withBody(set({object("MANB", {})}))},
 
-    {"object", "The manifest has no \"xyzt\"", [] { return soundManifest(ec384); }, nullptr, "xyzt"},
-    {"object", "\"sepi\" of the manifest is INTEGER instead of SET",
-     [] { return withObject(property("sepi", integer(1))); }, nullptr, "sepi"},
-    {"object", "private \"sepi\" of the manifest is named \"boot\" inside",
-     [] {
-         return withObject(item(propertyTag("sepi"), sequence({ia5("boot"), set({})})));
-     },
-     nullptr, "sepi"},
+        {"object", R"(The manifest has no "xyzt")", soundManifest(ec384), nullptr, "xyzt"},
+        {"object", R"("sepi" of the manifest is INTEGER instead of SET)", withObject(property("sepi", integer(1))),
+         nullptr, "sepi"},
+        {"object", R"(private "sepi" of the manifest is named "boot" inside)",
+         withObject(item(propertyTag("sepi"), sequence({ia5("boot"), set({})}))), nullptr, "sepi"},
 
-    {"constraints", "The leaf certificate carries no constraints",
-     [] { return withLeaf(ec384, [](Certificate& leaf) { leaf.extensions = {}; }); }},
-    {"constraints", "says that \"ABCD\" of the manifest must be INTEGER 8, and it is INTEGER 7",
-     [] { return constrained({object("MANP", {property("ABCD", integer(8))})}); }},
-    {"constraints", "says that \"ABCD\" of the manifest must be BOOLEAN true, and it is INTEGER 7",
-     [] { return constrained({object("MANP", {property("ABCD", boolean(true))})}); }},
-    {"constraints", "says that \"NONE\" of the manifest must be OCTET STRING 1 byte: 07, and there is none",
-     [] { return constrained({object("MANP", {property("NONE", octets({7}))})}); }},
-    {"constraints", "says that \"NONE\" of the object must be there, and there is none",
-     [] { return constrained({object("OBJP", {mustBePresent("NONE")})}); }, nullptr, "sepi"},
-    {"constraints", "says that \"ABCD\" of the manifest must not be there, and it is INTEGER 7",
-     [] {
-         return constrained({object("MANP", {mustBePresent("TEXT"), mustBeAbsent("ABCD")})});
-     }},
-    {"constraints", "private \"ABCD\" is IA5String, which is no kind of constraint",
-     [] { return constrained({object("MANP", {property("ABCD", ia5("text"))})}); }},
-    {"constraints", "private \"NEWP\" is no dictionary of constraints",
-     [] { return constrained({object("NEWP", {})}); }},
-    {"constraints", "private \"MANP\" is INTEGER instead of SET",
-     [] { return constrained({property("MANP", integer(1))}); }},
-    {"constraints", "private \"MANP\" is named \"OBJP\" inside",
-     [] {
-         return constrained({item(propertyTag("MANP"), sequence({ia5("OBJP"), set({})}))});
-     }},
+        {"constraints", "The leaf certificate carries no constraints", withLeaf(ec384, &Certificate::extensions, {})},
+        {"constraints", R"(says that "ABCD" of the manifest must be INTEGER 8, and it is INTEGER 7)",
+         constrained({object("MANP", {property("ABCD", integer(8))})})},
+        {"constraints", R"(says that "ABCD" of the manifest must be BOOLEAN true, and it is INTEGER 7)",
+         constrained({object("MANP", {property("ABCD", boolean(true))})})},
+        {"constraints", R"(says that "NONE" of the manifest must be OCTET STRING 1 byte: 07, and there is none)",
+         constrained({object("MANP", {property("NONE", octets({7}))})})},
+        {"constraints", R"(says that "NONE" of the object must be there, and there is none)",
+         constrained({object("OBJP", {mustBePresent("NONE")})}), nullptr, "sepi"},
+        {"constraints", R"(says that "ABCD" of the manifest must not be there, and it is INTEGER 7)",
+         constrained({object("MANP", {mustBePresent("TEXT"), mustBeAbsent("ABCD")})})},
+        {"constraints", R"(private "ABCD" is IA5String, which is no kind of constraint)",
+         constrained({object("MANP", {property("ABCD", ia5("text"))})})},
+        {"constraints", R"(private "NEWP" is no dictionary of constraints)", constrained({object("NEWP", {})})},
+        {"constraints", R"(private "MANP" is INTEGER instead of SET)", constrained({property("MANP", integer(1))})},
+        {"constraints", R"(private "MANP" is named "OBJP" inside)",
+         constrained({item(propertyTag("MANP"), sequence({ia5("OBJP"), set({})}))})},
 
-    {"properties", "private \"LIST\" of the manifest is SEQUENCE, and only BOOLEAN,",
-     [] { return withProperty(property("LIST", sequence({}))); }},
-    {"properties", "INTEGER of the manifest is no property", [] { return withProperty(integer(1)); }},
-    {"properties", "private \"LONG\" of the object goes on behind its value",
-     [] {
-         return withObject(
-             object("sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))}));
-     },
-     nullptr, "sepi"},
-};
+        {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
+         withProperty(property("LIST", sequence({})))},
+        {"properties", "INTEGER of the manifest is no property", withProperty(integer(1))},
+        {"properties", R"(private "LONG" of the object goes on behind its value)",
+         withObject(object("sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))})),
+         nullptr, "sepi"},
+    };
+}
 
 TEST(VerifyImg4, saysWhyItRefusesAndWhere) {
-    for (const RefusalCase& row : refusalCases) {
-        const Bytes bytes = row.make();
-        const Report report =
-            verify(bytes, testDomain(row.profile != nullptr ? std::optional<std::string>(row.profile) : std::nullopt),
-                   row.object);
+    for (const RefusalCase& row : refusalCases()) {
+        const Report report = verify(
+            row.bytes, testDomain(row.profile != nullptr ? std::optional<std::string>(row.profile) : std::nullopt),
+            row.object);
         EXPECT_FALSE(report.ok) << row.problem;
         EXPECT_NE(report.problem.find(row.problem), std::string::npos) << row.problem << "\n" << report.problem;
         EXPECT_EQ(report.json["failedStep"], row.step) << row.problem;
-        EXPECT_LE(report.json["problemOffset"], bytes.size()) << row.problem;
+        EXPECT_LE(report.json["problemOffset"], row.bytes.size()) << row.problem;
         EXPECT_EQ(report.json["trusted"], false);
         EXPECT_NE(report.text.find("\nResult: not trusted\n"), std::string::npos);
     }
