@@ -271,7 +271,7 @@ class PutTcrt(TopModuleTest):
             self.assert_refused(
                 ["Display Auth not completed within 10 secs. Timeout has occurred", "Top Module Auth Passsed : 0"]
             )
-            self.assertTrue(10 <= time.monotonic() - start < 15)
+            self.assertGreaterEqual(time.monotonic() - start, 10)
         # The late answer comes while this request waits for its own, which is not taken for it.
         self.describe("M3", componentAuth={"mode": "fail", "delayMs": 2000})
         self.assert_refused(["Starting Top Module Auth : M3", "Top Module Auth Passsed : 0"])
