@@ -238,6 +238,7 @@ struct MiddleCase {
     bool signedByRoot = true;
     Img4ChainFault ofRSA;
     Img4ChainFault ofEC;
+    std::uint8_t keyChange = 0; // of the last octet of its key, whose fault then shows at the leaf
 };
 
 constexpr const char* authority = "Tevari Secure Boot Certification Authority";
@@ -246,6 +247,8 @@ const Bytes emptyName = sequence({});
 const MiddleCase middleCases[] = {
     {"authority", distinguishedName(authority), true, Img4ChainSound, Img4ChainSound},
     {"authority that signs itself", distinguishedName(authority), false, Img4ChainSignature, Img4ChainSignature},
+    // The point leaves its curve; the exponent becomes even.
+    {"unsound key", distinguishedName(authority), true, Img4ChainSignature, Img4ChainSignature, 0x01},
     {"name that differs in a character", distinguishedName("Tevari Secure Boot Certification authority"), true,
      Img4ChainAuthority, Img4ChainSound},
     {"name with a character more", distinguishedName(std::string(authority) + " "), true, Img4ChainAuthority,
@@ -268,6 +271,7 @@ TEST(Img4Chain, middleCertificateOfTheRSAChainBelongsToTheAuthority) {
             middle.issuer = subjectOf(root);
             middle.subject = row.subject;
             middle.publicKeyInfo = publicKeyInfo(signer.issuerKey());
+            middle.publicKeyInfo.back() ^= row.keyChange;
             Certificate leaf = signer.leaf();
             leaf.issuer = row.subject;
             const Verdict verdict =
@@ -275,7 +279,7 @@ TEST(Img4Chain, middleCertificateOfTheRSAChainBelongsToTheAuthority) {
                                     signer.issue(leaf)}));
             const Img4ChainFault fault = isEC(entry) ? row.ofEC : row.ofRSA;
             EXPECT_EQ(verdict.refusal.fault, fault);
-            EXPECT_EQ(verdict.refusal.certificate, fault == Img4ChainSound ? 2U : 1U);
+            EXPECT_EQ(verdict.refusal.certificate, fault == Img4ChainSound || row.keyChange != 0 ? 2U : 1U);
             EXPECT_EQ(verdict.status, fault == Img4ChainSound ? DERSuccess : Img4Failure);
         }
     }

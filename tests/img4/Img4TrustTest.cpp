@@ -596,6 +596,25 @@ TEST(Img4TrustBySHA1, runsThePartsInOrderAndStopsAtTheFirstThatFails) {
     }
 }
 
+TEST(Img4TrustBySHA1, endsWhereTheDictionariesOrTheObjectAreMissing) {
+    const Img4TrustProfileEntry& entry = entryOf(kImg4DecodeSecureBootRsa1kSha1);
+    const Signer& signer = signerOf(entry);
+    const Bytes body = set({object("MANX", {})});
+    const Bytes signature = octets(sign(signer.leafKey(), Img4HashLength, body));
+    const Bytes withoutDictionaries =
+        sequence({ia5("IM4M"), integer(0), body, signature, sequence(signer.standardChain())});
+    for (const auto& [manifest, code] :
+         {std::pair(withoutDictionaries, objectCode), {soundManifest(entry), fourCC("none")}}) {
+        Decoded decoded(manifest);
+        Judge context;
+        EXPECT_EQ(Img4DecodeEvaluateTrust(code, &decoded.record, judge, &context), DEREndOfSequence);
+        EXPECT_NE(decoded.record.manifest.certProperties.data, nullptr) << "the signature was verified before";
+        EXPECT_EQ(decoded.record.objp.data, nullptr);
+        EXPECT_EQ(decoded.record.payloadHashed, 0);
+        EXPECT_TRUE(context.seen.empty());
+    }
+}
+
 TEST(Img4TrustBySHA1, needsItsArguments) {
     Decoded decoded(soundManifest(entryOf(kImg4DecodeSecureBootRsa1kSha1)));
     Img4Record none = {};
