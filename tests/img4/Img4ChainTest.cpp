@@ -37,11 +37,6 @@ Verdict verify(const Img4TrustProfileEntry& entry, const Bytes& chain) {
     return verdict;
 }
 
-Bytes changed(Bytes bytes, std::size_t place, std::uint8_t mask = 0x01) {
-    bytes.at(place) ^= mask;
-    return bytes;
-}
-
 const Bytes sha512Rsa = {0x2A, 0x86, 0x48, 0x86, 0xF7, 0x0D, 0x01, 0x01, 0x0D};
 const Bytes sha512Ecdsa = {0x2A, 0x86, 0x48, 0xCE, 0x3D, 0x04, 0x03, 0x04};
 const Bytes otherOid = item(DERTagObjectIdentifier, {0x88, 0x37, 0x05});
@@ -72,7 +67,7 @@ std::vector<LeafCase> leafCases(const Signer& signer, bool isEC) {
     const Bytes none = constraints(set({}));
     const Certificate sound = signer.leaf();
     const Bytes otherExtension = sequence({otherOid, boolean(true), octets({})});
-    const Bytes otherIssuer = changed(sound.issuer, sound.issuer.size() - 1);
+    const Bytes otherIssuer = lastChanged(sound.issuer);
     const Bytes ofSha512Rsa = algorithm(item(DERTagObjectIdentifier, sha512Rsa), null);
     const Bytes ofSha512Ecdsa = algorithm(item(DERTagObjectIdentifier, sha512Ecdsa));
     const Bytes bits = publicKeyBits(signer.leafKey());
@@ -212,7 +207,7 @@ std::vector<ChainCase> chainCases(const Signer& s) {
         {"leaf that is no certificate", Img4ChainEncoding, 1, with(sequence({integer(1), null}))},
         {"leaf signed with its own key", Img4ChainSignature, 1, with(s.issue(s.leaf(), s.leafKey()))},
         {"octet of the to-be-signed part changed", Img4ChainSignature, 1, with(renamed)},
-        {"octet of the signature changed", Img4ChainSignature, 1, with(changed(leaf, leaf.size() - 1))},
+        {"octet of the signature changed", Img4ChainSignature, 1, with(lastChanged(leaf))},
         {"unused bits in the signature", Img4ChainSignature, 1, with(unusedBitsIn(s))},
         {"largest certificate", Img4ChainSound, 1, with(leafOfSize(s, largestCertificate))},
         {"too large a certificate", Img4ChainCertificateSize, 1, with(leafOfSize(s, largestCertificate + 1))},
@@ -270,8 +265,7 @@ TEST(Img4Chain, middleCertificateOfTheRSAChainBelongsToTheAuthority) {
             Certificate middle = signer.leaf();
             middle.issuer = subjectOf(root);
             middle.subject = row.subject;
-            middle.publicKeyInfo = publicKeyInfo(signer.issuerKey());
-            middle.publicKeyInfo.back() ^= row.keyChange;
+            middle.publicKeyInfo = lastChanged(publicKeyInfo(signer.issuerKey()), row.keyChange);
             Certificate leaf = signer.leaf();
             leaf.issuer = row.subject;
             const Verdict verdict =

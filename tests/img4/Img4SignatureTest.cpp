@@ -124,10 +124,6 @@ std::vector<BlockCase> blockCases(const Bytes& digest, const Bytes& oid) {
     const Bytes algorithm = sequence({oid, null});
     const Bytes sound = sequence({algorithm, octets(digest)});
     const auto with = [](const Bytes& digestInfo) { return Block{.digestInfo = digestInfo}; };
-    const auto changed = [](Bytes octets, std::uint8_t bits) {
-        octets.back() ^= bits;
-        return octets;
-    };
     const Bytes longDigest = join({Bytes{0x04, 0x81, static_cast<std::uint8_t>(digest.size())}, digest});
     return {
         {"sound", with(sound), true},
@@ -140,12 +136,12 @@ std::vector<BlockCase> blockCases(const Bytes& digest, const Bytes& oid) {
         {"indefinite length", with(join({Bytes{0x30, 0x80}, algorithm, octets(digest), Bytes{0x00, 0x00}}))},
         {"octets behind the digest", with(sequence({algorithm, octets(digest), null}))},
         {"octets behind the algorithm's NULL", with(sequence({sequence({oid, null, null}), octets(digest)}))},
-        {"other digest algorithm", with(sequence({sequence({changed(oid, 0x03), null}), octets(digest)}))},
+        {"other digest algorithm", with(sequence({sequence({lastChanged(oid, 0x03), null}), octets(digest)}))},
         {"digest in a BIT STRING", with(sequence({algorithm, item(DERTagBitString, digest)}))},
         {"DigestInfo in a SET", with(set({algorithm, octets(digest)}))},
         {"digest that lacks an octet", with(sequence({algorithm, octets(Bytes(digest.begin(), digest.end() - 1))}))},
         {"digest alone", with(digest)},
-        {"other digest", with(sequence({algorithm, octets(changed(digest, 1))}))},
+        {"other digest", with(sequence({algorithm, octets(lastChanged(digest))}))},
         {"nothing", with({})},
         {"octets behind the DigestInfo", {.digestInfo = sound, .rest = {0x00}}},
         {"short padding and octets behind", {.paddingLength = 8, .digestInfo = sound}},
@@ -443,10 +439,8 @@ std::vector<std::pair<const char*, Bytes>> refusedPoints(const Key& key) {
     const Bytes negatedY = octetsOf(number(difference(p.get(), y)).get(), half);
     const std::uint8_t parity = y.back() & 1;
     const bool isP256 = half == 32;
-    Bytes offCurve = point;
-    offCurve.back() ^= 1;
     return {
-        {"not on the curve", offCurve},
+        {"not on the curve", lastChanged(point)},
         {"hybrid", withForm(point, 0x06 | parity)},
         {"compressed", join({Bytes{static_cast<std::uint8_t>(0x02 | parity)}, x})},
         {"form of a compressed point", withForm(point, 0x02)},

@@ -33,4 +33,10 @@ inline DERItem viewOf(const img4maker::Bytes& bytes) {
     return {bytes.data(), bytes.size()};
 }
 
+// `bytes` with bits of the last octet changed.
+inline img4maker::Bytes lastChanged(img4maker::Bytes bytes, std::uint8_t bits = 0x01) {
+    bytes.at(bytes.size() - 1) ^= bits;
+    return bytes;
+}
+
 #endif
