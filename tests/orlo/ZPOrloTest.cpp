@@ -241,7 +241,7 @@ TEST_F(ZPOrloTest, aPutThatIsRefusedDoesNotPassOnTheLibrarysError) {
 TEST_F(ZPOrloTest, aGetReplacesTheBufferOrLeavesItAndPassesOnTheLibrarysError) {
     const struct {
         std::optional<Value::Data> record;
-        std::optional<Error> libraryError;
+        std::optional<Error> fromLibrary;
         std::optional<Error> error;
         std::string line;
     } rows[] = {
@@ -256,7 +256,7 @@ TEST_F(ZPOrloTest, aGetReplacesTheBufferOrLeavesItAndPassesOnTheLibrarysError) {
     for (const auto& row : rows) {
         SCOPED_TRACE(row.line);
         store_.record = row.record;
-        store_.getError = row.libraryError;
+        store_.getError = row.fromLibrary;
         ZPOrlo orlo = ZPOrlo::init();
         recordLog();
         Value::Data data = {'o', 'l', 'd'};

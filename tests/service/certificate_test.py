@@ -169,21 +169,6 @@ class GetTcrt(TopModuleTest):
         status, answer = self.service.orloctl("get-tcrt", "-o", self.service.root)
         self.assertEqual((status, answer["response"]["statusCode"]), (2, 0), answer)
 
-    def test_log_and_console_tell_every_step(self):
-        self.describe("M4", AUTHENTICATOR)
-        lines = self.service.messages_of(self.get)[4:]
-        self.assertRegex(lines[0], r"^-\[ZPOrloServices handleMessage:completion:\]:\d+ - Received getTCRT$")
-        self.assertEqual(
-            lines[1:],
-            ["cannot get service", "Serial Number : <009a3c5e71d2046b88>", "Hex Serial Number : 009a3c5e71d2046b88"],
-        )
-        get, service = "-[ZPDevice getTcrtCertificate:] - ", "-[ZPDevice getService:service:] - Entering for service "
-        self.assertEqual(
-            self.service.console_of(self.get),
-            [get + "Entering", service + RELAY, service + AUTHENTICATOR, get + "IO Service Found ",
-             get + "tcrt Found in IOReg"],
-        )
-
     def test_a_registry_without_it_is_a_failure_that_says_what_is_missing(self):
         for holder, act, description in (
             (None, lambda: None, "cannot get service"),

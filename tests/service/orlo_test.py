@@ -193,29 +193,6 @@ class Export(OrloTest):
         self.assertEqual(self.answer("export", "ycrt", "AlsH"), SUCCESS)
         self.assertEqual(self.exported(), [{"ycrt": "(null)-U", "AlsH": "CVG0001-(null)"}])
 
-    def test_the_response_line_ends_a_host_list_twice(self):
-        response = "Orlo Services Plugin - Response : (null)"
-        lines = self.service.messages_of(lambda: self.answer("export"))
-        self.assertEqual(lines[-2:], ["Successfully exported Orlo Data", response])
-        lines = self.service.messages_of(lambda: self.answer("export", "CtCl"))
-        self.assertEqual(lines[-3:], ["Successfully exported Orlo Data", response, response])
-        self.assertIn('Export Dict : {"CtCl": "CVG0001"}', lines)
-        lines = self.service.messages_of(lambda: self.answer("export", "xxxx"))
-        reason = "Orlo Export Failed due to - Key doesn't exist - xxxx"
-        self.assertEqual(lines[-3:], ["Export Dict : (null)", reason, response])
-        self.describe()
-        lines = self.service.messages_of(lambda: self.answer("export"))
-        self.assertEqual(lines[-2:], ["Export Dict : (null)", "Key doesn't exist or Error reading IDs"])
-
-    def test_a_device_without_ticket_is_told_so(self):
-        os.remove(self.root / TICKET)
-        error = {
-            "domain": "OrloExport", "code": 2006,
-            "description": "ZephyrineExport Upload Failed due to - Orlo Object Create Error",
-        }
-        lines = self.service.messages_of(lambda: self.assertEqual(self.answer("export"), (-1, None, error)))
-        self.assertEqual(lines[-2], f"Could not read AP ticket: /{TICKET}")
-
 
 class Store(OrloTest):
     def mount(self, path, size):
