@@ -135,6 +135,9 @@ class GetTcrt(TopModuleTest):
             for prefix in PREFIXES:
                 self.describe(f"x{prefix}y", holder)
                 self.assertEqual(self.get(), expected)
+        console = self.service.console_of(self.get)
+        self.assertEqual(console[0], "-[ZPDevice getTcrtCertificate:] - Entering")
+        self.assertEqual(console[-1], "-[ZPDevice getTcrtCertificate:] - tcrt Found in IOReg")
         for model in ("M1", "M2", "m3", "M 3", "", None):
             self.describe(model)
             console = self.service.console_of(lambda: self.assertEqual(self.call("get-tcrt"), (1, None, None)))
