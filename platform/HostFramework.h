@@ -73,7 +73,7 @@ public:
 
 protected:
     // Registers the server with the host under `serviceName`. False, after a line on standard error, when there is no
-    // host to reach or the name is taken.
+    // device root, no host to reach, or the name is taken.
     bool initWithServiceName(std::string_view serviceName);
 
 private:

@@ -1,10 +1,39 @@
+#include <cstdio>
 #include <cstdlib>
+#include <string_view>
 
 #include "Daemon/HSLog.h"
 #include "platform/SystemLog.h"
 #include "plugin/ZPOrloServices.h"
 
-int main() {
+namespace {
+
+constexpr const char* help = R"(Usage: VeltraOrloServices [--help | --version]
+
+Serves the requests of the host on D-Bus until SIGTERM or SIGINT ends it. orloctl sends requests.
+
+Environment:
+  VELTRA_BUS          the bus: "system" (the default), "session" or a D-Bus address
+  VELTRA_DEVICE_ROOT  the folder below which every path of the device lies (default /)
+
+VeltraOrloServices(8) says more.)";
+
+// Answers a start with arguments, which serves no request.
+int answer(std::string_view argument, bool isOnlyOne) {
+    if (isOnlyOne && argument == "--help")
+        return std::puts(help) < 0;
+    if (isOnlyOne && argument == "--version")
+        return std::puts(("VeltraOrloServices " + pluginVersion()).c_str()) < 0;
+    consoleLog("VeltraOrloServices takes no arguments but --help or --version");
+    return 2;
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+    if (argc > 1)
+        return answer(argv[1], argc == 2);
+
     constexpr const char* serviceName = "com.tevari.VeltraOrloServices";
     constexpr LogSource mainLog{"main"};
 

@@ -1,7 +1,6 @@
 """The service as its host sees it: requests, refusals, the configuration blob, and what it survives."""
 import json
 import os
-import re
 import signal
 import subprocess
 import unittest
@@ -250,15 +249,25 @@ class Survival(ServiceTest):
         self.assertTrue(self.service.log()[-1].endswith("Writting new data to file"), self.service.log()[-1])
         self.assertEqual(self.service.orloctl("call", "x")[0], 3)
 
-    def test_a_second_service_and_one_without_bus_say_so_and_end_with_1(self):
-        program = BIN / "VeltraOrloServices"
-        second = self.service.run(program, stderr=subprocess.PIPE)
-        self.assertEqual(second.returncode, 1)
-        self.assertRegex(second.stderr, re.escape(NAME) + ": cannot own this name .* another process owns it already")
-        environment = {**self.service.environment, "VELTRA_BUS": "unix:path=/nonexistent"}
-        lost = subprocess.run([program], env=environment, stderr=subprocess.PIPE, text=True)
-        self.assertEqual(lost.returncode, 1)
-        self.assertIn('cannot reach the bus "unix:path=/nonexistent"', lost.stderr)
+    def test_a_start_that_cannot_serve_says_why_and_has_its_exit_status(self):
+        for status, says, arguments, environment in (
+            (1, f"{NAME}: cannot own this name .* another process owns it already", [], {}),
+            (1, 'cannot reach the bus "unix:path=/nonexistent"', [], {"VELTRA_BUS": "unix:path=/nonexistent"}),
+            (1, 'device root "/nonexistent": No such', [], {"VELTRA_DEVICE_ROOT": "/nonexistent"}),
+            (1, 'device root "/dev/null": Not a directory', [], {"VELTRA_DEVICE_ROOT": "/dev/null"}),
+            (2, "takes no arguments but", ["--halp"], {}),
+            (2, "takes no arguments but", ["--version", "--help"], {}),
+            (0, "^VeltraOrloServices 1\\.0\\.0\\.1$", ["--version"], {}),
+            (0, "^Usage: VeltraOrloServices ", ["--help"], {}),
+        ):
+            with self.subTest(says, arguments=arguments):
+                before = len(self.service.log())
+                done = subprocess.run([BIN / "VeltraOrloServices", *arguments], text=True, stdout=subprocess.PIPE,
+                                      stderr=subprocess.PIPE, env={**self.service.environment, **environment})
+                self.assertEqual(done.returncode, status)
+                self.assertRegex(done.stdout if status == 0 else done.stderr, says)
+                if arguments:
+                    self.assertEqual(len(self.service.log()), before)
 
 
 class Client(ServiceTest):

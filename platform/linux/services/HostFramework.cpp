@@ -12,6 +12,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
+#include <cstring>
 #include <exception>
 #include <memory>
 #include <new>
@@ -23,6 +24,7 @@
 
 #include "platform/SystemLog.h"
 #include "platform/linux/services/BusValue.h"
+#include "platform/linux/system/DeviceRoot.h"
 
 namespace {
 
@@ -165,6 +167,10 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     const std::string which = busInUse();
     connection_ = new Connection;
     (void)std::signal(SIGPIPE, SIG_IGN); // a reader of standard error that is gone must not end the service
+    if (!openDeviceRoot()) {
+        consoleLog(name + ": cannot open the device root \"" + deviceRootPath() + "\": " + std::strerror(errno));
+        return false;
+    }
     int result = bus::open(which, &connection_->bus);
     if (result >= 0)
         result = sd_bus_add_object_vtable(connection_->bus, nullptr, objectPath(name).c_str(), interfaceName, methods,

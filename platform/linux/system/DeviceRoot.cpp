@@ -36,12 +36,16 @@ std::string deviceRootPath() {
     return root && *root ? root : "/";
 }
 
+FileDescriptor openDeviceRoot() {
+    return FileDescriptor(::open(deviceRootPath().c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+}
+
 FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode, std::uint64_t resolve) {
     if (path.find('\0') != std::string_view::npos) {
         errno = EINVAL;
         return {};
     }
-    const FileDescriptor root(::open(deviceRootPath().c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const FileDescriptor root = openDeviceRoot();
     if (!root)
         return {};
     open_how how = {};

@@ -21,6 +21,9 @@
 // The device root as the environment names it.
 std::string deviceRootPath();
 
+// Opens the device root itself, for the *at system calls. None, with errno set, when it is missing or no directory.
+FileDescriptor openDeviceRoot();
+
 // Opens the device path `path` with the flags of open(2); O_CLOEXEC and O_NOCTTY are always added. `mode` is the mode
 // of a file that O_CREAT makes. `resolve` adds RESOLVE_ flags of openat2(2), such as RESOLVE_NO_SYMLINKS. A relative
 // path counts from the root. None, with errno set, on failure; an empty path is ENOENT and one that holds a NUL EINVAL.
