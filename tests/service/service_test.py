@@ -290,6 +290,23 @@ class Client(ServiceTest):
                 self.assertEqual((exit_status, answer["exitStatus"]), (status, status), answer)
                 self.assertEqual("problem" in answer, status != 0)
 
+    def test_output_that_is_lost_is_a_failure(self):
+        reader, closed_pipe = os.pipe()
+        os.close(reader)
+        full = os.open("/dev/full", os.O_WRONLY)
+        for words in (["check-entitlement"], ["show", "img4", self.service.root / "images/container.img4"], ["--help"]):
+            for form in ([], ["--json"]):
+                for output in (closed_pipe, full, None):
+                    with self.subTest(words=words, form=form, output=output):
+                        close = None if output else lambda: os.close(1)
+                        command = [str(word) for word in (BIN / "orloctl", *form, *words)]
+                        done = subprocess.run(command, env=self.service.environment, stdout=output, preexec_fn=close,
+                                              stderr=subprocess.PIPE, text=True)
+                        self.assertEqual(done.returncode, 2)
+                        self.assertIn("Cannot write to standard output", done.stderr)
+        os.close(closed_pipe)
+        os.close(full)
+
     def test_words_become_texts_json_values_and_file_contents(self):
         self.write("bytes", b"\x00\xff")
         words = ["t=a=b", 'j:={"d": {"$data": "0badcafe"}, "n": [1, true]}', f"f@={self.service.root}/bytes"]

@@ -1,5 +1,8 @@
 // orloctl: the host's side of the service, for people and scripts.
 #include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
 #include <exception>
 #include <functional>
 #include <iostream>
@@ -7,6 +10,8 @@
 #include <string>
 #include <string_view>
 #include <vector>
+
+#include <fcntl.h>
 
 #include <CLI/CLI.hpp>
 
@@ -32,8 +37,8 @@ constexpr const char* resultPath = "/tmp/new_bCfg";
 constexpr const char* exitStatuses = R"(Exit status:
   0  success
   1  the plug-in answered with a failure
-  2  wrong usage, a request that the service refuses, or a local file that
-     cannot be read or written
+  2  wrong usage, a request that the service refuses, or a local file or
+     output that cannot be read or written
   3  the service cannot be reached, or did not answer in time
   4  the plug-in does not know the command
   5  an offline reader met bad input, or a file is not trusted
@@ -368,8 +373,29 @@ private:
     std::function<int()> run_;
 };
 
+// A standard stream that is closed gets a file on which reading and writing fail: nothing that is opened later is then
+// taken for it.
+void occupyStandardStreams() {
+    for (int number = STDIN_FILENO; number <= STDERR_FILENO; ++number)
+        if (::fcntl(number, F_GETFD) == -1)
+            (void)::open("/dev/null", number == STDIN_FILENO ? O_WRONLY : O_RDONLY);
+}
+
+// A status that tells of success while what was printed is lost would deceive whoever reads it.
+int unlessOutputIsLost(int status) {
+    errno = 0;
+    std::cout.flush();
+    if (std::cout.good())
+        return status;
+    std::cerr << "orloctl: Cannot write to standard output: "
+              << (errno != 0 ? std::strerror(errno) : "it did not take all of it") << '\n';
+    return static_cast<int>(Outcome::Usage);
+}
+
 } // namespace
 
 int main(int argc, char** argv) {
-    return CommandLine().run(argc, argv);
+    occupyStandardStreams();
+    (void)std::signal(SIGPIPE, SIG_IGN); // a pipe that nobody reads is output that is lost, of which the status tells
+    return unlessOutputIsLost(CommandLine().run(argc, argv));
 }
