@@ -1,86 +1,60 @@
-#include <string_view>
+#include <string>
 #include <utility>
 
 #include "Daemon/HSLog.h"
 #include "device/ZPDevice.h"
 #include "orlo/OrloSession.h"
 #include "orlo/ZPOrloExport.h"
+#include "platform/DataClasses.h"
 
 namespace {
 
 constexpr LogSource zplog{"ZPOrloExport"};
 
-// One identity of a component, and the message for a device that has none.
-struct Identity {
+// How an identity is read.
+struct IdentityRow {
+    ComponentIdentity identity;
     Value (ZPDevice::*get)() const;
-    const char* missing;
-};
-
-constexpr Identity miravel{&ZPDevice::getMiravelSerialNumber, "Error Reading Miravel SN"};
-constexpr Identity coverGlass{&ZPDevice::getCoverGlassSerialNumber, "Error Reading Cover Glass SN"};
-constexpr Identity ambientLight{&ZPDevice::getAmbientLightSensorSerialNumber, "Error Reading Ambient Light SN"};
-constexpr Identity backGlass{&ZPDevice::getBackglassCompassSerialNumber, "Error Reading Back Glass SN"};
-constexpr Identity vanter{&ZPDevice::getVanterSerialNumber, "Error Reading Vanter SN"};
-constexpr Identity vanterChip{&ZPDevice::getVanterChipId, "Error Reading Vanter Chip ID"};
-constexpr Identity vanterUID{&ZPDevice::getVanterUID, "Error Reading Vanter UID"};
-constexpr Identity loddenChip{&ZPDevice::getLoddenChipID, "Error Reading Lodden Chip ID"};
-constexpr Identity loddenUID{&ZPDevice::getLoddenUID, "Error Reading Lodden UID"};
-constexpr Identity proximity{&ZPDevice::getProxSerialNumber, "Error Reading Prox SN"};
-constexpr Identity frontCamera{&ZPDevice::getFCAMModuleSerialNumber, "Error Reading FCAMModule SN"};
-// These two are not checked: "(null)" stands in the place of a missing one.
-constexpr Identity topModuleChip{&ZPDevice::getTopModuleChipID, nullptr};
-constexpr Identity screen{&ZPDevice::getScreenSerialNumber, nullptr};
-constexpr Identity none{nullptr, nullptr};
-
-enum class IfMissing {
-    Stops,
-    GoesOn,
-};
-
-struct ClassRow {
-    std::string_view name;
-    Identity first;  // asked first
-    Identity second; // none when one identity is the instance
-    IfMissing ifMissing = IfMissing::Stops;
-    bool secondLeads = false;          // in the instance, the second identity stands before the first
+    const char* missing;               // the message for a device that has none; null: nobody checks
     const char* readingLine = nullptr; // logged with the class once the identity has been asked for
-    const char* notJoined = nullptr;   // the message when memory does not suffice to join them; null: the second's
 };
 
-constexpr ClassRow classes[] = {
-    {"pfcl", miravel, none},
-    {"HmCl", coverGlass, ambientLight},
-    {"IfCl", ambientLight, none},
-    {"CtCl", coverGlass, none},
-    {"GpC2", coverGlass, none},
-    {"tcrt", topModuleChip, screen, IfMissing::Stops, true, nullptr, "Error Reading gpCl SN"},
-    {"dCfg", coverGlass, none},
-    {"bCfg", backGlass, none},
-    {"ycrt", loddenChip, loddenUID, IfMissing::GoesOn},
-    {"AlsH", coverGlass, ambientLight, IfMissing::GoesOn},
-    {"PxTC", coverGlass, proximity},
-    {"pspc", vanterChip, vanterUID},
-    {"FCCl", frontCamera, none, IfMissing::Stops, false, "Reading FCAMModule SN for %@"},
+constexpr IdentityRow identities[] = {
+    {ComponentIdentity::MiravelSerialNumber, &ZPDevice::getMiravelSerialNumber, "Error Reading Miravel SN"},
+    {ComponentIdentity::CoverGlassSerialNumber, &ZPDevice::getCoverGlassSerialNumber, "Error Reading Cover Glass SN"},
+    {ComponentIdentity::AmbientLightSensorSerialNumber, &ZPDevice::getAmbientLightSensorSerialNumber,
+     "Error Reading Ambient Light SN"},
+    {ComponentIdentity::BackglassCompassSerialNumber, &ZPDevice::getBackglassCompassSerialNumber,
+     "Error Reading Back Glass SN"},
+    {ComponentIdentity::VanterSerialNumber, &ZPDevice::getVanterSerialNumber, "Error Reading Vanter SN",
+     "Reading Vanter SN for %@"},
+    {ComponentIdentity::VanterChipID, &ZPDevice::getVanterChipId, "Error Reading Vanter Chip ID"},
+    {ComponentIdentity::VanterUID, &ZPDevice::getVanterUID, "Error Reading Vanter UID"},
+    {ComponentIdentity::LoddenChipID, &ZPDevice::getLoddenChipID, "Error Reading Lodden Chip ID"},
+    {ComponentIdentity::LoddenUID, &ZPDevice::getLoddenUID, "Error Reading Lodden UID"},
+    {ComponentIdentity::ProximitySensorSerialNumber, &ZPDevice::getProxSerialNumber, "Error Reading Prox SN"},
+    {ComponentIdentity::FrontCameraModuleSerialNumber, &ZPDevice::getFCAMModuleSerialNumber,
+     "Error Reading FCAMModule SN", "Reading FCAMModule SN for %@"},
+    {ComponentIdentity::TopModuleChipID, &ZPDevice::getTopModuleChipID, nullptr},
+    {ComponentIdentity::ScreenSerialNumber, &ZPDevice::getScreenSerialNumber, nullptr},
 };
 
-constexpr std::string_view VanterSerialClasses[] = {
-    "pcic", "pcii", "pcvc", "pcvi", "pcve", "pbas", "pmpc", "pdcl",
-    "prf1", "prf2", "psd1", "psd2", "pwcl", "psnv", "psdt", "preg",
-};
-constexpr ClassRow vanterSerialClass{
-    "", vanter, none, IfMissing::Stops, false, "Reading Vanter SN for %@",
-};
+// The message when memory does not suffice to join two identities of which the second is not checked.
+constexpr const char* notJoined = "Error Reading gpCl SN";
 
-const ClassRow* rowOf(const Value& dataClass) {
-    const std::string* name = dataClass.text();
-    if (!name)
-        return nullptr;
-    for (const ClassRow& row : classes)
-        if (row.name == *name)
+// Null for none.
+const IdentityRow* rowOf(ComponentIdentity identity) {
+    for (const IdentityRow& row : identities)
+        if (row.identity == identity)
             return &row;
-    for (const std::string_view vanterSerial : VanterSerialClasses)
-        if (vanterSerial == *name)
-            return &vanterSerialClass;
+    return nullptr;
+}
+
+const DataClass* classNamed(const Value& name) {
+    const std::string* text = name.text();
+    for (const DataClass& dataClass : dataClasses)
+        if (text && *text == dataClass.name)
+            return &dataClass;
     return nullptr;
 }
 
@@ -90,35 +64,38 @@ void report(const char* message, Value* error) {
         *error = message;
 }
 
-Value joined(const ClassRow& row, const Value& first, const Value& second) {
-    const auto text = madeIfMemorySuffices(
-        [&] { return row.secondLeads ? format("%@-%@", second, first) : format("%@-%@", first, second); });
-    return text ? Value(*text) : Value();
+Value read(const IdentityRow* row) {
+    return row ? (ZPDevice::sharedSingleton().*row->get)() : Value();
+}
+
+// Whether the gathering ends here because the identity is missing, which is reported also when it goes on.
+bool stops(const DataClass& dataClass, const IdentityRow& row, const Value& identity, Value* error) {
+    if (!row.missing || !identity.isNothing())
+        return false;
+    report(row.missing, error);
+    return !dataClass.mayLackOne;
 }
 
 // The instance of one class, or nothing when the gathering stops here.
-Value readInstance(const ClassRow& row, const Value& dataClass, Value* error) {
-    const ZPDevice& device = ZPDevice::sharedSingleton();
-    const bool isComposite = row.second.get != nullptr;
-    Value first = (device.*row.first.get)();
-    const Value second = isComposite ? (device.*row.second.get)() : Value();
-    if (row.readingLine)
-        zplog.info(row.readingLine, dataClass);
+Value readInstance(const DataClass& dataClass, Value* error) {
+    const IdentityRow& first = *rowOf(dataClass.first);
+    const IdentityRow* const second = rowOf(dataClass.second);
+    Value trailing = dataClass.secondIsReadFirst ? read(second) : Value();
+    Value leading = read(&first);
+    if (!dataClass.secondIsReadFirst)
+        trailing = read(second);
+    if (first.readingLine)
+        zplog.info(first.readingLine, dataClass.name);
 
-    const std::pair<const Identity&, const Value&> parts[] = {{row.first, first}, {row.second, second}};
-    for (const auto& [identity, value] : parts) {
-        if (!identity.missing || !value.isNothing())
-            continue;
-        report(identity.missing, error);
-        if (row.ifMissing == IfMissing::Stops)
-            return {};
-    }
-    if (!isComposite)
-        return first;
-    Value instance = joined(row, first, second);
-    if (instance.isNothing())
-        report(row.notJoined ? row.notJoined : row.second.missing, error);
-    return instance;
+    if (stops(dataClass, first, leading, error) || (second && stops(dataClass, *second, trailing, error)))
+        return {};
+    if (!second)
+        return leading;
+    const auto text = madeIfMemorySuffices([&] { return format("%@-%@", leading, trailing); });
+    if (text)
+        return *text;
+    report(second->missing ? second->missing : notJoined, error);
+    return {};
 }
 
 } // namespace
@@ -126,14 +103,14 @@ Value readInstance(const ClassRow& row, const Value& dataClass, Value* error) {
 Value ZPOrloExport::getDataInstances(const Value::Array& exportList, Value* error) {
     Value::Dictionary instances;
     for (const Value& dataClass : exportList) {
-        const ClassRow* row = rowOf(dataClass);
-        if (!row) {
+        const DataClass* known = classNamed(dataClass);
+        if (!known) {
             zplog.error("Key %@ doesn't exist", dataClass);
             if (error)
                 *error = format("Key doesn't exist - %@", dataClass);
             return {};
         }
-        Value instance = readInstance(*row, dataClass, error);
+        Value instance = readInstance(*known, error);
         if (instance.isNothing())
             return {};
         instances.insert_or_assign(*dataClass.text(), std::move(instance));
