@@ -19,6 +19,7 @@
 #include "platform/Files.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
+#include "tools/orloctl/Completion.h"
 #include "tools/orloctl/CrashLogReport.h"
 #include "tools/orloctl/Json.h"
 #include "tools/orloctl/LocalFiles.h"
@@ -223,15 +224,19 @@ public:
     CommandLine() {
         app_.set_version_flag("--version", "orloctl " VELTRA_VERSION);
         app_.add_option("--bus", options_.address.bus, "\"system\", \"session\" or a D-Bus address")
+            ->type_name("BUS")
             ->envname("VELTRA_BUS")
             ->capture_default_str();
         app_.add_option("--timeout", options_.timeoutSeconds, "Seconds to wait for an answer")
-            ->check(CLI::Range(1LL, 1'000'000LL))
+            ->type_name("SECONDS")
+            ->check(CLI::Range(1LL, 1'000'000LL).description(""))
             ->capture_default_str();
         app_.add_flag("--json", options_.json, "Print exactly one JSON object");
         app_.require_subcommand(1);
         app_.fallthrough();
         app_.footer(exitStatuses);
+        for (const char* label : {"TEXT", "REQUIRED"}) // the names and brackets of the usage line say enough
+            app_.get_formatter()->label(label, "");
         addRequests();
         addRecords();
         addReaders();
@@ -239,6 +244,11 @@ public:
     }
 
     int run(int argc, char** argv) {
+        // For shells: the words after it are not the client's own.
+        if (argc > 1 && argv[1] == std::string_view("--complete")) {
+            printCompletions(app_, {argv + 2, argv + argc});
+            return 0;
+        }
         // A failure to parse the command line may come before the flag is read.
         options_.json = std::find(argv, argv + argc, std::string_view("--json")) != argv + argc;
         try {
@@ -258,7 +268,7 @@ private:
     void addRequests() {
         CLI::App* verb = app_.add_subcommand("call", "Send any request");
         verb->add_option("COMMAND", command_, "The command's name")->required();
-        verb->add_option("ARGUMENTS", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
+        verb->add_option("ARGUMENT", words_, "KEY=TEXT, KEY:=JSON ({\"$data\": \"hex\"} is data) or KEY@=FILE");
         verb->callback([this] { run_ = [this] { return call(options_, command_, words_); }; });
 
         addPairing("provision", "corvoSCProv", "Provision the secure face sensor with a pairing server");
@@ -270,21 +280,22 @@ private:
         verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
 
         verb = app_.add_subcommand("get-tcrt", "Read the top module's certificate and its serial number");
-        verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file");
+        verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file")->type_name("FILE");
         verb->callback([this] { run_ = [this] { return getTcrt(options_, copyPath_); }; });
 
         verb = app_.add_subcommand("put-tcrt", "Authenticate the display and store the top module's certificate");
         verb->callback([this] { run_ = [this] { return call(options_, "putTCRT", {}); }; });
 
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
-        verb->add_option("FILE", path_, "The blob, a path on the device")->required();
-        verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file");
+        verb->add_option("DEVICE-FILE", path_, "The blob, a path on the device")->required();
+        verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file")
+            ->type_name("FILE");
         verb->callback([this] { run_ = [this] { return setBcfg(options_, path_, copyPath_); }; });
     }
 
     void addRecords() {
         CLI::App* verb = app_.add_subcommand("export", "Export the identities of components to the Orlo store");
-        verb->add_option("CLASSES", words_, "Data classes, such as tcrt; the plug-in's own list without any");
+        verb->add_option("CLASS", words_, "Data classes, such as tcrt; the plug-in's own list without any");
         verb->callback([this] { run_ = [this] { return exportClasses(options_, words_); }; });
 
         addFileRequest("put-psd2", "Put the secure face sensor's record into the Orlo store",
@@ -297,7 +308,7 @@ private:
     void addFileRequest(const char* name, const char* says, const char* saysOfFile, const char* command,
                         const char* key) {
         CLI::App* verb = app_.add_subcommand(name, says);
-        verb->add_option("FILE", path_, saysOfFile)->required();
+        verb->add_option("DEVICE-FILE", path_, saysOfFile)->required();
         verb->callback([this, command, key] {
             run_ = [this, command, key] { return send(options_, command, {{key, path_}}); };
         });
@@ -311,7 +322,7 @@ private:
 
     void addReaders() {
         CLI::App* crashLogs = app_.add_subcommand("crash-logs", "List the device's crash and panic logs, offline");
-        crashLogs->add_option("-o,--output", copyPath_, "Copy them into this local directory");
+        crashLogs->add_option("-o,--output", copyPath_, "Copy them into this local directory")->type_name("DIRECTORY");
         crashLogs->callback(
             [this] { run_ = [this] { return show(options_, collectCrashLogs(copyPath_), Outcome::Usage); }; });
 
@@ -321,7 +332,8 @@ private:
 
         CLI::App* verb = readers->add_subcommand("bcfg", "Entries and HMAC state of a configuration blob");
         verb->add_option("FILE", path_, "A local file")->required();
-        verb->add_option("--hmac-key-file", keyPath_, "Check the HMACs with the key in this local file");
+        verb->add_option("--hmac-key-file", keyPath_, "Check the HMACs with the key in this local file")
+            ->type_name("FILE");
         verb->callback([this] {
             run_ = [this] {
                 const Value::Data key = keyPath_.empty() ? Value::Data{} : readLocalFile(keyPath_);
@@ -341,11 +353,14 @@ private:
             "img4", "Verify the chain, the signature and the constraints of a container or bare manifest");
         verb->add_option("FILE", path_, "A local file")->required();
         verb->add_option("--profile", verifyOptions_.profile,
-                         "The trust profile, such as kImg4DecodeSecureBootEc384Sha384; without it, the one that fits");
-        verb->add_option("--object", verifyOptions_.object, "Evaluate the object with this four-character code too");
+                         "The trust profile, such as kImg4DecodeSecureBootEc384Sha384; without it, the one that fits")
+            ->type_name("PROFILE");
+        verb->add_option("--object", verifyOptions_.object, "Evaluate the object with this four-character code too")
+            ->type_name("CODE");
         verb->add_option("--trust-dir", verifyOptions_.trustFolder,
                          "Take roots and names from this folder, which scripts/make-trust-domain has made, instead of "
-                         "those that are built in");
+                         "those that are built in")
+            ->type_name("DIRECTORY");
         verb->callback([this] { run_ = [this] { return verify(options_, path_, verifyOptions_); }; });
     }
 
