@@ -63,7 +63,8 @@ protected:
 
 TEST_F(ComponentAuth, theChipsSignatureIsVerifiedWithTheModulesCertificate) {
     for (const char* className : {"TeskAuthI2CRelayInterface", "TevariAuthCPAID"}) {
-        describe(R"({"mode": "key", "key": "/key"})", className);
+        describe(R"({"mode": "key", "key": {"$file": "/path", "as": "text"}})", className);
+        root_.write("/path", "/key\n");
         for (const KeyKind kind : {KeyKind::P256, KeyKind::RSA2048, KeyKind::Ed25519}) {
             const auto module = certificatemaker::module({0x01}, kind);
             root_.write("/key", module.key);

@@ -1,10 +1,14 @@
-#include "platform/linux/system/DeviceDescription.h"
+#include "platform/linux/services/DeviceDescription.h"
 
+#include <cstdlib>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include <gtest/gtest.h>
 
 #include "platform/linux/system/Json.h"
+#include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
 
 namespace {
@@ -52,25 +56,97 @@ TEST(DeviceDescription, isReadAtEveryCall) {
     }
 }
 
-TEST(DeviceDescription, withoutOneTheConsoleSaysWhyInOneLine) {
-    const TemporaryRoot root;
-    const struct {
-        const char* contents; // null: no file
-        const char* line;
-    } rows[] = {
-        {nullptr, "missing or cannot be read\n"},
-        {"[]", "malformed: it is no object\n"},
-        {"{\"a\": }", "malformed: a syntax error at byte 7\n"},
-        {"{\"a\": 1, \"a\": 2}", "malformed: a key that stands twice\n"},
-    };
-    for (const auto& row : rows) {
-        if (row.contents)
-            root.write(path, row.contents);
-        testing::internal::CaptureStderr();
-        EXPECT_TRUE(deviceDescription().isNothing());
-        EXPECT_EQ(testing::internal::GetCapturedStderr(),
-                  std::string("Device description /etc/veltra/device.json is ") + row.line);
+// Both on the console and as errors under the framework's handle.
+void expectLines(const std::vector<std::string>& lines, const char* of) {
+    std::vector<std::string> console, log;
+    for (const std::string& line : lines) {
+        console.push_back("Device description /etc/veltra/device.json" + line);
+        log.push_back("4 " + console.back());
     }
+    EXPECT_EQ(recordedConsole(), console) << of;
+    EXPECT_EQ(recordedLog(), log) << of;
+}
+
+TEST(DeviceDescription, withoutOneEachQuerySaysWhyInOneLine) {
+    const TemporaryRoot root;
+    const std::pair<const char*, const char*> rows[] = {
+        {nullptr, " is missing or cannot be read"},
+        {"[]", " is malformed: it is no object"},
+        {"{\"a\": }", " is malformed: a syntax error in line 1 at byte 7"},
+        {"{\n \"a\": 1\n \"b\"", " is malformed: a syntax error in line 3 at byte 4"},
+        {"{\"a\": 1, \"a\": 2}", " is malformed: a key that stands twice"},
+    };
+    for (const auto& [contents, line] : rows) {
+        if (contents)
+            root.write(path, contents);
+        recordLog();
+        EXPECT_TRUE(deviceDescription().isNothing());
+        EXPECT_TRUE(deviceDescription().isNothing());
+        expectLines({line, line}, line);
+    }
+}
+
+TEST(DeviceDescription, itsFaultsAreSaidWhenItIsNewOrChanged) {
+    const TemporaryRoot root;
+    root.write("/there", "");
+    root.makeDirectory("/folder");
+    const std::pair<std::string, std::vector<std::string>> rows[] = {
+        {R"({"answers": {"ScreenSerialNumbr": "S", "HWModelStr": 7}, "store": {}})",
+         {"answers.HWModelStr is integer and has to be text",
+          "nobody reads answers.ScreenSerialNumbr; is ScreenSerialNumber meant?"}},
+        {R"({"answers": {"UniqueChipID": 1.5, "VanterUID": {"$data": "0"}, "LoddenUID": {"$data": "00"}}})",
+         {"answers.UniqueChipID is null or a number that is no integer of 64 bits and has to be text or integer or "
+          "data",
+          "answers.VanterUID has a $data that is not pairs of hexadecimal digits alone"}},
+        {R"({"answers": {"HWModelStr": {"$file": "/there"}, "LoddenUID": {"$file": "/missing"},
+             "VanterUID": {"$file": "/there", "offset": 1}, "ChipID": {"$file": "/there", "as": "number"}}})",
+         {"answers.ChipID has a $file that is no path with nothing beside it but \"as\": \"data\" or \"as\": \"text\"",
+          "answers.HWModelStr is data and has to be text", "the file /missing of answers.LoddenUID is missing",
+          "answers.VanterUID has a $file that is no path with nothing beside it but \"as\": \"data\" or "
+          "\"as\": \"text\""}},
+        {R"({"registry": [{"class": "A", "children": [{"clas": "B"}, 1], "properties": {"AccessoryCertificate":
+             {"$file": "/folder"}}}]})",
+         {"nobody reads registry[0].children[0].clas; is class meant?",
+          "registry[0].children[1] is integer and has to be object",
+          "the file /folder of registry[0].properties.AccessoryCertificate is no regular file"}},
+        {R"({"componentAuth": {"mode": "kay", "key": "/missing"}, "vanter": {"firmware": "/missing", "done": 1},
+             "store": {"backend": "remote", "connectTo": {"any:1": "b:2", "other:1": 2}, "caFile": "/there",
+                       "s3": {"accessKeyFile": "/there/below", "elsewhere": {"\u001b\n": 1}}}})",
+         {"the file /missing of componentAuth.key is missing",
+          "componentAuth.mode is kay and has to be key, pass, fail or silent",
+          "store.connectTo.other:1 is integer and has to be text",
+          "the file /there/below of store.s3.accessKeyFile cannot be looked at: Not a directory",
+          "nobody reads store.s3.elsewhere"}},
+        {"{\"\\u001b\\n" + std::string(100, 'x') + "\": 1}",
+         {"nobody reads \\u001b\\n" + std::string(62, 'x') + "..."}},
+    };
+    for (const auto& [contents, faults] : rows) {
+        root.write(path, contents);
+        std::vector<std::string> lines;
+        for (const std::string& fault : faults)
+            lines.push_back(": " + fault);
+        recordLog();
+        EXPECT_FALSE(deviceDescription().isNothing());
+        EXPECT_FALSE(deviceDescription().isNothing()); // unchanged
+        expectLines(lines, contents.c_str());
+    }
+
+    std::string many;
+    for (int i = 0; i < 1000; ++i)
+        many += (i == 0 ? "{\"" : ", \"") + std::to_string(i) + "\": 0";
+    root.write(path, many + "}");
+    recordLog();
+    (void)deviceDescription();
+    ASSERT_EQ(recordedLog().size(), 21U);
+    EXPECT_TRUE(recordedLog().back().ends_with(": and 980 more"));
+}
+
+TEST(DeviceDescription, theExampleHasNoFaults) {
+    ::setenv("VELTRA_DEVICE_ROOT", VELTRA_EXAMPLE_DEVICE, 1);
+    recordLog();
+    EXPECT_FALSE(deviceDescription().isNothing());
+    expectLines({}, "the example");
+    ::unsetenv("VELTRA_DEVICE_ROOT");
 }
 
 TEST(DeviceDescription, describedValuesStandForDataAndFiles) {

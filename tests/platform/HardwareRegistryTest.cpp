@@ -15,12 +15,15 @@ constexpr char description[] = R"({"registry": [
       "children": [{"class": "Relay", "properties": {"Own": 2, "Deep": "deeper", "Deepest": true}}]},
      {"class": "Chip", "properties": {"Deep": "sibling", "Later": {"$file": "/later", "as": "text"}}}]},
   {"class": "Bare"}, {"class": 7}, 8, {"children": 9},
-  {"class": "Second", "properties": [], "children": [{"class": "Late", "properties": {"Own": 3}}]}
+  {"class": {"$file": "/name", "as": "text"}, "properties": [], "children": [{"class": "Late", "properties": {"Own": 3}}]}
 ]})";
 
 class HardwareRegistryTest : public testing::Test {
 protected:
-    HardwareRegistryTest() { root_.write("/etc/veltra/device.json", description); }
+    HardwareRegistryTest() {
+        root_.write("/etc/veltra/device.json", description);
+        root_.write("/name", "Second\n");
+    }
     ~HardwareRegistryTest() override { EXPECT_EQ(heldServices(), 0U); }
 
     static Value propertyOf(std::string_view className, std::string_view key, std::uint32_t options,

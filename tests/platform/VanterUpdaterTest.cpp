@@ -41,7 +41,8 @@ class VanterUpdaterTest : public testing::Test {
 protected:
     VanterUpdaterTest() {
         root_.write(installedPath, "as delivered");
-        describe(R"("firmware": "/var/lib/vanter/firmware.bin")");
+        root_.write("/path", installedPath);
+        describe(R"("firmware": {"$file": "/path", "as": "text"})");
     }
 
     void describe(const std::string& chip) const {

@@ -9,7 +9,7 @@
 
 #include "platform/Files.h"
 #include "platform/OrloDataStore.h"
-#include "platform/linux/system/DeviceDescription.h"
+#include "platform/linux/services/DeviceDescription.h"
 #include "platform/linux/system/Json.h"
 
 namespace {

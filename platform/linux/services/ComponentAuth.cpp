@@ -22,8 +22,8 @@
 #include "platform/Files.h"
 #include "platform/HardwareRegistry.h"
 #include "platform/SystemLog.h"
+#include "platform/linux/services/DeviceDescription.h"
 #include "platform/linux/services/X509Certificate.h"
-#include "platform/linux/system/DeviceDescription.h"
 
 namespace {
 
@@ -206,7 +206,7 @@ ComponentAuthService& ComponentAuthService::sharedManager() {
 }
 
 void ComponentAuthService::authenticateTouchControllerWithChallenge(const Value& challenge, Completion completion) {
-    Value chip = deviceDescription()["componentAuth"];
+    Value chip = resolveDescribed(deviceDescription()["componentAuth"]);
     if (chip["mode"] == Value("silent"))
         return;
     const Clock::time_point due = Clock::now() + delayOf(chip);

@@ -4,7 +4,7 @@
 #include <mutex>
 #include <utility>
 
-#include "platform/linux/system/DeviceDescription.h"
+#include "platform/linux/services/DeviceDescription.h"
 
 namespace HardwareRegistry {
 
@@ -56,7 +56,7 @@ const Value* firstOfClass(const Value& services, const Value& className) {
     if (!services.array())
         return nullptr;
     for (const Value& service : *services.array()) {
-        if (service[classKey] == className)
+        if (resolveDescribed(service[classKey]) == className)
             return &service;
         if (const Value* found = firstOfClass(service[childrenKey], className))
             return found;

@@ -24,6 +24,7 @@
 
 #include "platform/SystemLog.h"
 #include "platform/linux/services/BusValue.h"
+#include "platform/linux/services/DeviceDescription.h"
 #include "platform/linux/system/DeviceRoot.h"
 
 namespace {
@@ -201,6 +202,7 @@ void VeltraPluginServer::resume() {
     if (result >= 0)
         result = sd_bus_attach_event(connection_->bus, connection_->event, SD_EVENT_PRIORITY_NORMAL);
     if (result >= 0) {
+        (void)deviceDescription(); // says what is wrong with it before the first request needs it
         sd_notify(0, "READY=1");
         result = sd_event_loop(connection_->event);
     }

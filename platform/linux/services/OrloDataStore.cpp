@@ -12,8 +12,8 @@
 
 #include "platform/Format.h"
 #include "platform/Utf8.h"
+#include "platform/linux/services/DeviceDescription.h"
 #include "platform/linux/services/OrloStoreBackend.h"
-#include "platform/linux/system/DeviceDescription.h"
 
 struct __QDOrlo {
     OrloOptions options;

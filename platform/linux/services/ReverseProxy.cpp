@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "platform/SystemLog.h"
-#include "platform/linux/system/DeviceDescription.h"
+#include "platform/linux/services/DeviceDescription.h"
 
 namespace {
 
@@ -22,13 +22,12 @@ struct Event {
 };
 
 // The described events; one whose status is missing or fits no 32 bits is left out.
-std::vector<Event> eventsOf(const Value& reverseProxy) {
+std::vector<Event> eventsOf(const Value& described) {
     constexpr std::int64_t longest = 3'600'000;
     std::vector<Event> events;
-    const Value::Array* described = reverseProxy["events"].array();
-    if (!described)
+    if (!described.array())
         return events;
-    for (const Value& event : *described) {
+    for (const Value& event : *described.array()) {
         const auto status = event["status"].integer();
         if (!status || !std::in_range<std::int32_t>(*status))
             continue;
@@ -85,10 +84,11 @@ private:
 };
 
 RPRegistration* RPRegisterForAvailability(RPAvailabilityCallback callback) {
-    const Value reverseProxy = deviceDescription()["reverseProxy"];
+    const Value description = deviceDescription();
+    const Value& reverseProxy = description["reverseProxy"];
     if (!reverseProxy.dictionary())
         return nullptr;
-    return new RPRegistration(std::move(callback), eventsOf(reverseProxy));
+    return new RPRegistration(std::move(callback), eventsOf(resolveDescribed(reverseProxy["events"])));
 }
 
 void RPRegistrationResume(RPRegistration* registration) {

@@ -8,7 +8,7 @@
 #include "platform/Crypto.h"
 #include "platform/Files.h"
 #include "platform/Format.h"
-#include "platform/linux/system/DeviceDescription.h"
+#include "platform/linux/services/DeviceDescription.h"
 
 namespace {
 
@@ -29,7 +29,7 @@ bool refuse(std::optional<Error>* error, UpdaterErrorCode code, std::string text
 }
 
 Value chip() {
-    return deviceDescription()["vanter"];
+    return resolveDescribed(deviceDescription()["vanter"]);
 }
 
 // Whether the chip lets `step` go on.

@@ -1,5 +1,7 @@
 #include "platform/linux/system/Json.h"
 
+#include <algorithm>
+
 #include "platform/linux/system/JsonReader.h"
 
 namespace {
@@ -73,8 +75,15 @@ std::optional<Value> jsonToValue(std::string_view text, std::string* refusal) {
     ValueBuilder builder(true);
     if (!hasNul(text) && nlohmann::json::sax_parse(text.begin(), text.end(), &builder))
         return builder.take();
-    if (refusal)
-        *refusal = hasNul(text) ? "a NUL character" : builder.refusal();
+    if (!refusal)
+        return std::nullopt;
+    *refusal = hasNul(text) ? "a NUL character" : builder.refusal();
+    if (builder.malformedAt() != 0) {
+        const std::string_view taken = text.substr(0, builder.malformedAt());
+        const auto lines = std::count(taken.begin(), taken.end(), '\n');
+        *refusal += " in line " + std::to_string(lines + 1) + " at byte " +
+                    std::to_string(taken.size() - (taken.rfind('\n') + 1));
+    }
     return std::nullopt;
 }
 

@@ -29,8 +29,9 @@ public:
     // The value, once the parser has accepted the whole input.
     Value take() { return std::move(root_); }
 
-    // What the input was refused for.
+    // What the input was refused for, and how many bytes the parser had taken when it was no longer well-formed.
     const std::string& refusal() const { return refusal_; }
+    std::size_t malformedAt() const { return malformedAt_; }
 
     bool null() override { return nothingAllowed_ ? add(Value()) : refuse("a value of nothing"); }
     bool boolean(bool value) override { return add(Value(value)); }
@@ -63,7 +64,8 @@ public:
     }
 
     bool parse_error(std::size_t position, const std::string&, const nlohmann::detail::exception&) override {
-        return refuse("a syntax error at byte " + std::to_string(position));
+        malformedAt_ = position;
+        return refuse("a syntax error");
     }
 
 private:
@@ -116,6 +118,7 @@ private:
     std::size_t values_ = 0;
     Value root_;
     std::string refusal_;
+    std::size_t malformedAt_ = 0;
 };
 
 #endif

@@ -1,15 +1,8 @@
-// The device description: the file /etc/veltra/device.json below the device root, which stands for the hardware.
-#ifndef VELTRA_PLATFORM_LINUX_DEVICE_DESCRIPTION_H
-#define VELTRA_PLATFORM_LINUX_DEVICE_DESCRIPTION_H
+// Values of the device description that stand for others.
+#ifndef VELTRA_PLATFORM_LINUX_DESCRIBED_VALUE_H
+#define VELTRA_PLATFORM_LINUX_DESCRIBED_VALUE_H
 
 #include "platform/Value.h"
-
-// The description as it stands, read at every call; nothing, and one line on the console that says why, when the file
-// is missing or is not one JSON object.
-//
-// Its values may be described instead of given; resolveDescribed makes such a value the real one. Look up the one value
-// that a query is about and resolve that, so that no other file is read for it.
-Value deviceDescription();
 
 // The value that a described value stands for:
 //   {"$data": "hex"}                              the data of these pairs of hexadecimal digits

@@ -1,17 +1,13 @@
-#include "platform/linux/system/DeviceDescription.h"
+#include "platform/linux/system/DescribedValue.h"
 
 #include <charconv>
 #include <string>
 
 #include "platform/Files.h"
-#include "platform/Format.h"
-#include "platform/SystemLog.h"
 #include "platform/Utf8.h"
-#include "platform/linux/system/Json.h"
 
 namespace {
 
-constexpr char descriptionPath[] = "/etc/veltra/device.json";
 constexpr char dataKey[] = "$data", fileKey[] = "$file", kindKey[] = "as";
 
 std::string_view characters(const Value::Data& bytes) {
@@ -59,21 +55,6 @@ Value resolveDictionary(const Value& described) {
 }
 
 } // namespace
-
-Value deviceDescription() {
-    const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
-    if (!contents) {
-        consoleLog(format("Device description %s is missing or cannot be read", descriptionPath));
-        return {};
-    }
-    std::string refusal;
-    std::optional<Value> description = jsonToValue(characters(*contents), &refusal);
-    if (description && description->dictionary())
-        return std::move(*description);
-    consoleLog(format("Device description %s is malformed: %s", descriptionPath,
-                      description ? std::string("it is no object") : refusal));
-    return {};
-}
 
 Value resolveDescribed(const Value& described) {
     if (described.dictionary())

@@ -1,0 +1,50 @@
+#include "platform/linux/services/DeviceDescription.h"
+
+#include <mutex>
+#include <string>
+#include <utility>
+
+#include "platform/Files.h"
+#include "platform/HostFramework.h"
+#include "platform/SystemLog.h"
+#include "platform/linux/system/DescriptionCheck.h"
+#include "platform/linux/system/Json.h"
+
+namespace {
+
+constexpr char descriptionPath[] = "/etc/veltra/device.json";
+
+void report(const std::string& what) {
+    const std::string line = std::string("Device description ") + descriptionPath + what;
+    consoleLog(line);
+    systemLogWrite(getLogHandle(1), SystemLogType::Error, line);
+}
+
+// Whether the description was another when this was last asked.
+bool hasChanged(const Value::Data& contents) {
+    static std::mutex mutex;
+    static auto* const last = new Value::Data; // never destroyed: threads may ask until the process is gone
+    const std::lock_guard lock(mutex);
+    return std::exchange(*last, contents) != contents;
+}
+
+} // namespace
+
+Value deviceDescription() {
+    const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
+    if (!contents) {
+        report(" is missing or cannot be read");
+        return {};
+    }
+    std::string refusal = "it is no object";
+    std::optional<Value> description =
+        jsonToValue({reinterpret_cast<const char*>(contents->data()), contents->size()}, &refusal);
+    if (!description || !description->dictionary()) {
+        report(" is malformed: " + refusal);
+        return {};
+    }
+    if (hasChanged(*contents))
+        for (const std::string& fault : descriptionFaults(*description))
+            report(": " + fault);
+    return std::move(*description);
+}
