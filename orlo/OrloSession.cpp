@@ -3,6 +3,27 @@
 #include "platform/Crypto.h"
 #include "platform/Files.h"
 
+namespace {
+
+std::string identityText(const Value& identity) {
+    if (const std::string* text = identity.text())
+        return *text;
+    const Value text = identity.data() ? QDOrloCreateInstanceString(identity) : Value();
+    return text.isNothing() ? identity.description() : "<" + *text.text() + ">";
+}
+
+bool isCollection(const Value& value) {
+    return value.array() || value.dictionary();
+}
+
+} // namespace
+
+Value joinedInstance(const Value& first, const Value& second) {
+    if (isCollection(first) || isCollection(second))
+        return {};
+    return identityText(first) + "-" + identityText(second);
+}
+
 std::optional<Value::Data> readApTicket(const LogSource& log) {
     std::optional<Error> error;
     const Value path =

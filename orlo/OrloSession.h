@@ -49,6 +49,11 @@ auto madeIfMemorySuffices(Make make) -> std::optional<decltype(make())> try {
     return std::nullopt;
 }
 
+// The instance "<first>-<second>" of a component that two identities name. Texts stand as they are, and data whole in
+// angle brackets, in hexadecimal, since its description would leave out what tells two components apart; a number
+// stands in decimal, and "(null)" for nothing. Nothing when one is a collection, which names no component.
+Value joinedInstance(const Value& first, const Value& second);
+
 // The bytes of the device's boot ticket, or none. Writes to `log` where it is, and at level 4 when it cannot be read.
 std::optional<Value::Data> readApTicket(const LogSource& log);
 

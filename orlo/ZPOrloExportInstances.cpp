@@ -91,11 +91,10 @@ Value readInstance(const DataClass& dataClass, Value* error) {
         return {};
     if (!second)
         return leading;
-    const auto text = madeIfMemorySuffices([&] { return format("%@-%@", leading, trailing); });
-    if (text)
-        return *text;
-    report(second->missing ? second->missing : notJoined, error);
-    return {};
+    Value joined = madeIfMemorySuffices([&] { return joinedInstance(leading, trailing); }).value_or(Value());
+    if (joined.isNothing())
+        report(second->missing ? second->missing : notJoined, error);
+    return joined;
 }
 
 } // namespace

@@ -4,8 +4,8 @@
 
 #include "Daemon/Conversions.h"
 #include "device/ZPDevice.h"
+#include "orlo/OrloSession.h"
 #include "orlo/ZPOrlo.h"
-#include "platform/Format.h"
 #include "plugin/Commands.h"
 
 namespace {
@@ -59,7 +59,7 @@ HSMessageResponse putTCRT(const HSMessageRequest& request, const Value&) {
     ZPOrlo orlo = ZPOrlo::init();
     const Value screen = device.getScreenSerialNumber();
     const Value chip = device.getTopModuleChipID();
-    const Value instance = format("%@-%@", screen, chip);
+    const Value instance = joinedInstance(screen, chip);
     serviceLog.info("tcrt- : %@", instance);
     if (auto error = orlo.orloPut(dataClass, instance, *certificate.data(), nullptr))
         return failure(request, std::move(error));

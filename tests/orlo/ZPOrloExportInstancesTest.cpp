@@ -233,9 +233,31 @@ TEST_F(DataInstances, anInstanceThatMemoryDoesNotSufficeForStops) {
     }
 }
 
-TEST_F(DataInstances, anIdentityThatIsNoTextIsHandedOnAsItIs) {
-    services_.answers["CoverGlassSNKey"] = 17;
-    EXPECT_EQ(gather({"CtCl", "HmCl"}), Value(Value::Dictionary{{"CtCl", 17}, {"HmCl", "17-ALS"}}));
+TEST_F(DataInstances, anIdentityThatIsNoTextIsHandedOnAsItIsAndJoinedWhole) {
+    const std::pair<Value, Value> rows[] = {
+        {17, "17-ALS"},
+        {true, "true-ALS"},
+        {Value::Data{}, "<>-ALS"},
+        {Value::Data(65, 0xA5), "<" +
+                                    [] {
+                                        std::string t;
+                                        for (int i = 0; i < 65; ++i)
+                                            t += "a5";
+                                        return t;
+                                    }() +
+                                    ">-ALS"},
+        {"line\n\u202e", "line\n\u202e-ALS"},
+        {Value::Array{"CVG"}, {}},
+        {Value::Dictionary{}, {}},
+    };
+    for (const auto& [identity, joined] : rows) {
+        SCOPED_TRACE(identity.description());
+        services_.answers["CoverGlassSNKey"] = identity;
+        EXPECT_EQ(gather({"CtCl"}), Value(Value::Dictionary{{"CtCl", identity}}));
+        const Value both = gather({"HmCl"});
+        EXPECT_EQ(both["HmCl"], joined);
+        EXPECT_EQ(both.isNothing(), joined.isNothing());
+    }
 }
 
 } // namespace

@@ -206,6 +206,13 @@ const std::vector<Row> rows = {
     {"getTCRT", [] { servicesDouble().answers["HWModelStr"] = "M7"; }, {}, {"2 Received getTCRT"}, -1, {}, {}},
     {"putTCRT", [] {}, {}, {"2 tcrt- : SCR-TMA"}, 0, {}, {}},
     {"putTCRT",
+     [] { servicesDouble().answers["ScreenSerialNumber"] = Value::Data(65, 0x11); },
+     {},
+     {"2 tcrt- : <" + std::string(130, '1') + ">-TMA"},
+     0,
+     {},
+     {}},
+    {"putTCRT",
      [] {
          servicesDouble().answers["HWModelStr"] = "M3x";
          servicesDouble().authenticate = [](const Value&, const auto& completion) {
