@@ -122,7 +122,7 @@ void printCompletions(const CLI::App& app, const std::vector<std::string>& words
         else if (!optionsHaveEnded && word.starts_with('-') && word.size() > 1) {
             optionsHaveEnded = word == "--";
             const CLI::Option* option = optionNamed(verb, word);
-            waiting = option && option->get_type_size() != 0 ? option : nullptr;
+            waiting = option && option->get_items_expected_max() > 0 ? option : nullptr;
         } else if (operands == 0 && next != verbs.end())
             verb = *next;
         else
