@@ -49,6 +49,12 @@ class Help(unittest.TestCase):
     def test_the_manual_has_the_verbs_operands_and_options_that_the_help_has(self):
         self.assertEqual(told_by_manual(), told_by_help())
 
+    def test_the_manual_of_the_description_has_the_keys_that_are_known(self):
+        known = re.findall(r'{"(\w+)", [a-z]', (SOURCE / "platform/linux/system/DescriptionCheck.cpp").read_text())
+        told = re.findall(r"^\.(?:It Va|Va|Ss) (\w+)", (SOURCE / "man/veltra-device.json.5").read_text(), re.MULTILINE)
+        self.assertLessEqual({"HWModelStr", "store", "s3"}, set(known))
+        self.assertLessEqual(set(known), set(told))
+
     def test_the_manual_pages_are_sound(self):
         subprocess.run(["mandoc", "-Tlint", "-Wwarning", *(SOURCE / "man").glob("*.[1-9]")], check=True)
 
