@@ -1,4 +1,5 @@
 """The service as its host sees it: requests, refusals, the configuration blob, and what it survives."""
+import fcntl
 import json
 import os
 import signal
@@ -274,6 +275,7 @@ class Client(ServiceTest):
     def test_exit_statuses_and_one_json_object_for_every_outcome(self):
         for status, words in (
             (0, ["set-bcfg", "/blobs/every-kind.bin"]),
+            (1, ["set-bcfg", "/missing"]),
             (2, ["call", "x", "word"]),
             (2, ["call", "x", "a:={"]),
             (2, ["call", "x", "a:=1.5"]),
@@ -315,13 +317,78 @@ class Client(ServiceTest):
             lines[2], 'request.messageDict : {"f": <00ff>, "j": {"d": <0badcafe>, "n": [1, true]}, "t": "a=b"}'
         )
 
-    def test_a_copy_of_the_result_and_a_note_when_it_is_empty(self):
+    def test_a_copy_is_a_new_file_for_its_owner_or_goes_to_standard_output(self):
         copy = self.service.root / "copy"
+        copy.write_bytes(b"earlier")
+        copy.chmod(0o644)
         self.assertEqual(self.service.orloctl("set-bcfg", "/blobs/every-kind.bin", "-o", copy)[0], 0)
         self.assertEqual(copy.read_bytes(), self.read(RESULT))
-        status, answer = self.service.orloctl("set-bcfg", "/missing")
-        self.assertEqual(status, 0)
-        self.assertIn("is empty", answer["note"])
+        self.assertEqual(copy.stat().st_mode & 0o7777, 0o600)
+        done = subprocess.run([BIN / "orloctl", "set-bcfg", "/blobs/holds-WCh0.bin", "-o", "-"],
+                              env=self.service.environment, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        self.assertEqual(done.stdout, self.read(RESULT))
+        self.assertTrue(done.stderr.startswith(b"setGlobalbCfg: success"))
+        (self.service.root / "link").symlink_to(copy)
+        for target in ("link", "blobs", "missing/copy"):
+            status, answer = self.service.orloctl("set-bcfg", "/blobs/holds-WCh0.bin", "-o", self.service.root / target)
+            self.assertEqual((status, answer["response"]["statusCode"]), (2, 0))
+            self.assertIn("Cannot write", answer["note"])
+        self.assertNotEqual(copy.read_bytes(), self.read(RESULT))
+
+    def test_clients_that_rewrite_at_once_get_each_its_own_result(self):
+        blobs = ["/blobs/every-kind.bin", "/blobs/holds-WCh0.bin"]
+        expected = []
+        for blob in blobs:
+            self.set_bcfg(blob)
+            expected.append(self.read(RESULT))
+        clients = []
+        for number in range(20):
+            copy = self.service.root / f"copy{number}"
+            command = [BIN / "orloctl", "set-bcfg", blobs[number % 2], "-o", copy]
+            clients.append((copy, subprocess.Popen(command, env=self.service.environment, stdout=subprocess.DEVNULL,
+                                                   stderr=subprocess.DEVNULL)))
+        for number, (copy, client) in enumerate(clients):
+            self.assertEqual(client.wait(), 0)
+            self.assertEqual(copy.read_bytes(), expected[number % 2])
+
+    def test_waiting_for_another_client_is_said_and_ends_with_the_timeout_or_an_interruption(self):
+        lock = self.service.root / "var/lib/orlo/orloctl.lock"
+        self.set_bcfg_with_client()
+        with open(lock) as held:
+            fcntl.flock(held, fcntl.LOCK_EX)
+            for end, says in ((None, "Time is up"), (signal.SIGINT, "Interrupted"),
+                              (lambda: fcntl.flock(held, fcntl.LOCK_UN), None)):
+                with self.subTest(says):
+                    seconds = "1" if end is None else "60"
+                    client = subprocess.Popen(
+                        [BIN / "orloctl", "--json", "--timeout", seconds, "set-bcfg", "/blobs/every-kind.bin"],
+                        env=self.service.environment, stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True)
+                    self.assertIn("waiting for another orloctl", client.stderr.readline())
+                    if callable(end):
+                        end()
+                    elif end:
+                        client.send_signal(end)
+                    output, _ = client.communicate()
+                    self.assertEqual(client.returncode, 3 if says else 0)
+                    if says:
+                        self.assertTrue(json.loads(output)["problem"].startswith(says), output)
+                        self.assertTrue(json.loads(output)["problem"].endswith("The request was not sent."), output)
+        lock.chmod(0o666)
+        self.assertEqual(self.set_bcfg_with_client()[0], 2)
+
+    def set_bcfg_with_client(self):
+        return self.service.orloctl("set-bcfg", "/blobs/every-kind.bin")
+
+    def test_a_timeout_says_whether_the_service_goes_on_with_the_request(self):
+        for stopped, says in ((self.service.pid, "The service goes on with the request."),
+                              (self.service.bus.daemon.pid, "The request was not sent.")):
+            os.kill(stopped, signal.SIGSTOP)
+            try:
+                status, answer = self.service.orloctl("--timeout", "1", "call", "x")
+            finally:
+                os.kill(stopped, signal.SIGCONT)
+            self.assertEqual(status, 3)
+            self.assertTrue(answer["problem"].endswith(says), answer)
 
 
 if __name__ == "__main__":

@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include "platform/linux/services/BusValue.h"
+#include "tools/orloctl/Interruption.h"
 
 namespace {
 
@@ -22,6 +23,7 @@ constexpr const char* serviceInterface = "com.tevari.VeltraPluginServer";
 using Clock = std::chrono::steady_clock;
 using BusPtr = std::unique_ptr<sd_bus, decltype(&sd_bus_close_unref)>;
 using MessagePtr = std::unique_ptr<sd_bus_message, decltype(&sd_bus_message_unref)>;
+using CredentialsPtr = std::unique_ptr<sd_bus_creds, decltype(&sd_bus_creds_unref)>;
 using SlotPtr = std::unique_ptr<sd_bus_slot, decltype(&sd_bus_slot_unref)>;
 
 int check(int result) {
@@ -97,10 +99,31 @@ Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address)
     return answer;
 }
 
+std::chrono::microseconds timeLeft(const ServiceAddress& address) {
+    return std::max(std::chrono::duration_cast<std::chrono::microseconds>(address.deadline() - Clock::now()),
+                    std::chrono::microseconds(0));
+}
+
+std::optional<uid_t> userOf(sd_bus* connection, const char* name) {
+    sd_bus_creds* credentials = nullptr;
+    uid_t user = 0;
+    const int result = sd_bus_get_name_creds(connection, name, SD_BUS_CREDS_EUID, &credentials);
+    const CredentialsPtr owner(credentials, sd_bus_creds_unref);
+    return result >= 0 && sd_bus_creds_get_euid(credentials, &user) >= 0 ? std::optional(user) : std::nullopt;
+}
+
+// What becomes of a request whose answer is not awaited any longer. The service serves whatever has reached the bus.
+std::string fateOf(sd_bus* connection) {
+    std::uint64_t waiting = 0;
+    const bool isSent = sd_bus_get_n_queued_write(connection, &waiting) >= 0 && waiting == 0;
+    return isSent ? "The service goes on with the request." : "The request was not sent.";
+}
+
 struct Pending {
     const ServiceAddress& address;
     const std::string& command;
     std::optional<Answer> answer;
+    std::string sender; // of the answer
 };
 
 int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
@@ -108,27 +131,22 @@ int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
     try {
         const sd_bus_error* error = sd_bus_message_get_error(reply);
         pending.answer = error ? answerFromError(*error, pending.address) : answerFrom(reply, pending.command);
+        if (const char* sender = sd_bus_message_get_sender(reply); sender && !error)
+            pending.sender = sender;
     } catch (const std::exception& failure) {
-        pending.answer = Answer{Outcome::Unreachable, {}, std::string("The answer cannot be read: ") + failure.what()};
+        pending.answer =
+            Answer{Outcome::Unreachable, {}, std::string("The answer cannot be read: ") + failure.what(), {}};
     }
     return 0;
 }
 
-Answer noAnswer(const ServiceAddress& address, const std::string& why) {
-    return {Outcome::Unreachable,
-            {},
-            "The service on the bus \"" + address.bus + "\" did not answer: " + why + " (the timeout is " +
-                std::to_string(address.timeout.count()) + " s)"};
-}
-
-// The timeout counts from here, also while the bus itself keeps the client waiting.
+// The timeout counts also while the bus itself keeps the client waiting.
 Answer converse(sd_bus* connection, const ServiceAddress& address, const std::string& command,
                 const Value::Dictionary& arguments) {
     constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
     constexpr std::chrono::microseconds tick = std::chrono::seconds(1);
-    const auto deadline = Clock::now() + address.timeout;
     const MessagePtr message = requestMessage(connection, command, arguments);
-    Pending pending{address, command, {}};
+    Pending pending{address, command, {}, {}};
     sd_bus_slot* slot = nullptr;
     check(sd_bus_call_async(connection, &slot, message.get(), onReply, &pending, noTimeoutOfItsOwn));
     const SlotPtr slotOwner(slot, sd_bus_slot_unref);
@@ -136,30 +154,47 @@ Answer converse(sd_bus* connection, const ServiceAddress& address, const std::st
     while (!pending.answer) {
         if (check(sd_bus_process(connection, nullptr)) > 0)
             continue;
-        const auto left = std::chrono::duration_cast<std::chrono::microseconds>(deadline - Clock::now());
-        if (left.count() <= 0)
-            return noAnswer(address, "time is up");
-        check(sd_bus_wait(connection, static_cast<std::uint64_t>(std::min(left, tick).count())));
+        const auto left = timeLeft(address);
+        if (left.count() == 0 || Interruption::isRaised())
+            return {Outcome::Unreachable,
+                    {},
+                    noAnswerReason(address) + " while the service on the bus \"" + address.bus + "\" was to answer. " +
+                        fateOf(connection),
+                    {}};
+        const int waited = sd_bus_wait(connection, static_cast<std::uint64_t>(std::min(left, tick).count()));
+        if (waited != -EINTR)
+            check(waited);
         elapsed.show();
     }
+    sd_bus_set_method_call_timeout(connection, static_cast<std::uint64_t>(std::max(timeLeft(address), tick).count()));
+    if (!pending.sender.empty())
+        pending.answer->serviceUser = userOf(connection, pending.sender.c_str());
     return *pending.answer;
 }
 
 } // namespace
 
+std::string noAnswerReason(const ServiceAddress& address) {
+    return Interruption::isRaised() ? "Interrupted"
+                                    : "Time is up (the timeout is " + std::to_string(address.timeout.count()) + " s)";
+}
+
 Answer sendRequest(const ServiceAddress& address, const std::string& command, const Value::Dictionary& arguments) {
+    const Interruption interruption;
     sd_bus* opened = nullptr;
     if (const int result = bus::open(address.bus, &opened); result < 0)
-        return {
-            Outcome::Unreachable, {}, "Cannot reach the bus \"" + address.bus + "\": " + bus::Failure(result).what()};
+        return {Outcome::Unreachable,
+                {},
+                "Cannot reach the bus \"" + address.bus + "\": " + bus::Failure(result).what(),
+                {}};
     const BusPtr connection(opened, sd_bus_close_unref);
     try {
         return converse(connection.get(), address, command, arguments);
     } catch (const bus::Refusal& refusal) {
-        return {Outcome::Usage, {}, refusal.what()};
+        return {Outcome::Usage, {}, refusal.what(), {}};
     } catch (const bus::Failure& failure) {
         if (failure.code == -E2BIG || failure.code == -EMSGSIZE || failure.code == -ENOBUFS)
-            return {Outcome::Usage, {}, std::string("The request is too large for a message: ") + failure.what()};
-        return {Outcome::Unreachable, {}, "Lost the bus \"" + address.bus + "\": " + failure.what()};
+            return {Outcome::Usage, {}, std::string("The request is too large for a message: ") + failure.what(), {}};
+        return {Outcome::Unreachable, {}, "Lost the bus \"" + address.bus + "\": " + failure.what(), {}};
     }
 }

@@ -3,7 +3,10 @@
 #define VELTRA_TOOLS_ORLOCTL_CLIENT_H
 
 #include <chrono>
+#include <optional>
 #include <string>
+
+#include <sys/types.h>
 
 #include "platform/Value.h"
 
@@ -21,15 +24,23 @@ struct Answer {
     Outcome outcome = Outcome::Unreachable;
     Value::Dictionary response; // as the plug-in sent it; empty unless it answered
     std::string problem;        // a sentence for a person; empty on success
+    // The user whom the bus names as the one who runs the service that answered; none when it has left meanwhile.
+    std::optional<uid_t> serviceUser;
 };
 
 struct ServiceAddress {
     std::string bus = "system"; // "system", "session" or a D-Bus address
     std::chrono::seconds timeout{600};
+    std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+
+    std::chrono::steady_clock::time_point deadline() const { return start + timeout; }
 };
 
+// Why a wait ended without an answer, the beginning of a sentence: an interruption, or else that time is up.
+std::string noAnswerReason(const ServiceAddress& address);
+
 // Sends `command` with `arguments` and waits for the answer. On a terminal, standard error shows the time that has
-// passed.
+// passed. When the time is up, and at SIGINT or SIGTERM, the problem says whether the service goes on with the request.
 Answer sendRequest(const ServiceAddress& address, const std::string& command, const Value::Dictionary& arguments);
 
 #endif

@@ -13,10 +13,12 @@ public:
     using std::runtime_error::runtime_error;
 };
 
-// The contents of a file. Raises UsageError when it cannot be read or is larger than 256 MiB.
+// The contents of a file, for "-" of standard input. Raises UsageError when it cannot be read or is larger than 256
+// MiB.
 Value::Data readLocalFile(const std::string& path);
 
-// Makes `contents` the contents of a file. Raises UsageError when it cannot be written.
+// Makes `contents` the contents of a new file of mode 0600 in place of a regular file that may be there. No link at the
+// path's end is followed. For "-", writes to standard output. Raises UsageError when the file cannot be written.
 void writeLocalFile(const std::string& path, const Value::Data& contents);
 
 #endif

@@ -23,6 +23,7 @@
 #include "tools/orloctl/CrashLogReport.h"
 #include "tools/orloctl/Json.h"
 #include "tools/orloctl/LocalFiles.h"
+#include "tools/orloctl/SetBcfg.h"
 #include "tools/orloctl/ShowBcfg.h"
 #include "tools/orloctl/ShowDer.h"
 #include "tools/orloctl/ShowImg4.h"
@@ -33,11 +34,9 @@ namespace {
 
 using nlohmann::ordered_json;
 
-constexpr const char* resultPath = "/tmp/new_bCfg";
-
 constexpr const char* exitStatuses = R"(Exit status:
   0  success
-  1  the plug-in answered with a failure
+  1  the plug-in answered with a failure, or there is no result to rely on
   2  wrong usage, a request that the service refuses, or a local file or
      output that cannot be read or written
   3  the service cannot be reached, or did not answer in time
@@ -51,6 +50,7 @@ struct Options {
     ServiceAddress address;
     long long timeoutSeconds = 600;
     bool json = false;
+    bool copiesToOutput = false; // -o -
 };
 
 void printJson(const ordered_json& json) {
@@ -67,18 +67,18 @@ int fail(const Options& options, Outcome outcome, const std::string& problem) {
     return status;
 }
 
-void printResponse(const Value::Dictionary& dictionary) {
+void printResponse(std::ostream& out, const Value::Dictionary& dictionary) {
     const Value response(dictionary);
     const char* verdict = response["statusCode"].integer() == 0 ? "success" : "failure";
-    std::cout << response["name"].description() << ": " << verdict << " (status "
-              << response["statusCode"].description() << ")\n";
+    out << response["name"].description() << ": " << verdict << " (status " << response["statusCode"].description()
+        << ")\n";
     if (const Value::Dictionary* entries = response["response"].dictionary())
         for (const auto& [key, value] : *entries)
-            std::cout << "  " << key << " = " << jsonFromValue(value).dump() << '\n';
+            out << "  " << key << " = " << jsonFromValue(value).dump() << '\n';
     const Value& error = response["error"];
     if (!error.isNothing())
-        std::cout << "  error: " << error["description"].description() << " (" << error["domain"].description() << " "
-                  << error["code"].description() << ")\n";
+        out << "  error: " << error["description"].description() << " (" << error["domain"].description() << " "
+            << error["code"].description() << ")\n";
 }
 
 // What the client itself has to add to an answer.
@@ -104,12 +104,14 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
     }
     if (answer.response.empty())
         return fail(options, answer.outcome, answer.problem);
-    printResponse(answer.response);
+    // A result that goes to standard output has it for itself.
+    std::ostream& out = options.copiesToOutput ? std::cerr : std::cout;
+    printResponse(out, answer.response);
     if (!remarks.result.empty())
-        std::cout << "  result: " << remarks.result << '\n';
+        out << "  result: " << remarks.result << '\n';
     if (!remarks.note.empty())
         std::cerr << "orloctl: " << remarks.note << '\n';
-    if (!answer.problem.empty() && answer.outcome == Outcome::Usage)
+    if (!answer.problem.empty() && Value(answer.response)["statusCode"].integer() == 0)
         std::cerr << "orloctl: " << answer.problem << '\n';
     return status;
 }
@@ -130,22 +132,17 @@ int exportClasses(const Options& options, const std::vector<std::string>& classe
     return send(options, "OrloExport", arguments);
 }
 
-int reportUncopied(const Options& options, Answer answer, const Remarks& remarks) {
-    answer.outcome = Outcome::Usage;
-    answer.problem = "The request was carried out, but its result was not copied.";
-    return report(options, answer, remarks);
-}
-
 // Copies the request's result to a file and reports both: a copy that fails does not take the answer along.
-int reportCopied(const Options& options, const Answer& answer, Remarks remarks, const std::string& copyPath,
+int reportCopied(const Options& options, Answer answer, Remarks remarks, const std::string& copyPath,
                  const Value::Data& contents) {
     try {
         writeLocalFile(copyPath, contents);
-        return report(options, answer, remarks);
     } catch (const UsageError& failure) {
         remarks.note = failure.what();
+        answer.outcome = Outcome::Usage;
+        answer.problem = "The request was carried out, but its result was not copied.";
     }
-    return reportUncopied(options, answer, remarks);
+    return report(options, answer, remarks);
 }
 
 int getTcrt(const Options& options, const std::string& copyPath) {
@@ -170,23 +167,15 @@ int callServer(const Options& options, const char* command, const std::string& u
     return report(options, sendRequest(options.address, command, {{"waftonUrl", url}}));
 }
 
-int setBcfg(const Options& options, const std::string& devicePath, const std::string& copyPath) {
-    const Answer answer = sendRequest(options.address, "setGlobalbCfg", {{"bcfgDataPath", devicePath}});
+int rewriteBlob(const Options& options, const std::string& devicePath, const std::string& copyPath) {
+    const auto [answer, result] = setBcfg(options.address, devicePath);
     if (answer.outcome != Outcome::Success)
         return report(options, answer);
-    const auto result = files::readWhole(resultPath);
-    Remarks remarks;
-    if (!result)
-        remarks.note = std::string("the result, ") + resultPath + " below the device root, cannot be read";
-    else
-        remarks.result = std::string(resultPath) + " on the device, " + std::to_string(result->size()) + " bytes";
-    if (result && result->empty())
-        remarks.note = "the result is empty: " + devicePath +
-                       " is missing on the device, or is no configuration blob that can be rewritten";
-    if (copyPath.empty())
-        return report(options, answer, remarks);
-    return result ? reportCopied(options, answer, remarks, copyPath, *result)
-                  : reportUncopied(options, answer, remarks);
+    const Remarks remarks = {std::string(blobResultPath) + " on the device, " + std::to_string(result.contents.size()) +
+                                 " bytes",
+                             result.note};
+    return copyPath.empty() ? report(options, answer, remarks)
+                            : reportCopied(options, answer, remarks, copyPath, result.contents);
 }
 
 int show(const Options& options, const Report& found, Outcome failure = Outcome::BadInput) {
@@ -254,6 +243,9 @@ public:
         try {
             app_.parse(argc, argv);
             options_.address.timeout = std::chrono::seconds(options_.timeoutSeconds);
+            options_.copiesToOutput = copyPath_ == "-";
+            if (options_.json && options_.copiesToOutput)
+                throw UsageError("--json and -o - both ask for standard output");
             return run_();
         } catch (const CLI::Success& printed) {
             return app_.exit(printed);
@@ -280,7 +272,8 @@ private:
         verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
 
         verb = app_.add_subcommand("get-tcrt", "Read the top module's certificate and its serial number");
-        verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file")->type_name("FILE");
+        verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file, - for standard output")
+            ->type_name("FILE");
         verb->callback([this] { run_ = [this] { return getTcrt(options_, copyPath_); }; });
 
         verb = app_.add_subcommand("put-tcrt", "Authenticate the display and store the top module's certificate");
@@ -288,9 +281,10 @@ private:
 
         verb = app_.add_subcommand("set-bcfg", "Rewrite the \"WCh0\" and \"MiGB\" entries of a configuration blob");
         verb->add_option("DEVICE-FILE", path_, "The blob, a path on the device")->required();
-        verb->add_option("-o,--output", copyPath_, "Copy the result, /tmp/new_bCfg on the device, to this local file")
+        verb->add_option("-o,--output", copyPath_,
+                         "Copy the result, /tmp/new_bCfg on the device, to this local file, - for standard output")
             ->type_name("FILE");
-        verb->callback([this] { run_ = [this] { return setBcfg(options_, path_, copyPath_); }; });
+        verb->callback([this] { run_ = [this] { return rewriteBlob(options_, path_, copyPath_); }; });
     }
 
     void addRecords() {
@@ -331,7 +325,7 @@ private:
         readers->fallthrough();
 
         CLI::App* verb = readers->add_subcommand("bcfg", "Entries and HMAC state of a configuration blob");
-        verb->add_option("FILE", path_, "A local file")->required();
+        verb->add_option("FILE", path_, "A local file, - for standard input")->required();
         verb->add_option("--hmac-key-file", keyPath_, "Check the HMACs with the key in this local file")
             ->type_name("FILE");
         verb->callback([this] {
@@ -351,7 +345,7 @@ private:
 
         CLI::App* verb = verifiers->add_subcommand(
             "img4", "Verify the chain, the signature and the constraints of a container or bare manifest");
-        verb->add_option("FILE", path_, "A local file")->required();
+        verb->add_option("FILE", path_, "A local file, - for standard input")->required();
         verb->add_option("--profile", verifyOptions_.profile,
                          "The trust profile, such as kImg4DecodeSecureBootEc384Sha384; without it, the one that fits")
             ->type_name("PROFILE");
@@ -367,7 +361,7 @@ private:
     void addReader(CLI::App* readers, const char* name, const char* help,
                    Report (*read)(const std::uint8_t*, std::size_t)) {
         CLI::App* verb = readers->add_subcommand(name, help);
-        verb->add_option("FILE", path_, "A local file")->required();
+        verb->add_option("FILE", path_, "A local file, - for standard input")->required();
         verb->callback([this, read] {
             run_ = [this, read] {
                 const Value::Data file = readLocalFile(path_);

@@ -1,0 +1,117 @@
+#include "tools/orloctl/BlobResult.h"
+
+#include <functional>
+#include <initializer_list>
+#include <string>
+
+#include <unistd.h>
+
+#include "sysconfig/SysConfig3Ptr.h"
+#include "tests/support/TemporaryRoot.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+
+constexpr std::uint32_t wCh0 = 0x57436830;
+constexpr std::uint32_t miGB = 0x4D694742;
+
+std::string blob(std::initializer_list<std::uint32_t> keys, SysConfig3Version version = 0x30003) {
+    const sysconfig::SysConfig3Ptr object(allocSysConfig3(0x62436667, version));
+    for (const std::uint32_t key : keys) {
+        const std::uint8_t octet = 1;
+        const sysconfig::PayloadEntryPtr entry(allocSysConfig3PayloadEntryWithData(key, "", &octet, 1));
+        sysConfig3AddPayloadEntry(object.get(), entry.get());
+    }
+    SysConfigData encoded = {};
+    encodeSysConfig3(object.get(), &encoded);
+    const sysconfig::BytesPtr owner(encoded.data);
+    return {encoded.data, encoded.data + encoded.length};
+}
+
+// A blob of the version that has HMACs; the library encodes none without a key.
+std::string protectedBlob() {
+    std::string changed = blob({});
+    changed[changed.find(std::string("\x02\x04\x03\x00\x03\x00", 6)) + 2] = 0x02;
+    return changed;
+}
+
+struct Case {
+    const char* name;
+    std::function<void(const TemporaryRoot&)> serve; // what happens at the device while the request is served
+    const char* problem;                             // empty for a result
+    const char* model = "M12x";
+    const char* note = "";
+    uid_t otherUser = 0; // how far the service's user is from the one who runs the tests
+};
+
+void makeResult(const TemporaryRoot& root, const std::string& contents) {
+    root.write("/tmp/new", contents);
+    std::filesystem::rename(root.host("/tmp/new"), root.host(blobResultPath));
+}
+
+std::function<void(const TemporaryRoot&)> results(const std::string& contents) {
+    return [contents](const TemporaryRoot& root) { makeResult(root, contents); };
+}
+
+void emptyAfter(const TemporaryRoot& root, const std::string& input) {
+    root.write("/blob", input);
+    makeResult(root, "");
+}
+
+void replacedBy(const TemporaryRoot& root, const std::function<void(const std::filesystem::path&)>& make) {
+    std::filesystem::remove(root.host(blobResultPath));
+    make(root.host(blobResultPath));
+}
+
+const std::string whole = blob({wCh0, miGB});
+
+const Case cases[] = {
+    {"new file", results(whole), ""},
+    {"model without WCh0", results(blob({miGB})), "", "Banana", "model Banana has no WCh0"},
+    {"no WCh0", results(blob({miGB})), "has no WCh0 entry, and model xM11 has one", "xM11"},
+    {"no MiGB", results(blob({wCh0})), "has no MiGB entry"},
+    {"no blob", results("text"), "is no configuration blob."},
+    {"no input", results(""), "is empty: /blob is missing on the device"},
+    {"input of text", [](auto& root) { emptyAfter(root, "text"); }, "is empty: /blob is no configuration blob"},
+    {"protected input", [](auto& root) { emptyAfter(root, protectedBlob()); }, "is empty: /blob needs a key"},
+    {"nothing done", [](auto&) {}, "is that of an earlier request"},
+    {"removed", [](auto& root) { std::filesystem::remove(root.host(blobResultPath)); }, "is missing"},
+    {"another user's", results(whole), "belongs to another user", "M12x", "", 1},
+    {"two names",
+     [](auto& root) {
+         makeResult(root, whole);
+         std::filesystem::create_hard_link(root.host(blobResultPath), root.host("/tmp/other"));
+     },
+     "has a second name"},
+    {"link",
+     [](auto& root) {
+         makeResult(root, whole);
+         std::filesystem::rename(root.host(blobResultPath), root.host("/tmp/other"));
+         root.link(blobResultPath, "/tmp/other");
+     },
+     "is no regular file"},
+    {"FIFO", [](auto& root) { replacedBy(root, [](auto& path) { ::mkfifo(path.c_str(), 0600); }); },
+     "is no regular file"},
+};
+
+TEST(BlobResult, isTheRequestsOwnOrAProblemThatSaysWhyNot) {
+    for (const Case& row : cases) {
+        SCOPED_TRACE(row.name);
+        const TemporaryRoot root;
+        // A folder on the way may be a link that stays on the device.
+        root.makeDirectory("/private/tmp");
+        root.link("/tmp", "private/tmp");
+        root.write("/etc/veltra/device.json", std::string(R"({"answers": {"HWModelStr": ")") + row.model + "\"}}");
+        makeResult(root, whole);
+        const BlobResult result;
+        row.serve(root);
+        const JudgedBlob judged = result.read(::geteuid() + row.otherUser, "/blob");
+        EXPECT_NE(judged.problem.find(row.problem), std::string::npos) << judged.problem;
+        EXPECT_EQ(judged.problem.empty(), *row.problem == '\0') << judged.problem;
+        EXPECT_NE(judged.note.find(row.note), std::string::npos) << judged.note;
+        EXPECT_EQ(judged.note.empty(), *row.note == '\0') << judged.note;
+    }
+}
+
+} // namespace
