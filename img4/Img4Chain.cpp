@@ -44,12 +44,14 @@ bool isNamedCurve(const DERItem& parameters, const DERItem* curve) {
     return isWholeItem(parameters, DERTagObjectIdentifier, &oid) && DEROidCompare(&oid, curve);
 }
 
-bool isPoint(const DERItem& key, const DERItem* curveOid) {
+// A key on either curve is judged by its own length; that the signature algorithm fits the profile is seen to
+// elsewhere.
+bool isPointOfItsCurve(const DERItem& key, const DERItem& parameters) {
     const NamedCurve* curve = curveOfPoint(key.length);
-    return curve != nullptr && DEROidCompare(curve->oid, curveOid);
+    return curve != nullptr && isNamedCurve(parameters, curve->oid);
 }
 
-bool parseKey(const DERItem& subjectPublicKeyInfo, KeyKind kind, const DERItem* curveOid, DERItem* key) {
+bool parseKey(const DERItem& subjectPublicKeyInfo, KeyKind kind, DERItem* key) {
     DERSubjPubKeyInfo info;
     DERAlgorithmId algorithm;
     if (DERParseSequenceContent(&subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info,
@@ -58,20 +60,16 @@ bool parseKey(const DERItem& subjectPublicKeyInfo, KeyKind kind, const DERItem* 
         return false;
     if (kind == KeyKind::RSA)
         return DEROidCompare(&algorithm.algorithm, &oidRsa) && isAbsentOrNull(algorithm.parameters);
-    return DEROidCompare(&algorithm.algorithm, &oidEcPubKey) && isNamedCurve(algorithm.parameters, curveOid) &&
-           isPoint(*key, curveOid);
+    return DEROidCompare(&algorithm.algorithm, &oidEcPubKey) && isPointOfItsCurve(*key, algorithm.parameters);
 }
 
-Img4ChainFault parseCertificate(const DERItem& encoding, KeyKind kind, const Img4TrustProfile& profile,
-                                Certificate* certificate) {
+Img4ChainFault parseCertificate(const DERItem& encoding, KeyKind kind, Certificate* certificate) {
     if (DERParseSequence(&encoding, DERNumSignedCertCrlItemSpecs, DERSignedCertCrlItemSpecs, &certificate->fields,
                          sizeof certificate->fields) != DERSuccess ||
         DERParseSequence(&certificate->fields.tbs, DERNumTBSCertItemSpecs, DERTBSCertItemSpecs, &certificate->tbs,
                          sizeof certificate->tbs) != DERSuccess)
         return Img4ChainEncoding;
-    return parseKey(certificate->tbs.subjectPublicKeyInfo, kind, profile.keyAlgorithmOid, &certificate->key)
-               ? Img4ChainSound
-               : Img4ChainKey;
+    return parseKey(certificate->tbs.subjectPublicKeyInfo, kind, &certificate->key) ? Img4ChainSound : Img4ChainKey;
 }
 
 // The encodings of the certificates, the root's first.
@@ -216,8 +214,7 @@ Img4ChainRefusal img4::verifyChain(const ChainRules& rules, const DERItem& root,
         return refusal;
     Certificate certificates[longestChain];
     for (uint32_t i = 0; i < rules.length; ++i) {
-        const Img4ChainFault fault =
-            parseCertificate(encodings.certificates[i], rules.key, *arguments.profile, &certificates[i]);
+        const Img4ChainFault fault = parseCertificate(encodings.certificates[i], rules.key, &certificates[i]);
         if (fault != Img4ChainSound)
             return {fault, i};
     }

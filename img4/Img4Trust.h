@@ -231,7 +231,8 @@ IMG4_API DERReturn verify_signature_ecdsa(const DERItem* key, const DERItem* sig
 // `certChain` holds certificates (RFC 5280) one after the other, from the one that the root has signed to the leaf; the
 // root itself is stored in the program. A verifier demands
 //   - that the chain has exactly its length, the root included, and that no certificate exceeds 131071 octets;
-//   - that every key is of its kind: RSA with absent or NULL parameters, or EC on the curve of the profile;
+//   - that every key is of its kind: RSA with absent or NULL parameters, or EC on P-256 or P-384, whichever
+//     the profile's own is, an uncompressed point that is as long as its curve's;
 //   - of every certificate that its issuer is, octet for octet, the subject of the one before, that it names the
 //     profile's signature algorithm, and that the profile's verifySignature accepts its signature under the key before;
 //   - that the leaf's list of extensions, when it has one, is not empty.

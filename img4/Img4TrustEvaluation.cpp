@@ -12,6 +12,20 @@ bool isComplete(const Img4TrustProfile* profile) {
            profile->digestInfo != nullptr;
 }
 
+// Stores the digest of `data` by the flow's computeDigest in the record. It is computed aside, so that one that fails
+// leaves the record's digest and the flag that vouches for it as they were.
+template <typename Flow>
+DERReturn storeDigest(const Flow& flow, const DERItem& data, uint8_t (&digest)[Img4MaxDigestLength], uint8_t* flag) {
+    uint8_t computed[Img4MaxDigestLength];
+    std::memcpy(computed, digest, sizeof computed);
+    if (const DERReturn result = flow.computeDigest(data, computed); result != DERSuccess)
+        return result;
+    std::memcpy(digest, computed, sizeof computed);
+    if (flag != nullptr)
+        *flag = 1;
+    return DERSuccess;
+}
+
 // One evaluation of a record under a profile.
 struct Evaluation {
     Img4Record& record;
@@ -42,7 +56,7 @@ DERReturn Evaluation::verifySignature() const {
     if (const DERReturn result = profile.verifyChain(&manifest.certChain, &leafKey, &manifest.certProperties, &profile);
         result != DERSuccess)
         return result;
-    if (const DERReturn result = computeDigest(manifest.body, manifest.bodyDigest); result != DERSuccess)
+    if (const DERReturn result = storeDigest(*this, manifest.body, manifest.bodyDigest, nullptr); result != DERSuccess)
         return result;
     return profile.verifySignature(&leafKey, &manifest.signature, manifest.bodyDigest, profile.digestInfo->length,
                                    &profile);
@@ -59,28 +73,17 @@ DERReturn Evaluation::findObject(uint32_t object) const {
     return result;
 }
 
-// Runs `digest` into the record; the flag tells the whole time whether the record's digest is valid.
-template <typename Compute>
-DERReturn storeDigest(uint8_t* flag, Compute compute) {
-    *flag = 0;
-    const DERReturn result = compute();
-    *flag = result == DERSuccess;
-    return result;
-}
-
-// By the flow's computeDigest. A record without payload has nothing to digest.
+// A record without payload has nothing to digest.
 template <typename Flow>
 DERReturn digestPayload(Img4Record& record, const Flow& flow) {
     if (!hasContent(record.payload.data))
         return DERSuccess;
-    return storeDigest(&record.payloadHashed,
-                       [&] { return flow.computeDigest(record.payloadRaw, record.payload.digest); });
+    return storeDigest(flow, record.payloadRaw, record.payload.digest, &record.payloadHashed);
 }
 
 // Evaluates the manifest alone when `object` is null.
 DERReturn Evaluation::run(const uint32_t* object) const {
-    DERReturn result =
-        storeDigest(&record.manifestHashed, [&] { return computeDigest(record.manifestRaw, record.manifest.digest); });
+    DERReturn result = storeDigest(*this, record.manifestRaw, record.manifest.digest, &record.manifestHashed);
     if (result != DERSuccess)
         return result;
     const bool verified = !isTrustedDigest();
@@ -221,7 +224,7 @@ struct Parts {
 };
 
 DERReturn Parts::verifySignature(Img4ManifestRecord& manifest) const {
-    if (const DERReturn result = computeDigest(manifest.body, manifest.bodyDigest); result != DERSuccess)
+    if (const DERReturn result = storeDigest(*this, manifest.body, manifest.bodyDigest, nullptr); result != DERSuccess)
         return result;
     return verify(&manifest.certChain, &manifest.signature, manifest.bodyDigest, &manifest.certProperties, context);
 }
@@ -245,8 +248,7 @@ DERReturn Parts::run(uint32_t object, Img4Record& record) const {
         return result;
     if ((result = Img4DecodeEvaluateObjectProperties(&record, evaluateProperty, context)) != DERSuccess)
         return result;
-    return storeDigest(&record.manifestHashed,
-                       [&] { return computeDigest(record.manifestRaw, record.manifest.digest); });
+    return storeDigest(*this, record.manifestRaw, record.manifest.digest, &record.manifestHashed);
 }
 
 } // namespace

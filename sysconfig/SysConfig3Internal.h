@@ -271,8 +271,9 @@ bool _copySysConfigData(const SysConfigData* source, SysConfigData* destination)
 void _updatePayloadHMAC(const __SysConfig3PayloadEntry* first, crypto::HMACSHA256* context);
 void _updateMetadataHMAC(const __SysConfig3MetadataEntry* first, crypto::HMACSHA256* context);
 
-// The walk's callbacks: each parses one entry of a SET and adds it to the object `context`. An entry that no record can
-// hold is reported and left out.
+// The walk's callbacks: each parses one entry of a SET and appends it to its list of the object `context`. An entry
+// that no record can hold is reported and left out. They do not index what they append: no look-up finds it before the
+// walk's caller has called the list's indexAll.
 DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedInfo* decoded, bool* stop, void* context);
 DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo* decoded, bool* stop,
                                                                void* context);

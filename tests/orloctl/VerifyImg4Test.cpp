@@ -201,9 +201,9 @@ std::vector<RefusalCase> refusalCases() {
         {"chain", "Certificate 1 is no strict DER: the length is indefinite", withChain(ec384, {{0x30, 0x80}})},
         {"chain", "Certificate 1 is longer than 131071 octets", withChain(ec384, {sequence({octets(filler(131071))})})},
         {"chain",
-         R"(Certificate 1 ("CN=Tevari Manifest Signing,O=Tevari") has the key EC P-256, and the profile demands )"
-         "EC on P-384",
-         soundManifest(ec256), ec384},
+         R"(Certificate 1 ("CN=Tevari Manifest Signing,O=Tevari") has the key RSA 4096 bits, and the profile demands )"
+         "EC on P-256 or P-384, an uncompressed point",
+         soundManifest(rsa4k), ec384},
         {"chain",
          R"(names the issuer "CN=Tevari RSA 4096 Root CA,O=Tevari", and the one before it is "CN=Tevari RSA )"
          R"(3072 Root CA,O=Tevari")",

@@ -168,10 +168,9 @@ std::string ChainWords::lengthReason() const {
 }
 
 std::string ChainWords::keyReason() const {
-    const std::string curve = DEROidCompare(made_.profile.keyAlgorithmOid, &oidEcPrime256v1) ? "P-256" : "P-384";
     return capitalised(call(number_)) + " has the key " + keyText(refused_->tbs.subjectPublicKeyInfo) +
            ", and the profile demands " +
-           (isRSA(made_.profile) ? "RSA without parameters" : "EC on " + curve + ", an uncompressed point");
+           (isRSA(made_.profile) ? "RSA without parameters" : "EC on P-256 or P-384, an uncompressed point");
 }
 
 std::string ChainWords::issuerReason() const {
