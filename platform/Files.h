@@ -41,15 +41,15 @@ Value attributes(std::string_view path, Error* error = nullptr);
 bool exists(std::string_view path);
 
 // Makes `contents` the whole contents of the file at `path`: a new file of mode 0600 in the same directory, flushed to
-// the disk and then renamed over the target. No symbolic link is followed on the way. Returns false, and leaves
+// the disk and then renamed over the target. A symbolic link at the end is not followed. Returns false, and leaves
 // everything as it was, when the directory is missing or the target exists and is no regular file. The same goes for a
 // new file that was made but could not be filled or moved to its place; *writeError, when given, is then set and says
 // why.
 bool replace(std::string_view path, const Value::Data& contents, std::optional<Error>* writeError = nullptr);
 
-// Appends `text` to the file at `path` with one write; the file is created with mode 0640 when it is missing and closed
-// again at the end. A symbolic link or anything but a regular file is not opened. False when the text could not be
-// written.
+// Appends `text` to the file at `path` with one write; the file is created with mode 0640 when it is missing, keeps the
+// mode that it has otherwise, and is closed again at the end. A symbolic link or anything but a regular file is not
+// opened. False when the text could not be written.
 bool append(std::string_view path, std::string_view text);
 
 } // namespace files

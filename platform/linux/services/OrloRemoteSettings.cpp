@@ -99,7 +99,7 @@ std::string readSecretFile(const std::string& path) {
     const auto failWithErrno = [&] {
         fail("The store's accessKeyFile " + path + " cannot be read: " + std::strerror(errno));
     };
-    const FileDescriptor file = openInRoot(path, O_RDONLY | O_NONBLOCK);
+    const FileDescriptor file = openInRoot(path, O_RDONLY);
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0)
         failWithErrno();

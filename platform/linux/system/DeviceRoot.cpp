@@ -1,33 +1,125 @@
 #include "platform/linux/system/DeviceRoot.h"
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
+#include <climits>
 #include <cstdlib>
 #include <new>
 #include <utility>
+#include <vector>
 
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 
 namespace {
 
-int openat2(int directory, const char* path, const open_how& how) {
-    // The kernel gives up with EAGAIN when something on the way was renamed while it looked, which an attacker could
-    // go on doing for ever.
-    for (int attempts = 0; attempts < 100; ++attempts) {
-        const long result = ::syscall(SYS_openat2, directory, path, &how, sizeof how);
-        if (result >= 0 || (errno != EINTR && errno != EAGAIN))
-            return static_cast<int>(result);
-    }
-    return -1;
-}
+constexpr int mostLinks = 40; // as many as the kernel follows
+constexpr std::size_t deepest = 128;
 
 std::nullopt_t nothing(int number) {
     errno = number;
     return std::nullopt;
 }
+
+FileDescriptor none(int number) {
+    errno = number;
+    return {};
+}
+
+bool isSame(const struct stat& one, const struct stat& other) {
+    return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
+// The way from the device root to what a path names, one name at a time. No name is looked up but in a directory that
+// is held open, links are read and never followed by the kernel, and ".." goes back to the directory that was passed on
+// the way here, wherever that has been moved to meanwhile.
+class Walk {
+public:
+    // What `path` names, as a descriptor of O_PATH.
+    FileDescriptor find(std::string_view path, bool followLast, Links links) {
+        if (path.empty() || path.size() >= PATH_MAX || path.find('\0') != std::string_view::npos)
+            return none(path.empty() ? ENOENT : path.size() >= PATH_MAX ? ENAMETOOLONG : EINVAL);
+        passed_.push_back(openDeviceRoot());
+        if (!passed_.back())
+            return {};
+        rest_ = path;
+        for (int linksLeft = links == Links::Followed ? mostLinks : 0; takeName();) {
+            if (name_ == ".." && passed_.size() > 1)
+                passed_.pop_back();
+            if (name_ == "." || name_ == "..")
+                continue;
+            FileDescriptor next(::openat(passed_.back().get(), name_.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+            if (!next || ::fstat(next.get(), &status_) != 0)
+                return {};
+            const bool isLast = rest_.empty();
+            if (S_ISLNK(status_.st_mode) && (followLast || !isLast || links == Links::Refused)) {
+                if (linksLeft-- == 0)
+                    return none(ELOOP);
+                if (!goOnWith(next))
+                    return {};
+            } else if (isLast) {
+                return next;
+            } else if (!S_ISDIR(status_.st_mode) || passed_.size() > deepest) {
+                return none(S_ISDIR(status_.st_mode) ? ENAMETOOLONG : ENOTDIR);
+            } else {
+                passed_.push_back(std::move(next));
+            }
+        }
+        FileDescriptor directory = std::move(passed_.back());
+        return ::fstat(directory.get(), &status_) == 0 ? std::move(directory) : FileDescriptor();
+    }
+
+    // Opens the regular file or directory that was found, that very one; nothing else is opened, since opening alone
+    // can arm a device or wake who waits at a FIFO.
+    FileDescriptor open(const FileDescriptor& found, int flags) {
+        if (S_ISDIR(status_.st_mode))
+            return FileDescriptor(::openat(found.get(), ".", flags));
+        if (!S_ISREG(status_.st_mode))
+            return none(S_ISLNK(status_.st_mode) ? ELOOP : ENXIO);
+        if ((flags & O_DIRECTORY) != 0)
+            return none(ENOTDIR);
+        FileDescriptor file(::open(("/proc/self/fd/" + std::to_string(found.get())).c_str(), flags & ~O_NOFOLLOW));
+        if (file || errno != ENOENT)
+            return file;
+        // Without /proc only the name is left, and what it names may have changed since.
+        file =
+            FileDescriptor(::openat(passed_.back().get(), name_.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY));
+        struct stat opened;
+        return file && ::fstat(file.get(), &opened) == 0 && isSame(opened, status_) ? std::move(file) : none(EAGAIN);
+    }
+
+private:
+    // Takes the next name off the rest of the path; false when there is none.
+    bool takeName() {
+        const std::size_t start = rest_.find_first_not_of('/');
+        if (start == std::string::npos)
+            return false;
+        const std::size_t end = std::min(rest_.find('/', start), rest_.size());
+        name_ = rest_.substr(start, end - start);
+        rest_.erase(0, end);
+        return true;
+    }
+
+    // Puts the text of a link in front of the rest of the path.
+    bool goOnWith(const FileDescriptor& link) {
+        std::array<char, PATH_MAX> text;
+        const ssize_t size = ::readlinkat(link.get(), "", text.data(), text.size());
+        if (size <= 0 || size == PATH_MAX) {
+            errno = size < 0 ? errno : size == 0 ? ENOENT : ENAMETOOLONG;
+            return false;
+        }
+        rest_.insert(0, text.data(), static_cast<std::size_t>(size));
+        if (text[0] == '/')
+            passed_.erase(passed_.begin() + 1, passed_.end());
+        return true;
+    }
+
+    std::vector<FileDescriptor> passed_; // the root, and the directories below it that lead to the next name
+    std::string name_;                   // the last name that was looked up
+    std::string rest_;
+    struct stat status_ = {}; // of what was found
+};
 
 } // namespace
 
@@ -40,23 +132,14 @@ FileDescriptor openDeviceRoot() {
     return FileDescriptor(::open(deviceRootPath().c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
 }
 
-FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode, std::uint64_t resolve) {
-    if (path.find('\0') != std::string_view::npos) {
-        errno = EINVAL;
-        return {};
-    }
-    const FileDescriptor root = openDeviceRoot();
-    if (!root)
-        return {};
-    open_how how = {};
-    how.flags = static_cast<unsigned>(flags | O_CLOEXEC | ((flags & O_PATH) != 0 ? 0 : O_NOCTTY));
-    how.mode = mode;
-    how.resolve = resolve | RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS;
-    return FileDescriptor(openat2(root.get(), std::string(path).c_str(), how));
+FileDescriptor openInRoot(std::string_view path, int flags, Links links) {
+    Walk walk;
+    FileDescriptor found = walk.find(path, (flags & O_NOFOLLOW) == 0, links);
+    return !found || (flags & O_PATH) != 0 ? std::move(found) : walk.open(found, flags | O_CLOEXEC);
 }
 
-FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve) {
-    return openInRoot(path, O_RDONLY | O_DIRECTORY, 0, resolve);
+FileDescriptor openDirectoryInRoot(std::string_view path, Links links) {
+    return openInRoot(path, O_RDONLY | O_DIRECTORY, links);
 }
 
 FileDescriptor makeDirectoryInRoot(std::string_view path, mode_t mode) {

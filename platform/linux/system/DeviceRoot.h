@@ -2,13 +2,13 @@
 // or named in a request. It is the value of the environment variable VELTRA_DEVICE_ROOT, "/" when that is not set or
 // empty, and is read at every call.
 //
-// The kernel resolves the paths (openat2 with RESOLVE_IN_ROOT), so that neither "..", nor an absolute symbolic link,
-// nor a link swapped in meanwhile leads out of the root. Magic links of /proc are never followed. Code that needs more
-// than one operation on a place opens the directory once and goes on with the *at system calls.
+// A path is walked name by name, each looked up in a directory that is held open, so that neither "..", nor an absolute
+// symbolic link, nor anything that is renamed or swapped in meanwhile leads out of the root; a link of /proc counts as
+// the path that it shows. This needs nothing of the kernel that an old one, a system-call filter or an emulator lacks.
+// Code that needs more than one operation on a place opens the directory once and goes on with the *at system calls.
 #ifndef VELTRA_PLATFORM_LINUX_DEVICE_ROOT_H
 #define VELTRA_PLATFORM_LINUX_DEVICE_ROOT_H
 
-#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -24,13 +24,21 @@ std::string deviceRootPath();
 // Opens the device root itself, for the *at system calls. None, with errno set, when it is missing or no directory.
 FileDescriptor openDeviceRoot();
 
-// Opens the device path `path` with the flags of open(2); O_CLOEXEC and O_NOCTTY are always added. `mode` is the mode
-// of a file that O_CREAT makes. `resolve` adds RESOLVE_ flags of openat2(2), such as RESOLVE_NO_SYMLINKS. A relative
-// path counts from the root. None, with errno set, on failure; an empty path is ENOENT and one that holds a NUL EINVAL.
-FileDescriptor openInRoot(std::string_view path, int flags, mode_t mode = 0, std::uint64_t resolve = 0);
+// Whether symbolic links on the way and at the end of a path are followed, or end it with ELOOP.
+enum class Links {
+    Followed,
+    Refused,
+};
+
+// Opens what the device path `path` names with the flags of open(2), but never makes it; O_CLOEXEC is always added, and
+// with O_NOFOLLOW a link at the end is not followed. Its kind is looked at first: without O_PATH only a regular file or
+// a directory is opened, anything else is ENXIO and not touched. A relative path counts from the root. None, with errno
+// set, on failure; an empty path is ENOENT, one that holds a NUL EINVAL, and one that leads through more than 128
+// directories ENAMETOOLONG.
+FileDescriptor openInRoot(std::string_view path, int flags, Links links = Links::Followed);
 
 // Opens the directory at the device path `path` for reading and for the *at system calls.
-FileDescriptor openDirectoryInRoot(std::string_view path, std::uint64_t resolve = 0);
+FileDescriptor openDirectoryInRoot(std::string_view path, Links links = Links::Followed);
 
 // Opens the directory at the device path `path`, which is made first when it is missing: with mode `mode`, and those
 // above it with mode 0755. What is made outlasts a power cut.

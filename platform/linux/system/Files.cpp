@@ -9,7 +9,6 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <sys/stat.h>
 
 #include "platform/linux/system/DeviceRoot.h"
@@ -35,10 +34,25 @@ bool mayBeReplaced(const FileDescriptor& directory, const std::string& name) {
     return S_ISREG(status.st_mode);
 }
 
+// Makes the log file, with the mode that it should have whatever bits the umask takes; or opens the one that another
+// process has made meanwhile.
+FileDescriptor makeLog(std::string_view path) {
+    const std::optional<DevicePath> parts = splitDevicePath(path);
+    const FileDescriptor directory = parts ? openDirectoryInRoot(parts->parent) : FileDescriptor();
+    if (!directory)
+        return {};
+    FileDescriptor file(
+        ::openat(directory.get(), parts->name.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_EXCL | O_CLOEXEC, logMode));
+    if (!file)
+        return errno == EEXIST ? openInRoot(path, O_WRONLY | O_APPEND | O_NOFOLLOW) : FileDescriptor();
+    ::fchmod(file.get(), logMode);
+    return file;
+}
+
 } // namespace
 
 std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum, Error* error) {
-    const FileDescriptor file = openInRoot(path, O_RDONLY | O_NONBLOCK);
+    const FileDescriptor file = openInRoot(path, O_RDONLY);
     std::optional<Value::Data> contents = file ? readRegularFile(file, maximum) : std::nullopt;
     if (!contents)
         explain(error);
@@ -89,7 +103,7 @@ bool replace(std::string_view path, const Value::Data& contents, std::optional<E
     const std::optional<DevicePath> parts = splitDevicePath(path);
     if (!parts)
         return false;
-    const FileDescriptor directory = openDirectoryInRoot(parts->parent, RESOLVE_NO_SYMLINKS);
+    const FileDescriptor directory = openDirectoryInRoot(parts->parent);
     if (!directory || !mayBeReplaced(directory, parts->name))
         return false;
     NewFile file(directory);
@@ -104,12 +118,10 @@ bool replace(std::string_view path, const Value::Data& contents, std::optional<E
 }
 
 bool append(std::string_view path, std::string_view text) {
-    const FileDescriptor file = openInRoot(path, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK, logMode);
-    struct stat status;
-    if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode))
-        return false;
-    // A new file has the mode that it should have, whatever bits the umask took.
-    if (status.st_size == 0 && (status.st_mode & 07777) != logMode && ::fchmod(file.get(), logMode) != 0)
+    FileDescriptor file = openInRoot(path, O_WRONLY | O_APPEND | O_NOFOLLOW);
+    if (!file && errno == ENOENT)
+        file = makeLog(path);
+    if (!file)
         return false;
     ssize_t count;
     do
