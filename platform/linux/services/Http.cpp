@@ -214,7 +214,9 @@ void Client::set(CURLoption option, Setting setting) {
 
 void Client::configure(const Request& request) {
     set(CURLOPT_URL, request.url.c_str());
-    set(CURLOPT_PATH_AS_IS, 1L);
+    // libcurl signs no path that it is to leave as it is. It would only take dot segments out, which those who have a
+    // request signed refuse.
+    set(CURLOPT_PATH_AS_IS, request.signature ? 0L : 1L);
     set(CURLOPT_PROTOCOLS_STR, "http,https");
     set(CURLOPT_PROXY, request.proxy.c_str());
     set(CURLOPT_NOPROXY, "");
