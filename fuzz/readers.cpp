@@ -1,0 +1,178 @@
+// Any octets to the readers of what comes from files and servers, each of which may hold so many bytes of memory for an
+// octet of its input. The first octet says to which reader the others go.
+#include <algorithm>
+#include <chrono>
+#include <span>
+#include <string>
+#include <string_view>
+#include <thread>
+
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "Daemon/CrashLogs.h"
+#include "fuzz/Growth.h"
+#include "platform/Base64.h"
+#include "platform/URL.h"
+#include "platform/linux/services/Http.h"
+#include "platform/linux/services/OrloRemoteSettings.h"
+#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/system/DescriptionCheck.h"
+#include "platform/linux/system/Json.h"
+#include "platform/linux/system/PropertyList.h"
+#include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+using Octets = std::span<const std::uint8_t>;
+
+std::string_view textOf(Octets octets) {
+    return {reinterpret_cast<const char*>(octets.data()), octets.size()};
+}
+
+const TemporaryRoot& root() {
+    static const TemporaryRoot shared;
+    return shared;
+}
+
+void readPropertyList(Octets octets) {
+    (void)propertyListToValue({octets.begin(), octets.end()});
+}
+
+// As a device description, whose faults are said too.
+void readJson(Octets octets) {
+    std::string refusal;
+    const std::optional<Value> value = jsonToValue(textOf(octets), &refusal);
+    FUZZ_REQUIRE(value.has_value() == refusal.empty());
+    FUZZ_REQUIRE(!value || descriptionFaults(*value).size() <= 21);
+}
+
+void readJsonMember(Octets octets) {
+    (void)jsonTextMember(textOf(octets), "os_version");
+}
+
+// What is accepted comes back from an encoding of its own. (It need not be this one: the bits of the last character
+// that no octet has may be any.)
+void readBase64(Octets octets) {
+    const std::optional<Value::Data> data = base64Decode(textOf(octets));
+    FUZZ_REQUIRE(!data || (data->size() <= octets.size() / 4 * 3 && base64Decode(base64Encode(*data)) == data));
+}
+
+void readURL(Octets octets) {
+    (void)isWellFormedURL(textOf(octets)); // which need not agree with libcurl
+    try {
+        (void)http::Url(std::string(textOf(octets))).under("/records").scheme();
+    } catch (const http::Failure&) {
+    }
+}
+
+// The store's settings, with the octets as one of its files.
+void readStoreFile(Octets octets, const char* store) {
+    root().write("/file", textOf(octets));
+    ::chmod(root().host("/file").c_str(), S_IRUSR);
+    try {
+        (void)readRemoteSettings(*jsonToValue(store));
+    } catch (const OrloStoreFailure&) {
+    }
+    ::unlink(root().host("/file").c_str());
+}
+
+void readAuthorities(Octets octets) {
+    readStoreFile(octets, R"({"caFile": "/file"})");
+}
+
+void readAccessKey(Octets octets) {
+    readStoreFile(octets, R"({"s3": {"region": "r", "bucket": "b", "accessKeyFile": "/file"}})");
+}
+
+// A folder with one crash log: its name is the first line, its contents are the rest.
+void readCrashLogs(Octets octets) {
+    const std::string_view text = textOf(octets);
+    const std::size_t end = std::min(text.find('\n'), text.size());
+    std::string name(text.substr(0, std::min<std::size_t>(end, 200)));
+    std::erase_if(name, [](char c) { return c == '/' || c == '\0'; });
+    const std::string path = "/private/var/logs/" + (name == "." || name == ".." ? "" : name) + ".log";
+    root().write("/System/Library/Quennel/SystemVersion.plist",
+                 "<plist><dict><key>ProductBuildVersion</key><string>1</string></dict></plist>");
+    root().write(path, text.substr(std::min(end + 1, text.size())));
+    Value response;
+    FUZZ_REQUIRE(get_ramdisk_logs(&response) == (response["Data"].isNothing() ? 45 : 0));
+    ::unlink(root().host(path).c_str());
+}
+
+// A server on the loopback interface that answers the next request with the octets it is given.
+class Server {
+public:
+    Server() : listener_(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+        sockaddr_in address = {};
+        address.sin_family = AF_INET;
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t length = sizeof address;
+        auto* const any = reinterpret_cast<sockaddr*>(&address);
+        FUZZ_REQUIRE(::bind(listener_, any, length) == 0 && ::listen(listener_, 1) == 0 &&
+                     ::getsockname(listener_, any, &length) == 0);
+        url_ = "http://127.0.0.1:" + std::to_string(ntohs(address.sin_port)) + "/";
+    }
+
+    const std::string& url() const { return url_; }
+
+    void answer(Octets octets) const {
+        const int connection = ::accept(listener_, nullptr, nullptr);
+        std::string request;
+        char bytes[1024];
+        for (ssize_t count = 1; count > 0 && request.find("\r\n\r\n") == std::string::npos;) {
+            count = ::recv(connection, bytes, sizeof bytes, 0);
+            request.append(bytes, static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+        }
+        (void)::send(connection, octets.data(), octets.size(), MSG_NOSIGNAL);
+        ::close(connection);
+    }
+
+private:
+    int listener_;
+    std::string url_;
+};
+
+// An answer that is taken ends where its headers say.
+void readHttpAnswer(Octets octets) {
+    static const Server server;
+    std::thread answering([octets] { server.answer(octets); });
+    try {
+        const std::chrono::milliseconds limit(5000);
+        http::Client client;
+        const http::Answer answer = client.exchange({.method = "GET",
+                                                     .url = server.url(),
+                                                     .limits = {limit, limit, std::chrono::seconds(5)},
+                                                     .maximumAnswer = 1 << 16,
+                                                     .endMustBeMarked = true});
+        FUZZ_REQUIRE(answer.body.size() <= octets.size());
+    } catch (const http::Failure&) {
+    }
+    answering.join();
+}
+
+constexpr std::size_t kibibyte = 1024;
+
+// What a reader may hold beside what its input needs, and for each octet.
+constexpr struct {
+    void (*read)(Octets);
+    std::size_t base;
+    std::size_t perOctet;
+} readers[] = {
+    {readPropertyList, 64 * kibibyte, 256}, {readJson, 16 * kibibyte, 256},      {readJsonMember, 16 * kibibyte, 16},
+    {readBase64, 16 * kibibyte, 16},        {readURL, 16 * kibibyte, 64},        {readAuthorities, 256 * kibibyte, 64},
+    {readAccessKey, 64 * kibibyte, 32},     {readCrashLogs, 256 * kibibyte, 64}, {readHttpAnswer, 512 * kibibyte, 64},
+};
+
+} // namespace
+
+int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    if (size == 0)
+        return 0;
+    const auto& reader = readers[data[0] % std::size(readers)];
+    const Octets octets(data + 1, size - 1);
+    requireProportion(size, reader.base, reader.perOctet, [&] { reader.read(octets); });
+    return 0;
+}
