@@ -6,7 +6,7 @@ import signal
 import subprocess
 import unittest
 
-from harness import BIN, NAME, Service
+from harness import BIN, LOG, NAME, Service
 
 RESULT = "tmp/new_bCfg"
 SUCCESS = {"name": "setGlobalbCfg", "statusCode": 0}
@@ -166,10 +166,11 @@ class Entitlement(ServiceTest):
                 if ticket is not None:
                     path.write_bytes(ticket)
                 answers = []
-                lines = self.service.messages_of(lambda: answers.append(self.service.orloctl("check-entitlement")))
+                lines = self.service.messages_of(lambda: answers.extend(self.service.orloctl("check-entitlement")))
                 response = {"name": "checkCorvoPostSwapEntitlement", "statusCode": 0,
                             "response": {"IsPostSwapEntitled": entitled}}
-                self.assertEqual(answers, [(0, {"exitStatus": 0, "response": response})])
+                self.assertEqual((answers[0], answers[1]["response"]), (0, response))
+                self.assertEqual(LOG in answers[1].get("note", ""), not entitled)
                 checking = "Checking entitlement for eksp     , tag 1701540720"
                 self.assertEqual(lines[4:], [checking, line] if line else [checking])
 

@@ -11,6 +11,7 @@
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
+#include "platform/Files.h"
 #include "platform/linux/services/BusValue.h"
 #include "tools/orloctl/Interruption.h"
 
@@ -19,6 +20,8 @@ namespace {
 constexpr const char* serviceName = "com.tevari.VeltraOrloServices";
 constexpr const char* servicePath = "/com/tevari/VeltraOrloServices";
 constexpr const char* serviceInterface = "com.tevari.VeltraPluginServer";
+constexpr const char* logPath = "/private/var/log/com.tevari.VeltraOrloServices.log";
+constexpr const char* journal = "the journal (journalctl -u veltra-orlo-services)";
 
 using Clock = std::chrono::steady_clock;
 using BusPtr = std::unique_ptr<sd_bus, decltype(&sd_bus_close_unref)>;
@@ -63,6 +66,23 @@ MessagePtr requestMessage(sd_bus* connection, const std::string& command, const 
     return owner;
 }
 
+std::int64_t logSize() {
+    return files::attributes(logPath)["Size"].integer().value_or(0);
+}
+
+// Where the service has said what it did. Only what the service manager starts for the system bus writes to the journal
+// for certain.
+std::string whereReasonsAre(const std::string& bus, std::int64_t logSizeBefore) {
+    const std::int64_t size = logSize();
+    const bool logged = size > 0 && size != logSizeBefore; // a log that was rotated meanwhile is smaller
+    const std::string log = std::string(logPath) + " on the device";
+    if (bus == "system")
+        return logged ? "The reasons are in " + log + " and in " + journal + "."
+                      : "The request left nothing in " + log + "; the reasons are in " + journal + ".";
+    return logged ? "The reasons are in " + log + "."
+                  : "The request left nothing in " + log + "; see what the service printed.";
+}
+
 // Reads a reply into an answer. A reply without response object is one to an unknown command.
 Answer answerFrom(sd_bus_message* reply, const std::string& command) {
     int completed = 0;
@@ -90,6 +110,10 @@ Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address)
         return answer;
     }
     const std::string where = " on the bus \"" + address.bus + "\"";
+    if (std::string_view(error.name) == SD_BUS_ERROR_ACCESS_DENIED && geteuid() != 0) {
+        answer.problem = "Only root may call the service" + where + ".";
+        return answer;
+    }
     if (std::string_view(error.name) == SD_BUS_ERROR_NO_REPLY)
         answer.problem = "The service" + where + " did not answer: " + text;
     else if (std::string_view(error.name) == SD_BUS_ERROR_SERVICE_UNKNOWN)
@@ -146,6 +170,7 @@ Answer converse(sd_bus* connection, const ServiceAddress& address, const std::st
     constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
     constexpr std::chrono::microseconds tick = std::chrono::seconds(1);
     const MessagePtr message = requestMessage(connection, command, arguments);
+    const std::int64_t logSizeBefore = logSize();
     Pending pending{address, command, {}, {}};
     sd_bus_slot* slot = nullptr;
     check(sd_bus_call_async(connection, &slot, message.get(), onReply, &pending, noTimeoutOfItsOwn));
@@ -169,6 +194,9 @@ Answer converse(sd_bus* connection, const ServiceAddress& address, const std::st
     sd_bus_set_method_call_timeout(connection, static_cast<std::uint64_t>(std::max(timeLeft(address), tick).count()));
     if (!pending.sender.empty())
         pending.answer->serviceUser = userOf(connection, pending.sender.c_str());
+    pending.answer->reasons = whereReasonsAre(address.bus, logSizeBefore);
+    if (pending.answer->outcome == Outcome::Failure)
+        pending.answer->problem += ' ' + pending.answer->reasons;
     return *pending.answer;
 }
 

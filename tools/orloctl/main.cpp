@@ -111,7 +111,7 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
         out << "  result: " << remarks.result << '\n';
     if (!remarks.note.empty())
         std::cerr << "orloctl: " << remarks.note << '\n';
-    if (!answer.problem.empty() && Value(answer.response)["statusCode"].integer() == 0)
+    if (!answer.problem.empty())
         std::cerr << "orloctl: " << answer.problem << '\n';
     return status;
 }
@@ -122,6 +122,14 @@ int send(const Options& options, const std::string& command, const Value::Dictio
 
 int call(const Options& options, const std::string& command, const std::vector<std::string>& words) {
     return send(options, command, parseArguments(words));
+}
+
+int checkEntitlement(const Options& options) {
+    const Answer answer = sendRequest(options.address, "checkCorvoPostSwapEntitlement", {});
+    Remarks remarks;
+    if (Value(answer.response)["response"]["IsPostSwapEntitled"] == Value(false))
+        remarks.note = "The boot ticket does not hold the entitlement, or cannot be read. " + answer.reasons;
+    return report(options, answer, remarks);
 }
 
 // Without classes the choice is the plug-in's.
@@ -269,7 +277,7 @@ private:
 
         verb = app_.add_subcommand("check-entitlement",
                                    "Ask whether the boot ticket entitles the device to swapped parts");
-        verb->callback([this] { run_ = [this] { return call(options_, "checkCorvoPostSwapEntitlement", {}); }; });
+        verb->callback([this] { run_ = [this] { return checkEntitlement(options_); }; });
 
         verb = app_.add_subcommand("get-tcrt", "Read the top module's certificate and its serial number");
         verb->add_option("-o,--output", copyPath_, "Write the certificate to this local file, - for standard output")
