@@ -392,9 +392,32 @@ TEST_F(OrloDataStore, leavesAFileAloneThatAPlantedJournalNames) {
 
 TEST_F(OrloDataStore, refusesADatabaseOfAnotherKindAndRunsNothingOfIt) {
     ASSERT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", {'r'}), 0);
-    sql("CREATE TRIGGER t AFTER UPDATE ON records BEGIN DELETE FROM records; END");
-    EXPECT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", {'s'}), 0);
-    EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{'s'}));
+    sql("ANALYZE");
+    EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{'r'}));
+    const std::string database = root_.read(storePath);
+    const struct {
+        const char *change, *reason;
+    } rows[] = {
+        {"CREATE TRIGGER t AFTER UPDATE ON records BEGIN DELETE FROM records; END", "other tables"},
+        {"CREATE INDEX i ON records (hex(zeroblob(length(data))))", "other tables"},
+        {"CREATE TABLE t (x)", "other tables"},
+        {"ALTER TABLE records ADD COLUMN x AS (hex(data))", "other tables"},
+        {"DROP TABLE export_pairs", "lacks a table"},
+        {"PRAGMA writable_schema = 1; UPDATE sqlite_master SET sql = sql || printf('%10000s', '')", "too big"},
+        {"PRAGMA writable_schema = 1; WITH RECURSIVE n (i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n LIMIT 20000) "
+         "INSERT INTO sqlite_master SELECT 'view', i, i, 0, 'CREATE VIEW v' || i || ' AS SELECT 1' FROM n",
+         "(9)"}, // interrupted
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.change);
+        sql(row.change);
+        logged().clear();
+        EXPECT_EQ(open(), nullptr);
+        ASSERT_EQ(logged().size(), 1U);
+        EXPECT_NE(logged()[0].find(row.reason), std::string::npos) << logged()[0];
+        root_.write(storePath, database);
+        EXPECT_NE(open(), nullptr);
+    }
     sql("PRAGMA user_version = 9");
     EXPECT_EQ(open(), nullptr);
 

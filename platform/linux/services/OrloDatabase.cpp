@@ -21,31 +21,39 @@ constexpr int schemaVersion = 1;
 // is longer than the record in it.
 constexpr int longestValue = static_cast<int>(files::maximumSize) + (1 << 20);
 
+// What a statement may take while the schema is read and judged: nothing near it is needed for the service's own, and a
+// schema of a million tables, or a table of a million columns, holds nobody up.
+constexpr int mostInstructions = 100'000;
+constexpr int longestStatement = 10'000;
+
 // A record belongs to the data version under which it was put. An export is one row with its pairs beside it.
-constexpr const char* tables = R"(
-CREATE TABLE records (
+constexpr std::string_view tables[] = {
+    R"(CREATE TABLE records (
     data_version INTEGER NOT NULL,
     class        TEXT NOT NULL,
     instance     TEXT NOT NULL,
     data         BLOB NOT NULL,
     put_at       TEXT NOT NULL,
     PRIMARY KEY (class, instance, data_version)
-);
-CREATE TABLE exports (
+))",
+    R"(CREATE TABLE exports (
     id           INTEGER PRIMARY KEY,
     data_version INTEGER NOT NULL,
     ticket       TEXT NOT NULL, -- SHA-256 of the device's boot ticket
     exported_at  TEXT NOT NULL
-);
-CREATE TABLE export_pairs (
+))",
+    R"(CREATE TABLE export_pairs (
     export_id    INTEGER NOT NULL REFERENCES exports (id),
     position     INTEGER NOT NULL,
     class        TEXT NOT NULL,
     instance     TEXT NOT NULL,
     PRIMARY KEY (export_id, position)
-) WITHOUT ROWID;
-PRAGMA user_version = 1;
-)";
+) WITHOUT ROWID)",
+};
+
+// What there is beside tables of statistics, which a site may want.
+constexpr const char* ownSchema = R"(
+SELECT sql FROM sqlite_master WHERE sql IS NOT NULL AND sql NOT GLOB 'CREATE TABLE sqlite_stat?(*' ORDER BY rowid)";
 
 // The database may have been put there by anyone, so nothing in it is run or trusted.
 constexpr struct {
@@ -189,8 +197,12 @@ OrloDatabase::OrloDatabase(const FileDescriptor& directory, const std::string& n
     handle_.reset(opened);
     if (result != SQLITE_OK)
         failWithReasonOf(opened);
+    sqlite3_progress_handler(
+        handle(), mostInstructions, [](void*) { return 1; }, nullptr);
     configure();
     makeTables();
+    requireOwnTables();
+    sqlite3_progress_handler(handle(), 0, nullptr, nullptr);
 }
 
 void OrloDatabase::run(const char* sql) {
@@ -201,6 +213,7 @@ void OrloDatabase::run(const char* sql) {
 void OrloDatabase::configure() {
     sqlite3_busy_timeout(handle(), busyMilliseconds);
     sqlite3_limit(handle(), SQLITE_LIMIT_LENGTH, longestValue);
+    sqlite3_limit(handle(), SQLITE_LIMIT_SQL_LENGTH, longestStatement);
     for (const auto& setting : settings)
         if (sqlite3_db_config(handle(), setting.option, setting.value, nullptr) != SQLITE_OK)
             failWithReasonOf(handle());
@@ -232,11 +245,25 @@ void OrloDatabase::makeTables() {
     };
     if (version() == 0) {
         OrloTransaction transaction(*this);
-        if (version() == 0) // nobody was faster
-            run(tables);
+        if (version() == 0) { // nobody was faster
+            for (const std::string_view table : tables)
+                run(table.data());
+            run(("PRAGMA user_version = " + std::to_string(schemaVersion)).c_str());
+        }
         transaction.commit();
     }
     if (version() != schemaVersion)
         throw OrloStoreFailure(QDOrloErrorStorage, "The store is of version " + std::to_string(version()) +
                                                        ", which this service does not know");
+}
+
+// An index, a check or a computed column of somebody else's would be part of every put, however long it takes.
+void OrloDatabase::requireOwnTables() {
+    OrloStatement schema(handle(), ownSchema);
+    const std::string_view* own = std::begin(tables);
+    while (schema.step())
+        if (own == std::end(tables) || schema.text(0) != *own++)
+            throw OrloStoreFailure(QDOrloErrorStorage, "The store has other tables or indexes than this service's");
+    if (own != std::end(tables))
+        throw OrloStoreFailure(QDOrloErrorStorage, "The store lacks a table");
 }

@@ -45,6 +45,8 @@ class OrloDatabase {
 public:
     // Opens the database file `name` in `directory`, and makes it, with mode 0600, when it is missing. No symbolic link
     // is followed, neither for the file nor for those that SQLite keeps beside it. `directory` must outlive this.
+    // Raises OrloStoreFailure when it cannot be used, and for one with other tables, indexes, triggers or views than
+    // this service makes.
     OrloDatabase(const FileDescriptor& directory, const std::string& name);
 
     sqlite3* handle() const { return handle_.get(); }
@@ -55,6 +57,7 @@ public:
 private:
     void configure();
     void makeTables();
+    void requireOwnTables();
 
     std::unique_ptr<sqlite3, decltype(&sqlite3_close)> handle_;
 };
