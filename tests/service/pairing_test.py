@@ -52,8 +52,8 @@ class Network:
         self.folder.chmod(0o755)  # nginx's worker runs as another user
         self.http, self.https = free_ports(2)
         subprocess.run(
-            ["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-subj", "/CN=127.0.0.1", "-keyout",
-             self.folder / "key.pem", "-out", self.folder / "cert.pem"], check=True, stderr=subprocess.DEVNULL,
+            ["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-subj", "/CN=store", "-addext",
+             "subjectAltName=IP:127.0.0.1", "-keyout", self.folder / "key.pem", "-out", self.folder / "cert.pem"], check=True, stderr=subprocess.DEVNULL,
         )
         (self.folder / "huge").mkdir()
         with open(self.folder / "huge/provision", "wb") as huge:

@@ -4,13 +4,19 @@
 #include <charconv>
 #include <mutex>
 #include <new>
+#include <optional>
 #include <string_view>
 #include <system_error>
 #include <utility>
 
+#include <openssl/ssl.h>
+#include <openssl/x509v3.h>
+#include <stdlib.h>
+
 #include "platform/Crypto.h"
 #include "platform/Format.h"
 #include "platform/Utf8.h"
+#include "platform/linux/services/X509Certificate.h"
 
 namespace http {
 namespace {
@@ -18,6 +24,9 @@ namespace {
 // Of an answer that is no success only the beginning is of interest, and of no answer more headers than these.
 constexpr std::size_t maximumRefusal = std::size_t{16} << 10;
 constexpr std::size_t maximumHeaders = std::size_t{64} << 10;
+constexpr std::size_t longestTag = 256;
+
+constexpr std::string_view head = "HEAD";
 
 constexpr CURLcode passing[] = {
     CURLE_COULDNT_RESOLVE_PROXY,
@@ -47,7 +56,8 @@ struct Incoming {
     bool isTooLarge = false;
     bool hasTooManyHeaders = false;
     bool hasMarkedEnd = false; // a length, or chunks of which the last one says so
-    bool isCut = false;        // the rest of a refusal is of no interest
+    bool isEncoded = false;
+    bool isCut = false; // the rest of a refusal is of no interest
 };
 
 // libcurl calls these two through C, which no exception may cross.
@@ -83,32 +93,70 @@ std::string_view trimmed(std::string_view text) {
     return first == text.npos ? "" : text.substr(first, text.find_last_not_of(" \t\r\n") - first + 1);
 }
 
+// The value of a header when it is the one with this name, which ends in a colon.
+std::optional<std::string_view> valueOf(std::string_view header, std::string_view name) {
+    return beginsWith(header, name) ? std::optional(trimmed(header.substr(name.size()))) : std::nullopt;
+}
+
 // Whether the header says where the body ends, to libcurl too: with a length that it can represent, or with chunked as
 // the last transfer coding (RFC 9112 6.3).
 bool marksEnd(std::string_view header) {
-    constexpr std::string_view length = "content-length:";
-    constexpr std::string_view coding = "transfer-encoding:";
     constexpr std::string_view chunked = "chunked";
-    if (beginsWith(header, length)) {
-        const std::string_view value = trimmed(header.substr(length.size()));
+    if (const auto length = valueOf(header, "content-length:")) {
         curl_off_t octets = 0;
-        return std::from_chars(value.data(), value.data() + value.size(), octets).ec == std::errc();
+        return std::from_chars(length->data(), length->data() + length->size(), octets).ec == std::errc();
     }
-    const std::string_view value = trimmed(header);
-    return beginsWith(header, coding) && value.size() > chunked.size() &&
-           beginsWith(value.substr(value.size() - chunked.size()), chunked);
+    const auto coding = valueOf(header, "transfer-encoding:");
+    return coding && coding->size() >= chunked.size() &&
+           beginsWith(coding->substr(coding->size() - chunked.size()), chunked);
 }
 
-std::size_t receiveHeader(char* bytes, std::size_t, std::size_t count, void* context) {
+bool isTag(std::string_view text) {
+    return text.size() <= longestTag &&
+           std::all_of(text.begin(), text.end(), [](char c) { return c > ' ' && c < '\x7F'; });
+}
+
+std::size_t receiveHeader(char* bytes, std::size_t, std::size_t count, void* context) try {
     auto& incoming = *static_cast<Incoming*>(context);
     const std::string_view header(bytes, count);
     // The headers of a proxy's answer to CONNECT and of an interim answer come in here before those that count.
-    if (beginsWith(header, "HTTP/"))
-        incoming.hasMarkedEnd = false;
+    if (beginsWith(header, "HTTP/")) {
+        incoming.hasMarkedEnd = incoming.isEncoded = false;
+        incoming.answer.tag.clear();
+    }
     incoming.hasMarkedEnd |= marksEnd(header);
+    incoming.isEncoded |= valueOf(header, "content-encoding:").has_value();
+    if (const auto tag = valueOf(header, "etag:"); tag && isTag(*tag))
+        incoming.answer.tag = *tag;
     incoming.headers += count;
     incoming.hasTooManyHeaders = incoming.headers > maximumHeaders;
     return incoming.hasTooManyHeaders ? 0 : count;
+} catch (const std::bad_alloc&) {
+    return 0;
+}
+
+bool namesHosts(const X509* certificate) {
+    const openssl::Owner<GENERAL_NAMES, GENERAL_NAMES_free> names(
+        static_cast<GENERAL_NAMES*>(X509_get_ext_d2i(certificate, NID_subject_alt_name, nullptr, nullptr)));
+    for (int i = 0; names && i < sk_GENERAL_NAME_num(names.get()); ++i)
+        if (const int type = sk_GENERAL_NAME_value(names.get(), i)->type; type == GEN_DNS || type == GEN_IPADD)
+            return true;
+    return false;
+}
+
+// Where a certificate has no such names libcurl would turn to its common name, which is no way to name a server any
+// more (RFC 9110 4.3.4).
+int verifyNames(int isGood, X509_STORE_CTX* context) {
+    const bool isServers = X509_STORE_CTX_get_error_depth(context) == 0;
+    if (isGood == 0 || !isServers || namesHosts(X509_STORE_CTX_get_current_cert(context)))
+        return isGood;
+    X509_STORE_CTX_set_error(context, X509_V_ERR_HOSTNAME_MISMATCH);
+    return 0;
+}
+
+CURLcode prepareTls(CURL*, void* context, void*) {
+    SSL_CTX_set_verify(static_cast<SSL_CTX*>(context), SSL_VERIFY_PEER, verifyNames);
+    return CURLE_OK;
 }
 
 std::string hexadecimal(const std::uint8_t (&digest)[crypto::sha256Size]) {
@@ -160,7 +208,11 @@ std::string proxyFor(const std::string& scheme, const Value& description) {
 
 Client::Client() {
     static std::once_flag once;
-    std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
+    std::call_once(once, [] {
+        // libcurl would write the keys of every connection to the file that this names.
+        ::unsetenv("SSLKEYLOGFILE");
+        curl_global_init(CURL_GLOBAL_DEFAULT);
+    });
     handle_.reset(curl_easy_init());
     if (!handle_)
         check(CURLE_FAILED_INIT);
@@ -193,9 +245,12 @@ Answer Client::exchange(const Request& request) {
     check(curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &incoming.answer.status));
     long version = 0;
     check(curl_easy_getinfo(handle_.get(), CURLINFO_HTTP_VERSION, &version));
-    if (request.endMustBeMarked && version < CURL_HTTP_VERSION_2 && !incoming.hasMarkedEnd &&
-        incoming.answer.isSuccess())
+    if (!incoming.answer.isSuccess() || request.method == head)
+        return std::move(incoming.answer);
+    if (request.endMustBeMarked && version < CURL_HTTP_VERSION_2 && !incoming.hasMarkedEnd)
         throw Failure(CURLE_WEIRD_SERVER_REPLY, "The answer does not say where it ends");
+    if (incoming.isEncoded)
+        throw Failure(CURLE_BAD_CONTENT_ENCODING, "The answer has a Content-Encoding");
     return std::move(incoming.answer);
 }
 
@@ -240,6 +295,7 @@ void Client::configure(const Request& request) {
 
 void Client::configureTrust() {
     set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+    set(CURLOPT_SSL_CTX_FUNCTION, prepareTls);
     if (authorities_.empty())
         return;
     // These take the place of libcurl's file of authorities but not of its folder, which has the same ones.
@@ -248,7 +304,8 @@ void Client::configureTrust() {
 }
 
 void Client::configureBody(const Request& request) {
-    set(CURLOPT_CUSTOMREQUEST, request.method);
+    set(CURLOPT_NOBODY, request.method == head ? 1L : 0L); // of the answer
+    set(CURLOPT_CUSTOMREQUEST, request.method.c_str());
     if (!request.body)
         return;
     // A null pointer would make libcurl ask a callback for the octets.

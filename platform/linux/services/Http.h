@@ -1,6 +1,7 @@
 // HTTP for the services that speak it: one client, on libcurl, with the same care everywhere. The certificate of a
-// server is always verified, a redirection is an answer and is not followed, no scheme but http and https is spoken,
-// the environment's proxy variables have no say, and an answer never takes more memory than the request allows.
+// server is always verified, and names the server in its subjectAltName; a redirection is an answer and is not
+// followed; no scheme but http and https is spoken; the environment's variables for proxies and for a log of keys have
+// no say; an answer of success with a content coding is refused, and none takes more memory than the request allows.
 #ifndef VELTRA_PLATFORM_LINUX_HTTP_H
 #define VELTRA_PLATFORM_LINUX_HTTP_H
 
@@ -78,7 +79,7 @@ struct Signature {
 };
 
 struct Request {
-    const char* method;
+    std::string method;
     std::string url;
     Limits limits;
     std::size_t maximumAnswer; // octets in the body of an answer with status 2xx
@@ -95,6 +96,7 @@ struct Request {
 struct Answer {
     long status;
     Value::Data body; // of a status other than 2xx its beginning at most
+    std::string tag;  // the header ETag; empty for none, or one with blanks or of more than 256 octets
 
     bool isSuccess() const { return status >= 200 && status <= 299; }
 };
