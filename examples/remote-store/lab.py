@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""lab.py nginx|swift DEVICE-ROOT: runs a store of this folder on loopback until its standard input ends or it is
+"""lab.py nginx|swift|ceph DEVICE-ROOT: runs a store of this folder on loopback until its standard input ends or it is
 interrupted, with certificates of its own, and has the device use it.
 
 It writes the entry "store" into the device's description, takes the proxy out of it, since the servers are on this
@@ -20,6 +20,7 @@ import subprocess
 import sys
 import tempfile
 import urllib.parse
+import uuid
 import xml.etree.ElementTree
 
 HERE = pathlib.Path(__file__).resolve().parent
@@ -52,11 +53,12 @@ class Authority:
         openssl("req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-days", "2",
                 "-subj", "/CN=Authority of the lab", "-keyout", folder / "ca.key", "-out", self.certificate)
 
-    def certify(self, name, hosts=(HOST, CA_HOST), days=2):
+    def certify(self, name, hosts=(HOST, CA_HOST), days=2, common_name="store"):
         """Makes <name>.key and <name>.pem; a negative number of days makes a certificate that has expired."""
+        names = ("-addext", "subjectAltName=" + ",".join("DNS:" + host for host in hosts)) if hosts else ()
         key, request, certificate = (self.folder / f"{name}.{suffix}" for suffix in ("key", "csr", "pem"))
-        openssl("req", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-subj", "/CN=store",
-                "-addext", "subjectAltName=" + ",".join("DNS:" + host for host in hosts), "-keyout", key, "-out", request)
+        openssl("req", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-subj", "/CN=" + common_name,
+                *names, "-keyout", key, "-out", request)
         openssl("x509", "-req", "-in", request, "-CA", self.certificate, "-CAkey", self.folder / "ca.key",
                 "-CAcreateserial", "-copy_extensions", "copy", "-days", days, "-out", certificate)
         return certificate, key
@@ -86,14 +88,14 @@ class NginxStore:
     to Authority.certify."""
 
     configuration = "nginx-store.conf"
+    ports = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
 
     def __init__(self, extra="", **certificate):
         self.folder = pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
-        self.store_port, self.ca_port, *ports = free_ports(7)
-        names = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
+        self.store_port, self.ca_port, *ports = free_ports(2 + len(self.ports))
         self.values = {
             "FOLDER": self.folder, "STORE": self.store_port, "CA": self.ca_port, "USER": getpass.getuser(),
-            "DIGEST": hashlib.sha256(TRUST_OBJECT).hexdigest(), **dict(zip(names, ports)),
+            "DIGEST": hashlib.sha256(TRUST_OBJECT).hexdigest(), **dict(zip(self.ports, ports)),
         }
         self.authority = Authority(self.folder)
         self.authority.certify("store", **certificate)
@@ -162,11 +164,48 @@ class NginxStore:
         shutil.rmtree(self.folder)
 
 
-class SwiftStore(NginxStore):
-    """Swift with its S3 layer behind nginx."""
+class ObjectStore(NginxStore):
+    """An S3-compatible object store behind nginx."""
 
     configuration = "nginx-s3.conf"
     region, access_key, secret = "eu-bench-1", "orlo:bench", "a-secret/of+the=lab"
+    patience = ()  # options of curl
+    conditional = {}
+
+    def start(self, extra):
+        super().start(extra)
+        self.use_bucket("orlo-records")
+
+    def use_bucket(self, name):
+        """Makes a bucket, which is the store from now on."""
+        self.bucket = name
+        self.s3("PUT")
+
+    def s3(self, method, path=""):
+        """The body of the answer to a signed request about the bucket, past nginx."""
+        user = ":".join(urllib.parse.quote(text, safe="") for text in (self.access_key, self.secret))
+        url = f"http://{user}@127.0.0.1:{self.values['PROXY']}/{self.bucket}{path}"
+        return subprocess.run(
+            ["curl", "-sSf", "-X", method, "--aws-sigv4", f"aws:amz:{self.region}:s3", "-H",
+             "x-amz-content-sha256: UNSIGNED-PAYLOAD", *self.patience, url], check=True, stdout=subprocess.PIPE,
+        ).stdout
+
+    def describe(self, root, **changes):
+        key_file = root / "store-key"
+        key_file.write_text(f"{self.access_key}\n{self.secret}\n")
+        key_file.chmod(0o600)
+        s3 = {"region": self.region, "bucket": self.bucket, "accessKeyFile": "/store-key", **self.conditional}
+        return super().describe(root, **{"s3": s3 | changes.pop("s3", {})}, **changes)
+
+    def stored(self):
+        names = [key.text for key in xml.etree.ElementTree.fromstring(self.s3("GET")).iterfind(".//{*}Key")]
+        return {name: self.s3("GET", "/" + urllib.parse.quote(name, safe="/~")) for name in names}
+
+
+class SwiftStore(ObjectStore):
+    """Swift with its S3 layer, which knows no conditional puts."""
+
+    conditional = {"conditional": False}
 
     def start(self, extra):
         self.values |= {"SECRET": self.secret, "SUFFIX": os.urandom(8).hex()}
@@ -186,37 +225,54 @@ class SwiftStore(NginxStore):
                 self.servers.append(Server(int(pid)))
         assert len(self.servers) == len(starting), "one of Swift's servers did not start"
         super().start(extra)
-        self.use_bucket("orlo-records")
 
-    def use_bucket(self, name):
-        """Makes a bucket, which is the store from now on."""
-        self.bucket = name
-        self.s3("PUT")
 
-    def s3(self, method, path=""):
-        """The body of the answer to a signed request about the bucket, past nginx."""
-        user = ":".join(urllib.parse.quote(text, safe="") for text in (self.access_key, self.secret))
-        url = f"http://{user}@127.0.0.1:{self.values['PROXY']}/{self.bucket}{path}"
-        return subprocess.run(
-            ["curl", "-sSf", "-X", method, "--aws-sigv4", f"aws:amz:{self.region}:s3", "-H",
-             "x-amz-content-sha256: UNSIGNED-PAYLOAD", url], check=True, stdout=subprocess.PIPE,
-        ).stdout
+class CephStore(ObjectStore):
+    """Ceph's gateway, on a cluster of one that keeps everything in memory."""
 
-    def describe(self, root, **changes):
-        key_file = root / "store-key"
-        key_file.write_text(f"{self.access_key}\n{self.secret}\n")
-        key_file.chmod(0o600)
-        s3 = {"region": self.region, "bucket": self.bucket, "accessKeyFile": "/store-key"}
-        return super().describe(root, **{"s3": s3 | changes.pop("s3", {})}, **changes)
+    ports = ("PROXY", "MONITOR")
+    patience = ("--retry", "120", "--retry-delay", "1", "--retry-connrefused")
 
-    def stored(self):
-        names = [key.text for key in xml.etree.ElementTree.fromstring(self.s3("GET")).iterfind(".//{*}Key")]
-        return {name: self.s3("GET", "/" + urllib.parse.quote(name, safe="/~")) for name in names}
+    def start(self, extra):
+        cluster, disk = str(uuid.uuid4()), str(uuid.uuid4())
+        members, keys, disk_key = (self.folder / name for name in ("members", "keyring", "osd/keyring"))
+        self.values["CLUSTER"] = cluster
+        configuration = self.configure("ceph.conf")
+        for folder in ("mon", "osd"):
+            (self.folder / folder).mkdir()
+
+        # Each of the commands waits for the servers that it needs.
+        def run(start, program, *words):
+            return start([program, "-c", configuration, *words], stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+
+        def do(*words):
+            run(subprocess.run, *words).check_returncode()
+
+        def serve(*words):
+            self.servers.append(Server(run(subprocess.Popen, *words, "--foreground").pid))
+
+        for name in ("mon.", "client.admin"):
+            do("ceph-authtool", keys, "--create-keyring" if name == "mon." else "--gen-key", "--gen-key", "-n", name,
+                "--cap", "mon", "allow *", "--cap", "osd", "allow *")
+        do("monmaptool", "--create", "--addv", "a", f"[v2:127.0.0.1:{self.values['MONITOR']}]", "--fsid", cluster, members)
+        do("ceph-mon", "-i", "a", "--mkfs", "--monmap", members, "--keyring", keys)
+        serve("ceph-mon", "-i", "a")
+        do("ceph", "osd", "new", disk, "0")
+        do("ceph", "auth", "get-or-create", "osd.0", "mon", "allow profile osd", "osd", "allow *", "-o", disk_key)
+        do("ceph-osd", "-i", "0", "--keyring", disk_key, "--mkfs", "--osd-uuid", disk)
+        serve("ceph-osd", "-i", "0", "--keyring", disk_key)
+        do("radosgw-admin", "user", "create", "--uid=orlo", "--display-name=orlo", f"--access-key={self.access_key}",
+            f"--secret={self.secret}")
+        serve("radosgw", "-n", "client.admin")
+        super().start(extra)
+
+
+STORES = {"nginx": NginxStore, "swift": SwiftStore, "ceph": CephStore}
 
 
 def main(kind, root):
     root = pathlib.Path(root)
-    store = {"nginx": NginxStore, "swift": SwiftStore}[kind]()
+    store = STORES[kind]()
     try:
         path = root / "etc/veltra/device.json"
         description = json.loads(path.read_text())
@@ -233,6 +289,6 @@ def main(kind, root):
 
 
 if __name__ == "__main__":
-    if len(sys.argv) != 3 or sys.argv[1] not in ("nginx", "swift"):
-        sys.exit("usage: lab.py nginx|swift DEVICE-ROOT")
+    if len(sys.argv) != 3 or sys.argv[1] not in STORES:
+        sys.exit("usage: lab.py nginx|swift|ceph DEVICE-ROOT")
     main(*sys.argv[1:])
