@@ -7,7 +7,8 @@
 // A session is made from options (QDOrloCreateWithOptions), is given a permission and the store's trust object as
 // further options, and then serves operations. It holds the caller to its word: put, get and export are refused unless
 //   - the option "Permissions" has the exact grant for the action, the class and the instance, and
-//   - the option "TrustObjectDigest" is the SHA-256 of the store's trust object, as the session last fetched it.
+//   - the option "TrustObjectDigest" is the SHA-256 of the store's trust object, as it is at the operation or, of a
+//     remote store, as "CAURL" gave it over TLS since the session last fetched it.
 // A grant is the text "<action>:<class>:<instance>"; grants are joined by ";".
 //
 // Every operation is synchronous. A session serves one thread at a time; sessions are independent of each other, also
@@ -65,10 +66,10 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler);
 // A remote store is a server, or an S3-compatible object store when the description's "store" has "s3". How the servers
 // are reached stands there too: see platform/linux/services/OrloRemoteSettings.h. These options count:
 //   "DSURL"                    https URL of the server of records and exports
-//   "CAURL"                    https URL whose "/orlotrustobject" is asked when the trust object has not been fetched
+//   "CAURL"                    https URL whose "/orlotrustobject" is the measure of the trust object
 //   "EnableProxy"              true: http URLs are fetched through the device's proxy (ReverseProxy.h), if there is one
 //   "EnableProxySsl"           "ForHttps": if "EnableProxy" is true, so are https URLs
-//   "HTTPTimeout"              how many seconds an attempt may take: 1 to 3600, usually 30
+//   "HTTPTimeout"              how many seconds an attempt may take, all in all: 1 to 3600, usually 30
 //   "HTTPMaxAttempts"          how often the trust object is asked for, and a record put or got: 1 to 10, usually once
 //   "MultiRequestMaxAttempts"  the same for an export
 // A larger number counts as the largest, and what is no number of 1 or more as the usual one. What is tried again are
@@ -95,9 +96,13 @@ bool QDOrloDataCopyTrustObject(__QDOrlo* session, std::string_view url, Value::D
 
 // Stores `data` as the record, in place of one that is there. After success the record outlasts a crash and a power
 // cut, as far as a remote store keeps its word. After failure the store is as it was, with one exception: when the
-// answer of a server got lost (QDOrloErrorTransport) it may have stored the record, as a whole, and putting it again
-// does no harm. A remote store takes no record of more than 64 MiB, nor one whose class or instance is "." or "..", has
-// a NUL in it, a slash with nothing, "." or ".." on either side, or more than 512 bytes (QDOrloErrorStorage).
+// answer of a server got lost (QDOrloErrorTransport) it may have stored the record, as a whole, or may do so later. In
+// an object store a put is conditional on what was found before it, so that such a one is dropped once a later put has
+// been answered; in a plain one it may replace what that put.
+//
+// A remote store takes no record of more than 64 MiB, nor one whose class or instance is "." or "..", has a NUL in it,
+// a slash with nothing, "." or ".." on either side, or more than 512 bytes; an object store none whose class has a
+// slash or whose class or instance has a control character (QDOrloErrorStorage).
 bool QDOrloDataPut(__QDOrlo* session, const Value& dataClass, const Value& dataInstance, const Value::Data& data,
                    std::optional<Error>* error);
 

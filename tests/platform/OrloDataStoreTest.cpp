@@ -179,9 +179,10 @@ TEST_F(OrloDataStore, refusesWhatTheSessionHasNoGrantForOrDoesNotTrust) {
     EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{'r'}));
     EXPECT_EQ(sql("SELECT count(*) FROM exports"), std::vector<std::string>{"0"});
 
-    // Another trust object ends the trust of a session that has the digest of the one before.
+    // Another trust object ends the trust of a session that has the digest of the one before, and that at once.
     const Session before = openFor("psd2", "S1");
     root_.write(trustPath, "another");
+    EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 2);
     Data object;
     ASSERT_TRUE(QDOrloDataCopyTrustObject(before.get(), "", &object, nullptr));
     EXPECT_EQ(object, (Data{'a', 'n', 'o', 't', 'h', 'e', 'r'}));
@@ -312,6 +313,7 @@ TEST_F(OrloDataStore, makesNoSessionForARemoteStoreThatIsDescribedBadly) {
         {R"("s3": {"region": "eu", "bucket": "a/b", "accessKeyFile": "/key"})", "bucket"},
         {R"("s3": {"region": "eu", "bucket": "..", "accessKeyFile": "/key"})", "bucket"},
         {R"("s3": {"region": "eu", "bucket": "b"})", "accessKeyFile"},
+        {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/key", "conditional": 1})", "conditional"},
         {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/missing"})", "/missing cannot be read"},
         {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/open"})", "mode 0600"},
         {R"("s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/short"})", "two lines"},

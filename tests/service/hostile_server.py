@@ -1,6 +1,8 @@
 """An HTTPS server that misbehaves in the way that the last segment of a request's path names."""
+import hashlib
 import http.client
 import http.server
+import os
 import socket
 import ssl
 import threading
@@ -15,7 +17,8 @@ class Handler(http.server.BaseHTTPRequestHandler):
         pass
 
     def handle_request(self):
-        behaviour, *argument = (self.server.instead or self.path.rsplit("/", 1)[1]).split("-")
+        measure = self.server.context and self.path == "/orlotrustobject"
+        behaviour, *argument = (not measure and self.server.instead or self.path.rsplit("/", 1)[1]).split("-")
         with self.server.lock:
             self.server.seen.append((self.command, self.path))
             count = self.server.counts[self.path] = self.server.counts.get(self.path, 0) + 1
@@ -24,7 +27,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
         except (OSError, ssl.SSLError):
             self.close_connection = True
 
-    do_GET = do_PUT = handle_request
+    do_GET = do_HEAD = do_PUT = handle_request
 
     def body(self):
         return self.rfile.read(int(self.headers.get("Content-Length", 0)))
@@ -34,7 +37,8 @@ class Handler(http.server.BaseHTTPRequestHandler):
         for name, value in {"Content-Length": len(body), **headers}.items():
             self.send_header(name.replace("_", "-"), str(value))
         self.end_headers()
-        self.wfile.write(body)
+        if self.command != "HEAD":
+            self.wfile.write(body)
 
     def drop(self):
         self.connection.shutdown(socket.SHUT_RDWR)
@@ -110,6 +114,10 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.wfile.write(b"half")
         self.close_connection = True
 
+    def encoded(self, count):
+        self.body()
+        self.answer(200, b"\x1f\x8b", Content_Encoding="gzip")
+
     def mid(self, count):
         """Closes while the body of the request is under way."""
         self.rfile.read(100000)
@@ -147,6 +155,45 @@ class Handler(http.server.BaseHTTPRequestHandler):
         else:
             self.answer(*answer)
 
+    def keep(self, count, how="", *_):
+        """An object store that knows conditions, with a weakness or a bad moment."""
+        record, server = self.body(), self.server
+        late = how == "late" and self.command == "PUT" and record == b"late"
+        if late:  # carried out only when its client has gone and the put after it is answered
+            try:
+                self.stall(count)
+            except OSError:
+                pass
+            assert server.answered.wait(60)
+        if how == "busy" and self.command == "PUT" and count == 2:
+            return self.answer(503)
+        with server.lock:
+            if how == "race" and self.command == "PUT" and server.racing > 0:
+                server.racing -= 1
+                server.objects[self.path] = os.urandom(8)
+            kept = server.objects.get(self.path)
+            tag = f'"{hashlib.md5(kept).hexdigest()}"' if kept is not None else None
+            status = 200 if kept is not None else 404
+            if self.command == "PUT":
+                status = 200 if self.holds(tag, how) else server.refusal
+                if status == 200:
+                    server.objects[self.path] = record
+        if late:
+            server.finished.set()
+        elif how == "lost" and self.command == "PUT" and status == 200:
+            self.drop()
+        else:
+            headers = {} if how == "tagless" or tag is None else {"ETag": tag}
+            self.answer(status, kept or b"" if self.command != "PUT" else b"<Code>NoSuchKey</Code>", **headers)
+            if how == "late" and record == b"after":
+                server.answered.set()
+
+    def holds(self, tag, how):
+        wanted, unwanted = self.headers["If-Match"], self.headers["If-None-Match"]
+        if wanted:
+            return wanted == (tag and tag.strip('"') if how == "bare" else tag)
+        return not unwanted or tag is None
+
 
 class HostileServer(http.server.ThreadingHTTPServer):
     """Speaks plain HTTP without a certificate. `instead`, when set, is the behaviour for every path."""
@@ -157,7 +204,8 @@ class HostileServer(http.server.ThreadingHTTPServer):
         super().__init__(("127.0.0.1", 0), Handler)
         self.instead = None
         self.trust_object, self.seen, self.counts, self.failing = trust_object, [], {}, 0
-        self.lock, self.closing = threading.Lock(), threading.Event()
+        self.objects, self.racing, self.refusal = {}, 0, 412
+        self.lock, self.closing, self.answered, self.finished = threading.Lock(), *(threading.Event() for _ in range(3))
         self.context = None
         if certificate:
             self.context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)

@@ -20,8 +20,9 @@ CLASSES = (
     "pfcl HmCl IfCl CtCl GpC2 tcrt dCfg bCfg ycrt AlsH PxTC pspc FCCl pcic pcii pcvc pcvi pcve pbas pmpc pdcl prf1 "
     "prf2 psd1 psd2 pwcl psnv psdt preg"
 ).split()
-NOT_PERMITTED, NO_SUCH_RECORD, TRANSPORT, STORAGE = 1, 3, 4, 5
+NOT_PERMITTED, MISMATCH, NO_SUCH_RECORD, TRANSPORT, STORAGE = 1, 2, 3, 4, 5
 DATA_STORE, TRUST_URL = f"https://{HOST}:8443", f"http://{CA_HOST}:8080/orlotrustobject"
+MEASURE_URL = f"https://{CA_HOST}:8443/orlotrustobject"
 
 
 class Session:
@@ -32,8 +33,9 @@ class Session:
         self.root = pathlib.Path(self.folder.name)
         (self.root / "etc/veltra").mkdir(parents=True)
         self.describe(store.describe(self.root))
-        # A proxy of the environment has no say.
+        # The environment has no say.
         dead = {name: "http://127.0.0.1:1" for name in ("http_proxy", "https_proxy", "HTTPS_PROXY", "ALL_PROXY")}
+        dead["SSLKEYLOGFILE"] = str(self.root / "keys")
         self.process = subprocess.Popen(
             [BIN / "store-session"], text=True, stdin=subprocess.PIPE, stdout=subprocess.PIPE,
             stderr=subprocess.DEVNULL,
@@ -78,6 +80,7 @@ class Session:
     def close(self):
         self.process.communicate()
         assert self.process.returncode == 0, self.process.returncode
+        assert not (self.root / "keys").exists(), "keys are in a file"
         self.folder.cleanup()
 
 
@@ -162,7 +165,7 @@ class StoreCases:
                 self.assertEqual(session.get(name), (0, ""))
                 self.assertEqual(session.got(), name.encode())
                 method, path, status, grants, _ = self.store.requests()[-1]
-                self.assertEqual(path.rsplit("/", 1)[1], urllib.parse.quote(name, safe=""))
+                self.assertEqual(path.split("/records/psd2/")[1], urllib.parse.quote(name, safe=self.KEPT))
                 self.assertEqual(urllib.parse.unquote(grants.split(";")[1]), "1:psd2:" + name)
         self.assertEqual(self.store.stored(), {f"v1/records/psd2/{name}": name.encode() for name in names})
         connections = {line[4] for line in self.store.requests()[before:] if "/records/" in line[1]}
@@ -197,6 +200,7 @@ NAMES = ["S1", "a b", "100%", "a+b=c", "~-._", "...", "a%2Fb", "a:b", "?x=1&y", 
 
 
 class PlainStore(RemoteTest, StoreCases):
+    KEPT = ""
     REFUSALS = """
         location = /v2/records/psd2/BROKEN { return 500; }
         location = /v2/records/psd2/MOVED { return 302 /v2/records/psd2/VAN0001; }
@@ -273,7 +277,7 @@ class PlainStore(RemoteTest, StoreCases):
                     "HTTPSEnable": 1, "HTTPSProxy": "127.0.0.1", "HTTPSPort": proxy.port}
         session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings})
         for options, tunnels in (({}, 0), ({"EnableProxy": True}, 1), ({"EnableProxySsl": "ForHttps"}, 0),
-                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 2)):
+                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 3)):
             with self.subTest(options):
                 session.open(**options)
                 self.assertEqual(session.run("trust", TRUST_URL), (0, ""))
@@ -289,6 +293,8 @@ class PlainStore(RemoteTest, StoreCases):
 
 
 class ObjectStore(RemoteTest, StoreCases):
+    KEPT = "/"
+
     @classmethod
     def setUpClass(cls):
         cls.swift = SwiftStore()
@@ -305,7 +311,13 @@ class ObjectStore(RemoteTest, StoreCases):
         self.check_export()
 
     def test_names(self):
-        self.check_names([*NAMES, "x" * 512])
+        self.check_names([*NAMES, "x" * 512, "c/d e"])
+        session = self.session()
+        for data_class, instance in (("psd2", "a\nb"), ("psd2", "\x7f"), ("psd2", "a\x85"), ("psd2", "\uffff"),
+                                     ("psd2", "a//b"), ("psd2", "c/.."), ("psd2", "/"), ("p/2", "S1"), ("..", "S1")):
+            with self.subTest((data_class, instance)):
+                session.run("grant", data_class, instance)
+                self.assertEqual(session.run("get", data_class, instance, "/got")[0], STORAGE)
 
     def test_two_services(self):
         self.check_two_services()
@@ -344,6 +356,7 @@ class ObjectStore(RemoteTest, StoreCases):
         self.assertEqual(self.put(b"x")[2]["code"], 1011)
         self.assertIn("HTTP status 403 SignatureDoesNotMatch", self.answer("export")[2]["description"])
         connect_to = {f"{HOST}:8443": f"127.0.0.1:{tampering.server_port}",
+                      f"{CA_HOST}:8443": f"127.0.0.1:{self.store.store_port}",
                       f"{CA_HOST}:8080": f"127.0.0.1:{self.store.ca_port}"}
         unchanged, changed = (f"relay-{self.store.values['PROXY']}-{bit}" for bit in (0, 1))
         self.describe(self.service, vanter=changed, connectTo=connect_to)
@@ -363,6 +376,7 @@ class Refusals(RemoteTest):
     def test_a_certificate_that_does_not_hold_is_a_failure_that_says_why(self):
         for certificate, reason in (
             ({"hosts": ("elsewhere.example",)}, "no alternative certificate subject name matches"),
+            ({"hosts": (), "common_name": CA_HOST}, "hostname mismatch"),
             ({"days": -1}, "certificate has expired"),
             ({}, "self-signed certificate|unable to get local issuer certificate"),
         ):
@@ -374,16 +388,14 @@ class Refusals(RemoteTest):
                     self.describe(self.service, caFile=None)
                 code, text = self.error_of_get()
                 self.assertEqual(code, TRANSPORT)
-                self.assertRegex(text, f"^GET {DATA_STORE}/v2/records/psd2/VAN0001: .*({reason})")
+                self.assertRegex(text, f"^GET {MEASURE_URL}: .*({reason})")
                 self.assertEqual(self.put(b"x")[2]["code"], 1011)
-                self.assertRegex(self.answer("export")[2]["description"], f"with Reason --> PUT .*({reason})")
+                self.assertRegex(self.answer("export")[2]["description"], f"with Reason --> GET {MEASURE_URL}: .*({reason})")
                 self.assertEqual(self.store.stored(), {})
                 self.assertEqual([line for line in self.store.requests() if line[1] != "/orlotrustobject"], [])
 
 
-class Failures(RemoteTest):
-    """Servers that misbehave; every exchange ends in bounded time and memory."""
-
+class HostileTest(RemoteTest):
     def setUp(self):
         self.folder = tempfile.TemporaryDirectory(prefix="veltra-hostile-")
         self.addCleanup(self.folder.cleanup)
@@ -398,6 +410,10 @@ class Failures(RemoteTest):
         here = f"127.0.0.1:{self.server.server_port}"
         return {"backend": "remote", "caFile": "/ca.pem",
                 "connectTo": {f"{HOST}:8443": here, f"{CA_HOST}:8443": here}}
+
+
+class Failures(HostileTest):
+    """Servers that misbehave; every exchange ends in bounded time and memory."""
 
     def test_each_misbehaviour_is_an_error_with_its_reason(self):
         hasty, patient = self.session(HTTPTimeout=1), self.session(HTTPTimeout=60)
@@ -416,6 +432,7 @@ class Failures(RemoteTest):
             ("half", TRANSPORT, "closed"),
             ("noise", TRANSPORT, "HTTP/0.9"),
             ("endless-500", TRANSPORT, "HTTP status 500"),
+            ("encoded", TRANSPORT, "Content-Encoding"),
         )
         rows = [("get", *row) for row in both] + [("put", *row) for row in both] + [
             ("get", "status-404", NO_SUCH_RECORD, "HTTP status 404"),
@@ -517,6 +534,25 @@ class Failures(RemoteTest):
         for behaviour in ("plain", "idle", "plain", "idle", "plain"):
             self.assertEqual((session.put(behaviour), session.get(behaviour)), ((0, ""), (0, "")))
 
+    def test_what_came_without_tls_is_measured_by_what_came_with_it(self):
+        plain = HostileServer(None, None, b"forged")
+        self.addCleanup(plain.close)
+        session = self.session()
+        description = self.describe(session.root)
+        description["connectTo"][f"{CA_HOST}:8080"] = f"127.0.0.1:{plain.server_port}"
+        session.describe(description)
+        session.open()
+        rows = ((b"forged", TRUST_OBJECT, MISMATCH), (TRUST_OBJECT, TRUST_OBJECT, 0), (b"new", TRUST_OBJECT, MISMATCH),
+                (b"new", b"new", 0))
+        for plain.trust_object, self.server.trust_object, code in rows:
+            before = len(self.server.seen)
+            self.assertEqual(session.run("trust", TRUST_URL), (0, ""))
+            outcomes = session.put("plain")[0], session.get("plain")[0], session.run("export", ["psd2"], ["plain"])[0]
+            self.assertEqual(outcomes, (code,) * 3)
+            seen = self.server.seen[before:]
+            self.assertEqual(seen[0], ("GET", "/orlotrustobject"))
+            self.assertEqual(len(seen), 4 if code == 0 else 1)
+
     def test_the_trust_object_is_checked_before_anything_is_sent(self):
         url = f"https://{CA_HOST}:8443/"
         session = self.session(HTTPTimeout=3)
@@ -539,6 +575,77 @@ class Failures(RemoteTest):
             self.assertEqual(code, TRANSPORT, other)
             self.assertNotIn("secret", text)
         self.assertEqual([line for line in self.server.seen if line[0] == "PUT"], [])
+
+
+class Conditions(HostileTest):
+    """A scripted object store, which records are put to on condition that nothing has changed."""
+
+    conditional = {}
+
+    def describe(self, root):
+        (root / "key").write_text("id\nsecret\n")
+        (root / "key").chmod(0o600)
+        return super().describe(root) | {
+            "s3": {"region": "eu", "bucket": "b", "accessKeyFile": "/key", **self.conditional}}
+
+    def kept(self, name):
+        return self.server.objects.get(f"/b/v1/records/psd2/{name}")
+
+    def test_a_put_that_timed_out_never_overtakes_one_that_was_answered(self):
+        for self.conditional, found, outcome in (({}, None, b"after"), ({}, b"before", b"after"),
+                                                 ({"conditional": False}, None, b"late")):
+            with self.subTest((self.conditional, found)):
+                self.server.objects.clear()
+                self.server.answered.clear()
+                self.server.finished.clear()
+                session = self.session()
+                if found:
+                    self.assertEqual(session.put("keep-late", found), (0, ""))
+                session.open(HTTPTimeout=1)
+                self.assertEqual(session.put("keep-late", b"late")[0], TRANSPORT)
+                session.open()
+                self.assertEqual(session.put("keep-late", b"after"), (0, ""))
+                self.assertTrue(self.server.finished.wait(60))
+                self.assertEqual(self.kept("keep-late"), outcome)
+
+    def test_a_condition_that_does_not_hold_begins_anew(self):
+        look, again, compare = "HEAD PUT", "HEAD PUT HEAD PUT", "HEAD PUT HEAD GET PUT"
+        session = self.session()
+        rows = (
+            # name, refusal of a condition, puts of somebody else in between, outcome, requests
+            ("keep", 412, 0, 0, look),
+            ("keep", 412, 0, 0, look),
+            ("keep-bare", 412, 0, 0, look),
+            ("keep-bare", 412, 0, 0, again),
+            ("keep-bare", 412, 0, 0, look),
+            ("keep", 412, 0, 0, again),
+            ("keep-race", 412, 1, 0, compare),
+            ("keep-race", 409, 1, 0, compare),
+            ("keep-race", 404, 1, 0, compare),
+            ("keep-race", 403, 1, NOT_PERMITTED, look),
+            ("keep-lost", 412, 0, 0, "HEAD PUT PUT HEAD GET"),
+            ("keep-tagless", 412, 0, 0, look),
+            ("keep-tagless", 412, 0, TRANSPORT, "HEAD"),
+            ("status-403", 412, 0, NOT_PERMITTED, "HEAD"),
+            ("status-204", 412, 0, TRANSPORT, "HEAD"),
+            ("busy-1", 412, 0, TRANSPORT, "HEAD"),
+        )
+        for number, (name, refusal, racing, code, requests) in enumerate(rows):
+            with self.subTest((number, name)):
+                self.server.refusal, self.server.racing, before = refusal, racing, len(self.server.seen)
+                record = b"record %d" % number
+                self.assertEqual(session.put(name, record)[0], code)
+                seen = [method for method, path in self.server.seen[before:] if path != "/orlotrustobject"]
+                self.assertEqual(seen, requests.split())
+                if code == 0:
+                    self.assertEqual(self.kept(name), record)
+        for attempts, code in ((1, TRANSPORT), (2, 0)):
+            session.open(HTTPMaxAttempts=attempts)
+            self.assertEqual(session.put(f"keep-busy-{attempts}")[0], code)
+        session.open(HTTPTimeout=1)
+        self.server.racing = 1000
+        self.assertEqual(session.put("keep-race")[0], TRANSPORT)
+        self.assertIn(self.server.racing, range(900, 999))
 
 
 if __name__ == "__main__":

@@ -100,9 +100,12 @@ OrloRecordName requireGrant(const __QDOrlo& session, std::int32_t action, const 
 
 // Holds the session to the store's trust object.
 void requireTrust(const __QDOrlo& session) {
-    const OrloStoreBackend::Digest digest = session.backend->trustObjectDigest(session.options);
+    const Value::Data measure = session.backend->trustMeasure(session.options);
+    std::uint8_t digest[crypto::sha256Size];
+    if (!crypto::sha256(measure.data(), measure.size(), digest))
+        throw OrloStoreFailure(QDOrloErrorStorage, "The trust object cannot be digested");
     const Value::Data* held = optionOf(session.options, "TrustObjectDigest").data();
-    if (!held || !std::equal(held->begin(), held->end(), digest.begin(), digest.end()))
+    if (!held || !std::equal(held->begin(), held->end(), std::begin(digest), std::end(digest)))
         throw OrloStoreFailure(QDOrloErrorTrustObjectMismatch,
                                "The session's trust object digest is not that of the store's trust object");
 }

@@ -30,14 +30,16 @@ class EmbeddedStore : public OrloStoreBackend {
 public:
     EmbeddedStore(FileDescriptor directory, const std::string& name)
         : directory_(std::move(directory)),
-          trust_(directory_, name + ".trust"),
+          trust_(name + ".trust"),
           database_(directory_, name),
           put_(database_.handle(), putRecord),
           copy_(database_.handle(), copyRecord) {}
 
-    Value::Data trustObject(const OrloOptions&, std::string_view) override { return trust_.read(); }
+    Value::Data trustObject(const OrloOptions&, std::string_view) override {
+        return readTrustObject(directory_, trust_);
+    }
 
-    Digest trustObjectDigest(const OrloOptions&) override { return trust_.digest(); }
+    Value::Data trustMeasure(const OrloOptions&) override { return readTrustObject(directory_, trust_); }
 
     void put(const OrloOptions& options, const OrloRecordName& name, const Value::Data& data) override {
         bindRecord(put_, options, name).bind(4, data).step();
@@ -72,7 +74,7 @@ private:
 
     // In this order: the database reaches its files through the directory, and the statements belong to it.
     FileDescriptor directory_;
-    OrloTrustObject trust_;
+    std::string trust_; // the name of its file
     OrloDatabase database_;
     OrloStatement put_;
     OrloStatement copy_;

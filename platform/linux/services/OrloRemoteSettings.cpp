@@ -133,8 +133,12 @@ OrloRemoteSettings::ObjectStore readObjectStore(const Value& described) {
         fail("The store's s3 has no bucket");
     if (!keyFile)
         fail("The store's s3 has no accessKeyFile");
+    const Value& conditional = described["conditional"];
+    if (!conditional.isNothing() && !conditional.isBoolean())
+        fail("The store's s3 has a conditional that is neither true nor false");
     std::string contents = readSecretFile(*keyFile);
-    OrloRemoteSettings::ObjectStore store{*bucket, {*region, takeLine(contents), takeLine(contents)}};
+    OrloRemoteSettings::ObjectStore store{
+        *bucket, {*region, takeLine(contents), takeLine(contents)}, conditional.boolean().value_or(true)};
     const bool hasMore = contents.find_first_not_of(" \t\r\n") != contents.npos;
     if (hasMore || !isVisible(store.signature.accessKey) || !isVisible(store.signature.secret))
         fail("The store's accessKeyFile " + *keyFile + " does not have two lines, the access key and its secret");

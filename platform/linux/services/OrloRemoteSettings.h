@@ -14,6 +14,7 @@ struct OrloRemoteSettings {
     struct ObjectStore {
         std::string bucket;
         http::Signature signature;
+        bool isConditional; // a record is put on condition that it is still what was found before
     };
 
     std::string authorities;            // PEM; empty for those of the system alone
@@ -26,7 +27,8 @@ struct OrloRemoteSettings {
 //   "connectTo"  an object: connections to the "host:port" of a name are made to the "host:port" of its value
 //   "s3"         an object of texts: "region" (letters, digits, "-", "_"), "bucket" (letters, digits, ".", "-", "_"),
 //                and "accessKeyFile", a file on the device that only its owner may read or write, of two lines: the
-//                access key and its secret
+//                access key and its secret. A boolean "conditional" may stand beside them, true unless given: false is
+//                for a store that knows no conditions
 // An IPv6 address stands in brackets. Raises OrloStoreFailure (QDOrloErrorStorage), which says what is wrong, for
 // anything else.
 OrloRemoteSettings readRemoteSettings(const Value& store);

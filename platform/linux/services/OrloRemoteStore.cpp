@@ -1,5 +1,6 @@
 // The remote backend: records and exports on HTTPS servers, plain ones or S3-compatible object stores.
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <ctime>
 #include <optional>
@@ -79,14 +80,17 @@ bool staysBelow(std::string_view name) {
     return !name.empty() && name.back() != '/';
 }
 
-// The name as one segment of a path.
-std::string segmentOf(std::string_view name) {
-    if (!staysBelow(name) || name.find('\0') != name.npos || name.size() > longestName) {
-        std::string quoted;
-        utf8::appendQuoted(quoted, utf8::beginning(name, longestQuoted));
-        throw OrloStoreFailure(QDOrloErrorStorage, "A server can keep no record under the name " + quoted);
+// Whether an object store's list of its objects, which is XML, can show the name without a trace of it being lost:
+// there are no control characters in it and nothing that is no character.
+bool canBeListed(std::string_view name) {
+    while (!name.empty()) {
+        const utf8::Step step = utf8::next(name);
+        const bool isControl = step.point < 0x20 || (step.point >= 0x7F && step.point < 0xA0);
+        if (step.kind != utf8::Step::Character || isControl || step.point == 0xFFFE || step.point == 0xFFFF)
+            return false;
+        name.remove_prefix(step.length);
     }
-    return percentEncoded(name, isUnreserved);
+    return true;
 }
 
 std::string hexadecimal(const std::uint8_t* bytes, std::size_t length) {
@@ -95,8 +99,9 @@ std::string hexadecimal(const std::uint8_t* bytes, std::size_t length) {
 
 // The headers by which a server can decide. Of the grants nothing breaks the line or is taken for blanks around it;
 // where there are none there is no such header, since one without a value would be signed but not sent.
-std::vector<std::string> headersFor(const OrloOptions& options, const OrloStoreBackend::Digest& trusted) {
-    std::vector<std::string> headers = {"Orlo-Trust-Object-Digest: " + hexadecimal(trusted.data(), trusted.size())};
+std::vector<std::string> headersFor(const OrloOptions& options) {
+    std::vector<std::string> headers = {"Orlo-Trust-Object-Digest: " +
+                                        *QDOrloCreateInstanceString(options.at("TrustObjectDigest")).text()};
     const std::string* grants = optionOf(options, "Permissions").text();
     if (!grants || grants->empty())
         return headers;
@@ -149,8 +154,8 @@ std::string_view reasonIn(const http::Answer& answer) {
     return rest.substr(0, std::min(longestReason, static_cast<std::size_t>(end - rest.begin())));
 }
 
-[[noreturn]] void failToTransport(const char* method, const std::string& url, const std::string& reason) {
-    throw OrloStoreFailure(QDOrloErrorTransport, format("%s %s: %s", method, url, reason));
+[[noreturn]] void failToTransport(const http::Request& request, const std::string& reason) {
+    throw OrloStoreFailure(QDOrloErrorTransport, format("%s %s: %s", request.method, request.url, reason));
 }
 
 // What a status other than that of success means.
@@ -165,6 +170,25 @@ std::string_view reasonIn(const http::Answer& answer) {
                                   reason.empty() ? "" : " ", reason));
 }
 
+// Whether a conditional put came too late: its condition does not hold, or another put is under way, or the object that
+// it was to replace is gone.
+bool isOvertaken(const http::Answer& answer) {
+    return answer.status == 412 || answer.status == 409 || (answer.status == 404 && reasonIn(answer) == "NoSuchKey");
+}
+
+// Some store compares the tag without the quotes that belong to it (RFC 9110 8.8.3). What was of use last is tried
+// first.
+std::atomic<bool> tagsAreBare = false;
+
+std::string conditionOn(const http::Answer& found) {
+    if (found.status == 404)
+        return "If-None-Match: *";
+    std::string_view tag = found.tag;
+    if (tagsAreBare && tag.size() > 2 && tag.starts_with('"') && tag.ends_with('"'))
+        tag = tag.substr(1, tag.size() - 2);
+    return "If-Match: " + std::string(tag);
+}
+
 class RemoteStore : public OrloStoreBackend {
 public:
     explicit RemoteStore(OrloRemoteSettings settings) : settings_(std::move(settings)) {
@@ -173,19 +197,23 @@ public:
     }
 
     Value::Data trustObject(const OrloOptions& options, std::string_view url) override {
+        measure_.reset(); // a session that begins anew is measured by what the store has now
         return fetchTrustObject(options, std::string(url), "");
     }
 
-    Digest trustObjectDigest(const OrloOptions& options) override {
-        if (!trusted_)
-            fetchTrustObject(options, endpoint(options, "CAURL"), "/orlotrustobject");
-        return *trusted_;
+    // What `url` of trustObject gave may have come without TLS, and then proves nothing.
+    Value::Data trustMeasure(const OrloOptions& options) override {
+        if (!measure_)
+            measure_ = fetchTrustObject(options, endpoint(options, "CAURL"), "/orlotrustobject");
+        return *measure_;
     }
 
     void put(const OrloOptions& options, const OrloRecordName& name, const Value::Data& data) override {
         if (data.size() > largestRecord)
             throw OrloStoreFailure(QDOrloErrorStorage, format("A record of %lu bytes is too large", data.size()));
-        putBytes(options, recordPath(options, name), data, attemptsOfOne);
+        const bool isConditional = settings_.objectStore && settings_.objectStore->isConditional;
+        putBytes(options, recordPath(options, name), data, attemptsOfOne,
+                 isConditional ? &RemoteStore::sendIfUnchanged : &RemoteStore::sendAsItIs);
     }
 
     Value::Data copy(const OrloOptions& options, const OrloRecordName& name) override {
@@ -203,32 +231,82 @@ public:
         const std::string text = exportText(options, names);
         const std::string path = versionPath(options) + "/exports/" + ticketDigestOf(options) + "/" +
                                  utcTime("%Y%m%dT%H%M%SZ") + "-" + randomName() + ".json";
+        // Nobody else puts an object of this name, so that one which is late overtakes nothing.
         putBytes(options, path, std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size()),
-                 attemptsOfMany);
+                 attemptsOfMany, &RemoteStore::sendAsItIs);
     }
 
 private:
+    // Makes one attempt of a request, which takes no longer than its limit. On return and on failure the request is the
+    // one that the outcome is about.
+    using Send = http::Answer (RemoteStore::*)(http::Request& request);
+
+    http::Answer sendAsItIs(http::Request& request) { return client_.exchange(request); }
+
+    // Puts on condition that the object is still what it was before. A put whose client has given up may be carried out
+    // at any time after: its condition does not hold any more once a later one has been answered.
+    http::Answer sendIfUnchanged(http::Request& request) {
+        const http::Request put = request;
+        const auto end = std::chrono::steady_clock::now() + put.limits.whole;
+        const auto timeLeft = [&] {
+            return std::chrono::duration_cast<milliseconds>(end - std::chrono::steady_clock::now());
+        };
+        const auto send = [&](const char* method, const std::string& condition) {
+            request = put;
+            request.method = method;
+            request.limits = {.whole = std::max(timeLeft(), milliseconds(1))};
+            if (!condition.empty())
+                request.headers.push_back(condition);
+            else
+                request.body.reset();
+            request.maximumAnswer = condition.empty() ? largestRecord : largestReply;
+            request.endMustBeMarked = condition.empty();
+            return client_.exchange(request);
+        };
+        http::Answer found = send("HEAD", "");
+        for (milliseconds rest{0};; rest = nextRest(rest)) {
+            if (found.status >= 500)
+                return found;
+            if (found.status != 200 && found.status != 404)
+                failWith(request, found);
+            if (found.status == 200 && found.tag.empty())
+                failToTransport(request, "The answer has no tag, so that no condition can be made of it");
+            http::Answer answer = send("PUT", conditionOn(found));
+            if (!isOvertaken(answer) || timeLeft() <= rest)
+                return answer;
+            std::this_thread::sleep_for(rest);
+            http::Answer now = send("HEAD", "");
+            if (now.tag == found.tag) {
+                tagsAreBare = !tagsAreBare;
+            } else {
+                now = send("GET", "");
+                if (now.status == 200 &&
+                    std::equal(now.body.begin(), now.body.end(), put.body->begin(), put.body->end()))
+                    return now; // it was this put's own, whose answer got lost, or as good
+            }
+            found = std::move(now);
+        }
+    }
+
+    static milliseconds nextRest(milliseconds rest) { return std::clamp(2 * rest, firstRest, longestRest); }
+
     Value::Data fetchTrustObject(const OrloOptions& options, const std::string& server, std::string_view path) {
-        http::Request request{.method = "GET", .url = {}, .limits = {}, .maximumAnswer = largestTrustObject};
+        http::Request request = {.method = "GET", .url = {}, .limits = {}, .maximumAnswer = largestTrustObject};
         request.endMustBeMarked = true;
         http::Answer answer = exchange(options, server, path, request, attemptsOfOne);
         if (answer.status != 200)
-            failToTransport(request.method, request.url, format("HTTP status %d", answer.status));
+            failToTransport(request, format("HTTP status %d", answer.status));
         if (answer.body.empty())
-            failToTransport(request.method, request.url, "The trust object is empty");
-        Digest digest;
-        if (!crypto::sha256(answer.body.data(), answer.body.size(), digest.data()))
-            throw OrloStoreFailure(QDOrloErrorStorage, "The trust object cannot be digested");
-        trusted_ = digest;
+            failToTransport(request, "The trust object is empty");
         return std::move(answer.body);
     }
 
     void putBytes(const OrloOptions& options, const std::string& path, std::span<const std::uint8_t> bytes,
-                  const NumberOption& attempts) {
+                  const NumberOption& attempts, Send send) {
         constexpr long stored[] = {200, 201, 204};
         http::Request request = dataStoreRequest("PUT", options);
         request.body = bytes;
-        const http::Answer answer = exchange(options, endpoint(options, "DSURL"), path, request, attempts);
+        const http::Answer answer = exchange(options, endpoint(options, "DSURL"), path, request, attempts, send);
         if (std::find(std::begin(stored), std::end(stored), answer.status) == std::end(stored))
             failWith(request, answer);
     }
@@ -239,7 +317,7 @@ private:
             .url = {},
             .limits = {},
             .maximumAnswer = largestReply,
-            .headers = headersFor(options, *trusted_),
+            .headers = headersFor(options),
             .signature = settings_.objectStore ? &settings_.objectStore->signature : nullptr,
         };
     }
@@ -250,11 +328,24 @@ private:
     }
 
     std::string recordPath(const OrloOptions& options, const OrloRecordName& name) const {
-        return versionPath(options) + "/records/" + segmentOf(name.dataClass) + "/" + segmentOf(name.instance);
+        return versionPath(options) + "/records/" + inPath(name.dataClass, true) + "/" + inPath(name.instance, false);
     }
 
-    // An endpoint of the session's options. Nothing but the trust object, which a digest vouches for, comes without
-    // TLS.
+    // A name as it stands in a path. An object store signs for the path that it gets when it decodes the one it was
+    // sent and encodes it again, with its slashes as they are; so a slash is sent as one there, and a class has none,
+    // since that would read as another class.
+    std::string inPath(std::string_view name, bool isClass) const {
+        const bool isObject = settings_.objectStore.has_value();
+        const bool isKept = !isObject || (canBeListed(name) && !(isClass && name.find('/') != name.npos));
+        if (!isKept || !staysBelow(name) || name.find('\0') != name.npos || name.size() > longestName) {
+            std::string quoted;
+            utf8::appendQuoted(quoted, utf8::beginning(name, longestQuoted));
+            throw OrloStoreFailure(QDOrloErrorStorage, "A server can keep no record under the name " + quoted);
+        }
+        return percentEncoded(name, [&](char c) { return isUnreserved(c) || (isObject && c == '/'); });
+    }
+
+    // An endpoint of the session's options.
     static std::string endpoint(const OrloOptions& options, const char* key) {
         const std::string* url = optionOf(options, key).text();
         if (!url || !url->starts_with("https://"))
@@ -274,7 +365,7 @@ private:
 
     // Sends the request, whose URL becomes that of `path` on `server`, as often as it may be and as is of use.
     http::Answer exchange(const OrloOptions& options, const std::string& server, std::string_view path,
-                          http::Request& request, const NumberOption& attempts) {
+                          http::Request& request, const NumberOption& attempts, Send send = &RemoteStore::sendAsItIs) {
         if (server.find('@') != server.npos)
             throw OrloStoreFailure(QDOrloErrorTransport, "A server's URL has to do without user and password");
         request.url = server + std::string(path);
@@ -283,21 +374,23 @@ private:
             request.url = url.text();
             request.proxy = proxyFor(options, url);
             request.limits = {.whole = std::chrono::seconds(timeoutSeconds.in(options))};
+            const http::Request whole = request;
             milliseconds rest = firstRest;
-            for (std::int64_t left = attempts.in(options); left > 1; --left, rest = std::min(2 * rest, longestRest)) {
-                if (std::optional<http::Answer> answer = attempt(request))
+            for (std::int64_t left = attempts.in(options); left > 1; --left, rest = nextRest(rest)) {
+                if (std::optional<http::Answer> answer = attempt(request, send))
                     return std::move(*answer);
                 std::this_thread::sleep_for(rest);
+                request = whole;
             }
-            return client_.exchange(request);
+            return (this->*send)(request);
         } catch (const http::Failure& failure) {
-            failToTransport(request.method, request.url, failure.what());
+            failToTransport(request, failure.what());
         }
     }
 
     // The answer, or none when another attempt may bring a better one.
-    std::optional<http::Answer> attempt(const http::Request& request) try {
-        http::Answer answer = client_.exchange(request);
+    std::optional<http::Answer> attempt(http::Request& request, Send send) try {
+        http::Answer answer = (this->*send)(request);
         return answer.status < 500 ? std::optional(std::move(answer)) : std::nullopt;
     } catch (const http::Failure& failure) {
         if (!failure.mayPass())
@@ -308,7 +401,7 @@ private:
     OrloRemoteSettings settings_;
     http::Client client_;
     std::optional<Value> proxies_;
-    std::optional<Digest> trusted_; // the digest of the trust object as it was last had
+    std::optional<Value::Data> measure_; // the trust object as it last came over TLS
 };
 
 } // namespace

@@ -3,7 +3,6 @@
 #ifndef VELTRA_PLATFORM_LINUX_ORLO_STORE_BACKEND_H
 #define VELTRA_PLATFORM_LINUX_ORLO_STORE_BACKEND_H
 
-#include <array>
 #include <cstdint>
 #include <memory>
 #include <stdexcept>
@@ -36,17 +35,16 @@ using OrloOptions = Value::Dictionary;
 // Belongs to one session. Every operation raises OrloStoreFailure on failure and then has changed nothing.
 class OrloStoreBackend {
 public:
-    using Digest = std::array<std::uint8_t, crypto::sha256Size>;
-
     virtual ~OrloStoreBackend() = default;
 
-    // The store's trust object, from `url` when the store is a server.
+    // The store's trust object for the session to hold, from `url` when the store is a server.
     virtual Value::Data trustObject(const OrloOptions& options, std::string_view url) = 0;
 
-    // The SHA-256 of the trust object as trustObject last had it, against which the session's is checked before each
-    // operation; the store is asked when trustObject has not been called.
-    virtual Digest trustObjectDigest(const OrloOptions& options) = 0;
+    // The store's trust object as what the session holds is measured by, before each operation: from where nobody but
+    // the store can have put it.
+    virtual Value::Data trustMeasure(const OrloOptions& options) = 0;
 
+    // The library has measured the session's "TrustObjectDigest" before it calls these.
     virtual void put(const OrloOptions& options, const OrloRecordName& name, const Value::Data& data) = 0;
     virtual Value::Data copy(const OrloOptions& options, const OrloRecordName& name) = 0;
     virtual void multiExport(const OrloOptions& options, const std::vector<OrloRecordName>& names) = 0;

@@ -7,6 +7,8 @@
 
 #include <fcntl.h>
 
+#include "platform/Crypto.h"
+#include "platform/linux/services/OrloStoreBackend.h"
 #include "platform/linux/system/DeviceRoot.h"
 #include "platform/linux/system/NewFile.h"
 
@@ -32,33 +34,23 @@ void make(const FileDescriptor& directory, const std::string& name) {
         failWithErrno("cannot be made");
 }
 
-} // namespace
-
-Value::Data OrloTrustObject::read() {
-    std::optional<Value::Data> contents = readRegularFile(open(), maximumSize);
-    if (!contents || contents->empty())
-        fail("is damaged: it is empty, no regular file, or larger than 1 MiB");
-    OrloStoreBackend::Digest digest;
-    if (!crypto::sha256(contents->data(), contents->size(), digest.data()))
-        fail("cannot be digested");
-    digest_ = digest;
-    return std::move(*contents);
-}
-
-const OrloStoreBackend::Digest& OrloTrustObject::digest() {
-    if (!digest_)
-        read();
-    return *digest_;
-}
-
-FileDescriptor OrloTrustObject::open() {
+FileDescriptor open(const FileDescriptor& directory, const std::string& name) {
     constexpr int flags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
-    FileDescriptor file(::openat(directory_.get(), name_.c_str(), flags));
+    FileDescriptor file(::openat(directory.get(), name.c_str(), flags));
     if (!file && errno == ENOENT) {
-        make(directory_, name_);
-        file = FileDescriptor(::openat(directory_.get(), name_.c_str(), flags));
+        make(directory, name);
+        file = FileDescriptor(::openat(directory.get(), name.c_str(), flags));
     }
     if (!file)
         failWithErrno("cannot be opened");
     return file;
+}
+
+} // namespace
+
+Value::Data readTrustObject(const FileDescriptor& directory, const std::string& name) {
+    std::optional<Value::Data> contents = readRegularFile(open(directory, name), maximumSize);
+    if (!contents || contents->empty())
+        fail("is damaged: it is empty, no regular file, or larger than 1 MiB");
+    return std::move(*contents);
 }
