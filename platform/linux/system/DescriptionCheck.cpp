@@ -28,7 +28,7 @@ enum Kinds : unsigned {
     data = 8,
     array = 16,
     object = 32,
-    identity = text | integer | data, // what becomes an instance of a data class
+    identity = text | integer | data, // what is made a text: an instance of a data class, or a part of one
     file = text | 64,                 // the path of a file that has to be there
 };
 
@@ -51,12 +51,12 @@ struct Section {
 // What the readers of each section look up.
 constexpr Key answerKeys[] = {
     {"HWModelStr", text},
-    {"ScreenSerialNumber", identity},
+    {"ScreenSerialNumber", text},
     {"VanterSerialNumber", identity},
-    {"MiravelSerialNumber", identity},
-    {"CoverGlassSerialNumber", identity},
-    {"AmbientLightSensorSerialNumber", identity},
-    {"FrontCameraModuleSerialNumber", identity},
+    {"MiravelSerialNumber", text},
+    {"CoverGlassSerialNumber", text},
+    {"AmbientLightSensorSerialNumber", text},
+    {"FrontCameraModuleSerialNumber", text},
     {"VanterChipID", identity},
     {"VanterUID", identity},
     {"LoddenChipID", identity},
@@ -67,7 +67,7 @@ constexpr Key answerKeys[] = {
 };
 constexpr Section answers{answerKeys};
 
-constexpr Key tansuKeys[] = {{"ProxSerialNumber", identity}, {"BackglassCompassSerialNumber", identity}};
+constexpr Key tansuKeys[] = {{"ProxSerialNumber", text}, {"BackglassCompassSerialNumber", text}};
 constexpr Section tansu{tansuKeys};
 
 constexpr Key propertyKeys[] = {{"AccessoryCertificate", data}};
