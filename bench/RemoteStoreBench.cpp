@@ -1,6 +1,6 @@
 // What the remote store costs on top of HTTPS: puts and gets of records in one session of the data-store library,
 // beside the curl command line with as many requests on one connection, both to the same nginx on loopback. Either
-// makes its connection anew for each run, and the session fetches the trust object first.
+// makes its connection anew for each run, and the session fetches the trust object and its measure first.
 #include <cstdint>
 #include <cstdlib>
 #include <filesystem>
@@ -132,7 +132,10 @@ public:
 
 private:
     static Value options() {
-        return Value::Dictionary{{"APTicket", Value::Data{1}}, {"DataVersion", 1}, {"DSURL", host}};
+        return Value::Dictionary{{"APTicket", Value::Data{1}},
+                                 {"DataVersion", 1},
+                                 {"DSURL", host},
+                                 {"CAURL", "https://orlo-ca.tevari.example:8443"}};
     }
 
     void permit(OrloAction action, int number) {
