@@ -56,6 +56,7 @@ void writeLine(const LogState& state, int level, const std::string& line) {
 std::string logTimestamp(std::time_t time) {
     std::tm local = {};
     char text[64];
+    ::tzset(); // which localtime_r need not do, so that a change of the time zone shows at once
     if (!::localtime_r(&time, &local) || std::strftime(text, sizeof text, "%Y-%m-%d %I:%M:%S", &local) == 0)
         return {};
     return text;

@@ -81,8 +81,9 @@ protected:
 };
 
 TEST(HSLogTimestamp, carriesTheLocalTimeOnATwelveHourClock) {
-    ::setenv("TZ", "UTC-2", 1); // two hours ahead of UTC
-    ::tzset();
+    ::setenv("TZ", "UTC0", 1);
+    EXPECT_EQ(logTimestamp(0), "1970-01-01 12:00:00");
+    ::setenv("TZ", "UTC-2", 1); // from now on two hours ahead of UTC
     const std::pair<std::time_t, const char*> rows[] = {
         {1709640309, "2024-03-05 02:05:09"}, // 14:05:09
         {1709589600, "2024-03-05 12:00:00"}, // 00:00:00
