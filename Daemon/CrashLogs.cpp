@@ -1,16 +1,20 @@
 #include "Daemon/CrashLogs.h"
 
 #include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
 #include <limits>
 #include <new>
 #include <optional>
-#include <string>
 #include <utility>
 
-#include "Daemon/Conversions.h"
+#include <fcntl.h>
+
 #include "Daemon/HSLog.h"
 #include "platform/Files.h"
 #include "platform/Utf8.h"
+#include "platform/linux/system/DeviceRoot.h"
 #include "platform/linux/system/Json.h"
 #include "platform/linux/system/PropertyList.h"
 
@@ -26,6 +30,9 @@ constexpr std::string_view systemVersionPath = "/System/Library/Quennel/SystemVe
 constexpr int collected = 0;
 constexpr int directoryProblem = 43;
 constexpr int noneCollected = 45;
+
+// A line that is longer is none that a system writes before its report.
+constexpr std::size_t longestHeader = std::size_t{16} << 20;
 
 // A log has no size that would be too large, so only memory bounds what is read.
 constexpr std::size_t anySize = std::numeric_limits<std::ptrdiff_t>::max() - 1;
@@ -48,64 +55,8 @@ bool hasLogSuffix(std::string_view path) {
     return std::ranges::any_of(suffixes, [path](std::string_view suffix) { return path.ends_with(suffix); });
 }
 
-// The log entry of one file, or nothing when it is left out.
-Value entryOf(const std::string& path, std::string_view name) try {
-    if (!hasLogSuffix(path)) {
-        crashLog.info("Suffix Mismatch . Skipping file : %@", shown(path));
-        return {};
-    }
-    Error error;
-    const Value attributes = files::attributes(path, &error);
-    if (attributes.isNothing()) {
-        crashLog.info("Failed to retrieve attributes for %@: (%@)", shown(path), error);
-        return {};
-    }
-    const Value size = isLXNumber(attributes["Size"]);
-    if (size.isNothing()) {
-        crashLog.info("Failed to retrieve size of %@.", shown(path));
-        return {};
-    }
-    const bool isPanic = name.starts_with(panicPrefix);
-    if (isPanic && !check_panic_version(path)) {
-        crashLog.info("Panic Version and System Version does not match. Skipping");
-        return {};
-    }
-    if (isPanic)
-        crashLog.info("Panic Version and System Version matches. Sending to HOST");
-    std::optional<Value::Data> contents = files::readWhole(path, anySize, &error);
-    if (!contents) {
-        crashLog.info("Failed to load %@: %@", shown(path), error);
-        return {};
-    }
-    Value::Dictionary entry{
-        {"isPanic", isPanic ? "YES" : "NO"}, {"LogFileName", utf8::repaired(path)}, {"LogFileSize", size}};
-    entry["LogFileData"] = std::move(*contents); // in a list it would be copied
-    return Value(std::move(entry));
-} catch (const std::bad_alloc& failure) {
-    crashLog.info("Failed to load %@: %@", shown(path), failure.what());
-    return {};
-}
-
-void collect(std::string_view directory, Value::Array& entries) {
-    for (const std::string& name : files::list(directory)) {
-        const std::string path = joined(directory, name);
-        crashLog.info("File Name: %@", shown(path));
-        if (Value entry = entryOf(path, name); !entry.isNothing())
-            entries.push_back(std::move(entry));
-    }
-}
-
-// What is wrong with a log directory, or null.
-const char* problemWith(std::string_view directory) {
-    switch (files::kindOf(directory)) {
-    case files::Kind::Nothing:
-        return "Log directory not found";
-    case files::Kind::Other:
-        return "Log directory expected. but found file";
-    case files::Kind::Directory:
-        break;
-    }
-    return nullptr;
+Error lastError() {
+    return {"POSIXErrorDomain", errno, std::strerror(errno)};
 }
 
 Value systemVersionList() {
@@ -113,18 +64,122 @@ Value systemVersionList() {
     return contents ? propertyListToValue(*contents).value_or(Value()) : Value();
 }
 
+// The first line of the file, or nothing when it is no ASCII text, too long, or cannot be read. The file is gone
+// through piece by piece, since it may be of any size, and its position stays.
+std::optional<std::string> headerOf(const FileDescriptor& report) {
+    std::string header;
+    bool isWhole = false;
+    std::array<char, 65536> piece;
+    for (off_t position = 0;;) {
+        const ssize_t count = ::pread(report.get(), piece.data(), piece.size(), position);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count < 0)
+            return std::nullopt;
+        if (count == 0)
+            return header;
+        const std::string_view text(piece.data(), static_cast<std::size_t>(count));
+        if (std::ranges::any_of(text, [](char byte) { return static_cast<unsigned char>(byte) >= 0x80; }))
+            return std::nullopt;
+        if (!isWhole) {
+            const std::size_t end = text.find('\n');
+            isWhole = end != std::string_view::npos;
+            header += text.substr(0, end);
+            if (header.size() > longestHeader || header.find('\0') != std::string::npos)
+                return std::nullopt;
+        }
+        position += count;
+    }
+}
+
+bool isOfRunningBuild(const FileDescriptor& report) {
+    const Value systemVersion = systemVersionList();
+    const std::string* build = systemVersion["ProductBuildVersion"].text();
+    if (!build || build->empty()) // every text would contain an empty identifier
+        return false;
+    const auto header = headerOf(report);
+    const auto version = header ? jsonTextMember(*header, "os_version") : std::nullopt;
+    return version && version->find(*build) != std::string::npos;
+}
+
+void visitEntry(const FileDescriptor& directory, const std::string& path, const std::string& name,
+                const CrashLogVisitor& visitor) try {
+    crashLog.info("File Name: %@", shown(path));
+    if (!hasLogSuffix(path)) {
+        crashLog.info("Suffix Mismatch . Skipping file : %@", shown(path));
+        return;
+    }
+    CrashLog log{path, name.starts_with(panicPrefix), {}, {}};
+    if (::fstatat(directory.get(), name.c_str(), &log.status, AT_SYMLINK_NOFOLLOW) != 0) {
+        const Error error = lastError();
+        crashLog.info("Failed to retrieve attributes for %@: (%@)", shown(path), error);
+        visitor.missed(path, error.text);
+        return;
+    }
+    errno = EISDIR;
+    if (!S_ISDIR(log.status.st_mode))
+        log.file = openInRoot(path, O_RDONLY, Links::Refused);
+    const Error error = lastError();
+    if (!log.file)
+        visitor.missed(path, S_ISREG(log.status.st_mode) ? error.text : "it is no regular file");
+    if (log.isPanic && !(log.file && isOfRunningBuild(log.file))) {
+        crashLog.info("Panic Version and System Version does not match. Skipping");
+        return;
+    }
+    if (log.isPanic)
+        crashLog.info("Panic Version and System Version matches. Sending to HOST");
+    if (log.file)
+        visitor.found(log);
+    else
+        crashLog.info("Failed to load %@: %@", shown(path), error);
+} catch (const std::bad_alloc& failure) {
+    crashLog.info("Failed to load %@: %@", shown(path), failure.what());
+    visitor.missed(path, failure.what());
+}
+
+void visitDirectory(std::string_view path, const CrashLogVisitor& visitor) {
+    const FileDescriptor directory = openInRoot(path, O_PATH, Links::Refused);
+    struct stat status = {};
+    const bool isThere = directory ? ::fstat(directory.get(), &status) == 0 : errno == ELOOP;
+    if (!isThere && errno != ENOENT)
+        visitor.missed(path, std::strerror(errno));
+    if (isThere && !S_ISDIR(status.st_mode))
+        visitor.missed(path, "it is no directory, or a link leads there");
+    if (!S_ISDIR(status.st_mode)) {
+        const char* problem = isThere ? "Log directory expected. but found file" : "Log directory not found";
+        const Value interim = Value::Dictionary{{"Status", directoryProblem}, {"Error", problem}};
+        crashLog.info(" Response dict populated: %@", interim);
+        return;
+    }
+    const std::optional<std::vector<std::string>> names = namesIn(directory);
+    if (!names)
+        visitor.missed(path, std::strerror(errno));
+    for (const std::string& name : names.value_or(std::vector<std::string>()))
+        visitEntry(directory, joined(path, name), name, visitor);
+}
+
 } // namespace
+
+void visitCrashLogs(const CrashLogVisitor& visitor) {
+    for (const std::string_view directory : directories)
+        visitDirectory(directory, visitor);
+}
 
 int get_ramdisk_logs(Value* response) {
     Value::Array entries;
-    for (const std::string_view directory : directories) {
-        if (const char* problem = problemWith(directory)) {
-            const Value interim = Value::Dictionary{{"Status", directoryProblem}, {"Error", problem}};
-            crashLog.info(" Response dict populated: %@", interim);
-            continue;
+    const auto load = [&entries](const CrashLog& log) {
+        std::optional<Value::Data> contents = readRegularFile(log.file, anySize);
+        if (!contents) {
+            crashLog.info("Failed to load %@: %@", shown(log.path), lastError());
+            return;
         }
-        collect(directory, entries);
-    }
+        Value::Dictionary entry{{"isPanic", log.isPanic ? "YES" : "NO"},
+                                {"LogFileName", utf8::repaired(log.path)},
+                                {"LogFileSize", std::int64_t{log.status.st_size}}};
+        entry["LogFileData"] = std::move(*contents); // in a list it would be copied
+        entries.emplace_back(std::move(entry));
+    };
+    visitCrashLogs({load, [](std::string_view, std::string_view) {}});
     const int status = entries.empty() ? noneCollected : collected;
     Value::Dictionary final{{"Status", status}, {"Error", ""}};
     if (!entries.empty())
@@ -136,16 +191,8 @@ int get_ramdisk_logs(Value* response) {
 }
 
 bool check_panic_version(std::string_view path) try {
-    const std::optional<Value::Data> report = files::readWhole(path, anySize);
-    const Value systemVersion = systemVersionList();
-    const std::string* build = systemVersion["ProductBuildVersion"].text();
-    if (!report || report->empty() || !build || build->empty()) // every text would contain an empty identifier
-        return false;
-    const std::string_view text(reinterpret_cast<const char*>(report->data()), report->size());
-    if (std::ranges::any_of(text, [](char byte) { return static_cast<unsigned char>(byte) >= 0x80; }))
-        return false; // no ASCII text
-    const auto version = jsonTextMember(text.substr(0, text.find('\n')), "os_version");
-    return version && version->find(*build) != std::string::npos;
+    const FileDescriptor report = openInRoot(path, O_RDONLY, Links::Refused);
+    return report && isOfRunningBuild(report);
 } catch (const std::bad_alloc&) {
     return false; // as a report that cannot be read
 }

@@ -33,10 +33,6 @@ Kind kindOf(std::string_view path);
 // it cannot be listed.
 std::vector<std::string> list(std::string_view path);
 
-// A dictionary of the attributes of what is at `path`, or nothing; *error, when `error` is given, then says why. A file
-// and a directory have "Size", a number of bytes; what holds no bytes (a FIFO, a socket, a device) has no size.
-Value attributes(std::string_view path, Error* error = nullptr);
-
 // Whether there is anything at `path`, whatever its kind; a symbolic link counts as what it leads to.
 bool exists(std::string_view path);
 

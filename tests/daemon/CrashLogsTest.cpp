@@ -160,12 +160,24 @@ TEST_F(CrashLogs, whatIsNoReadableFileNeitherHangsNorBreaksTheCollection) {
     root_.link(logs + "in.log", varrow + "target");
     root_.link(logs + "loop.log", "loop.log");
 
-    EXPECT_EQ(collect(), (Lines{logs + "good.log NO 4: good", logs + "in.log NO 6: linked"}));
+    EXPECT_EQ(collect(), Lines{logs + "good.log NO 4: good"});
     ::close(socket);
-    for (const char* name : {"fifo.log", "socket.ips"})
-        EXPECT_TRUE(logged("Failed to retrieve size of " + logs + name + ".")) << name;
-    for (const char* name : {"out.log", "dots.log", "loop.log"})
-        EXPECT_TRUE(logged("Failed to retrieve attributes for " + logs + name + ": (")) << name;
+    for (const char* name : {"fifo.log", "socket.ips", "out.log", "dots.log", "in.log", "loop.log"})
+        EXPECT_TRUE(logged("Failed to load " + logs + name + ": ")) << name;
+    EXPECT_TRUE(logged("Panic Version and System Version does not match. Skipping"));
+    EXPECT_FALSE(check_panic_version(logs + "panic.log"));
+}
+
+// Users may write to the folders, and a link in place of one would lead to files that only the collector may read.
+TEST_F(CrashLogs, noFolderOnTheWayIsALink) {
+    runningBuild("1");
+    root_.write("/secret/varrow/panic-1.ips", "{\"os_version\": \"1\"}");
+    root_.link("/private/var/logs", "/secret/varrow");
+    root_.link("/private/var/mobile/Library", "/secret");
+    root_.link("/secret/Logs/Varrow", "/secret/varrow");
+    EXPECT_EQ(collect(), Lines{});
+    EXPECT_TRUE(logged(" Response dict populated: {\"Error\": \"Log directory expected. but found file\""));
+    EXPECT_FALSE(check_panic_version(logs + "panic-1.ips"));
 }
 
 TEST_F(CrashLogs, anUnreadableFileIsLeftOut) {

@@ -3,15 +3,18 @@
 #include <atomic>
 #include <csignal>
 #include <cstdio>
+#include <cstdlib>
 #include <map>
 #include <optional>
 #include <string>
 #include <thread>
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/inotify.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 
 #include <gtest/gtest.h>
 
@@ -224,6 +227,43 @@ TEST(Files, replaceThatCannotWriteKeepsTheOldFileAndLeavesNoOther) {
         EXPECT_FALSE(files::replace("/tmp/file", bytes("more than ten bytes")));
     });
     EXPECT_EQ(root.contents(), (std::map<std::string, std::string>{{"/tmp", "directory"}, {"/tmp/file", "old"}}));
+}
+
+// Another writer removes what a killed one has left, and nothing else that has such a name.
+TEST(Files, replaceRemovesWhatKilledWritersHaveLeft) {
+    const TemporaryRoot root;
+    for (const char* name : {".new-1", ".new-18446744073709551615", ".new-2x", ".new", ".new-3", ".new-4", "other"})
+        root.write(std::string("/tmp/") + name, "");
+    std::filesystem::create_hard_link(root.host("/tmp/other"), root.host("/tmp/.new-5"));
+    root.link("/tmp/.new-6", "other");
+    root.makeDirectory("/tmp/.new-7");
+    const FileDescriptor held(::open(root.host("/tmp/.new-3").c_str(), O_RDONLY));
+    ASSERT_EQ(::flock(held.get(), LOCK_EX), 0);
+    const bool foreign = ::chown(root.host("/tmp/.new-4").c_str(), 65534, 65534) == 0; // root alone may do so
+    auto expected = root.contents();
+    for (const char* name : {"/tmp/.new-1", "/tmp/.new-18446744073709551615", foreign ? "" : "/tmp/.new-4"})
+        expected.erase(name);
+    expected["/tmp/file"] = "new";
+    EXPECT_TRUE(files::replace("/tmp/file", bytes("new")));
+    EXPECT_EQ(root.contents(), expected);
+}
+
+TEST(Files, writersSideBySideDoNotTakeEachOthersFilesForLeftovers) {
+    const TemporaryRoot root;
+    root.makeDirectory("/tmp");
+    inOwnProcess([] {
+        for (int writer = 0; writer < 6; ++writer)
+            if (::fork() == 0) {
+                const std::string path = "/tmp/" + std::to_string(writer);
+                bool written = true;
+                for (int round = 0; round < 50; ++round)
+                    written = files::replace(path, bytes("new")) && written;
+                std::_Exit(written ? 0 : 1);
+            }
+        for (int status = 0; ::wait(&status) > 0;)
+            EXPECT_EQ(status, 0);
+    });
+    EXPECT_EQ(root.contents().size(), 7u);
 }
 
 TEST(Files, appendAddsToARegularFileOnly) {

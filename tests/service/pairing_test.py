@@ -233,11 +233,13 @@ class CrashLogs(unittest.TestCase):
         (self.logs / "panic-full-1.ips").write_bytes(panic)
         (varrow / "a.log").write_bytes(b"second")
         (self.logs / "a.log").write_bytes(b"first\x00\xff")
-        os.mkfifo(self.logs / "fifo.log")
-        os.symlink("/etc/hostname", self.logs / "out.log")
+        paths = self.logs / "a.log", self.logs / "panic-full-1.ips", varrow / "a.log"
+        for number, path in enumerate(paths):
+            os.utime(path, ns=(0, 1_700_000_000_000_000_000 - number))
         copies = self.service.root / "copies/of logs"
         status, answer = self.service.orloctl("crash-logs", "-o", copies)
         self.assertEqual((status, answer["status"]), (0, 0))
+        self.assertEqual([self.service.root / log["name"][1:] for log in answer["logs"]], list(paths))
         found = {log["name"]: log for log in answer["logs"]}
         expected = {
             "/private/var/logs/panic-full-1.ips": (True, panic, "panic-full-1.ips"),
@@ -246,10 +248,30 @@ class CrashLogs(unittest.TestCase):
         }
         self.assertEqual(found.keys(), expected.keys())
         for name, (is_panic, contents, copy) in expected.items():
-            self.assertEqual(found[name], {"name": name, "size": len(contents), "panic": is_panic,
+            self.assertEqual(found[name], {"name": name, "date": "2023-11-14T22:13:20Z" if name == "/private/var/logs/a.log"
+                                           else "2023-11-14T22:13:19Z", "size": len(contents), "panic": is_panic,
                                            "copy": str(copies / copy)})
             self.assertEqual((copies / copy).read_bytes(), contents)
+            self.assertEqual((copies / copy).stat().st_mtime_ns, (self.service.root / name[1:]).stat().st_mtime_ns)
         self.assertEqual(len(os.listdir(copies)), 3)
+
+    def test_what_cannot_be_looked_at_is_missed_and_said_so(self):
+        (self.logs / "huge.log").touch()
+        os.truncate(self.logs / "huge.log", 1 << 42)  # more than memory holds
+        os.mkfifo(self.logs / "fifo.log")
+        os.symlink("/etc/hostname", self.logs / "out.log")
+        varrow = self.service.root / "private/var/mobile/Library/Logs/Varrow"
+        varrow.parent.mkdir(parents=True)
+        os.symlink("/", varrow)
+        status, answer = self.service.orloctl("crash-logs")
+        self.assertEqual((status, [log["size"] for log in answer["logs"]]), (2, [1 << 42]))
+        self.assertEqual({entry["name"] for entry in answer["missed"] if entry["note"]},
+                         {"/private/var/logs/fifo.log", "/private/var/logs/out.log",
+                          "/private/var/mobile/Library/Logs/Varrow/"})
+        missing = {**self.service.environment, "VELTRA_DEVICE_ROOT": "/missing"}
+        done = subprocess.run([BIN / "orloctl", "crash-logs"], env=missing, capture_output=True, text=True)
+        self.assertEqual((done.returncode, done.stdout), (2, ""))
+        self.assertIn("device root /missing: No such file", done.stderr)
 
     def test_a_log_that_cannot_be_copied_holds_up_no_other(self):
         varrow = self.service.root / "private/var/mobile/Library/Logs/Varrow"
@@ -287,10 +309,11 @@ class CrashLogs(unittest.TestCase):
         self.assertEqual(self.service.run(*crash_logs).stdout, "The device keeps no crash logs.\n")
         self.assertEqual(self.service.run(*crash_logs, "-o", self.service.root / "copies").returncode, 0)
         (self.logs / "a\n.log").write_bytes(b"x" * 1000)
+        os.utime(self.logs / "a\n.log", (0, 1_700_000_000))
         self.assertEqual(
             self.service.run(*crash_logs).stdout,
-            "NAME                               SIZE  PANIC\n"
-            "/private/var/logs/a\\n.log          1000  no\n",
+            "DATE                  NAME                               SIZE  PANIC\n"
+            "2023-11-14T22:13:20Z  /private/var/logs/a\\n.log          1000  no\n",
         )
         (self.service.root / "copies/a\n.log").mkdir()
         done = self.service.run(*crash_logs, "-o", self.service.root / "copies", stderr=subprocess.PIPE)

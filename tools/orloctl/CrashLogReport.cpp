@@ -4,19 +4,24 @@
 #include <cerrno>
 #include <climits>
 #include <cstring>
+#include <ctime>
 #include <filesystem>
+#include <functional>
+#include <iomanip>
 #include <map>
+#include <optional>
 #include <set>
 #include <sstream>
 #include <string_view>
 #include <system_error>
+#include <utility>
 
 #include <fcntl.h>
 #include <sys/stat.h>
 
 #include "Daemon/CrashLogs.h"
 #include "platform/Utf8.h"
-#include "platform/linux/system/FileDescriptor.h"
+#include "platform/linux/system/DeviceRoot.h"
 #include "platform/linux/system/NewFile.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/LocalFiles.h"
@@ -48,13 +53,14 @@ public:
             throw UsageError("Cannot open the directory " + path + ": " + std::strerror(errno));
     }
 
-    // Copies a log, of which `log` tells: "copy" is then the path of the copy, or "note" says why there is none.
-    void copy(ordered_json& log, std::string_view logPath, const Value::Data& contents) {
-        const std::string name = unusedName(logPath.substr(logPath.rfind('/') + 1));
-        if (const std::string problem = write(name, contents); problem.empty())
-            log["copy"] = (path_ / name).string();
+    // Copies a log, of which `entry` tells: "copy" is then the path of the copy, or "note" says why there is none.
+    void copy(ordered_json& entry, const CrashLog& log) {
+        const std::string path = utf8::repaired(log.path);
+        const std::string name = unusedName(path.substr(path.rfind('/') + 1));
+        if (const std::string problem = write(name, log.file); problem.empty())
+            entry["copy"] = (path_ / name).string();
         else
-            log["note"] = "not copied to " + (path_ / name).string() + ": " + problem;
+            entry["note"] = "not copied to " + (path_ / name).string() + ": " + problem;
     }
 
 private:
@@ -67,12 +73,12 @@ private:
 
     // A regular file that is there is replaced, anything else stays as it is. The reason of a failure, or an empty
     // text.
-    std::string write(const std::string& name, const Value::Data& contents) const {
+    std::string write(const std::string& name, const FileDescriptor& log) const {
         struct stat status;
         if (::fstatat(directory_.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && !S_ISREG(status.st_mode))
             return "what stands there is no file";
         NewFile file(directory_);
-        return file && file.fill(contents) && file.replace(name) ? "" : std::strerror(errno);
+        return file && file.fillFrom(log) && file.replace(name) ? "" : std::strerror(errno);
     }
 
     const std::filesystem::path path_;
@@ -87,55 +93,75 @@ std::string onOneLine(const std::string& text) {
     return line;
 }
 
-std::string table(const ordered_json& logs) {
-    if (logs.empty())
-        return "The device keeps no crash logs.\n";
+std::string dateOf(const CrashLog& log) {
+    std::tm utc = {};
+    char text[64] = "";
+    if (::gmtime_r(&log.status.st_mtime, &utc))
+        std::strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%SZ", &utc);
+    return text;
+}
+
+void printTable(std::ostringstream& text, const ordered_json& logs) {
     std::size_t width = 4;
     for (const ordered_json& log : logs)
         width = std::max(width, onOneLine(log["name"]).size());
-    std::ostringstream text;
-    const auto row = [&](const std::string& name, const std::string& size, const std::string& panic) {
-        text << name << std::string(width - name.size() + 2, ' ');
-        text << std::string(12 - std::min<std::size_t>(12, size.size()), ' ') << size << "  " << panic << '\n';
+    const auto row = [&](const std::string& date, const std::string& name, const std::string& size, const char* panic) {
+        text << std::left << std::setw(22) << date << std::setw(static_cast<int>(width) + 2) << name << std::right
+             << std::setw(12) << size << "  " << panic << '\n';
     };
-    row("NAME", "SIZE", "PANIC");
+    row("DATE", "NAME", "SIZE", "PANIC");
     for (const ordered_json& log : logs)
-        row(onOneLine(log["name"]), std::to_string(log["size"].get<std::int64_t>()), log["panic"] ? "yes" : "no");
-    for (const ordered_json& log : logs)
-        if (log.contains("note"))
-            text << onOneLine(log["name"]) << ": " << onOneLine(log["note"]) << '\n';
-    return text.str();
+        row(log["date"], onOneLine(log["name"]), std::to_string(log["size"].get<std::int64_t>()),
+            log["panic"] ? "yes" : "no");
 }
 
 } // namespace
 
 Report collectCrashLogs(const std::string& copyDirectory) {
-    Value response;
-    const int status = get_ramdisk_logs(&response);
+    if (!openDeviceRoot())
+        throw UsageError("Cannot open the device root " + deviceRootPath() + ": " + std::strerror(errno));
     std::optional<CopyDirectory> copies;
     if (!copyDirectory.empty())
         copies.emplace(copyDirectory);
+    std::multimap<std::pair<std::time_t, long>, ordered_json, std::greater<>> found; // by time, newest first
+    ordered_json missed = ordered_json::array();
+    visitCrashLogs({[&](const CrashLog& log) {
+                        ordered_json entry{{"name", utf8::repaired(log.path)},
+                                           {"date", dateOf(log)},
+                                           {"size", log.status.st_size},
+                                           {"panic", log.isPanic}};
+                        if (copies)
+                            copies->copy(entry, log);
+                        found.emplace(std::pair(log.status.st_mtim.tv_sec, log.status.st_mtim.tv_nsec), entry);
+                    },
+                    [&](std::string_view path, std::string_view reason) {
+                        missed.push_back({{"name", utf8::repaired(path)}, {"note", reason}});
+                    }});
     ordered_json logs = ordered_json::array();
-    if (const Value::Array* entries = response["Data"].array()) {
-        for (const Value& entry : *entries) {
-            const std::string& name = *entry["LogFileName"].text();
-            ordered_json log{{"name", name},
-                             {"size", *entry["LogFileSize"].integer()},
-                             {"panic", *entry["isPanic"].text() == "YES"}};
-            if (copies)
-                copies->copy(log, name, *entry["LogFileData"].data());
-            logs.push_back(std::move(log));
-        }
-    }
+    for (auto& [time, entry] : found)
+        logs.push_back(std::move(entry));
+    std::ostringstream text;
+    if (!logs.empty())
+        printTable(text, logs);
+    else if (missed.empty())
+        text << "The device keeps no crash logs.\n";
+    for (const ordered_json* list : {&logs, &missed})
+        for (const ordered_json& entry : *list)
+            if (entry.contains("note"))
+                text << onOneLine(entry["name"]) << ": " << onOneLine(entry["note"]) << '\n';
     Report report;
-    report.text = table(logs);
+    if (!missed.empty())
+        report.problem = "Not everything could be looked at";
     if (copies && !logs.empty()) {
         const auto copied = std::ranges::count_if(logs, [](const ordered_json& log) { return log.contains("copy"); });
-        report.ok = static_cast<std::size_t>(copied) == logs.size();
-        report.text += std::to_string(copied) + " copied to " + copyDirectory + "\n";
-        if (!report.ok)
+        text << copied << " copied to " << copyDirectory << '\n';
+        if (static_cast<std::size_t>(copied) != logs.size())
             report.problem = "Not all logs were copied to " + copyDirectory;
     }
-    report.json = {{"status", status}, {"logs", std::move(logs)}};
+    report.ok = report.problem.empty();
+    report.text = text.str();
+    report.json = {{"status", logs.empty() ? 45 : 0}, {"logs", std::move(logs)}};
+    if (!missed.empty())
+        report.json["missed"] = std::move(missed);
     return report;
 }

@@ -5,10 +5,12 @@
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
+#include <memory>
 #include <new>
 #include <utility>
 #include <vector>
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
 
@@ -164,6 +166,22 @@ std::optional<DevicePath> splitDevicePath(std::string_view path) {
     if (name.empty() || name == "." || name == ".." || name.find('\0') != std::string::npos)
         return std::nullopt;
     return DevicePath{slash == std::string_view::npos ? "/" : path.substr(0, slash + 1), std::move(name)};
+}
+
+std::optional<std::vector<std::string>> namesIn(const FileDescriptor& directory) {
+    // A descriptor of its own, since the stream moves its position and closes it.
+    FileDescriptor file(::openat(directory.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const std::unique_ptr<DIR, int (*)(DIR*)> stream(file ? ::fdopendir(file.get()) : nullptr, ::closedir);
+    if (!stream)
+        return std::nullopt;
+    file.release();
+    std::vector<std::string> names;
+    while (const dirent* entry = ::readdir(stream.get())) {
+        const std::string_view name = entry->d_name;
+        if (name != "." && name != "..")
+            names.emplace_back(name);
+    }
+    return names;
 }
 
 std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size_t maximum) try {

@@ -12,6 +12,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include <sys/types.h>
 
@@ -52,6 +53,10 @@ struct DevicePath {
 
 // The parts of `path`, or none when it does not end in a name.
 std::optional<DevicePath> splitDevicePath(std::string_view path);
+
+// The names of the entries of the open directory, in the file system's order and without "." and ".."; nothing, with
+// errno set, when they cannot be read.
+std::optional<std::vector<std::string>> namesIn(const FileDescriptor& directory);
 
 // The rest of the open file from its position on; nothing, with errno set, when it is no regular file, cannot be read,
 // or holds more than `maximum` bytes. What counts are the bytes that come, not the size that the file system states:

@@ -1,13 +1,10 @@
 #include "platform/Files.h"
 
 #include <cerrno>
-#include <cstdint>
 #include <cstdio>
 #include <cstring>
-#include <memory>
 #include <string>
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
 
@@ -68,31 +65,7 @@ Kind kindOf(std::string_view path) {
 }
 
 std::vector<std::string> list(std::string_view path) {
-    std::vector<std::string> names;
-    FileDescriptor file = openDirectoryInRoot(path);
-    const std::unique_ptr<DIR, int (*)(DIR*)> directory(file ? ::fdopendir(file.get()) : nullptr, ::closedir);
-    if (!directory)
-        return names;
-    file.release(); // the stream closes it
-    while (const dirent* entry = ::readdir(directory.get())) {
-        const std::string_view name = entry->d_name;
-        if (name != "." && name != "..")
-            names.emplace_back(name);
-    }
-    return names;
-}
-
-Value attributes(std::string_view path, Error* error) {
-    const FileDescriptor file = openInRoot(path, O_PATH);
-    struct stat status;
-    if (!file || ::fstat(file.get(), &status) != 0) {
-        explain(error);
-        return {};
-    }
-    Value::Dictionary found;
-    if (S_ISREG(status.st_mode) || S_ISDIR(status.st_mode))
-        found["Size"] = std::int64_t{status.st_size};
-    return found;
+    return namesIn(openDirectoryInRoot(path)).value_or(std::vector<std::string>());
 }
 
 bool exists(std::string_view path) {

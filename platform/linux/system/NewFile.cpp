@@ -1,21 +1,27 @@
 #include "platform/linux/system/NewFile.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
+#include <string_view>
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/random.h>
 #include <sys/stat.h>
+
+#include "platform/linux/system/DeviceRoot.h"
 
 namespace {
 
 constexpr mode_t privateMode = 0600;
+constexpr std::string_view prefix = ".new-";
 
-bool writeAll(const FileDescriptor& file, const Value::Data& contents) {
+bool writeAll(const FileDescriptor& file, const std::uint8_t* bytes, std::size_t size) {
     std::size_t written = 0;
-    while (written < contents.size()) {
-        const ssize_t count = ::write(file.get(), contents.data() + written, contents.size() - written);
+    while (written < size) {
+        const ssize_t count = ::write(file.get(), bytes + written, size - written);
         if (count < 0 && errno == EINTR)
             continue;
         if (count < 0)
@@ -33,16 +39,45 @@ bool flush(const FileDescriptor& file) {
     return result == 0;
 }
 
+bool lock(const FileDescriptor& file, int operation) {
+    int result;
+    do
+        result = ::flock(file.get(), operation);
+    while (result != 0 && errno == EINTR);
+    return result == 0;
+}
+
+// A writer holds a lock on its file. Anyone may give a file such a name, so only those count that nobody else can have
+// put there, neither as the owner nor as a further link to something.
+void removeLeftovers(const FileDescriptor& directory) {
+    for (const std::string& name : namesIn(directory).value_or(std::vector<std::string>())) {
+        struct stat status;
+        if (!name.starts_with(prefix) || name.find_first_not_of("0123456789", prefix.size()) != std::string::npos ||
+            ::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISREG(status.st_mode) ||
+            status.st_nlink != 1 || status.st_uid != ::geteuid())
+            continue;
+        const FileDescriptor file(::openat(directory.get(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+        if (file && lock(file, LOCK_EX | LOCK_NB))
+            ::unlinkat(directory.get(), name.c_str(), 0);
+    }
+}
+
 } // namespace
 
 NewFile::NewFile(const FileDescriptor& directory) : directory_(directory) {
-    std::uint64_t random;
-    if (::getrandom(&random, sizeof random, 0) != static_cast<ssize_t>(sizeof random))
-        return;
-    name_ = ".new-" + std::to_string(random);
-    file_ = FileDescriptor(
-        ::openat(directory.get(), name_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, privateMode));
-    remove_ = static_cast<bool>(file_);
+    removeLeftovers(directory);
+    // Until it is locked another writer may take the file for a leftover.
+    struct stat status;
+    do {
+        std::uint64_t random;
+        if (::getrandom(&random, sizeof random, 0) != static_cast<ssize_t>(sizeof random))
+            return;
+        name_ = prefix;
+        name_ += std::to_string(random);
+        file_ = FileDescriptor(::openat(directory.get(), name_.c_str(),
+                                        O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, privateMode));
+        remove_ = static_cast<bool>(file_);
+    } while (file_ && lock(file_, LOCK_EX) && ::fstat(file_.get(), &status) == 0 && status.st_nlink == 0);
 }
 
 NewFile::~NewFile() {
@@ -54,7 +89,23 @@ NewFile::~NewFile() {
 
 // The mode is set once more, since the umask may have taken bits from it.
 bool NewFile::fill(const Value::Data& contents) const {
-    return ::fchmod(file_.get(), privateMode) == 0 && writeAll(file_, contents) && flush(file_);
+    return ::fchmod(file_.get(), privateMode) == 0 && writeAll(file_, contents.data(), contents.size()) && flush(file_);
+}
+
+bool NewFile::fillFrom(const FileDescriptor& source) const {
+    Value::Data piece(std::size_t{1} << 16);
+    ssize_t count;
+    do {
+        count = ::read(source.get(), piece.data(), piece.size());
+        if ((count < 0 && errno != EINTR) ||
+            (count > 0 && !writeAll(file_, piece.data(), static_cast<std::size_t>(count))))
+            return false;
+    } while (count != 0);
+    struct stat status;
+    if (::fstat(source.get(), &status) != 0)
+        return false;
+    const timespec times[] = {status.st_mtim, status.st_mtim};
+    return ::futimens(file_.get(), times) == 0 && fill({});
 }
 
 bool NewFile::placeAt(const std::string& name) {

@@ -7,7 +7,8 @@
 #include "platform/Value.h"
 #include "platform/linux/system/FileDescriptor.h"
 
-// Every operation returns false, with errno set, on failure. The file is removed again unless it was moved.
+// Every operation returns false, with errno set, on failure. The file is removed again unless it was moved; what a
+// writer that was killed has left is removed by the next one in that directory.
 class NewFile {
 public:
     // Makes an empty file of mode 0600 in `directory`, which must outlive this. False as a whole when that failed.
@@ -20,6 +21,9 @@ public:
 
     // Writes the contents and flushes them to the disk.
     bool fill(const Value::Data& contents) const;
+
+    // The same with the rest of the open file `source`, piece by piece, and with its time of modification.
+    bool fillFrom(const FileDescriptor& source) const;
 
     // Moves the file to `name`, in place of what is there.
     bool replace(const std::string& name) { return moveTo(name, 0); }
