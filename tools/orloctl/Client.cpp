@@ -8,11 +8,13 @@
 #include <optional>
 #include <string_view>
 
+#include <fcntl.h>
+#include <sys/stat.h>
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
-#include "platform/Files.h"
 #include "platform/linux/services/BusValue.h"
+#include "platform/linux/system/DeviceRoot.h"
 #include "tools/orloctl/Interruption.h"
 
 namespace {
@@ -67,7 +69,9 @@ MessagePtr requestMessage(sd_bus* connection, const std::string& command, const 
 }
 
 std::int64_t logSize() {
-    return files::attributes(logPath)["Size"].integer().value_or(0);
+    const FileDescriptor log = openInRoot(logPath, O_PATH);
+    struct stat status = {};
+    return log && ::fstat(log.get(), &status) == 0 ? status.st_size : 0;
 }
 
 // Where the service has said what it did. Only what the service manager starts for the system bus writes to the journal
