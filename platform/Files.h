@@ -43,6 +43,9 @@ bool exists(std::string_view path);
 // why.
 bool replace(std::string_view path, const Value::Data& contents, std::optional<Error>* writeError = nullptr);
 
+// Removes the regular file at `path`; a symbolic link or anything else that stands there stays.
+void remove(std::string_view path);
+
 // Appends `text` to the file at `path` with one write; the file is created with mode 0640 when it is missing, keeps the
 // mode that it has otherwise, and is closed again at the end. A symbolic link or anything but a regular file is not
 // opened. False when the text could not be written.

@@ -89,7 +89,7 @@ Value::Data encode(const SysConfig3Ptr& object) {
 
 } // namespace
 
-HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) {
+HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) try {
     serviceLog.info("%s:%d - Received setGlobalbCfg", handlerName, __LINE__);
     const SysConfig3Ptr object = decodeFile(request.messageDict["bcfgDataPath"]);
     serviceLog.info("Decoded recieved data ");
@@ -104,7 +104,12 @@ HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) {
     serviceLog.info("Printing the LXData: ");
     serviceLog.info("New data %@", data);
     serviceLog.info("Writting new data to file");
-    // Whether the file could be written is no part of the answer; the host looks at the file.
-    files::replace(resultPath, *data.data());
+    // Whether the file could be written is no part of the answer; the host looks at the file, which is never that of an
+    // earlier request.
+    if (!files::replace(resultPath, *data.data()))
+        files::remove(resultPath);
     return HSMessageResponse::initWithName(request.messageStr, 0, {});
+} catch (...) {
+    files::remove(resultPath);
+    throw;
 }

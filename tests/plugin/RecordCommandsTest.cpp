@@ -14,6 +14,7 @@
 #include "tests/support/OwnProcess.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
+#include "tests/sysconfig/Blob.h"
 
 namespace {
 
@@ -239,12 +240,15 @@ TEST_F(RecordCommands, logTheirStepsAndAnswer) {
     }
 }
 
-TEST_F(RecordCommands, aFileThatCannotBeWrittenIsNamedInTheAnswer) {
+TEST_F(RecordCommands, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlierBlobIsTakenForTheResult) {
     inOwnProcess([this] {
+        const Bytes blob = BlobParts{}.whole();
+        root_.write("/blob", std::string(blob.begin(), blob.end()));
+        root_.write("/tmp/new_bCfg", "earlier");
         root_.write("/out", "before");
         dataStoreDouble().record = Value::Data(1 << 20);
         std::signal(SIGXFSZ, SIG_IGN);
-        const rlimit full = {4096, 4096};
+        const rlimit full = {64, 64};
         ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &full), 0);
         const HSMessageResponse response = request("getPSD2", paths);
         EXPECT_EQ(lines().back(), "2 Failed to write psd2 to file");
@@ -252,6 +256,8 @@ TEST_F(RecordCommands, aFileThatCannotBeWrittenIsNamedInTheAnswer) {
         EXPECT_EQ(response.response(), Value());
         EXPECT_TRUE(response.error() && !response.error()->text.empty());
         EXPECT_EQ(root_.read("/out"), "before");
+        EXPECT_EQ(request("setGlobalbCfg", Value::Dictionary{{"bcfgDataPath", "/blob"}}).statusCode(), 0);
+        EXPECT_EQ(root_.read("/tmp/new_bCfg"), "(missing)");
     });
 }
 

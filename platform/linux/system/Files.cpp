@@ -90,6 +90,13 @@ bool replace(std::string_view path, const Value::Data& contents, std::optional<E
     return true;
 }
 
+void remove(std::string_view path) {
+    const std::optional<DevicePath> parts = splitDevicePath(path);
+    const FileDescriptor directory = parts ? openDirectoryInRoot(parts->parent) : FileDescriptor();
+    if (directory && mayBeReplaced(directory, parts->name))
+        ::unlinkat(directory.get(), parts->name.c_str(), 0);
+}
+
 bool append(std::string_view path, std::string_view text) {
     FileDescriptor file = openInRoot(path, O_WRONLY | O_APPEND | O_NOFOLLOW);
     if (!file && errno == ENOENT)
