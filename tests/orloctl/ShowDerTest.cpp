@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <sstream>
 
+#include "tests/orloctl/PrintedReport.h"
 #include "tests/support/OpenSSLTool.h"
 #include "tools/makers/Img4Maker.h"
 
@@ -14,7 +15,7 @@ using namespace img4maker;
 using nlohmann::ordered_json;
 
 Report show(const Bytes& bytes) {
-    return showDer(bytes.data(), bytes.size());
+    return printed(showDer(bytes.data(), bytes.size()));
 }
 
 // Offset, depth, header length, content length and form of each item, a line each.
@@ -71,25 +72,29 @@ TEST(ShowDer, spellsTagsAndValues) {
         item(DERTagObjectIdentifier, {0x2A, 0x86, 0x48, 0x86, 0xF7, 0x0D}),
         item(DERTagObjectIdentifier, {0x88, 0x37}),
         ia5("a\"b\\\n"),
-        octets(filler(40)),
+        octets(filler(200)),
         item(propertyTag("sepi"), {}),
         item(DERTagPrivateConstructed(0x01020304), {}),
         item(DERTagContextConstructed(2), {}),
+        integer((std::uint64_t{1} << 53) + 1),
     });
     const Report report = show(file);
     ASSERT_TRUE(report.ok) << report.problem;
-    const ordered_json& items = report.json["items"][0]["items"];
+    const ordered_json& items = report.json["items"].at(0)["items"];
     EXPECT_EQ(items[0]["value"], true);
     EXPECT_EQ(items[1]["value"], "0x00ffffffffffffffff");
     EXPECT_EQ(items[2]["value"], -128);
     EXPECT_EQ(items[3]["value"], "1.2.840.113549");
     EXPECT_EQ(items[4]["value"], "2.999");
     EXPECT_EQ(items[5]["value"], "a\"b\\x5c\\x0a");
-    EXPECT_EQ(items[6]["value"].get<std::string>().size(), 67U) << "32 octets and an ellipsis";
+    EXPECT_EQ(items[6]["value"].get<std::string>().size(), 400U) << "whole";
     EXPECT_EQ(items[7]["tag"], "private \"sepi\"");
     EXPECT_EQ(items[8]["tag"], "private [16909060]");
     EXPECT_EQ(items[9]["tag"], "context [2]");
+    EXPECT_EQ(items[10]["value"], "9007199254740993") << "no double holds it";
     EXPECT_NE(report.text.find("private \"sepi\"\n"), std::string::npos) << report.text;
+    EXPECT_NE(report.text.find("IA5String \"a\"b\\x5c\\x0a\"\n"), std::string::npos) << report.text;
+    EXPECT_EQ(report.text.find(items[6]["value"].get<std::string>()), std::string::npos) << "shortened";
 }
 
 struct FaultCase {
@@ -140,7 +145,7 @@ TEST(ShowDer, saysWhereAndWhyStrictDEREnds) {
 TEST(ShowDer, showsWhatComesBeforeAFault) {
     const Report report = show(sequence({integer(7), item(DERTagBoolean, {0x01}), {0x04, 0x80}}));
     EXPECT_NE(report.problem.find("offset 7"), std::string::npos) << "the first fault: " << report.problem;
-    const ordered_json& items = report.json["items"][0]["items"];
+    const ordered_json& items = report.json["items"].at(0)["items"];
     ASSERT_EQ(items.size(), 2U);
     EXPECT_EQ(items[0]["value"], 7);
     EXPECT_TRUE(items[1].contains("fault"));
@@ -159,8 +164,8 @@ TEST(ShowDer, boundsDepthAndNumber) {
         many.insert(many.end(), {0x05, 0x00});
     const Report wide = show(many);
     EXPECT_TRUE(wide.ok);
-    EXPECT_EQ(wide.json["items"].size(), 50000U);
-    EXPECT_EQ(wide.json["itemsNotShown"], 10000);
+    EXPECT_EQ(wide.json["items"].size(), 60000U);
+    EXPECT_NE(wide.text.find("50000 further items are not shown"), std::string::npos);
     many.push_back(0x05);
     EXPECT_FALSE(show(many).ok) << "items that are not shown are checked all the same";
 }

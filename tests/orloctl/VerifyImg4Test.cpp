@@ -1,5 +1,7 @@
 #include "tools/orloctl/VerifyImg4.h"
 
+#include "platform/Crypto.h"
+#include "tests/orloctl/PrintedReport.h"
 #include "tools/makers/SignedManifestMaker.h"
 
 #include <algorithm>
@@ -34,9 +36,14 @@ Bytes soundManifest(const std::string& profile) {
     return signer.manifest(standardManifest(), signer.standardChain());
 }
 
-Report verify(const Bytes& bytes, const TrustDomain& domain, const std::string& object = "") {
-    return verifyImg4({bytes.data(), bytes.size()}, domain,
-                      object.empty() ? std::nullopt : std::optional(objectCode(object)));
+Report verify(const Bytes& bytes, const TrustDomain& domain, const std::string& object = "",
+              const std::string& payloadDigest = "") {
+    VerifyRequest request;
+    if (!object.empty())
+        request.object = fourCharacterCode("--object", object);
+    if (!payloadDigest.empty())
+        request.payloadDigest = fourCharacterCode("--payload-digest", payloadDigest);
+    return printed(verifyImg4({bytes.data(), bytes.size()}, domain, request));
 }
 
 TrustDomain testDomain(const std::optional<std::string>& profile = std::nullopt) {
@@ -348,13 +355,49 @@ TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
         << report.text;
 }
 
+TEST(VerifyImg4, comparesThePayloadWithThePropertyThatIsNamed) {
+    const Bytes image = payload({});
+    Bytes digest(crypto::sha384Size);
+    ASSERT_TRUE(crypto::sha384(image.data(), image.size(), digest.data()));
+    Manifest fields = standardManifest();
+    fields.objects = {object("sepi", {property("DGST", octets(digest)), property("ELSE", octets(filler(48))),
+                                      property("SHRT", octets({digest.begin(), digest.begin() + 20})),
+                                      property("FLAG", boolean(true))})};
+    const Bytes manifest = constrained({}, fields);
+    const Bytes whole = container(image, manifest, {});
+    const struct {
+        const Bytes& file;
+        const char* property;
+        const char* payload;
+        const char* problem;
+    } rows[] = {
+        {whole, "", "not judged", ""},
+        {whole, "DGST", "the object's", ""},
+        {whole, "ELSE", "not the object's", "its SHA-384 is another than \"ELSE\" of \"sepi\" demands"},
+        {whole, "SHRT", "not the object's", "\"SHRT\" of \"sepi\" has 20 octets, and SHA-384 has 48"},
+        {whole, "FLAG", "not the object's", "\"sepi\" has no sound property \"FLAG\" with an OCTET STRING"},
+        {whole, "NONE", "not the object's", "\"sepi\" has no sound property \"NONE\" with an OCTET STRING"},
+        {manifest, "DGST", "not the object's", "The file has no payload"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.property);
+        const Report report = verify(row.file, testDomain(), "sepi", row.property);
+        EXPECT_EQ(report.json["payload"], row.payload);
+        EXPECT_EQ(report.ok, *row.problem == '\0') << report.problem;
+        EXPECT_NE(report.problem.find(row.problem), std::string::npos) << report.problem;
+        EXPECT_EQ(report.json["trusted"], report.ok);
+        EXPECT_EQ(report.json.value("failedStep", ""), report.ok ? "" : "payload");
+        EXPECT_EQ(report.json["notes"].size(), *row.property == '\0' ? 1U : 0U);
+    }
+}
+
 TEST(VerifyImg4, boundsWhatItShows) {
     Manifest fields = standardManifest();
     for (int i = 0; i < 1500; ++i)
         fields.objects.push_back(object(largeObjectName(static_cast<unsigned>(i % 1000)), {}));
     const Report objects = verify(constrained({}, fields), testDomain());
-    EXPECT_EQ(objects.json["objects"].size(), 1000U);
-    EXPECT_NE(objects.text.find("502 further objects are not shown"), std::string::npos);
+    EXPECT_EQ(objects.json["objects"].size(), 1502U);
+    EXPECT_NE(objects.text.find(" and 502 more\n"), std::string::npos);
 
     const Report chain = verify(withChain(ec384, List(150, sequence({}))), testDomain());
     EXPECT_EQ(chain.json["chain"].size(), 101U); // with the root

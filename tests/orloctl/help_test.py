@@ -61,7 +61,8 @@ class Help(unittest.TestCase):
     def test_a_shell_is_offered_what_may_follow(self):
         for line, offered in (
             ("get-", ["get-tcrt", "get-psd2"]),
-            ("show ", ["bcfg", "img4", "der"]),
+            ("show ", ["bcfg", "img4", "der", ":files"]),
+            ("verify i", ["img4", ":files"]),
             ("show bcfg x --", ["--help", "--hmac-key-file", "--version", "--bus", "--timeout", "--json"]),
             ("show bcfg -- --", [":files"]),
             ("show bcfg --hmac-key-file ", [":files"]),

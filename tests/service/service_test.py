@@ -287,11 +287,19 @@ class Client(ServiceTest):
             (3, ["--bus", "unix:path=/nonexistent", "call", "x"]),
             (4, ["call", "x"]),
             (5, ["show", "bcfg", "/dev/null"]),
+            (0, ["show", self.service.root / "blobs/every-kind.bin"]),
+            (2, ["show", "bcfg"]),
+            (2, ["show", self.service.root / "images/container.img4", "--hmac-key-file", "/dev/null"]),
         ):
             with self.subTest(words):
                 exit_status, answer = self.service.orloctl(*words)
                 self.assertEqual((exit_status, answer["exitStatus"]), (status, status), answer)
                 self.assertEqual("problem" in answer, status != 0)
+
+    def test_standard_input_is_a_file_too(self):
+        with open(self.service.root / "blobs/every-kind.bin", "rb") as blob:
+            done = self.service.run(BIN / "orloctl", "--json", "show", "-", stdin=blob)
+        self.assertEqual(json.loads(done.stdout)["format"], "bcfg")
 
     def test_output_that_is_lost_is_a_failure(self):
         reader, closed_pipe = os.pipe()

@@ -87,8 +87,7 @@ JudgedBlob BlobResult::read(uid_t serviceUser, const std::string& devicePath) co
     // Nothing is opened for reading before it is known to be a file.
     auto status = statusOf(openInRoot(blobResultPath, O_PATH | O_NOFOLLOW));
     const bool isFile = status && S_ISREG(status->st_mode);
-    const FileDescriptor file =
-        isFile ? openInRoot(blobResultPath, O_RDONLY | O_NOFOLLOW | O_NONBLOCK) : FileDescriptor();
+    const FileDescriptor file = isFile ? openInRoot(blobResultPath, O_RDONLY | O_NOFOLLOW) : FileDescriptor();
     const int error = errno;
     if (file)
         status = statusOf(file);

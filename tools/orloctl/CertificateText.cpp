@@ -13,7 +13,6 @@ namespace {
 
 using nlohmann::ordered_json;
 
-constexpr std::size_t longestName = 512;
 constexpr std::uint64_t mostOctetsOfValue = 256;
 
 struct Named {
@@ -83,9 +82,9 @@ bool isPrintable(std::uint8_t octet) {
 }
 
 // RFC 4514 2.4.
-std::string escapedValue(const DERItem& text) {
+std::string escapedValue(const DERItem& text, std::uint64_t most) {
     std::string escaped;
-    const std::uint64_t shown = std::min(text.length, mostOctetsOfValue);
+    const std::uint64_t shown = std::min(text.length, most);
     for (std::uint64_t i = 0; i < shown; ++i) {
         const std::uint8_t octet = text.data[i];
         const bool isEdge = (octet == ' ' && (i == 0 || i + 1 == text.length)) || (octet == '#' && i == 0);
@@ -109,30 +108,31 @@ bool isText(DERTag tag) {
     return std::find(std::begin(texts), std::end(texts), tag) != std::end(texts);
 }
 
-std::string attributeText(const DERAttributeTypeAndValue& attribute) {
+std::string attributeText(const DERAttributeTypeAndValue& attribute, std::uint64_t most) {
     const std::string oid = numbersOf(attribute.type);
     const Named* type = find(attributeTypes, oid);
     DERDecodedInfo value;
     if (type != nullptr && DERDecodeItem(&attribute.value, &value) == DERSuccess && isText(value.tag))
-        return std::string(type->name) + "=" + escapedValue(value.content);
-    return (type != nullptr ? type->name : oid) + "=#" + upperCase(hexText(attribute.value, mostOctetsOfValue));
+        return std::string(type->name) + "=" + escapedValue(value.content, most);
+    return (type != nullptr ? type->name : oid) + "=#" + upperCase(hexText(attribute.value, most));
 }
 
-// One RelativeDistinguishedName; nothing when it is malformed.
-std::optional<std::string> attributesText(const DERDecodedInfo& relativeName) {
+// One RelativeDistinguishedName; nothing when it is malformed. No more is read when it has become longer than
+// `longest`.
+std::optional<std::string> attributesText(const DERDecodedInfo& relativeName, std::size_t longest) {
     std::string text;
     DERSequence rest;
     DERDecodedInfo element;
     if (relativeName.tag != DERTagSet)
         return std::nullopt;
     DERDecodeSeqContentInit(&relativeName.content, &rest);
-    while (rest.next != rest.end && text.size() <= longestName) {
+    while (rest.next != rest.end && text.size() <= longest) {
         DERAttributeTypeAndValue attribute;
         if (DERDecodeSeqNext(&rest, &element) != DERSuccess || element.tag != DERTagSequence ||
             DERParseSequenceContent(&element.content, DERNumAttributeTypeAndValueItemSpecs,
                                     DERAttributeTypeAndValueItemSpecs, &attribute, sizeof attribute) != DERSuccess)
             return std::nullopt;
-        text += (text.empty() ? "" : "+") + attributeText(attribute);
+        text += (text.empty() ? "" : "+") + attributeText(attribute, longest / 2);
     }
     return text;
 }
@@ -222,10 +222,9 @@ std::string ecText(const Key& key) {
 
 // The number's digits, without the octet that keeps it positive.
 std::string serialText(DERItem serialNumber) {
-    constexpr std::uint64_t mostOctets = 64;
     if (serialNumber.length > 1 && serialNumber.data[0] == 0)
         serialNumber = {serialNumber.data + 1, serialNumber.length - 1};
-    return hexText(serialNumber, mostOctets);
+    return hexText(serialNumber);
 }
 
 } // namespace
@@ -240,20 +239,25 @@ std::optional<Certificate> readCertificate(const DERItem& encoding) {
     return certificate;
 }
 
-std::string nameText(const DERItem& name) {
-    std::string text;
+std::string nameText(const DERItem& name, std::size_t longest) {
+    std::vector<std::string> parts;
+    std::size_t size = 0;
     DERSequence rest;
     DERDecodedInfo relativeName;
     DERDecodeSeqContentInit(&name, &rest);
-    while (rest.next != rest.end && text.size() <= longestName) {
-        const auto attributes =
-            DERDecodeSeqNext(&rest, &relativeName) == DERSuccess ? attributesText(relativeName) : std::nullopt;
+    while (rest.next != rest.end && size <= longest) {
+        auto attributes =
+            DERDecodeSeqNext(&rest, &relativeName) == DERSuccess ? attributesText(relativeName, longest) : std::nullopt;
         if (!attributes)
-            return "#" + upperCase(hexText(name, mostOctetsOfValue));
-        // RFC 4514 2.1: the last one comes first.
-        text.insert(0, *attributes + (text.empty() ? "" : ","));
+            return "#" + upperCase(hexText(name, longest / 2));
+        size += attributes->size() + 1;
+        parts.push_back(std::move(*attributes));
     }
-    return text.size() > longestName ? text.substr(0, longestName) + "..." : text;
+    // RFC 4514 2.1: the last one comes first.
+    std::string text;
+    for (auto part = parts.rbegin(); part != parts.rend(); ++part)
+        text += (text.empty() ? "" : ",") + *part;
+    return shortened(text, longest);
 }
 
 std::string keyText(const DERItem& subjectPublicKeyInfo) {
@@ -299,8 +303,8 @@ ordered_json certificateJson(const DERItem& encoding) {
     const auto certificate = readCertificate(encoding);
     if (!certificate)
         return {{"fault", "is no certificate"}};
-    return {{"subject", nameText(certificate->tbs.subject)},
-            {"issuer", nameText(certificate->tbs.issuer)},
+    return {{"subject", nameText(certificate->tbs.subject, SIZE_MAX)},
+            {"issuer", nameText(certificate->tbs.issuer, SIZE_MAX)},
             {"key", keyText(certificate->tbs.subjectPublicKeyInfo)},
             {"signatureAlgorithm", algorithmText(certificate->fields.signatureAlgorithm)},
             {"serialNumber", serialText(certificate->tbs.serialNumber)},

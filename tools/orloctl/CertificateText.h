@@ -20,8 +20,8 @@ struct Certificate {
 std::optional<Certificate> readCertificate(const DERItem& encoding);
 
 // The content of a Name in the form of RFC 4514, "CN=Tevari Root CA,O=Tevari". Octets that are no printable ASCII are
-// escaped, and so are values that are no text. A long name ends in an ellipsis.
-std::string nameText(const DERItem& name);
+// escaped, and so are values that are no text. A name of more than `longest` characters ends in an ellipsis.
+std::string nameText(const DERItem& name, std::size_t longest = 512);
 
 // The content of a SubjectPublicKeyInfo: "RSA 4096 bits", "EC P-384".
 std::string keyText(const DERItem& subjectPublicKeyInfo);
@@ -37,8 +37,8 @@ std::string keyFault(const DERItem& subjectPublicKeyInfo);
 std::string algorithmName(const DERItem& oid);
 std::string algorithmText(const DERItem& identifier);
 
-// "subject", "issuer", "key", "signatureAlgorithm", "serialNumber" and the "sha256" of the encoding; with a "fault"
-// instead when it is no certificate.
+// Whole: "subject", "issuer", "key", "signatureAlgorithm", "serialNumber" and the "sha256" of the encoding; with a
+// "fault" instead when it is no certificate.
 nlohmann::ordered_json certificateJson(const DERItem& encoding);
 
 #endif

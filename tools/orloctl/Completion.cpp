@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <iostream>
+#include <sstream>
 #include <string_view>
 
 #include "img4/Img4Trust.h"
@@ -52,6 +53,16 @@ constexpr struct {
     {"PROFILE", offerTrustProfiles},
 };
 
+// The words of an option or operand that takes no others, which stand in braces in the name of its type.
+void offerMembers(const std::string& typeName, const std::string& typed) {
+    const std::size_t open = typeName.find('{');
+    if (open == std::string::npos)
+        return;
+    std::istringstream words(typeName.substr(open + 1, typeName.find('}') - open - 1));
+    for (std::string word; std::getline(words, word, ',');)
+        offer(word, typed);
+}
+
 void offerKind(std::string_view placeholder, const std::string& typed) {
     for (const auto& kind : kinds)
         if (kind.placeholder == placeholder)
@@ -99,8 +110,12 @@ void offerOperands(const CLI::App& verb, std::size_t before, const std::string& 
         if (!operand->get_positional())
             continue;
         const bool takesAllThatFollow = operand->get_expected_max() > 1;
-        if (position == before || (takesAllThatFollow && position < before))
+        if (position == before || (takesAllThatFollow && position < before)) {
+            offerMembers(operand->get_type_name(), typed);
             offerKind(operand->get_name(true), typed);
+            // What may be left out may be left out now.
+            before += operand->get_required() || takesAllThatFollow ? 0 : 1;
+        }
         ++position;
     }
 }

@@ -34,13 +34,13 @@ std::string quotedCode(std::uint64_t number);
 
 // The octets as text, those that are no printable ASCII and the backslash as \xNN; at most `most` of them, then an
 // ellipsis. The second form puts the text in quotes.
-std::string escapedText(const DERItem& text, std::uint64_t most);
+std::string escapedText(const DERItem& text, std::uint64_t most = UINT64_MAX);
 std::string quotedText(const DERItem& text, std::uint64_t most);
 
 // The content of an OBJECT IDENTIFIER as numbers with dots. A very long one ends in an ellipsis.
 std::string oidText(const DERItem& content);
 
 // Two lower-case digits an octet; at most `most` octets, then an ellipsis.
-std::string hexText(const DERItem& data, std::uint64_t most);
+std::string hexText(const DERItem& data, std::uint64_t most = UINT64_MAX);
 
 #endif

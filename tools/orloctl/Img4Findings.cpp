@@ -43,14 +43,10 @@ std::string sha384Text(const DERItem& data) {
 }
 
 nlohmann::ordered_json dataJson(const DERItem& data) {
-    nlohmann::ordered_json json = {{"length", data.length}, {"hex", boundedHex(data)}};
+    nlohmann::ordered_json json = {{"length", data.length}, {"hex", hexText(data)}};
     if (data.length > mostOctetsShown)
         json["sha256"] = sha256Text(data);
     return json;
-}
-
-std::string boundedHex(const DERItem& data) {
-    return hexText(data, mostOctetsShown);
 }
 
 } // namespace img4show

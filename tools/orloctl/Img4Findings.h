@@ -27,6 +27,7 @@ public:
     void note(const std::string& text) { notes_.push_back(text); }
     const nlohmann::ordered_json& notes() const { return notes_; }
 
+    const DERItem& file() const { return file_; }
     std::ptrdiff_t offsetOf(const std::uint8_t* place) const { return place - file_.data; }
     std::string at(const std::uint8_t* place) const { return "at offset " + std::to_string(offsetOf(place)); }
 
@@ -40,9 +41,8 @@ std::string sha1Text(const DERItem& data);
 std::string sha256Text(const DERItem& data);
 std::string sha384Text(const DERItem& data);
 
-// Octets as digits. Those that are too many to be shown can be told apart by their digest.
+// Octets as digits. Those that are too many to be shown to people can be told apart by their digest.
 nlohmann::ordered_json dataJson(const DERItem& data);
-std::string boundedHex(const DERItem& data);
 
 } // namespace img4show
 

@@ -58,8 +58,36 @@ PropertyFault propertyFault(const DERItem& content, DERTag tag) {
     return {elements.end, "goes on behind the SEQUENCE of name and value"};
 }
 
-ordered_json PropertyReader::dictionary(const DERItem& content, const std::string& where, unsigned depth) {
-    ordered_json properties = ordered_json::array();
+namespace {
+
+class Reader {
+public:
+    // Without `findings` the properties are only shown.
+    Reader(const DERItem& file, Findings* findings) : file_(file), findings_(findings) {}
+
+    Elements dictionary(const DERItem& content, const std::string& where, unsigned depth) const {
+        return [reader = *this, content, where, depth](const auto& take) { reader.walk(content, where, depth, take); };
+    }
+
+private:
+    void walk(const DERItem& content, const std::string& where, unsigned depth,
+              const std::function<bool(const Element&)>& take) const;
+    Element describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
+                     unsigned depth) const;
+    void describeValue(const Img4Property& property, const std::string& what, unsigned depth, Element& shown) const;
+    void valueFault(const Img4Property& property, const std::string& what, const std::string& reason,
+                    ordered_json& json) const;
+    void fault(const std::uint8_t* place, const std::string& reason) const {
+        if (findings_)
+            findings_->fault(place, reason);
+    }
+
+    DERItem file_;
+    Findings* findings_;
+};
+
+void Reader::walk(const DERItem& content, const std::string& where, unsigned depth,
+                  const std::function<bool(const Element&)>& take) const {
     std::set<DERTag> seen;
     DERSequence sequence;
     DERDecodedInfo element;
@@ -67,51 +95,52 @@ ordered_json PropertyReader::dictionary(const DERItem& content, const std::strin
     while (sequence.next != sequence.end) {
         const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
         if (DERDecodeSeqNext(&sequence, &element) != DERSuccess) {
-            findings_.headerFault(rest, "A property of " + where);
-            break;
+            if (findings_)
+                findings_->headerFault(rest, "A property of " + where);
+            return;
         }
         const DERItem encoding = {rest.data, static_cast<std::uint64_t>(sequence.next - rest.data)};
-        ordered_json property = describe(element, encoding, where, depth);
+        Element property = describe(element, encoding, where, depth);
         if (!seen.insert(element.tag).second)
-            property["hidden"] = "behind an earlier one of that tag, which a lookup takes";
-        if (++count_ <= mostProperties)
-            properties.push_back(std::move(property));
+            property.json["hidden"] = "behind an earlier one of that tag, which a lookup takes";
+        if (!take(property))
+            return;
     }
-    return properties;
 }
 
 // One element of a dictionary, which should be a property.
-ordered_json PropertyReader::describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
-                                      unsigned depth) {
+Element Reader::describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
+                         unsigned depth) const {
     const std::uint64_t number = element.tag & DERTagNumberMask;
     const bool isProperty = element.tag == Img4PropertyTag(number);
-    ordered_json json = {{"name", isProperty ? codeText(number) : derTagName(element.tag)},
-                         {"offset", findings_.offsetOf(encoding.data)}};
+    const std::ptrdiff_t offset = encoding.data - file_.data;
+    Element shown{{{"name", isProperty ? codeText(number) : derTagName(element.tag)}, {"offset", offset}}, {}};
     const std::string what = (isProperty ? quotedCode(number) : derTagName(element.tag)) + " of " + where;
     Img4Property property;
     if (!isProperty) {
-        findings_.fault(encoding.data, what + " is no property");
-        json["fault"] = "is no property";
+        fault(encoding.data, what + " is no property");
+        shown.json["fault"] = "is no property";
     } else if (DERImg4DecodeProperty(&element.content, element.tag, &property) == DERSuccess) {
-        describeValue(property, what, depth, json);
+        describeValue(property, what, depth, shown);
     } else {
         const PropertyFault why = propertyFault(element.content, element.tag);
-        findings_.fault(why.place, what + ", which begins " + findings_.at(encoding.data) + ", " + why.reason);
-        json["fault"] = why.reason;
+        fault(why.place, what + ", which begins at offset " + std::to_string(offset) + ", " + why.reason);
+        shown.json["fault"] = why.reason;
     }
-    return json;
+    return shown;
 }
 
-void PropertyReader::valueFault(const Img4Property& property, const std::string& what, const std::string& reason,
-                                ordered_json& json) {
-    findings_.fault(property.value.data, what + " " + reason);
+void Reader::valueFault(const Img4Property& property, const std::string& what, const std::string& reason,
+                        ordered_json& json) const {
+    fault(property.value.data, what + " " + reason);
     json["fault"] = reason;
-    json["hex"] = boundedHex(property.value);
+    json["hex"] = hexText(property.value);
 }
 
-void PropertyReader::describeValue(const Img4Property& property, const std::string& what, unsigned depth,
-                                   ordered_json& json) {
+void Reader::describeValue(const Img4Property& property, const std::string& what, unsigned depth,
+                           Element& shown) const {
     const DERItem& value = property.value;
+    ordered_json& json = shown.json;
     bool truth = false;
     std::uint64_t number = 0;
     json["type"] = derTagName(property.valueTag);
@@ -132,14 +161,15 @@ void PropertyReader::describeValue(const Img4Property& property, const std::stri
                        json);
         break;
     case DERTagIA5String:
-        json["value"] = escapedText(value, mostCharactersShown);
+        json["value"] = escapedText(value);
         if (value.length > mostCharactersShown)
             json["sha256"] = sha256Text(value);
         break;
     case DERTagSet:
     case DERTagSequence:
         if (depth < deepestDictionary && looksLikeDictionary(value))
-            json["properties"] = dictionary(value, quotedCode(property.tag & DERTagNumberMask), depth + 1);
+            json["properties"] =
+                shown.lists.add(dictionary(value, quotedCode(property.tag & DERTagNumberMask), depth + 1));
         else
             json.update(dataJson(value));
         break;
@@ -150,6 +180,21 @@ void PropertyReader::describeValue(const Img4Property& property, const std::stri
             json.update(dataJson(value));
         break;
     }
+}
+
+void goThrough(const Elements& properties) {
+    properties([](const Element& property) {
+        if (property.json.contains("properties"))
+            goThrough(property.lists.at(property.json["properties"]));
+        return true;
+    });
+}
+
+} // namespace
+
+Elements readProperties(const DERItem& content, const std::string& where, Findings& findings) {
+    goThrough(Reader(findings.file(), &findings).dictionary(content, where, 0));
+    return Reader(findings.file(), nullptr).dictionary(content, where, 0);
 }
 
 } // namespace img4show

@@ -4,11 +4,15 @@ namespace {
 
 using nlohmann::ordered_json;
 
+constexpr std::uint64_t mostProperties = 10000;
+constexpr std::uint64_t mostCertificates = 100;
+constexpr std::size_t mostCharactersShown = 128;
+
 std::string bytesText(const ordered_json& json) {
     const auto length = json["length"].get<std::uint64_t>();
     std::string text = std::to_string(length) + (length == 1 ? " byte" : " bytes");
     if (json.contains("hex") && length != 0)
-        text += ": " + json["hex"].get<std::string>();
+        text += ": " + shortened(json["hex"], mostCharactersShown);
     if (json.contains("sha256"))
         text += " (SHA-256 " + json["sha256"].get<std::string>() + ")";
     return text;
@@ -20,19 +24,33 @@ std::string placeText(const ordered_json& json) {
 
 class Lines {
 public:
+    explicit Lines(const Lists& lists) : lists_(lists) {}
+
     void add(unsigned depth, const std::string& line) {
         text_ += std::string(2 * std::size_t{depth}, ' ') + line + "\n";
     }
-    void addProperties(unsigned depth, const ordered_json& properties);
+    void addProperties(unsigned depth, const Elements& properties);
+    // There is an empty array in place of a dictionary that could not be entered.
+    void addProperties(unsigned depth, const ordered_json& properties) {
+        if (properties.is_binary())
+            addProperties(depth, lists_.at(properties));
+    }
+    void addCertificates(const ordered_json& certificates);
     void addDigests(const ordered_json& section);
     void addPayload(const ordered_json& payload);
     void addManifest(const ordered_json& manifest);
     void addRestoreInfo(const ordered_json& restoreInfo);
 
-    std::string text() && { return std::move(text_); }
+    std::string text() && {
+        if (properties_ > mostProperties)
+            add(0, std::to_string(properties_ - mostProperties) + " further properties are not shown");
+        return std::move(text_);
+    }
 
 private:
+    const Lists& lists_;
     std::string text_;
+    std::uint64_t properties_ = 0;
 };
 
 // brdI  INTEGER 12
@@ -47,12 +65,28 @@ std::string propertyLine(const ordered_json& property) {
     return line;
 }
 
-void Lines::addProperties(unsigned depth, const ordered_json& properties) {
-    for (const ordered_json& property : properties) {
-        add(depth, propertyLine(property));
-        if (property.contains("properties"))
-            addProperties(depth + 1, property["properties"]);
-    }
+void Lines::addProperties(unsigned depth, const Elements& properties) {
+    properties([&](const Element& property) {
+        if (++properties_ <= mostProperties)
+            add(depth, propertyLine(property.json));
+        if (property.json.contains("properties"))
+            addProperties(depth + 1, property.lists.at(property.json["properties"]));
+        return true;
+    });
+}
+
+void Lines::addCertificates(const ordered_json& certificates) {
+    std::string lines;
+    std::uint64_t count = 0;
+    lists_.at(certificates)([&](const Element& certificate) {
+        if (++count <= mostCertificates)
+            lines += "    " + placeText(certificate.json) + "\n";
+        return true;
+    });
+    add(1, "certificates: " + std::to_string(count));
+    text_ += lines;
+    if (count > mostCertificates)
+        add(2, "... " + std::to_string(count - mostCertificates) + " more");
 }
 
 void Lines::addDigests(const ordered_json& section) {
@@ -64,7 +98,7 @@ void Lines::addPayload(const ordered_json& payload) {
     add(0, "Payload, " + placeText(payload));
     for (const char* key : {"type", "version"})
         if (payload.contains(key))
-            add(1, std::string(key) + ": \"" + payload[key].get<std::string>() + "\"");
+            add(1, std::string(key) + ": \"" + shortened(payload[key], mostCharactersShown) + "\"");
     for (const char* key : {"data", "keybag"})
         if (payload.contains(key))
             add(1, std::string(key) + ": " + bytesText(payload[key]));
@@ -89,11 +123,8 @@ void Lines::addManifest(const ordered_json& manifest) {
         addProperties(1, manifest["body"]);
     if (manifest.contains("signature"))
         add(1, "signature: " + bytesText(manifest["signature"]));
-    if (manifest.contains("certificates")) {
-        add(1, "certificates: " + std::to_string(manifest["certificates"].size()));
-        for (const ordered_json& certificate : manifest["certificates"])
-            add(2, placeText(certificate));
-    }
+    if (manifest.contains("certificates"))
+        addCertificates(manifest["certificates"]);
     addDigests(manifest);
 }
 
@@ -108,20 +139,22 @@ void Lines::addRestoreInfo(const ordered_json& restoreInfo) {
 std::string img4ValueText(const ordered_json& property) {
     std::string text = property["type"];
     if (property.contains("value"))
-        text += " " + property["value"].dump();
+        text += " " + shortened(property["value"].dump(), mostCharactersShown);
     else if (property.contains("length"))
         text += " " + bytesText(property);
     return text;
 }
 
-std::string img4PropertiesText(const ordered_json& properties, unsigned depth) {
-    Lines lines;
+std::string img4PropertiesText(const Elements& properties, unsigned depth) {
+    const Lists none;
+    Lines lines(none);
     lines.addProperties(depth, properties);
     return std::move(lines).text();
 }
 
-std::string img4Text(const ordered_json& json) {
-    Lines lines;
+std::string img4Text(const Report& report) {
+    const ordered_json& json = report.json;
+    Lines lines(report.lists);
     lines.add(0, "Img4 " + json.value("kind", "file") + ", " + json["length"].dump() + " bytes");
     if (json.contains("payload"))
         lines.addPayload(json["payload"]);

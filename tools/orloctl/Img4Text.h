@@ -3,14 +3,14 @@
 
 #include <string>
 
-#include <nlohmann/json.hpp>
+#include "tools/orloctl/Report.h"
 
-// The lines for people of what showImg4 found.
-std::string img4Text(const nlohmann::ordered_json& json);
+// The lines for people of what showImg4 found; of many properties and certificates the first.
+std::string img4Text(const Report& report);
 
-// The lines of properties alone, as PropertyReader describes them, indented for `depth` dictionaries around them; and
-// the type and value of one that has a type, "INTEGER 12".
-std::string img4PropertiesText(const nlohmann::ordered_json& properties, unsigned depth);
+// The lines of properties alone, indented for `depth` dictionaries around them; and the type and value of one that has
+// a type, "INTEGER 12".
+std::string img4PropertiesText(const Elements& properties, unsigned depth);
 std::string img4ValueText(const nlohmann::ordered_json& property);
 
 #endif

@@ -4,6 +4,7 @@
 #include <cstdarg>
 #include <cstdio>
 #include <limits>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -14,11 +15,23 @@
 
 namespace {
 
-using sysconfig::SysConfig3Ptr;
+// Entries are read while they are written, from an object that lives as long as the report.
+using ObjectPtr = std::shared_ptr<__SysConfig3>;
 
 using nlohmann::ordered_json;
 
-std::vector<std::string>* messages = nullptr;
+constexpr std::size_t mostEntriesShown = 1000;
+constexpr std::size_t mostCharactersShown = 64;
+constexpr std::size_t mostMessages = 100;
+
+// The library's messages, of which a blob can cause several for each of its entries.
+struct Messages {
+    std::vector<std::string> first;
+    std::size_t leftOut = 0;
+    std::string last;
+};
+
+Messages* messages = nullptr;
 
 // Keeps a message of the library, without the prototype that most begin with.
 void keepMessage(int, const char* format, ...) {
@@ -29,7 +42,11 @@ void keepMessage(int, const char* format, ...) {
     va_end(arguments);
     const std::string message = line;
     const std::size_t prototypeEnd = format[0] == '%' && format[1] == 's' ? message.find(") ") : std::string::npos;
-    messages->push_back(prototypeEnd == std::string::npos ? message : message.substr(prototypeEnd + 2));
+    messages->last = prototypeEnd == std::string::npos ? message : message.substr(prototypeEnd + 2);
+    if (messages->first.size() < mostMessages)
+        messages->first.push_back(messages->last);
+    else
+        ++messages->leftOut;
 }
 
 // Collects the library's messages for as long as it lives.
@@ -46,12 +63,18 @@ public:
     MessageCollector(const MessageCollector&) = delete;
     MessageCollector& operator=(const MessageCollector&) = delete;
 
-    const std::vector<std::string>& collected() const { return collected_; }
+    const Messages& collected() const { return collected_; }
 
 private:
-    std::vector<std::string> collected_;
+    Messages collected_;
     SysConfig3LogHandler earlier_;
 };
+
+void addMessages(ordered_json& json, const Messages& said) {
+    json["messages"] = said.first;
+    if (said.leftOut != 0)
+        json["messagesLeftOut"] = said.leftOut;
+}
 
 std::string hexadecimal(std::uint32_t number) {
     char digits[16];
@@ -77,37 +100,43 @@ std::string hexDigits(const SysConfigData& view) {
     return digits.isNothing() ? "" : *digits.text();
 }
 
-ordered_json payloadEntries(const __SysConfig3* object) {
-    ordered_json entries = ordered_json::array();
-    for (const auto* entry = sysConfig3GetHeadPayloadEntry(object); entry;
-         entry = sysConfig3PayloadEntryGetNextEntry(entry)) {
-        ordered_json json{{"key", fourCharacters(sysConfig3PayloadEntryGetKey(entry))},
-                          {"comment", sysConfig3PayloadEntryGetComment(entry)}};
-        SysConfigData data = {};
-        if (sysConfig3PayloadEntryGetData(entry, &data))
-            json["data"] = hexDigits(data);
-        else if (const char* string = sysConfig3PayloadEntryGetString(entry))
-            json["string"] = string;
-        else
-            json["deleted"] = sysConfig3PayloadEntryGetDeleted(entry);
-        entries.push_back(std::move(json));
-    }
-    return entries;
+ordered_json payloadEntry(const __SysConfig3PayloadEntry* entry) {
+    ordered_json json{{"key", fourCharacters(sysConfig3PayloadEntryGetKey(entry))},
+                      {"comment", sysConfig3PayloadEntryGetComment(entry)}};
+    SysConfigData data = {};
+    if (sysConfig3PayloadEntryGetData(entry, &data))
+        json["data"] = hexDigits(data);
+    else if (const char* string = sysConfig3PayloadEntryGetString(entry))
+        json["string"] = string;
+    else
+        json["deleted"] = sysConfig3PayloadEntryGetDeleted(entry);
+    return json;
 }
 
-ordered_json metadataEntries(const __SysConfig3* object) {
-    ordered_json entries = ordered_json::array();
-    for (const auto* entry = sysConfig3GetHeadMetadataEntry(object); entry;
-         entry = sysConfig3MetadataEntryGetNextEntry(entry)) {
-        ordered_json json{{"key", sysConfig3MetadataEntryGetKey(entry)}};
-        SysConfigData data = {};
-        if (sysConfig3MetadataEntryGetData(entry, &data))
-            json["data"] = hexDigits(data);
-        else
-            json["string"] = sysConfig3MetadataEntryGetString(entry);
-        entries.push_back(std::move(json));
-    }
-    return entries;
+ordered_json metadataEntry(const __SysConfig3MetadataEntry* entry) {
+    ordered_json json{{"key", sysConfig3MetadataEntryGetKey(entry)}};
+    SysConfigData data = {};
+    if (sysConfig3MetadataEntryGetData(entry, &data))
+        json["data"] = hexDigits(data);
+    else
+        json["string"] = sysConfig3MetadataEntryGetString(entry);
+    return json;
+}
+
+Elements payloadEntries(const ObjectPtr& object) {
+    return [object](const auto& take) {
+        const auto* entry = sysConfig3GetHeadPayloadEntry(object.get());
+        while (entry && take({payloadEntry(entry), {}}))
+            entry = sysConfig3PayloadEntryGetNextEntry(entry);
+    };
+}
+
+Elements metadataEntries(const ObjectPtr& object) {
+    return [object](const auto& take) {
+        const auto* entry = sysConfig3GetHeadMetadataEntry(object.get());
+        while (entry && take({metadataEntry(entry), {}}))
+            entry = sysConfig3MetadataEntryGetNextEntry(entry);
+    };
 }
 
 ordered_json manifestHMACs(const __SysConfig3* object) {
@@ -162,49 +191,71 @@ std::string outerProblem(const Value::Data& blob) {
     return "Octets follow the manifest element, at offset " + std::to_string(sequence.next - blob.data()) + ".";
 }
 
+std::string quoted(const std::string& text) {
+    return ordered_json(shortened(text, mostCharactersShown))
+        .dump(-1, ' ', true, ordered_json::error_handler_t::replace);
+}
+
 std::string valueText(const ordered_json& entry) {
     if (entry.contains("data")) {
-        const std::string digits = entry["data"];
-        constexpr std::size_t shown = 64;
-        return "data, " + std::to_string(digits.size() / 2) + " bytes: " + digits.substr(0, shown) +
-               (digits.size() > shown ? "..." : "");
+        const auto& digits = entry["data"].get_ref<const std::string&>();
+        return "data, " + std::to_string(digits.size() / 2) + " bytes: " + shortened(digits, mostCharactersShown);
     }
     if (entry.contains("string"))
-        return "string: " + entry["string"].dump(-1, ' ', true, ordered_json::error_handler_t::replace);
+        return "string: " + quoted(entry["string"]);
     return entry["deleted"].get<bool>() ? "deleted" : "no value";
 }
 
-std::string entriesText(const char* title, const ordered_json& entries) {
-    std::string text = std::string(title) + ": " + std::to_string(entries.size()) + "\n";
-    for (const ordered_json& entry : entries) {
-        text += "  " + entry["key"].dump(-1, ' ', true, ordered_json::error_handler_t::replace);
+std::string entriesText(const char* title, std::size_t count, const Elements& entries) {
+    std::string text = std::string(title) + ": " + std::to_string(count) + "\n";
+    std::size_t shown = 0;
+    entries([&](const Element& element) {
+        const ordered_json& entry = element.json;
+        text += "  " + quoted(entry["key"]);
         if (entry.contains("comment"))
-            text += "  comment " + entry["comment"].dump(-1, ' ', true, ordered_json::error_handler_t::replace);
+            text += "  comment " + quoted(entry["comment"]);
         text += "  " + valueText(entry) + "\n";
-    }
+        return ++shown < mostEntriesShown;
+    });
+    if (count > shown)
+        text += "  ... " + std::to_string(count - shown) + " more\n";
     return text;
 }
 
-std::string reportText(const ordered_json& json) {
+std::string reportText(const Report& report, const __SysConfig3* object) {
+    const ordered_json& json = report.json;
     std::string text = "Configuration blob \"" + json["magic"].get<std::string>() + "\", version " +
                        json["version"].get<std::string>() + "\n";
-    text += entriesText("Payload entries", json["payload"]);
-    text += entriesText("Metadata entries", json["metadata"]);
+    text += entriesText("Payload entries", sysConfig3GetPayloadEntryCount(object), report.lists.at(json["payload"]));
+    text += entriesText("Metadata entries", sysConfig3GetMetadataEntryCount(object), report.lists.at(json["metadata"]));
     text += "HMACs: " + json["hmacState"].get<std::string>() + "\n";
-    for (const auto& [name, digits] : json["hmacs"].items())
-        text += "  " + name + ": " +
-                (digits.get_ref<const std::string&>().empty() ? "absent" : digits.get<std::string>()) + "\n";
+    for (const auto& [name, digits] : json["hmacs"].items()) {
+        const auto& all = digits.get_ref<const std::string&>();
+        text += "  " + name + ": " + (all.empty() ? "absent" : shortened(all, mostCharactersShown)) + "\n";
+    }
     for (const ordered_json& message : json["messages"])
         text += "Note: " + message.get<std::string>() + "\n";
+    if (json.contains("messagesLeftOut"))
+        text += "Note: ... " + json["messagesLeftOut"].dump() + " more\n";
+    if (json.contains("octetsBehind"))
+        text += "Note: " + json["octetsBehind"].dump() + " octets follow the blob\n";
     return text;
 }
 
-Report refused(const std::vector<std::string>& why, const Value::Data& blob) {
+Report refused(const Messages& why, const Value::Data& blob) {
     Report report;
     report.ok = false;
-    report.problem = "No configuration blob. " + (why.empty() ? outerProblem(blob) : why.back());
-    report.json = {{"messages", why}};
+    report.problem = "No configuration blob. " + (why.last.empty() ? outerProblem(blob) : why.last);
+    addMessages(report.json, why);
     return report;
+}
+
+// The octets behind the outer SEQUENCE, at which the library does not look.
+std::uint64_t octetsBehind(const Value::Data& blob) {
+    const DERItem whole{blob.data(), blob.size()};
+    DERDecodedInfo outer = {};
+    DERDecodeItem(&whole, &outer);
+    return static_cast<std::uint64_t>(blob.data() + blob.size() - (outer.content.data + outer.content.length));
 }
 
 } // namespace
@@ -212,19 +263,22 @@ Report refused(const std::vector<std::string>& why, const Value::Data& blob) {
 Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
     const MessageCollector collector;
     if (blob.size() > std::numeric_limits<std::uint32_t>::max())
-        return refused({"It is larger than 4 GiB."}, blob);
-    const SysConfig3Ptr object(decodeSysConfig3(blob.data(), static_cast<std::uint32_t>(blob.size())));
+        return refused({{}, 0, "It is larger than 4 GiB."}, blob);
+    const ObjectPtr object(decodeSysConfig3(blob.data(), static_cast<std::uint32_t>(blob.size())),
+                           sysconfig::Release());
     if (!object)
         return refused(collector.collected(), blob);
     Report report;
     report.json = {{"magic", fourCharacters(sysConfig3GetMagic(object.get()))},
                    {"version", hexadecimal(sysConfig3GetVersion(object.get()))},
-                   {"payload", payloadEntries(object.get())},
-                   {"metadata", metadataEntries(object.get())},
+                   {"payload", report.lists.add(payloadEntries(object))},
+                   {"metadata", report.lists.add(metadataEntries(object))},
                    {"hmacState", hmacState(object.get(), hmacKey)},
-                   {"hmacs", manifestHMACs(object.get())},
-                   {"messages", collector.collected()}};
-    report.text = reportText(report.json);
+                   {"hmacs", manifestHMACs(object.get())}};
+    addMessages(report.json, collector.collected());
+    if (const std::uint64_t behind = octetsBehind(blob); behind != 0)
+        report.json["octetsBehind"] = behind;
+    report.text = reportText(report, object.get());
     if (report.json["hmacState"] == "do not match") {
         report.ok = false;
         report.problem = "The HMACs do not match the entries under this key.";

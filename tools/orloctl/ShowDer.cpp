@@ -10,13 +10,12 @@ namespace {
 using nlohmann::ordered_json;
 
 constexpr unsigned deepest = 64;
-constexpr std::uint64_t mostShown = 50000;
-constexpr std::uint64_t mostOctetsOfValue = 32;
-constexpr std::uint64_t mostCharactersOfValue = 128;
+constexpr std::uint64_t mostShown = 10000;
+constexpr std::size_t mostCharactersOfValue = 128;
 
 ordered_json integerValue(const DERItem& content) {
     if (content.length == 0 || content.length > sizeof(std::int64_t))
-        return "0x" + hexText(content, mostOctetsOfValue);
+        return "0x" + hexText(content);
     std::uint64_t number = (content.data[0] & 0x80) != 0 ? UINT64_MAX : 0;
     for (std::uint64_t i = 0; i < content.length; ++i)
         number = number << 8 | content.data[i];
@@ -29,18 +28,24 @@ bool isText(DERTag tag) {
     return std::find(std::begin(texts), std::end(texts), tag) != std::end(texts);
 }
 
+// Numbers with dots, or the octets when a number is too large for them.
+std::string oidValue(const DERItem& content) {
+    const std::string numbers = oidText(content);
+    return numbers.ends_with("...") ? "0x" + hexText(content) : numbers;
+}
+
 // The value of a primitive item; null when it has none to show.
 ordered_json valueOf(DERTag tag, const DERItem& content) {
     constexpr DERTag enumerated = 10;
     if (isText(tag))
-        return escapedText(content, mostCharactersOfValue);
+        return escapedText(content);
     if (tag == DERTagBoolean && content.length == 1)
         return content.data[0] != 0;
     if (tag == DERTagInteger || tag == enumerated)
         return integerValue(content);
     if (tag == DERTagObjectIdentifier)
-        return oidText(content);
-    return content.length != 0 ? ordered_json(hexText(content, mostOctetsOfValue)) : ordered_json();
+        return oidValue(content);
+    return content.length != 0 ? ordered_json(hexText(content)) : ordered_json();
 }
 
 std::string padded(std::uint64_t number, std::size_t width) {
@@ -48,120 +53,151 @@ std::string padded(std::uint64_t number, std::size_t width) {
     return digits.size() < width ? std::string(width - digits.size(), ' ') + digits : digits;
 }
 
+// A value as one reads it, by the name of its tag.
+std::string valueText(const ordered_json& value, const std::string& tag) {
+    const std::string text =
+        shortened(value.is_string() ? value.get<std::string>() : value.dump(), mostCharactersOfValue);
+    return tag.ends_with("String") || tag.ends_with("Time") ? "\"" + text + "\"" : text;
+}
+
 class Tree {
 public:
-    // The findings go into `report`.
-    Tree(const std::uint8_t* data, std::size_t length, Report& report)
-        : data_(data), whole_{data, length}, report_(report) {}
+    Tree(const std::uint8_t* data, std::size_t length) : data_(data), whole_{data, length}, end_(data + length) {}
 
-    void show();
+    // Goes through all items, and keeps where the tree ends and what is wrong first.
+    void check(Report& report);
+
+    std::uint64_t count() const { return count_; }
+
+    // The items, each with the items inside it as its list.
+    Elements items() const { return itemsIn(whole_); }
 
 private:
-    // Each returns false when the tree ends here.
-    bool walk(const DERItem& content, unsigned depth, ordered_json& items);
-    bool enter(const DERDecodedInfo& item, unsigned depth, ordered_json& shown);
+    void check(const DERItem& content, unsigned depth, Report& report);
+    void note(Report& report, std::uint64_t offset, const DerFault& fault) const;
 
-    ordered_json describe(const DERItem& rest, const DERDecodedInfo& item, unsigned depth);
-    void note(std::uint64_t offset, const DerFault& fault);
+    Elements itemsIn(const DERItem& content) const;
+    Element describe(const DERItem& rest, const DERDecodedInfo& item) const;
+
     std::uint64_t offsetOf(const DERItem& place) const { return static_cast<std::uint64_t>(place.data - data_); }
 
     const std::uint8_t* data_;
     DERItem whole_;
-    std::uint64_t items_ = 0;
-    Report& report_;
+    const std::uint8_t* end_; // of what can be read
+    std::uint64_t count_ = 0;
 };
 
-void Tree::note(std::uint64_t offset, const DerFault& fault) {
-    if (!report_.ok)
+void Tree::note(Report& report, std::uint64_t offset, const DerFault& fault) const {
+    if (!report.ok)
         return;
-    report_.ok = false;
-    report_.json["problemOffset"] = offset + fault.offset;
-    report_.problem = "Strict DER ends at offset " + std::to_string(offset + fault.offset) +
-                      ", in the item at offset " + std::to_string(offset) + ": " + fault.reason + ".";
+    report.ok = false;
+    report.json["problemOffset"] = offset + fault.offset;
+    report.problem = "Strict DER ends at offset " + std::to_string(offset + fault.offset) + ", in the item at offset " +
+                     std::to_string(offset) + ": " + fault.reason + ".";
 }
 
-ordered_json Tree::describe(const DERItem& rest, const DERDecodedInfo& item, unsigned depth) {
-    const auto headerLength = static_cast<std::uint64_t>(item.content.data - rest.data);
-    ordered_json json = {{"offset", offsetOf(rest)},
-                         {"headerLength", headerLength},
-                         {"contentLength", item.content.length},
-                         {"tag", derTagName(item.tag)},
-                         {"constructed", isConstructed(item.tag)}};
-    const ordered_json value = isConstructed(item.tag) ? ordered_json() : valueOf(item.tag, item.content);
-    report_.text += padded(offsetOf(rest), 8) + padded(headerLength, 4) + padded(item.content.length, 9) + "  " +
-                    std::string(2 * std::size_t{depth}, ' ') + derTagName(item.tag);
-    if (!value.is_null()) {
-        const std::string text = value.is_string() ? value.get<std::string>() : value.dump();
-        report_.text += " " + (isText(item.tag) ? "\"" + text + "\"" : text);
-        json["value"] = value;
-    }
-    report_.text += '\n';
-    return json;
+Element Tree::describe(const DERItem& rest, const DERDecodedInfo& item) const {
+    Element element{{{"offset", offsetOf(rest)},
+                     {"headerLength", static_cast<std::uint64_t>(item.content.data - rest.data)},
+                     {"contentLength", item.content.length},
+                     {"tag", derTagName(item.tag)},
+                     {"constructed", isConstructed(item.tag)}},
+                    {}};
+    if (isConstructed(item.tag))
+        element.json["items"] = element.lists.add(itemsIn(item.content));
+    else if (ordered_json value = valueOf(item.tag, item.content); !value.is_null())
+        element.json["value"] = std::move(value);
+    if (const auto fault = derContentFault(item.tag, item.content))
+        element.json["fault"] = fault->reason;
+    return element;
 }
 
-bool Tree::enter(const DERDecodedInfo& item, unsigned depth, ordered_json& shown) {
-    ordered_json items = ordered_json::array();
-    if (depth == deepest) {
-        note(offsetOf(item.content), {0, "items are nested deeper than " + std::to_string(deepest) + " levels"});
-        return false;
-    }
-    const bool goesOn = walk(item.content, depth + 1, items);
-    if (shown.is_object())
-        shown["items"] = std::move(items);
-    return goesOn;
+Elements Tree::itemsIn(const DERItem& content) const {
+    return [tree = *this, content](const auto& take) {
+        DERSequence sequence;
+        DERDecodedInfo item;
+        DERDecodeSeqContentInit(&content, &sequence);
+        while (sequence.next < tree.end_) {
+            const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
+            if (DERDecodeSeqNext(&sequence, &item) != DERSuccess || !take(tree.describe(rest, item)))
+                return;
+        }
+    };
 }
 
-bool Tree::walk(const DERItem& content, unsigned depth, ordered_json& items) {
+void Tree::check(const DERItem& content, unsigned depth, Report& report) {
     DERSequence sequence;
     DERDecodedInfo item;
     DERDecodeSeqContentInit(&content, &sequence);
-    while (sequence.next != sequence.end) {
+    while (sequence.next != sequence.end && sequence.next < end_) {
         const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
         if (const auto fault = derHeaderFault(rest)) {
-            note(offsetOf(rest), *fault);
-            report_.text += padded(offsetOf(rest), 8) + "  not DER: " + fault->reason + "\n";
-            return false;
+            note(report, offsetOf(rest), *fault);
+            end_ = rest.data;
+            return;
         }
         if (DERDecodeSeqNext(&sequence, &item) != DERSuccess)
-            return false;
-        const bool isShown = ++items_ <= mostShown;
-        ordered_json shown = isShown ? describe(rest, item, depth) : ordered_json();
+            return;
+        ++count_;
         if (auto fault = derContentFault(item.tag, item.content)) {
             fault->offset += offsetOf(item.content) - offsetOf(rest);
-            note(offsetOf(rest), *fault);
-            if (isShown) {
-                shown["fault"] = fault->reason;
-                report_.text += std::string(23 + 2 * std::size_t{depth}, ' ') + "not DER: " + fault->reason + "\n";
-            }
+            note(report, offsetOf(rest), *fault);
         }
-        const bool goesOn = !isConstructed(item.tag) || enter(item, depth, shown);
-        if (isShown)
-            items.push_back(std::move(shown));
-        if (!goesOn)
-            return false;
+        if (isConstructed(item.tag) && depth == deepest) {
+            note(report, offsetOf(item.content),
+                 {0, "items are nested deeper than " + std::to_string(deepest) + " levels"});
+            end_ = item.content.data;
+        } else if (isConstructed(item.tag))
+            check(item.content, depth + 1, report);
     }
-    return true;
 }
 
-void Tree::show() {
-    ordered_json items = ordered_json::array();
-    report_.json["length"] = whole_.length;
-    report_.text = "  offset  hdr  content  item\n";
-    if (whole_.length == 0)
-        note(0, {0, "there are no octets"});
+void Tree::check(Report& report) {
+    if (data_ == end_)
+        note(report, 0, {0, "there are no octets"});
     else
-        walk(whole_, 0, items);
-    report_.json["items"] = std::move(items);
-    if (items_ > mostShown) {
-        report_.json["itemsNotShown"] = items_ - mostShown;
-        report_.text += std::to_string(items_ - mostShown) + " further items are not shown\n";
-    }
+        check(whole_, 0, report);
 }
+
+class Lines {
+public:
+    bool add(const Element& element, std::size_t depth) {
+        const ordered_json& item = element.json;
+        const auto number = [&](const char* key, std::size_t width) {
+            return padded(item[key].get<std::uint64_t>(), width);
+        };
+        text_ += number("offset", 8) + number("headerLength", 4) + number("contentLength", 9) + "  " +
+                 std::string(2 * depth, ' ') + item["tag"].get<std::string>();
+        if (item.contains("value"))
+            text_ += " " + valueText(item["value"], item["tag"]);
+        text_ += '\n';
+        if (item.contains("fault"))
+            text_ += std::string(23 + 2 * depth, ' ') + "not DER: " + item["fault"].get<std::string>() + "\n";
+        if (++count_ < mostShown && item.contains("items"))
+            element.lists.at(item["items"])([&](const Element& inner) { return add(inner, depth + 1); });
+        return count_ < mostShown;
+    }
+
+    std::string text(std::uint64_t all) && {
+        return "  offset  hdr  content  item\n" + text_ +
+               (all > count_ ? std::to_string(all - count_) + " further items are not shown\n" : "");
+    }
+
+private:
+    std::string text_;
+    std::uint64_t count_ = 0;
+};
 
 } // namespace
 
 Report showDer(const std::uint8_t* data, std::size_t length) {
     Report report;
-    Tree(data, length, report).show();
+    Tree tree(data, length);
+    Lines lines;
+    report.json["length"] = length;
+    tree.check(report);
+    tree.items()([&](const Element& element) { return lines.add(element, 0); });
+    report.json["items"] = report.lists.add(tree.items());
+    report.text = std::move(lines).text(tree.count());
     return report;
 }

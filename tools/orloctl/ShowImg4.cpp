@@ -5,6 +5,7 @@
 
 #include "der/DERDecode.h"
 #include "img4/Img4.h"
+#include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Findings.h"
 #include "tools/orloctl/Img4Properties.h"
@@ -14,8 +15,6 @@ namespace {
 
 using namespace img4show;
 using nlohmann::ordered_json;
-
-constexpr std::uint64_t mostCertificates = 100;
 
 // One field of a SEQUENCE, and where it lies once it was read.
 struct Field {
@@ -32,8 +31,7 @@ struct Field {
 class Reader {
 public:
     // The findings go into `report`.
-    Reader(const DERItem& file, Report& report)
-        : whole_(file), report_(report), findings_(file, report), properties_(findings_) {}
+    Reader(const DERItem& file, Report& report) : whole_(file), report_(report), findings_(file, report) {}
 
     void read();
 
@@ -55,13 +53,15 @@ private:
     bool checkMagic(const Field& magic, std::uint32_t expected);
     void noteRest(const DERItem& outer, const char* what);
 
+    ordered_json properties(const DERItem& dictionary, const std::string& where) {
+        return report_.lists.add(readProperties(dictionary, where, findings_));
+    }
     void addDigests(const DERItem& raw, ordered_json& json) const;
     DERReturn readAll(const DERItem& content);
 
     DERItem whole_;
     Report& report_;
     Findings findings_;
-    PropertyReader properties_;
 };
 
 // The content of the SEQUENCE `encoding`.
@@ -189,7 +189,7 @@ ordered_json Reader::readPayloadProperties(const DERItem& content) {
         !checkMagic(magic, Img4FourCC('P', 'A', 'Y', 'P')))
         return ordered_json::array();
     noteRest(content, "The SEQUENCE of payload properties");
-    return properties_.dictionary(set.content, "the payload");
+    return properties(set.content, "the payload");
 }
 
 ordered_json Reader::readPayload(const DERItem& encoding) {
@@ -207,8 +207,8 @@ ordered_json Reader::readPayload(const DERItem& encoding) {
         !readFields(content, "The payload", {&magic, &type, &version, &data, &keybag, &compression, &properties}) ||
         !checkMagic(magic, Img4FourCC('I', 'M', '4', 'P')))
         return json;
-    json["type"] = escapedText(type.content, mostCharactersShown);
-    json["version"] = escapedText(version.content, mostCharactersShown);
+    json["type"] = escapedText(type.content);
+    json["version"] = escapedText(version.content);
     json["data"] = dataJson(data.content);
     if (data.content.length == 0)
         findings_.note("The payload's data is empty, so that the payload counts as absent");
@@ -222,26 +222,21 @@ ordered_json Reader::readPayload(const DERItem& encoding) {
 }
 
 ordered_json Reader::readCertificates(const DERItem& content) {
-    ordered_json certificates = ordered_json::array();
     std::uint64_t count = 0;
-    DERSequence sequence;
-    DERDecodedInfo item;
-    DERDecodeSeqContentInit(&content, &sequence);
-    for (; sequence.next != sequence.end; ++count) {
-        const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
-        const std::string what = "Certificate " + std::to_string(count) + " of the chain";
-        if (DERDecodeSeqNext(&sequence, &item) != DERSuccess) {
-            findings_.headerFault(rest, what);
-            break;
-        }
-        if (item.tag != DERTagSequence)
-            findings_.fault(rest.data, what + " is " + derTagName(item.tag) + " instead of SEQUENCE");
-        if (count < mostCertificates)
-            certificates.push_back({{"offset", findings_.offsetOf(rest.data)}, {"length", sequence.next - rest.data}});
-    }
-    if (count > mostCertificates)
-        findings_.note(std::to_string(count - mostCertificates) + " further certificates are not shown");
-    return certificates;
+    DerItems items(content);
+    for (; items.next(); ++count)
+        if (items.item().tag != DERTagSequence)
+            findings_.fault(items.encoding().data, "Certificate " + std::to_string(count) + " of the chain is " +
+                                                       derTagName(items.item().tag) + " instead of SEQUENCE");
+    if (items.isBroken())
+        findings_.headerFault(items.encoding(), "Certificate " + std::to_string(count) + " of the chain");
+    return report_.lists.add([content, file = whole_.data](const auto& take) {
+        DerItems certificates(content);
+        while (
+            certificates.next() &&
+            take({{{"offset", certificates.encoding().data - file}, {"length", certificates.encoding().length}}, {}}))
+            ;
+    });
 }
 
 // Whether the decoder's search for MANB and MANP, on which every lookup stands, comes to an end.
@@ -249,7 +244,7 @@ void Reader::readBody(const DERItem& content, std::uint32_t version, ordered_jso
     const DERTag type = version == 2 ? DERTagSequence : DERTagSet;
     Img4Property manb;
     Img4Property manp;
-    json["body"] = properties_.dictionary(content, "the manifest body");
+    json["body"] = properties(content, "the manifest body");
     if (DERImg4DecodeFindProperty(&content, Img4PropertyTag(Img4FourCC('M', 'A', 'N', 'B')), type, &manb) !=
         DERSuccess) {
         findings_.fault(content.data, "The manifest body has no sound property \"MANB\" with a " + derTagName(type) +
@@ -300,7 +295,7 @@ ordered_json Reader::readRestoreInfo(const DERItem& encoding) {
     if (enter(encoding, "The restore information", &content) &&
         readFields(content, "The restore information", {&magic, &set}) &&
         checkMagic(magic, Img4FourCC('I', 'M', '4', 'R')))
-        json["properties"] = properties_.dictionary(set.content, "the restore information");
+        json["properties"] = properties(set.content, "the restore information");
     return json;
 }
 
@@ -374,10 +369,8 @@ void Reader::read() {
         if (const DERReturn status = readAll(content); status != DERSuccess)
             findings_.fault(whole_.data, "The decoder refuses the file with status " + std::to_string(status));
     }
-    if (properties_.leftOut() != 0)
-        findings_.note(std::to_string(properties_.leftOut()) + " further properties are not shown");
     report_.json["notes"] = findings_.notes();
-    report_.text = img4Text(report_.json);
+    report_.text = img4Text(report_);
 }
 
 } // namespace

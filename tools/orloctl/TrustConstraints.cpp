@@ -30,7 +30,11 @@ std::string faultText(const DERItem& rest) {
 std::string valueText(const DERItem& encoding) {
     Report report;
     img4show::Findings findings(encoding, report);
-    const nlohmann::ordered_json property = img4show::PropertyReader(findings).dictionary(encoding, "").at(0);
+    nlohmann::ordered_json property;
+    img4show::readProperties(encoding, "", findings)([&](const Element& element) {
+        property = element.json;
+        return false;
+    });
     return property.contains("type") ? img4ValueText(property) : "malformed";
 }
 

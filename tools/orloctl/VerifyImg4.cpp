@@ -9,6 +9,7 @@
 #include "tools/orloctl/Img4Findings.h"
 #include "tools/orloctl/Img4Properties.h"
 #include "tools/orloctl/LocalFiles.h"
+#include "tools/orloctl/ShowFile.h"
 #include "tools/orloctl/ShowImg4.h"
 #include "tools/orloctl/TrustConstraints.h"
 #include "tools/orloctl/TrustEvaluation.h"
@@ -18,7 +19,6 @@ namespace {
 
 using nlohmann::ordered_json;
 
-constexpr std::size_t mostObjects = 1000;
 constexpr DERTag manifestPropertiesTag = Img4PropertyTag(Img4FourCC('M', 'A', 'N', 'P'));
 
 bool areEqual(const DERItem& one, const DERItem& other) {
@@ -55,8 +55,12 @@ const char* digestName(std::uint64_t length) {
 class Verification {
 public:
     // The findings go into `report`.
-    Verification(const DERItem& file, const TrustDomain& domain, std::optional<std::uint32_t> object, Report& report)
-        : file_(file), domain_(domain), object_(object), report_(report) {}
+    Verification(const DERItem& file, const TrustDomain& domain, const VerifyRequest& request, Report& report)
+        : file_(file),
+          domain_(domain),
+          object_(request.object),
+          payloadDigest_(request.payloadDigest),
+          report_(report) {}
 
     void run();
 
@@ -73,6 +77,7 @@ private:
     void addConstraints(const Img4Record& record);
     void addDigests(const TrustEvaluation& evaluation);
     void addProperties(const TrustEvaluation& evaluation);
+    void judgePayload(const TrustEvaluation& evaluation);
     void addObjects(const DERItem& manb);
     ordered_json properties(const DERItem& dictionary, const std::string& where);
     void note(const std::string& text) { notes_.push_back(text); }
@@ -80,6 +85,7 @@ private:
     DERItem file_;
     const TrustDomain& domain_;
     std::optional<std::uint32_t> object_;
+    std::optional<std::uint32_t> payloadDigest_;
     Report& report_;
     Img4Record record_ = {};
     std::vector<DERItem> certificates_; // without the root
@@ -113,7 +119,9 @@ bool Verification::readBareManifest() {
         report_.json["kind"] = shown.json.value("kind", "file");
         report_.json["failedStep"] = "file";
         report_.json["problemOffset"] = shown.json.value("problemOffset", 0);
-        report_.problem = shown.problem;
+        report_.problem = pemProblem(file_);
+        if (report_.problem.empty())
+            report_.problem = shown.problem;
         report_.ok = false;
     }
     return false;
@@ -228,27 +236,21 @@ void Verification::addDigests(const TrustEvaluation& evaluation) {
 ordered_json Verification::properties(const DERItem& dictionary, const std::string& where) {
     Report shown;
     img4show::Findings findings(file_, shown);
-    img4show::PropertyReader reader(findings);
-    ordered_json json = reader.dictionary(dictionary, where);
+    ordered_json json = report_.lists.add(img4show::readProperties(dictionary, where, findings));
     if (!shown.ok && report_.ok)
         note(shown.problem.substr(0, shown.problem.size() - 1));
-    if (reader.leftOut() != 0)
-        note(std::to_string(reader.leftOut()) + " further properties of " + where + " are not shown");
     return json;
 }
 
 void Verification::addObjects(const DERItem& manb) {
-    ordered_json objects = ordered_json::array();
-    std::uint64_t count = 0;
-    for (DerItems items(manb); items.next();) {
-        const std::uint64_t code = items.item().tag & DERTagNumberMask;
-        if (items.item().tag == Img4PropertyTag(code) && items.item().tag != manifestPropertiesTag &&
-            ++count <= mostObjects)
-            objects.push_back(codeText(code));
-    }
-    report_.json["objects"] = std::move(objects);
-    if (count > mostObjects)
-        note(std::to_string(count - mostObjects) + " further objects are not shown");
+    report_.json["objects"] = report_.lists.add([manb](const auto& take) {
+        for (DerItems items(manb); items.next();) {
+            const std::uint64_t code = items.item().tag & DERTagNumberMask;
+            if (items.item().tag == Img4PropertyTag(code) && items.item().tag != manifestPropertiesTag &&
+                !take({codeText(code), {}}))
+                return;
+        }
+    });
 }
 
 void Verification::addProperties(const TrustEvaluation& evaluation) {
@@ -257,15 +259,40 @@ void Verification::addProperties(const TrustEvaluation& evaluation) {
         return;
     report_.json["manifestProperties"] = properties(record.manp, "the manifest");
     addObjects(record.manb);
-    if (record.objp.data == nullptr) {
-        if (record.payloadHashed != 0)
-            note("No object was named, so nothing says that the payload belongs to this manifest");
+    if (record.objp.data != nullptr)
+        report_.json["object"] = {{"name", codeText(*object_)}, {"properties", properties(record.objp, "the object")}};
+    if (record.payloadHashed == 0 || payloadDigest_)
         return;
-    }
-    report_.json["object"] = {{"name", codeText(*object_)}, {"properties", properties(record.objp, "the object")}};
-    if (record.payloadHashed != 0)
-        note("Whether the payload is this object's was not judged: compare the payload's digest with the one that the "
-             "object's properties demand");
+    report_.json["payload"] = "not judged";
+    note(record.objp.data == nullptr
+             ? "No object was named, so nothing says that the payload belongs to this manifest"
+             : "Whether the payload is this object's was not judged: name the property with the payload's digest "
+               "(--payload-digest)");
+}
+
+// Whether the payload is the one that the trusted object speaks of.
+void Verification::judgePayload(const TrustEvaluation& evaluation) {
+    const Img4Record& record = evaluation.record;
+    const std::uint64_t length = evaluation.profile->made.profile.digestInfo->length;
+    const std::string demand = quotedCode(*payloadDigest_) + " of " + quotedCode(*object_);
+    Img4Property property;
+    std::string reason;
+    const std::uint8_t* place = record.objp.data;
+    if (record.payloadHashed == 0)
+        reason = "The file has no payload that could be compared with " + demand;
+    else if (DERImg4DecodeFindProperty(&record.objp, Img4PropertyTag(*payloadDigest_), DERTagOctetString, &property) !=
+             DERSuccess)
+        reason = quotedCode(*object_) + " has no sound property " + quotedCode(*payloadDigest_) +
+                 " with an OCTET STRING, with which the payload could be compared";
+    else if (place = property.value.data; property.value.length != length)
+        reason = "The digest in " + demand + " has " + std::to_string(property.value.length) + " octets, and " +
+                 digestName(length) + " has " + std::to_string(length);
+    else if (!areEqual({record.payload.digest, length}, property.value))
+        reason = "The payload is not the object's: its " + std::string(digestName(length)) + " is another than " +
+                 demand + " demands";
+    report_.json["payload"] = reason.empty() ? "the object's" : "not the object's";
+    if (!reason.empty())
+        refuse({"payload", reason, place, std::nullopt});
 }
 
 void Verification::describe(const TrustEvaluation& evaluation) {
@@ -278,13 +305,16 @@ void Verification::describe(const TrustEvaluation& evaluation) {
     addConstraints(evaluation.record);
     addDigests(evaluation);
     addProperties(evaluation);
-    if (evaluation.status != DERSuccess)
+    if (evaluation.status == DERSuccess && payloadDigest_)
+        judgePayload(evaluation);
+    if (!report_.ok)
         return;
     report_.json["trusted"] = true;
     report_.json["result"] = "trusted under " + std::string(entry.name) +
                              ": the chain ends in a known root, the manifest's signature verifies, and the leaf's "
                              "constraints on the manifest " +
-                             (object_ ? "and on \"" + codeText(*object_) + "\" " : "") + "are met";
+                             (object_ ? "and on \"" + codeText(*object_) + "\" " : "") + "are met" +
+                             (payloadDigest_ ? ", and the payload is the object's" : "");
 }
 
 void Verification::run() {
@@ -301,20 +331,20 @@ void Verification::run() {
         }
     }
     report_.json["notes"] = std::move(notes_);
-    report_.text = verifyText(report_.json);
+    report_.text = verifyText(report_);
 }
 
 } // namespace
 
-Report verifyImg4(const DERItem& file, const TrustDomain& domain, std::optional<std::uint32_t> object) {
+Report verifyImg4(const DERItem& file, const TrustDomain& domain, const VerifyRequest& request) {
     Report report;
-    Verification(file, domain, object, report).run();
+    Verification(file, domain, request, report).run();
     return report;
 }
 
-std::uint32_t objectCode(const std::string& text) {
+std::uint32_t fourCharacterCode(const std::string& option, const std::string& text) {
     const auto isPrintable = [](char character) { return character >= 0x20 && character <= 0x7E; };
     if (text.size() != 4 || !std::all_of(text.begin(), text.end(), isPrintable))
-        throw UsageError("--object takes the four characters of an object's code, such as sepi");
+        throw UsageError(option + " takes four characters, such as sepi");
     return Img4FourCC(text[0], text[1], text[2], text[3]);
 }

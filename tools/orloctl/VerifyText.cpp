@@ -6,6 +6,9 @@ namespace {
 
 using nlohmann::ordered_json;
 
+constexpr std::size_t mostObjects = 1000;
+constexpr std::size_t longestName = 512;
+
 std::string textOf(const ordered_json& json, const char* key) {
     return json[key].get<std::string>();
 }
@@ -21,9 +24,10 @@ std::string certificateLine(const ordered_json& certificate) {
         "  " + certificate["number"].dump() + "  " + padded(textOf(certificate, "role"), 12) + "  ";
     if (certificate.contains("fault"))
         return line + textOf(certificate, "fault") + "\n";
-    return line + textOf(certificate, "subject") + "; issuer " + textOf(certificate, "issuer") + "; " +
-           textOf(certificate, "key") + "; " + textOf(certificate, "signatureAlgorithm") + "; serial number " +
-           textOf(certificate, "serialNumber") + "\n";
+    return line + shortened(textOf(certificate, "subject"), longestName) + "; issuer " +
+           shortened(textOf(certificate, "issuer"), longestName) + "; " + textOf(certificate, "key") + "; " +
+           textOf(certificate, "signatureAlgorithm") + "; serial number " +
+           shortened(textOf(certificate, "serialNumber"), longestName) + "\n";
 }
 
 std::string constraintLine(const ordered_json& constraint) {
@@ -52,7 +56,8 @@ std::string headText(const ordered_json& json) {
 
 } // namespace
 
-std::string verifyText(const ordered_json& json) {
+std::string verifyText(const Report& report) {
+    const ordered_json& json = report.json;
     std::string text = headText(json);
     if (json.contains("chain")) {
         text += "Chain:\n";
@@ -67,16 +72,20 @@ std::string verifyText(const ordered_json& json) {
     if (json.contains("digests"))
         text += digestLines(json["digests"]);
     if (json.contains("manifestProperties"))
-        text += "Manifest properties:\n" + img4PropertiesText(json["manifestProperties"], 1);
+        text += "Manifest properties:\n" + img4PropertiesText(report.lists.at(json["manifestProperties"]), 1);
     if (json.contains("objects")) {
+        std::size_t count = 0;
         text += "Objects:";
-        for (const ordered_json& object : json["objects"])
-            text += " " + object.get<std::string>();
-        text += "\n";
+        report.lists.at(json["objects"])([&](const Element& object) {
+            if (++count <= mostObjects)
+                text += " " + object.json.get<std::string>();
+            return true;
+        });
+        text += (count > mostObjects ? " and " + std::to_string(count - mostObjects) + " more" : "") + "\n";
     }
     if (json.contains("object"))
-        text +=
-            "Object " + textOf(json["object"], "name") + ":\n" + img4PropertiesText(json["object"]["properties"], 1);
+        text += "Object " + textOf(json["object"], "name") + ":\n" +
+                img4PropertiesText(report.lists.at(json["object"]["properties"]), 1);
     for (const ordered_json& note : json["notes"])
         text += "Note: " + note.get<std::string>() + "\n";
     return text + "Result: " + (json["trusted"].get<bool>() ? textOf(json, "result") : "not trusted") + "\n";

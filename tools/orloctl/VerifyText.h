@@ -3,9 +3,9 @@
 
 #include <string>
 
-#include <nlohmann/json.hpp>
+#include "tools/orloctl/Report.h"
 
 // The lines for people of what verifyImg4 found.
-std::string verifyText(const nlohmann::ordered_json& json);
+std::string verifyText(const Report& report);
 
 #endif

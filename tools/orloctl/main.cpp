@@ -24,9 +24,7 @@
 #include "tools/orloctl/Json.h"
 #include "tools/orloctl/LocalFiles.h"
 #include "tools/orloctl/SetBcfg.h"
-#include "tools/orloctl/ShowBcfg.h"
-#include "tools/orloctl/ShowDer.h"
-#include "tools/orloctl/ShowImg4.h"
+#include "tools/orloctl/ShowFile.h"
 #include "tools/orloctl/VerifyImg4.h"
 #include "tools/orloctl/Version.h"
 
@@ -53,15 +51,11 @@ struct Options {
     bool copiesToOutput = false; // -o -
 };
 
-void printJson(const ordered_json& json) {
-    std::cout << json.dump(2, ' ', false, ordered_json::error_handler_t::replace) << '\n';
-}
-
 // Reports a failure that has no response: the one JSON object, or a sentence on standard error.
 int fail(const Options& options, Outcome outcome, const std::string& problem) {
     const int status = static_cast<int>(outcome);
     if (options.json)
-        printJson({{"exitStatus", status}, {"problem", problem}});
+        writeJson(std::cout, {{"exitStatus", status}, {"problem", problem}});
     else
         std::cerr << "orloctl: " << problem << '\n';
     return status;
@@ -99,7 +93,7 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
             json["result"] = remarks.result;
         if (!remarks.note.empty())
             json["note"] = remarks.note;
-        printJson(json);
+        writeJson(std::cout, json);
         return status;
     }
     if (answer.response.empty())
@@ -193,7 +187,7 @@ int show(const Options& options, const Report& found, Outcome failure = Outcome:
         json.update(found.json);
         if (!found.ok)
             json["problem"] = found.problem;
-        printJson(json);
+        writeJson(std::cout, json, found.lists);
         return status;
     }
     std::cout << found.text << (found.text.empty() || found.text.ends_with('\n') ? "" : "\n");
@@ -205,15 +199,27 @@ int show(const Options& options, const Report& found, Outcome failure = Outcome:
 struct VerifyOptions {
     std::optional<std::string> profile;
     std::optional<std::string> object;
+    std::optional<std::string> payloadDigest;
     std::optional<std::string> trustFolder;
 };
 
 int verify(const Options& options, const std::string& path, const VerifyOptions& how) {
-    const auto object = how.object ? std::optional(objectCode(*how.object)) : std::nullopt;
+    VerifyRequest request;
+    if (how.object)
+        request.object = fourCharacterCode("--object", *how.object);
+    if (how.payloadDigest)
+        request.payloadDigest = fourCharacterCode("--payload-digest", *how.payloadDigest);
     const TrustDomain domain =
         how.trustFolder ? readTrustDomain(*how.trustFolder, how.profile) : builtInTrustDomain(how.profile);
     const Value::Data file = readLocalFile(path);
-    return show(options, verifyImg4({file.data(), file.size()}, domain, object));
+    return show(options, verifyImg4({file.data(), file.size()}, domain, request));
+}
+
+int showLocalFile(const Options& options, const std::string& path, const std::string& format,
+                  const std::string& keyPath) {
+    const auto key = keyPath.empty() ? std::nullopt : std::optional(readLocalFile(keyPath));
+    const Value::Data file = readLocalFile(path);
+    return show(options, showFile(file, format, key));
 }
 
 class CommandLine {
@@ -237,7 +243,7 @@ public:
         addRequests();
         addRecords();
         addReaders();
-        addVerifiers();
+        addVerifier();
     }
 
     int run(int argc, char** argv) {
@@ -328,36 +334,36 @@ private:
         crashLogs->callback(
             [this] { run_ = [this] { return show(options_, collectCrashLogs(copyPath_), Outcome::Usage); }; });
 
-        CLI::App* readers = app_.add_subcommand("show", "Show what a local file holds, without the service");
-        readers->require_subcommand(1);
-        readers->fallthrough();
-
-        CLI::App* verb = readers->add_subcommand("bcfg", "Entries and HMAC state of a configuration blob");
-        verb->add_option("FILE", path_, "A local file, - for standard input")->required();
-        verb->add_option("--hmac-key-file", keyPath_, "Check the HMACs with the key in this local file")
+        CLI::App* verb = app_.add_subcommand("show", "Show what a local file holds, without the service");
+        verb->validate_positionals();
+        verb->add_option("FORMAT", format_,
+                         "bcfg: entries and HMAC state of a configuration blob; img4: properties and digests of a "
+                         "container, bare payload or bare manifest; der: the items as a tree, and where strict DER "
+                         "ends; found out unless given")
+            ->check(CLI::IsMember({"bcfg", "img4", "der"}));
+        addLocalFile(verb);
+        verb->add_option("--hmac-key-file", keyPath_, "Check a blob's HMACs with the key in this local file")
             ->type_name("FILE");
-        verb->callback([this] {
-            run_ = [this] {
-                const Value::Data key = keyPath_.empty() ? Value::Data{} : readLocalFile(keyPath_);
-                return show(options_, showBcfg(readLocalFile(path_), key));
-            };
-        });
-        addReader(readers, "img4", "A container, bare payload or bare manifest: properties and digests", showImg4);
-        addReader(readers, "der", "The items of a DER file as a tree, and where strict DER ends", showDer);
+        verb->callback([this] { run_ = [this] { return showLocalFile(options_, path_, format_, keyPath_); }; });
     }
 
-    void addVerifiers() {
-        CLI::App* verifiers = app_.add_subcommand("verify", "Say whether a local file is trusted, without the service");
-        verifiers->require_subcommand(1);
-        verifiers->fallthrough();
-
-        CLI::App* verb = verifiers->add_subcommand(
-            "img4", "Verify the chain, the signature and the constraints of a container or bare manifest");
-        verb->add_option("FILE", path_, "A local file, - for standard input")->required();
+    void addVerifier() {
+        CLI::App* verb = app_.add_subcommand("verify", "Say whether a local file is trusted, without the service");
+        verb->validate_positionals();
+        verb->add_option("FORMAT", format_,
+                         "img4: the chain, the signature and the constraints of a container or bare manifest; found "
+                         "out unless given")
+            ->check(CLI::IsMember({"img4"}));
+        addLocalFile(verb);
         verb->add_option("--profile", verifyOptions_.profile,
                          "The trust profile, such as kImg4DecodeSecureBootEc384Sha384; without it, the one that fits")
             ->type_name("PROFILE");
-        verb->add_option("--object", verifyOptions_.object, "Evaluate the object with this four-character code too")
+        CLI::Option* object = verb->add_option("--object", verifyOptions_.object,
+                                               "Evaluate the object with this four-character code too");
+        object->type_name("CODE");
+        verb->add_option("--payload-digest", verifyOptions_.payloadDigest,
+                         "Compare the payload's digest with this property of the object, such as DGST")
+            ->needs(object)
             ->type_name("CODE");
         verb->add_option("--trust-dir", verifyOptions_.trustFolder,
                          "Take roots and names from this folder, which scripts/make-trust-domain has made, instead of "
@@ -366,21 +372,14 @@ private:
         verb->callback([this] { run_ = [this] { return verify(options_, path_, verifyOptions_); }; });
     }
 
-    void addReader(CLI::App* readers, const char* name, const char* help,
-                   Report (*read)(const std::uint8_t*, std::size_t)) {
-        CLI::App* verb = readers->add_subcommand(name, help);
+    void addLocalFile(CLI::App* verb) {
         verb->add_option("FILE", path_, "A local file, - for standard input")->required();
-        verb->callback([this, read] {
-            run_ = [this, read] {
-                const Value::Data file = readLocalFile(path_);
-                return show(options_, read(file.data(), file.size()));
-            };
-        });
     }
 
     CLI::App app_{"Sends requests to the Veltra Orlo services, and reads their file formats offline.", "orloctl"};
     Options options_;
     std::string command_;
+    std::string format_;
     std::string path_;
     std::string copyPath_;
     std::string keyPath_;

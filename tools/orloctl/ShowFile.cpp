@@ -1,0 +1,65 @@
+#include "tools/orloctl/ShowFile.h"
+
+#include <algorithm>
+#include <string_view>
+
+#include "tools/orloctl/DerItems.h"
+#include "tools/orloctl/LocalFiles.h"
+#include "tools/orloctl/ShowBcfg.h"
+#include "tools/orloctl/ShowDer.h"
+#include "tools/orloctl/ShowImg4.h"
+
+namespace {
+
+std::string_view textOf(const DERItem& item) {
+    return {reinterpret_cast<const char*>(item.data), static_cast<std::size_t>(item.length)};
+}
+
+// By the magic of an Img4 file, or the place of a blob's payload element behind two numbers of four octets.
+std::string formatOf(const DERItem& file) {
+    constexpr std::string_view magics[] = {"IMG4", "IM4M", "IM4P"};
+    DERDecodedInfo outer;
+    if (DERDecodeItem(&file, &outer) != DERSuccess || outer.tag != DERTagSequence)
+        return "der";
+    DerItems fields(outer.content);
+    if (!fields.next())
+        return "der";
+    if (fields.item().tag == DERTagIA5String)
+        return std::ranges::find(magics, textOf(fields.item().content)) != std::end(magics) ? "img4" : "der";
+    const bool isNumber = fields.item().tag == DERTagInteger && fields.item().content.length == 4;
+    return isNumber && fields.next() && fields.next() && fields.item().tag == DERTagPrivateConstructed(0x53504159)
+               ? "bcfg"
+               : "der";
+}
+
+} // namespace
+
+std::string pemProblem(const DERItem& file) {
+    constexpr std::string_view mark = "-----BEGIN ";
+    constexpr std::size_t longestPreface = 4096;
+    const std::string_view text = textOf(file).substr(0, longestPreface);
+    const std::size_t place = text.find(mark);
+    if (place == std::string_view::npos || (place != 0 && text[place - 1] != '\n'))
+        return "";
+    return "The file is PEM, text in which DER stands as base64, at offset " + std::to_string(place) +
+           ": turn it into DER first, for instance with openssl.";
+}
+
+Report showFile(const Value::Data& file, std::string format, const std::optional<Value::Data>& hmacKey) {
+    const DERItem item = {file.data(), file.size()};
+    Report report;
+    if (report.problem = pemProblem(item); !report.problem.empty()) {
+        report.ok = false;
+        report.json["format"] = "pem";
+        return report;
+    }
+    if (format.empty())
+        format = formatOf(item);
+    if (hmacKey && format != "bcfg")
+        throw UsageError("An HMAC key is for a configuration blob, and the file is none");
+    report = format == "bcfg"   ? showBcfg(file, hmacKey.value_or(Value::Data()))
+             : format == "img4" ? showImg4(item.data, item.length)
+                                : showDer(item.data, item.length);
+    report.json["format"] = format;
+    return report;
+}
