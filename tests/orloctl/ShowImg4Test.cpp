@@ -198,7 +198,7 @@ TEST(ShowImg4, everyFlippedBitIsShownOrRefused) {
     for (std::size_t bit = 0; bit < flipped.size() * 8; ++bit) {
         const auto mask = static_cast<std::uint8_t>(1U << (bit % 8));
         flipped[bit / 8] ^= mask;
-        const Report report = show(flipped);
+        const Report report = showImg4(flipped.data(), flipped.size());
         Img4Record record;
         const DERReturn status = Img4DecodeInit(flipped.data(), flipped.size(), &record);
         EXPECT_FALSE(report.ok && status != DERSuccess) << "bit " << bit;
