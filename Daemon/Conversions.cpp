@@ -2,10 +2,10 @@
 
 #include <optional>
 
+#include "Daemon/HSLog.h"
 #include "platform/Base64.h"
 #include "platform/Format.h"
 #include "platform/KeyedArchive.h"
-#include "platform/SystemLog.h"
 #include "platform/Utf8.h"
 
 namespace {
@@ -73,12 +73,12 @@ Value convertDataToDictionary(const Value& data) {
     Error error;
     const std::optional<ArchiveDecoder> decoder = ArchiveDecoder::create(*data.data(), &error);
     const FormatArgument shownError = decoder ? FormatArgument(nullptr) : FormatArgument(error);
-    consoleLog(format("Unarchive Error : %@", {shownError}));
+    consoleLine("Unarchive Error : %@", {shownError});
     if (!decoder)
-        consoleLog(format("Error : %@", {shownError}));
+        consoleLine("Error : %@", {shownError});
     Value object = decoder ? decoder->decode(rootKey) : Value();
-    consoleLog(format("recvDict : %@", object));
-    consoleLog(format("err : %@", {shownError}));
+    consoleLine("recvDict : %@", {object});
+    consoleLine("err : %@", {shownError});
     return object;
 }
 

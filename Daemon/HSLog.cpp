@@ -71,14 +71,19 @@ void newLog(int level, std::string_view text, std::initializer_list<FormatArgume
     const LogState* const state = logInitialized;
     if (!state)
         return;
-    const std::string message = format(text, arguments);
-    writeLine(*state, level, format("%@-%@", logTimestamp(std::time(nullptr)), message));
+    writeLine(*state, level, logTimestamp(std::time(nullptr)) + "-" + formatForLog(text, arguments));
 } catch (const std::exception&) {
     return; // a line that memory does not suffice for is lost; the work it tells of goes on
 }
 
+void consoleLine(std::string_view text, std::initializer_list<FormatArgument> arguments) try {
+    consoleLog(formatForLog(text, arguments));
+} catch (const std::exception&) {
+    return; // as above
+}
+
 void LogSource::write(LogLevel level, LineFormat format, std::initializer_list<FormatArgument> arguments) const try {
-    newLog(level, "[%@:%d] %@\n", {file, format.line, ::format(format.text, arguments)});
+    newLog(level, "[%@:%d] %@\n", {file, format.line, formatForLog(format.text, arguments).c_str()});
 } catch (const std::exception&) {
     return; // as above
 }

@@ -22,9 +22,13 @@ enum LogLevel {
 // do nothing.
 void logInit(const char* name);
 
-// Formats the arguments and writes the line, prefixed with the local time (12-hour clock) and a hyphen. A level other
-// than 1 to 4 goes to the log file only. Never fails outward.
+// Formats the arguments for a log line (platform/Format.h) and writes it, prefixed with the local time (12-hour clock)
+// and a hyphen. A level other than 1 to 4 goes to the log file only. Never fails outward: a line that memory does not
+// suffice for is lost.
 void newLog(int level, std::string_view format, std::initializer_list<FormatArgument> arguments);
+
+// Formats the arguments for a log line and writes it to the system console log. Never fails outward, as newLog.
+void consoleLine(std::string_view format, std::initializer_list<FormatArgument> arguments);
 
 // The local time `time` as it stands in front of a line: "yyyy-MM-dd hh:mm:ss" on a 12-hour clock without a marker.
 std::string logTimestamp(std::time_t time);

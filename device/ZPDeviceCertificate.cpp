@@ -12,10 +12,8 @@
 #include "platform/ComponentAuth.h"
 #include "platform/Crypto.h"
 #include "platform/DeviceAnswers.h"
-#include "platform/Format.h"
 #include "platform/HardwareRegistry.h"
 #include "platform/Semaphore.h"
-#include "platform/SystemLog.h"
 
 namespace {
 
@@ -29,8 +27,8 @@ constexpr std::string_view certificateKey = "AccessoryCertificate";
 constexpr std::chrono::seconds authenticationLimit(10);
 
 // A line about an operation on the system console log.
-void trace(const char* operation, std::string_view message, int line = __builtin_LINE()) {
-    consoleLog(format("%s:%d - %s", operation, line, message));
+void trace(const char* operation, const char* message, FormatArgument argument = "", int line = __builtin_LINE()) {
+    consoleLine("%s:%d - %s%@", {operation, line, message, argument});
 }
 
 Error certificateError(const char* description) {
@@ -81,7 +79,7 @@ bool authenticateTouchController(const Value& challenge) {
 } // namespace
 
 std::optional<Error> ZPDevice::getService(std::string_view className, std::uint32_t* service) const {
-    trace("-[ZPDevice getService:service:]", format("Entering for service %s", className));
+    trace("-[ZPDevice getService:service:]", "Entering for service ", className);
     Value matching = HardwareRegistry::serviceMatching(className);
     if (matching.isNothing()) {
         const Error error = certificateError("can't create matching dict");

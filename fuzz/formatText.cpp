@@ -1,5 +1,6 @@
-// A hostile format reads nothing but its arguments and grows no further than they do. The input is the format; its
-// first byte chooses the arguments.
+// A hostile format reads nothing but its arguments and grows no further than they do, and in a log arguments begin no
+// lines. The input is the format; its first byte chooses the arguments.
+#include <algorithm>
 #include <cstdint>
 #include <cstdlib>
 #include <string_view>
@@ -9,14 +10,18 @@
 
 namespace {
 
+const Value nothing, yes = true, bytes = Value::Data(100, 0xAB), words = "http://a:b@c\n\x1B\n",
+                     entries = Value::Dictionary{{"a", Value::Array{1, "b\n"}}};
+const Error problem{"D\n", 7, "text\n"};
 const FormatArgument choices[] = {
     nullptr,
     "text",
-    Value(),
-    Value(true),
-    Value(Value::Data(100, 0xAB)),
-    Value(Value::Dictionary{{"a", Value::Array{1, "b\n"}}}),
-    Error{"D", 7, "text"},
+    nothing,
+    yes,
+    bytes,
+    words,
+    entries,
+    problem,
     std::int64_t{-1},
     0xFFFFFFFFU,
     static_cast<const void*>(choices),
@@ -30,12 +35,16 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         return 0;
     const std::string_view text(reinterpret_cast<const char*>(data + 1), size - 1);
     const std::size_t chosen = data[0];
-    const std::string out =
-        format(text, {choices[chosen % count], choices[chosen / 7 % count], choices[chosen / 31 % count]});
+    const auto arguments = {choices[chosen % count], choices[chosen / 7 % count], choices[chosen / 31 % count]};
+    const std::string out = format(text, arguments);
     // Each argument is far below 512 characters, each missing one three times as long as the shortest conversion.
     if (out.size() > 3 * (512 + text.size()))
         std::abort();
     if (text.find('%') == std::string_view::npos && out != text)
+        std::abort();
+    // Nothing but the format begins lines in a log.
+    const std::string logged = formatForLog(text, arguments);
+    if (std::ranges::count(logged, '\n') > std::ranges::count(text, '\n') + 1)
         std::abort();
     std::string line;
     utf8::appendQuoted(line, out);

@@ -30,7 +30,7 @@ Error makeError(OrloErrorHere here, const Arguments&... arguments) {
 }
 
 void orloLogHandler(void*, const char* message) {
-    zplog.info("%s\n", message);
+    zplog.info("%s\n", std::string_view(message));
 }
 
 // The options that are the same whatever the ticket says and wherever the records are.

@@ -58,7 +58,7 @@ Error makeError(OrloErrorHere here, const Arguments&... arguments) {
 }
 
 void orloExportLogHandler(void*, const char* message) {
-    zplog.info("%s\n", message);
+    zplog.info("%s\n", std::string_view(message));
 }
 
 const std::pair<const char*, Value> fixedOptions[] = {

@@ -11,7 +11,7 @@ struct Error {
     std::int64_t code = 0;
     std::string text; // the description for a person
 
-    // One line with domain, code and text, as "%@" shows it.
+    // One line with domain, code and text, as "%@" shows it; a line end at its very end stays.
     std::string description() const;
 
     friend bool operator==(const Error&, const Error&) = default;

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <charconv>
 
+#include "platform/ShownText.h"
+
 namespace {
 
 constexpr unsigned widest = 64;
@@ -59,104 +61,140 @@ void appendPadded(std::string& out, std::string_view sign, const std::string& nu
 
 } // namespace
 
-FormatArgument::FormatArgument(const Value& value) {
-    if (const std::optional<std::int64_t> number = value.integer()) {
-        content_ = static_cast<std::uint64_t>(*number);
-        negative_ = *number < 0;
-        boolean_ = value.isBoolean();
-    } else if (!value.isNothing()) {
-        content_ = value.description();
-    }
+// Formats one text.
+class Formatter {
+public:
+    explicit Formatter(bool forLog) : forLog_(forLog) {}
+
+    std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments);
+
+private:
+    void append(const FormatArgument& argument, const Conversion& conversion);
+    void appendOnThisLine(const FormatArgument& argument, const Conversion& conversion);
+    void appendValue(const Value& value, const Conversion& conversion);
+    void appendText(std::string_view text, utf8::Escaping how = utf8::Escaping::OneLine);
+    void appendNumber(std::uint64_t number, bool negative, const Conversion& conversion);
+
+    const bool forLog_;
+    std::string out_;
+};
+
+void Formatter::append(const FormatArgument& argument, const Conversion& conversion) {
+    if (const Value* const* value = std::get_if<const Value*>(&argument.content_))
+        appendValue(**value, conversion);
+    else if (const Error* const* error = std::get_if<const Error*>(&argument.content_))
+        out_ += (*error)->description();
+    else if (const auto* literal = std::get_if<FormatArgument::Literal>(&argument.content_))
+        out_ += literal->text;
+    else if (const auto* text = std::get_if<std::string_view>(&argument.content_))
+        appendText(*text);
+    else if (const auto* output = std::get_if<ProgramOutput>(&argument.content_); output && output->text->text())
+        appendText(*output->text->text(), utf8::Escaping::Lines);
+    else if (const auto* number = std::get_if<std::uint64_t>(&argument.content_))
+        appendNumber(*number, argument.negative_, conversion);
+    else if (const void* const* pointer = std::get_if<const void*>(&argument.content_))
+        appendPadded(out_, "0x", digits(reinterpret_cast<std::uintptr_t>(*pointer), 16), conversion.zeroPadded,
+                     conversion.width);
+    else
+        out_ += noArgument;
 }
 
-FormatArgument::FormatArgument(const Error& error) : content_(error.description()) {}
-
-FormatArgument::FormatArgument(const std::optional<Error>& error) {
-    if (error)
-        content_ = error->description();
+// Where more of the line follows, a line end of the argument may not stay.
+void Formatter::appendOnThisLine(const FormatArgument& argument, const Conversion& conversion) {
+    const std::size_t before = out_.size();
+    append(argument, conversion);
+    const bool keepsLines = std::holds_alternative<FormatArgument::Literal>(argument.content_) ||
+                            std::holds_alternative<ProgramOutput>(argument.content_);
+    if (!keepsLines && out_.size() > before && out_.back() == '\n')
+        out_.replace(out_.size() - 1, 1, "\\n");
 }
 
-FormatArgument::FormatArgument(const char* text) {
-    if (text)
-        content_ = std::string(text);
+void Formatter::appendValue(const Value& value, const Conversion& conversion) {
+    const bool asBoolean =
+        value.isBoolean() && std::string_view("@sp").find(conversion.letter) != std::string_view::npos;
+    if (const std::string* text = value.text())
+        appendText(*text);
+    else if (const std::optional<std::int64_t> number = value.integer(); number && !asBoolean)
+        appendNumber(static_cast<std::uint64_t>(*number), *number < 0, conversion);
+    else
+        out_ += value.description();
 }
 
-FormatArgument::FormatArgument(std::string_view text) : content_(std::string(text)) {}
+void Formatter::appendText(std::string_view text, utf8::Escaping how) {
+    if (forLog_)
+        appendShown(out_, text, longestShownText, how);
+    else
+        out_ += text;
+}
 
-FormatArgument::FormatArgument(const std::string& text) : content_(text) {}
-
-void FormatArgument::append(std::string& out, char conversion, bool wide, bool zeroPadded, unsigned width) const {
-    if (const std::string* text = std::get_if<std::string>(&content_)) {
-        out += *text;
-        return;
-    }
-    if (const void* const* pointer = std::get_if<const void*>(&content_)) {
-        appendPadded(out, "0x", digits(reinterpret_cast<std::uintptr_t>(*pointer), 16), zeroPadded, width);
-        return;
-    }
-    const std::uint64_t* number = std::get_if<std::uint64_t>(&content_);
-    if (!number) {
-        out += noArgument;
-        return;
-    }
-
-    const std::uint64_t unsignedNumber = wide ? *number : static_cast<std::uint32_t>(*number);
-    switch (conversion) {
+void Formatter::appendNumber(std::uint64_t number, bool negative, const Conversion& conversion) {
+    const std::uint64_t unsignedNumber = conversion.wide ? number : static_cast<std::uint32_t>(number);
+    std::string sign, text;
+    switch (conversion.letter) {
     case 'd':
     case 'i': {
-        const bool negative = wide ? static_cast<std::int64_t>(*number) < 0 : static_cast<std::int32_t>(*number) < 0;
-        const std::uint64_t magnitude = !negative ? unsignedNumber
-                                        : wide    ? 0 - *number
-                                                  : static_cast<std::uint32_t>(0 - *number);
-        appendPadded(out, negative ? "-" : "", digits(magnitude, 10), zeroPadded, width);
-        return;
+        const bool below =
+            conversion.wide ? static_cast<std::int64_t>(number) < 0 : static_cast<std::int32_t>(number) < 0;
+        sign = below ? "-" : "";
+        text = digits(!below            ? unsignedNumber
+                      : conversion.wide ? 0 - number
+                                        : static_cast<std::uint32_t>(0 - number),
+                      10);
+        break;
     }
     case 'u':
-        appendPadded(out, "", digits(unsignedNumber, 10), zeroPadded, width);
-        return;
+        text = digits(unsignedNumber, 10);
+        break;
     case 'x':
-        appendPadded(out, "", digits(unsignedNumber, 16), zeroPadded, width);
-        return;
-    case 'X': {
-        std::string upper = digits(unsignedNumber, 16);
-        std::transform(upper.begin(), upper.end(), upper.begin(),
+        text = digits(unsignedNumber, 16);
+        break;
+    case 'X':
+        text = digits(unsignedNumber, 16);
+        std::transform(text.begin(), text.end(), text.begin(),
                        [](char digit) { return digit >= 'a' ? static_cast<char>(digit - 'a' + 'A') : digit; });
-        appendPadded(out, "", upper, zeroPadded, width);
-        return;
-    }
+        break;
     default:
-        if (boolean_)
-            out += *number != 0 ? "true" : "false";
-        else
-            appendPadded(out, negative_ ? "-" : "", digits(negative_ ? 0 - *number : *number, 10), zeroPadded, width);
+        sign = negative ? "-" : "";
+        text = digits(negative ? 0 - number : number, 10);
     }
+    appendPadded(out_, sign, text, conversion.zeroPadded, conversion.width);
 }
 
-std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments) {
-    std::string out;
+std::string Formatter::format(std::string_view text, std::initializer_list<FormatArgument> arguments) {
     auto argument = arguments.begin();
     while (true) {
         const std::size_t percent = text.find('%');
-        out += text.substr(0, percent);
+        out_ += text.substr(0, percent);
         if (percent == std::string_view::npos)
-            return out;
+            return std::move(out_);
         text.remove_prefix(percent + 1);
         if (text.starts_with('%')) {
-            out += '%';
+            out_ += '%';
             text.remove_prefix(1);
             continue;
         }
         const Conversion conversion = readConversion(text);
         if (conversion.length == 0) {
-            out += '%';
+            out_ += '%';
             continue;
         }
         text.remove_prefix(conversion.length);
         if (argument == arguments.end()) {
-            out += noArgument;
+            out_ += noArgument;
             continue;
         }
-        argument->append(out, conversion.letter, conversion.wide, conversion.zeroPadded, conversion.width);
+        if (forLog_ && !text.empty())
+            appendOnThisLine(*argument, conversion);
+        else
+            append(*argument, conversion);
         ++argument;
     }
+}
+
+std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments) {
+    return Formatter(false).format(text, arguments);
+}
+
+std::string formatForLog(std::string_view text, std::initializer_list<FormatArgument> arguments) {
+    return Formatter(true).format(text, arguments);
 }

@@ -1,4 +1,5 @@
-// Formatting with printf-style formats and typed arguments.
+// Formatting with printf-style formats and typed arguments: for texts, which are to hold what they were given, and for
+// log lines, in which what comes from outside must do no harm.
 #ifndef VELTRA_PLATFORM_FORMAT_H
 #define VELTRA_PLATFORM_FORMAT_H
 
@@ -14,27 +15,43 @@
 #include "platform/Error.h"
 #include "platform/Value.h"
 
-// One argument of a format. It knows its kind, so a conversion never reads memory that the argument does not own.
+// What a program wrote: a log keeps its lines.
+struct ProgramOutput {
+    const Value* text;
+};
+
+// One argument of a format. It knows its kind, so a conversion never reads memory that the argument does not have. It
+// refers to what it was made from, which has to live until the text is formatted; making one never fails.
 class FormatArgument {
 public:
     FormatArgument(std::nullptr_t) {}
-    FormatArgument(const Value& value);
-    FormatArgument(const Error& error);
-    FormatArgument(const std::optional<Error>& error);
-    FormatArgument(const char* text); // null is nothing
-    FormatArgument(std::string_view text);
-    FormatArgument(const std::string& text);
+    FormatArgument(const Value& value) : content_(&value) {}
+    FormatArgument(const Error& error) : content_(&error) {}
+    FormatArgument(const std::optional<Error>& error) {
+        if (error)
+            content_ = &*error;
+    }
+    FormatArgument(const char* text) { // the program's own words, which a log shows as they stand; null is nothing
+        if (text)
+            content_ = Literal{text};
+    }
+    FormatArgument(std::string_view text) : content_(text) {}
+    FormatArgument(const std::string& text) : content_(std::string_view(text)) {}
+    FormatArgument(ProgramOutput output) : content_(output) {}
     template <std::integral Integer>
     FormatArgument(Integer number) : content_(static_cast<std::uint64_t>(number)), negative_(number < Integer{}) {}
     FormatArgument(const void* pointer) : content_(pointer) {}
 
-    // Appends the argument under the conversion described by the remaining arguments; used by format().
-    void append(std::string& out, char conversion, bool wide, bool zeroPadded, unsigned width) const;
-
 private:
-    std::variant<std::monostate, std::string, std::uint64_t, const void*> content_;
+    friend class Formatter;
+    struct Literal {
+        const char* text;
+    };
+
+    std::variant<std::monostate, const Value*, const Error*, Literal, std::string_view, ProgramOutput, std::uint64_t,
+                 const void*>
+        content_;
     bool negative_ = false;
-    bool boolean_ = false;
 };
 
 // Replaces each conversion of `text` by its argument, in order:
@@ -46,7 +63,13 @@ private:
 //   %%            a per cent sign
 // A width with or without a leading 0 pads numbers ("%02x"), to 64 places at most. An argument of another kind than the
 // conversion asks for is written as "%@" would; a missing one is "(null)"; an unknown conversion stands as it is.
+// A text stands as it is, every other value and an error as its description.
 std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments);
+
+// The same for a log line, which is the one place where text from outside is made harmless: texts stand as appendShown
+// (platform/ShownText.h) shows them, without a line end where more of the line follows; so does what a program wrote,
+// but for its line ends.
+std::string formatForLog(std::string_view text, std::initializer_list<FormatArgument> arguments);
 
 template <class... Arguments>
 std::string format(std::string_view text, const Arguments&... arguments) {

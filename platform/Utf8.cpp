@@ -23,7 +23,7 @@ constexpr Lead leads[] = {
 
 bool leavesTheLine(char32_t point) {
     return point < 0x20 || (point >= 0x7F && point < 0xA0) || (point >= 0x2028 && point <= 0x202E) ||
-           (point >= 0x2066 && point <= 0x2069);
+           (point >= 0x2066 && point <= 0x2069) || point == 0x200E || point == 0x200F || point == 0x061C;
 }
 
 void appendHex(std::string& out, char32_t number, unsigned digits) {
@@ -43,7 +43,9 @@ void appendEscape(std::string& out, char32_t point) {
     appendHex(out, point, 4);
 }
 
-void append(std::string& out, std::string_view text, bool quoted) {
+} // namespace
+
+void appendEscaped(std::string& out, std::string_view text, Escaping how) {
     while (!text.empty()) {
         const Step step = next(text);
         const std::string_view bytes = text.substr(0, step.length);
@@ -53,17 +55,15 @@ void append(std::string& out, std::string_view text, bool quoted) {
                 out += "\\x";
                 appendHex(out, static_cast<unsigned char>(byte), 2);
             }
-        } else if (leavesTheLine(step.point)) {
+        } else if (leavesTheLine(step.point) && !(how == Escaping::Lines && step.point == '\n')) {
             appendEscape(out, step.point);
         } else {
-            if (quoted && (step.point == '"' || step.point == '\\'))
+            if (how == Escaping::Quotes && (step.point == '"' || step.point == '\\'))
                 out += '\\';
             out += bytes;
         }
     }
 }
-
-} // namespace
 
 Step next(std::string_view text) {
     const auto byte = [text](std::size_t index) { return static_cast<unsigned char>(text[index]); };
@@ -121,12 +121,12 @@ std::string_view beginning(std::string_view text, std::size_t limit) {
 }
 
 void appendOnOneLine(std::string& out, std::string_view text) {
-    append(out, text, false);
+    appendEscaped(out, text, Escaping::OneLine);
 }
 
 void appendQuoted(std::string& out, std::string_view text) {
     out += '"';
-    append(out, text, true);
+    appendEscaped(out, text, Escaping::Quotes);
     out += '"';
 }
 

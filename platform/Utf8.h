@@ -33,12 +33,20 @@ std::string repaired(std::string_view text);
 // The longest beginning of `text` of at most `limit` bytes that does not cut a character in two.
 std::string_view beginning(std::string_view text, std::size_t limit);
 
-// Appends `text` so that it stays on one line whatever shows it: control characters, line and paragraph separators,
+// What appendEscaped leaves as it is, or escapes beside the rest.
+enum class Escaping {
+    OneLine,
+    Lines,  // line feeds stay
+    Quotes, // \" and \\ for the quote and the backslash
+};
+
+// Appends `text` so that it does no harm to whatever shows it: control characters, line and paragraph separators,
 // characters that turn the writing direction, and bad sequences are written as \n, \r, \t, \u followed by four or \x
 // followed by two hexadecimal digits.
+void appendEscaped(std::string& out, std::string_view text, Escaping how);
 void appendOnOneLine(std::string& out, std::string_view text);
 
-// The same in double quotes, with \" and \\ for the quote and the backslash.
+// The same in double quotes.
 void appendQuoted(std::string& out, std::string_view text);
 
 } // namespace utf8

@@ -1,6 +1,6 @@
 #include "platform/Value.h"
 
-#include "platform/Utf8.h"
+#include "platform/ShownText.h"
 
 namespace {
 
@@ -32,10 +32,11 @@ void appendData(std::string& out, const Value::Data& data) {
 }
 
 void appendText(std::string& out, std::string_view text) {
-    const std::string_view shown = utf8::beginning(text, shownText);
-    utf8::appendQuoted(out, shown);
-    if (shown.size() < text.size())
-        out += "... (" + std::to_string(text.size()) + " bytes)";
+    out += '"';
+    const bool whole = appendShownText(out, text, shownText, utf8::Escaping::Quotes);
+    out += '"';
+    if (!whole)
+        appendCutMark(out, text);
 }
 
 void append(std::string& out, const Value& value, unsigned nesting);
@@ -111,9 +112,10 @@ const Value& Value::operator[](std::string_view key) const {
 }
 
 std::string Value::description() const {
-    if (const std::string* content = text())
-        return *content;
     std::string out;
-    append(out, *this, 0);
+    if (const std::string* content = text())
+        appendShown(out, *content);
+    else
+        append(out, *this, 0);
     return out;
 }

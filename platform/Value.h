@@ -50,9 +50,10 @@ public:
     // The value under `key`, or a value of nothing when there is none or this is no dictionary.
     const Value& operator[](std::string_view key) const;
 
-    // The value for a reader of the log, as "%@" shows it: "(null)" for nothing, a text as it stands, everything else
-    // on one line of bounded length. Data longer than 64 bytes shows its length and its first and last bytes. Texts
-    // inside a collection stand in quotes with control characters escaped.
+    // The value for a reader of the log: "(null)" for nothing, a text as appendShown (platform/ShownText.h) shows it,
+    // everything else on one line of bounded length. Data longer than 64 bytes shows its length and its first and last
+    // bytes. Texts inside a collection stand in quotes with control characters escaped and URLs without user and
+    // password.
     std::string description() const;
 
     friend bool operator==(const Value&, const Value&) = default;

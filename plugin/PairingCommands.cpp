@@ -14,7 +14,6 @@
 #include "platform/Pause.h"
 #include "platform/SystemLog.h"
 #include "platform/URL.h"
-#include "platform/Utf8.h"
 #include "platform/VanterUpdater.h"
 #include "plugin/Commands.h"
 #include "plugin/ZPOrloServices.h"
@@ -31,10 +30,12 @@ constexpr std::int32_t patchNotLoaded = -1;
 using UpdaterPtr = std::unique_ptr<VanterUpdater, decltype(&VanterUpdaterRelease)>;
 
 // The lines about loading the patch go to the framework's handle of the system log and not to the plug-in's log.
-void writeToFramework(SystemLogType type, std::string_view text, std::initializer_list<FormatArgument> arguments) {
+void writeToFramework(SystemLogType type, std::string_view text, std::initializer_list<FormatArgument> arguments) try {
     SystemLog* const log = getLogHandle(1);
     if (systemLogTypeEnabled(log, type))
-        systemLogWrite(log, type, format(text, arguments));
+        systemLogWrite(log, type, formatForLog(text, arguments));
+} catch (const std::exception&) {
+    return; // a line that memory does not suffice for is lost
 }
 
 template <class... Arguments>
@@ -165,20 +166,11 @@ struct PairingCommand {
 constexpr PairingCommand provisionCommand{"corvoSCProv", "provisioning", provision};
 constexpr PairingCommand pairCommand{"corvoSCPair", "pairing", pair};
 
-// A text of the request for the log: it cannot begin a line of its own.
-Value onOneLine(const Value& text) {
-    if (!text.text())
-        return text;
-    std::string line;
-    utf8::appendOnOneLine(line, *text.text());
-    return line;
-}
-
 HSMessageResponse run(const PairingCommand& command, const HSMessageRequest& request) {
     serviceLog.info("%s:%d - Received %s", handlerName, __LINE__, command.name);
     const Value& argument = request.messageDict["waftonUrl"];
     const Value url = argument.text() ? argument : Value();
-    serviceLog.info("URL for %s: %@", command.purpose, onOneLine(url));
+    serviceLog.info("URL for %s: %@", command.purpose, url);
     if (!url.text() || !isWellFormedURL(*url.text())) {
         serviceLog.error("Wafton URL not a valid URL");
         return HSMessageResponse::initWithName(
