@@ -61,10 +61,12 @@ std::optional<std::uint8_t> scanPair(std::string_view pair) {
 
 } // namespace
 
-Value convertDictionaryToData(const Value& dictionary) {
+Value convertDictionaryToData(const Value& dictionary) try {
     if (dictionary.isNothing())
         return {};
     return archiveEncode(rootKey, dictionary);
+} catch (const ArchiveFailure&) {
+    return {};
 }
 
 Value convertDataToDictionary(const Value& data) {

@@ -21,8 +21,8 @@ private:
     std::string name_;
 };
 
-// The keyed archive of `dictionary` under the root key "HSArchiverKey", as data; nothing for nothing. Raises
-// ArchiveFailure for a dictionary that archiveEncode (platform/KeyedArchive.h) refuses.
+// The keyed archive of `dictionary` under the root key "HSArchiverKey", as data; nothing for nothing, and for a
+// dictionary that archiveEncode (platform/KeyedArchive.h) refuses.
 Value convertDictionaryToData(const Value& dictionary);
 
 // The object under the root key "HSArchiverKey" of the archive in `data`; nothing for nothing, and when the bytes are

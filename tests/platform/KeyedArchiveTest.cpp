@@ -5,6 +5,8 @@
 
 #include <gtest/gtest.h>
 
+#include "tests/support/OwnProcess.h"
+
 namespace {
 
 using Data = Value::Data;
@@ -60,6 +62,11 @@ TEST(KeyedArchive, graphsThatCouldNotBeDecodedAreNotEncoded) {
     };
     for (const Value& root : roots)
         EXPECT_THROW(archiveEncode("k", root), ArchiveFailure) << root.description();
+
+    inOwnProcess([] { // which ends without taking such a graph apart
+        static const Value bottomless = nested(1 << 20);
+        EXPECT_THROW(archiveEncode("k", bottomless), ArchiveFailure);
+    });
 }
 
 TEST(KeyedArchive, bytesThatAreNoArchiveMakeNoDecoder) {

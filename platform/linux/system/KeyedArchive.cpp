@@ -30,6 +30,12 @@ unsigned major(std::uint8_t first) {
     return first >> 5;
 }
 
+// Refuses a collection inside of `nesting` others.
+void requireNesting(std::size_t nesting) {
+    if (nesting >= ValueBuilder::maximumNesting)
+        throw ArchiveFailure("a nesting of more than " + std::to_string(ValueBuilder::maximumNesting));
+}
+
 // Walks over the heads of all items and lets pass only what an archive may hold, before the library sees the bytes: the
 // library descends once for every nested head, also for texts of indefinite length, and wraps around at negative
 // integers beyond 64 bits.
@@ -71,8 +77,7 @@ private:
     }
 
     void elements(std::uint64_t count, std::size_t nesting) {
-        if (nesting == ValueBuilder::maximumNesting)
-            throw ArchiveFailure("a nesting of more than " + std::to_string(ValueBuilder::maximumNesting));
+        requireNesting(nesting);
         require(count); // an element has one byte at least
         for (; count > 0; --count)
             item(nesting + 1);
@@ -109,7 +114,7 @@ std::string archiveText(const std::string& text) {
     return text;
 }
 
-nlohmann::json archiveItem(const Value& value) {
+nlohmann::json archiveItem(const Value& value, std::size_t nesting) {
     if (value.isBoolean())
         return *value.boolean();
     if (value.isNumber())
@@ -121,15 +126,16 @@ nlohmann::json archiveItem(const Value& value) {
     if (value.isNothing())
         throw ArchiveFailure("a value of nothing");
 
+    requireNesting(nesting);
     if (const Value::Array* array = value.array()) {
         nlohmann::json items = nlohmann::json::array();
         for (const Value& element : *array)
-            items.push_back(archiveItem(element));
+            items.push_back(archiveItem(element, nesting + 1));
         return items;
     }
     nlohmann::json entries = nlohmann::json::object();
     for (const auto& [key, element] : *value.dictionary())
-        entries[archiveText(key)] = archiveItem(element);
+        entries[archiveText(key)] = archiveItem(element, nesting + 1);
     return entries;
 }
 
@@ -137,7 +143,7 @@ nlohmann::json archiveItem(const Value& value) {
 
 Value::Data archiveEncode(std::string_view rootKey, const Value& root) {
     nlohmann::json archive = nlohmann::json::object();
-    archive[archiveText(std::string(rootKey))] = archiveItem(root);
+    archive[archiveText(std::string(rootKey))] = archiveItem(root, 1);
     Value::Data bytes = nlohmann::json::to_cbor(archive);
     HeadCheck(bytes).run(); // what could not be decoded again is no archive
     return bytes;
