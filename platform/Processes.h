@@ -35,7 +35,8 @@ struct StandardDescriptors {
 
 // Starts the program argv[0] with the arguments `argv`, an empty environment and no signal blocked; a script runs under
 // the interpreter that its first line names. There is no search for the program and no shell. Everything else is
-// inherited, and beside it a descriptor of the program itself. Returns 0 and the child in `child`, or an error number.
+// inherited. Where the resolved program lies is what the kernel runs, so that a script finds itself there. Returns 0
+// and the child in `child`, or an error number.
 int spawn(const std::vector<std::string>& argv, const StandardDescriptors& standard, pid_t& child);
 
 // How a child ended.
@@ -59,20 +60,35 @@ void killAndWait(pid_t child);
 // Makes writes to this end answer at once, with what fits. The other end is not affected.
 void makeNonBlocking(int descriptor);
 
-// Waits until `writeEnd` takes bytes or shows that nobody reads them, or `readEnd` has bytes or its end. Either may be
-// -1.
+// A descriptor that can be read once the child has ended; -1 when the kernel has none to give.
+int openEnding(pid_t child);
+
+// Waits until `writeEnd` takes bytes or shows that nobody reads them, `readEnd` has bytes or its end, or the child has
+// ended. Either end may be -1; `ending` is what openEnding gave, and without it the child is looked at now and then.
 struct Ready {
     bool toWrite;
     bool toRead;
+    bool hasEnded;
 };
-Ready waitUntilReady(int writeEnd, int readEnd);
+Ready waitUntilReady(int writeEnd, int readEnd, pid_t child, int ending);
+
+// The number of bytes that can be read without waiting.
+std::size_t readableBytes(int readEnd);
 
 // Up to `size` bytes, in one go: the count, 0 at the end, or the negative error number. Interrupted calls are repeated.
 ssize_t readSome(int descriptor, void* bytes, std::size_t size);
 ssize_t writeSome(int descriptor, const void* bytes, std::size_t size);
 
 // The text of an error number.
-std::string errorText(int number);
+const char* errorText(int number);
+
+// Takes SIGPIPE with a handler that does nothing from here on, whatever the process inherited: a write that nobody
+// reads fails, and a program that is started has the signal's default.
+void catchBrokenPipe();
+
+// Fills up the standard descriptors of a process that was started without some of them, so that no file or connection
+// that it opens gets the number of one. Programs that it starts do not inherit what is filled in.
+void openStandardDescriptors();
 
 // Ignores SIGPIPE in the whole process for as long as it lives, so that a write to a pipe that nobody reads fails
 // instead of ending the process, and then restores what was before.

@@ -3,6 +3,7 @@
 #include <string_view>
 
 #include "Daemon/HSLog.h"
+#include "platform/Processes.h"
 #include "platform/SystemLog.h"
 #include "plugin/ZPOrloServices.h"
 
@@ -33,6 +34,8 @@ int answer(std::string_view argument, bool isOnlyOne) {
 int main(int argc, char** argv) {
     if (argc > 1)
         return answer(argv[1], argc == 2);
+    processes::openStandardDescriptors();
+    processes::catchBrokenPipe(); // a reader of standard error that is gone must not end the service
 
     constexpr const char* serviceName = "com.tevari.VeltraOrloServices";
     constexpr LogSource mainLog{"main"};

@@ -18,8 +18,8 @@ constexpr int failed = 7;
 constexpr int noExitStatus = -1;
 constexpr std::size_t chunkSize = 1023;
 
-const char* programOf(const std::vector<std::string>& argv) {
-    return argv.empty() ? "" : argv.front().c_str();
+std::string_view programOf(const std::vector<std::string>& argv) {
+    return argv.empty() ? std::string_view() : argv.front();
 }
 
 // Closes a descriptor at the end of its life, or earlier.
@@ -41,12 +41,16 @@ private:
 // Waits for a child that nobody else has waited for, so that it is reaped also when memory runs out on the way.
 class Child {
 public:
-    explicit Child(pid_t process) : process_(process) {}
+    explicit Child(pid_t process) : process_(process), ending_(processes::openEnding(process)) {}
     Child(const Child&) = delete;
     Child& operator=(const Child&) = delete;
     ~Child() {
         if (!waited_)
             processes::killAndWait(process_);
+    }
+
+    processes::Ready waitUntilReady(int writeEnd, int readEnd) const {
+        return processes::waitUntilReady(writeEnd, readEnd, process_, ending_.get());
     }
 
     // How the child ended. One that is stopped is killed after the wait.
@@ -60,6 +64,7 @@ public:
 
 private:
     pid_t process_;
+    Descriptor ending_;
     bool waited_ = false;
 };
 
@@ -68,18 +73,30 @@ class Output {
 public:
     explicit Output(int readEnd) : readEnd_(readEnd) {}
 
-    // Reads one chunk; false at the end of the output and when it cannot be read or kept.
-    bool readChunk() {
+    // Reads one chunk of at most `longest` bytes and returns how many it had: none at the end of the output and when it
+    // cannot be read or kept.
+    std::size_t readChunk(std::size_t longest = chunkSize) {
         char chunk[chunkSize];
-        const ssize_t count = processes::readSome(readEnd_.get(), chunk, sizeof chunk);
-        if (count > 0 && append({chunk, static_cast<std::size_t>(count)}))
-            return true;
+        const ssize_t count = processes::readSome(readEnd_.get(), chunk, std::min(longest, chunkSize));
+        const std::size_t read = count > 0 ? static_cast<std::size_t>(count) : 0;
+        if (read > 0 && append({chunk, read}))
+            return read;
         readEnd_.close();
-        return false;
+        return 0;
     }
 
-    void readToEnd() {
-        while (readEnd_.get() >= 0 && readChunk()) {
+    // Reads to the end of the output or, once the child has ended, what is there by then: those that have the other end
+    // from the child and live on are not waited for.
+    void readToEnd(const Child& child) {
+        while (readEnd_.get() >= 0) {
+            const processes::Ready ready = child.waitUntilReady(-1, readEnd_.get());
+            if (ready.hasEnded) {
+                for (std::size_t left = processes::readableBytes(readEnd_.get()); left > 0 && readEnd_.get() >= 0;)
+                    left -= readChunk(left);
+                readEnd_.close();
+            } else {
+                readChunk();
+            }
         }
     }
 
@@ -124,14 +141,18 @@ private:
     std::string incomplete_;
 };
 
-// Writes the input and reads what comes meanwhile; the child then sees the end of its input.
-void feed(const char* program, Descriptor& input, const void* bytes, std::size_t length, Output& output) {
+// Writes the input and reads what comes meanwhile; the child then sees the end of its input. Once the child has ended,
+// nobody else is waited for to take the rest.
+void feed(std::string_view program, const Child& child, Descriptor& input, const void* bytes, std::size_t length,
+          Output& output) {
     const char* next = static_cast<const char*>(bytes);
     processes::makeNonBlocking(input.get());
     while (length > 0) {
-        const processes::Ready ready = processes::waitUntilReady(input.get(), output.descriptor());
+        const processes::Ready ready = child.waitUntilReady(input.get(), output.descriptor());
         if (ready.toRead && output.descriptor() >= 0)
             output.readChunk();
+        if (!ready.toWrite && ready.hasEnded)
+            break;
         if (!ready.toWrite)
             continue;
         const ssize_t count = processes::writeSome(input.get(), next, length);
@@ -147,7 +168,7 @@ void feed(const char* program, Descriptor& input, const void* bytes, std::size_t
 }
 
 // The result that an ending stands for. An exit is a word in the log of a call with input only.
-int resultOf(const processes::Ending& ending, const char* program, bool withInput) {
+int resultOf(const processes::Ending& ending, std::string_view program, bool withInput) {
     using processes::Ending;
     if (withInput && ending.kind != Ending::Unknown)
         pipeLog.info("child exited\n");
@@ -182,7 +203,7 @@ Outcome run(const std::vector<std::string>& argv) {
     Child child(process);
     Output output(readEnd);
     pipeLog.info("Start Reading output from shell command\n");
-    output.readToEnd();
+    output.readToEnd(child);
     const int result = resultOf(child.wait(), programOf(argv), false);
     return {result, output.takeText()};
 }
@@ -198,9 +219,9 @@ Outcome runWithInput(const std::vector<std::string>& argv, const void* bytes, ss
     Child child(process);
     Output output(readEnd);
     Descriptor input(writeEnd);
-    feed(programOf(argv), input, bytes, length > 0 ? static_cast<std::size_t>(length) : 0, output);
+    feed(programOf(argv), child, input, bytes, length > 0 ? static_cast<std::size_t>(length) : 0, output);
     pipeLog.info("Start Reading output from shell command\n");
-    output.readToEnd();
+    output.readToEnd(child);
     pipeLog.info("waiting for child to exit\n");
     const int result = resultOf(child.wait(), programOf(argv), true);
     return {result, output.takeText()};
@@ -233,7 +254,7 @@ std::vector<std::string> argumentVector(const std::string& command, const std::v
 } // namespace
 
 int hs_spawn_command(const std::vector<std::string>& argv, pid_t& child, bool collectStandardError, int* input) {
-    const char* program = programOf(argv);
+    const std::string_view program = programOf(argv);
     pipeLog.info("executing %s\n", program);
     processes::Pipe outputPipe, inputPipe;
     int problem = processes::createPipe(outputPipe);

@@ -1,7 +1,8 @@
 // Runs an external program, feeds it and collects what it writes.
 //
 // A call starts the program as a child process without a shell, with an empty environment, waits for it to end, however
-// long that takes, and describes the outcome in a response dictionary of three keys:
+// long that takes, and describes the outcome in a response dictionary of three keys. Processes that the child leaves
+// behind are not waited for: what they write after its end is not read.
 //   "Status"  0 when the child exited with status 0, otherwise 7
 //   "Output"  all that it wrote, as text: U+FFFD stands for each sequence that is no UTF-8, and from a NUL on the rest
 //             of the at most 1023 bytes that were read with it is left out; output that memory does not suffice for is

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <cstddef>
 #include <cstring>
 #include <filesystem>
 #include <string>
@@ -10,7 +11,12 @@
 #include <vector>
 
 #include <fcntl.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -300,6 +306,70 @@ TEST_F(HSPipeUtilTest, theChildGetsItsArgumentsAnEmptyEnvironmentAndNoBlockedSig
     EXPECT_EQ(run(), 0);
     ::pthread_sigmask(SIG_SETMASK, &previous, nullptr);
     EXPECT_EQ(output(), "SigBlk:\t0000000000000000\n");
+}
+
+// Keeps from programs what this process itself has inherited, as the pipe to the test that waits for it.
+void keepOwnDescriptors() {
+    ASSERT_EQ(::close_range(3, ~0U, CLOSE_RANGE_CLOEXEC), 0);
+}
+
+TEST_F(HSPipeUtilTest, theChildHasItsDevicePathForItsNameAndNoDescriptorButTheStandardOnes) {
+    root_.link("/link", "/usr/bin/program");
+    binary("/bin/cat");
+    EXPECT_EQ(hs_execute_command({"/link", "/proc/self/cmdline"}, &response_, nullptr), 0);
+    EXPECT_EQ(output(), "/link");
+    script("echo \"$0\"; exec ls /proc/self/fd");
+    inOwnProcess([&] {
+        keepOwnDescriptors();
+        for (const bool withInput : {false, true}) {
+            EXPECT_EQ(withInput ? hs_execute_command_with_input_data({"/link"}, "x", 1, &response_, nullptr)
+                                : hs_execute_command({"/link"}, &response_, nullptr),
+                      0);
+            EXPECT_EQ(output(),
+                      fs::canonical(root_.host(program)).string() + "\n0\n1\n2\n3\n"); // 3 is the listing's own
+        }
+    });
+}
+
+// Makes the system call fail as on a kernel that does not know it.
+void withoutSystemCall(unsigned number) {
+    sock_filter steps[] = {BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+                           BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, number, 0, 1),
+                           BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | ENOSYS),
+                           BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW)};
+    const sock_fprog filter{std::size(steps), steps};
+    ASSERT_EQ(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0), 0);
+    ASSERT_EQ(::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &filter), 0);
+}
+
+TEST_F(HSPipeUtilTest, aProcessThatTheChildLeavesBehindIsNotWaitedFor) {
+    root_.makeDirectory("/");
+    ASSERT_EQ(::mkfifo(root_.host("/end").c_str(), 0600), 0);
+    const int end = ::open(root_.host("/end").c_str(), O_RDWR | O_CLOEXEC); // the one left behind lives until it closes
+    const struct {
+        const char* lines;
+        std::size_t input;
+        std::string output;
+    } rows[] = {
+        {"(read line < \"$1\"; echo late) & head -c 5000 /dev/zero | tr '\\0' x", 0, std::string(5000, 'x')},
+        {"(read line < \"$1\"; echo late) & cat", 50000, std::string(50000, 'i')},
+        {"exec 3<&0; read line < \"$1\" 3<&3 & printf out", 1 << 20, "out"},
+        {"printf out; yes late >&2 & exit", 0, "out"},
+    };
+    for (const auto& row : rows) {
+        script(row.lines);
+        for (const bool oldKernel : {false, true})
+            inOwnProcess([&] {
+                keepOwnDescriptors();
+                if (oldKernel)
+                    withoutSystemCall(SYS_pidfd_open);
+                EXPECT_EQ(row.input == 0 ? run({root_.host("/end")})
+                                         : runWith(Value::Data(row.input, 'i'), {root_.host("/end")}),
+                          0);
+                EXPECT_EQ(output().substr(0, row.output.size()), row.output) << row.lines;
+            });
+    }
+    ::close(end);
 }
 
 TEST_F(HSPipeUtilTest, inputAndOutputOfAnySizePassAtTheSameTime) {

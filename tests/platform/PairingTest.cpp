@@ -7,6 +7,7 @@
 #include <utility>
 #include <vector>
 
+#include <fcntl.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -57,6 +58,7 @@ private:
     // Reads one request, whose body is shorter than its header, and answers it.
     std::string serve(const std::string& answer) const {
         const FileDescriptor client(::accept4(listener_.get(), nullptr, nullptr, SOCK_CLOEXEC));
+        EXPECT_TRUE(isClosedOnExec(client.get()));
         std::string request;
         char piece[1024];
         while (!isWhole(request)) {
@@ -67,6 +69,20 @@ private:
         }
         EXPECT_EQ(::send(client.get(), answer.data(), answer.size(), MSG_NOSIGNAL), ssize_t(answer.size()));
         return request.substr(0, request.find('\r')) + ": " + request.substr(request.find("\r\n\r\n") + 4);
+    }
+
+    // Whether no program that this process starts inherits the other end of a connection.
+    static bool isClosedOnExec(int client) {
+        sockaddr_in peer = {}, own = {};
+        socklen_t length = sizeof peer;
+        EXPECT_EQ(::getpeername(client, reinterpret_cast<sockaddr*>(&peer), &length), 0);
+        for (int end = 3; end < 1024; ++end) {
+            length = sizeof own;
+            if (::getsockname(end, reinterpret_cast<sockaddr*>(&own), &length) == 0 && own.sin_family == AF_INET &&
+                own.sin_port == peer.sin_port)
+                return (::fcntl(end, F_GETFD) & FD_CLOEXEC) != 0;
+        }
+        return false;
     }
 
     static bool isWhole(const std::string& request) {

@@ -63,8 +63,9 @@ class Service:
             (root / folder).mkdir(parents=True)
         return root
 
-    def start(self):
-        self.pid = int(self.run(SOURCE / "scripts/start-service", BIN / "VeltraOrloServices").stdout)
+    def start(self, *starter):
+        """Starts the service, through a program that ends as it when one is named."""
+        self.pid = int(self.run(SOURCE / "scripts/start-service", *starter, BIN / "VeltraOrloServices").stdout)
         self.ended = os.pidfd_open(self.pid)
 
     def kill(self):

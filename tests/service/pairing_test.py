@@ -6,6 +6,7 @@ import select
 import shutil
 import signal
 import subprocess
+import sys
 import tempfile
 import unittest
 
@@ -150,9 +151,11 @@ class Pairing(unittest.TestCase):
                 self.assertEqual((error["domain"], error["code"]), ("BWCErrorDomain", code), error)
         with self.subTest("a certificate that nobody vouches for, behind the tunnel of the proxy"):
             self.assertEqual(self.fails("provision", self.url("corvo", "https"))["code"], 60)
-        with self.subTest("a proxy that the description does not name"):
-            self.describe(HTTPProxy="")
-            self.assertEqual(self.fails("provision", self.url("corvo"))["code"], 5)
+        for proxy in ("", "user:secret@127.0.0.1"):
+            with self.subTest("a proxy that the description does not name", proxy=proxy):
+                self.describe(HTTPProxy=proxy)
+                error = self.fails("provision", self.url("corvo"))
+                self.assertEqual((error["code"], "secret" in error["description"]), (5, False), error)
         with self.subTest("neither http nor https"):
             self.assertEqual(self.fails("provision", "file:///etc/hostname")["domain"], "BWCErrorDomain")
             self.assertEqual(self.fails("provision", "corvo")["domain"], "BWCErrorDomain")
@@ -180,6 +183,25 @@ class Pairing(unittest.TestCase):
             self.assertIn(f"] {message}\n", log + "\n")
         for message in ("Inside Loadpatch", "Vanter Firmware Update Successful", "loadVanterPatch success."):
             self.assertNotIn(message, log)  # these belong to the framework
+
+    def test_programs_get_a_clean_start_however_the_service_was_started(self):
+        trace = self.service.root / "calibrated"
+        self.write("usr/local/bin/q21isp", f"#!/bin/sh\nexec > {trace}\ngrep SigIgn /proc/self/status\n"
+                                           "exec ls /proc/self/fd\n".encode())
+        for case, change in (("standard error closed", "os.close(2)"),
+                             ("nobody reads standard error", "r, w = os.pipe(); os.dup2(w, 2)")):
+            with self.subTest(case):
+                self.service.stop()
+                # Python ignores SIGPIPE, and what it executes inherits that.
+                self.service.start(sys.executable, "-c",
+                                   f"import os, sys; {change}; os.execv(sys.argv[1], sys.argv[1:])")
+                (self.service.root / "etc/veltra/device.json").unlink()  # of which the console is told
+                self.assertEqual(self.service.orloctl("call", "x")[0], 4)
+                self.describe()
+                self.assertEqual(self.service.orloctl("pair", self.url("corvo"))[0], 0)
+                ignored, *descriptors = trace.read_text().splitlines()
+                self.assertEqual(int(ignored.split()[1], 16) >> (signal.SIGPIPE - 1) & 1, 0)
+                self.assertEqual(descriptors, ["0", "1", "2", "3"])  # the last one is the listing's own
 
     def test_pairing_fails_with_the_updater_and_the_server_hears_of_it(self):
         for step in ("create", "isDone", "queryInfo", "performNextStage"):

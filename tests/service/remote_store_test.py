@@ -489,7 +489,9 @@ class Failures(HostileTest):
                 for words, code in ((["get-psd2", "/tmp/out"], 1008), (["put-psd2", "/tmp/in"], 1008), (["export"], 2007)):
                     error = self.answer(*words)[2]
                     self.assertEqual((error["code"], reason in error["description"]), (code, True), error)
-        self.server.instead = trust.instead = None
+        self.server.instead, trust.instead = "mid", None
+        self.assertEqual(self.put(bytes(8 << 20))[2]["code"], 1011)
+        self.server.instead = None
         self.assertEqual(self.put(b"x"), SUCCESS)
         self.assertLess(service.peak_kilobytes(), 300 << 10)
 

@@ -167,7 +167,6 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     const std::string name(serviceName);
     const std::string which = busInUse();
     connection_ = new Connection;
-    (void)std::signal(SIGPIPE, SIG_IGN); // a reader of standard error that is gone must not end the service
     if (!openDeviceRoot()) {
         consoleLog(name + ": cannot open the device root \"" + deviceRootPath() + "\": " + std::strerror(errno));
         return false;

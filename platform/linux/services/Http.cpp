@@ -12,6 +12,7 @@
 #include <openssl/ssl.h>
 #include <openssl/x509v3.h>
 #include <stdlib.h>
+#include <sys/socket.h>
 
 #include "platform/Crypto.h"
 #include "platform/Format.h"
@@ -159,6 +160,11 @@ CURLcode prepareTls(CURL*, void* context, void*) {
     return CURLE_OK;
 }
 
+// A connection is not for programs that are started meanwhile.
+curl_socket_t openSocket(void*, curlsocktype, curl_sockaddr* address) {
+    return ::socket(address->family, address->socktype | SOCK_CLOEXEC, address->protocol);
+}
+
 std::string hexadecimal(const std::uint8_t (&digest)[crypto::sha256Size]) {
     std::string text;
     for (const std::uint8_t byte : digest)
@@ -200,7 +206,7 @@ std::string proxyFor(const std::string& scheme, const Value& description) {
         return "";
     const std::string* host = description[prefix + "Proxy"].text();
     const auto port = description[prefix + "Port"].integer();
-    if (!host || host->empty() || !port || *port < 1 || *port > 65535)
+    if (!host || host->empty() || host->find('@') != std::string::npos || !port || *port < 1 || *port > 65535)
         throw Failure(CURLE_COULDNT_RESOLVE_PROXY, "The proxy description names no host and port");
     const bool bare = host->find(':') != std::string::npos && !host->starts_with('['); // an IPv6 address
     return "http://" + (bare ? "[" + *host + "]" : *host) + ":" + std::to_string(*port);
@@ -276,6 +282,7 @@ void Client::configure(const Request& request) {
     set(CURLOPT_PROXY, request.proxy.c_str());
     set(CURLOPT_NOPROXY, "");
     set(CURLOPT_ERRORBUFFER, problem_);
+    set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
     set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_QUICK_EXIT, 1L); // a name server that is silent does not outlast the time-out
     set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(request.limits.connecting.count()));

@@ -1,12 +1,15 @@
 #include "platform/Processes.h"
 
 #include <cerrno>
+#include <climits>
 #include <cstring>
 #include <utility>
 
 #include <fcntl.h>
 #include <poll.h>
 #include <spawn.h>
+#include <sys/ioctl.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -86,16 +89,19 @@ void closeDescriptor(int descriptor) {
 }
 
 int spawn(const std::vector<std::string>& argv, const StandardDescriptors& standard, pid_t& child) {
-    const FileDescriptor program = aboveStandard(openInRoot(argv.empty() ? std::string_view() : argv[0], O_PATH));
+    const FileDescriptor program = openInRoot(argv.empty() ? std::string_view() : argv[0], O_PATH);
     if (!program)
         return errno;
+    char path[PATH_MAX];
+    const std::string link = "/proc/self/fd/" + std::to_string(program.get());
+    const ssize_t length = ::readlink(link.c_str(), path, sizeof path);
+    if (length < 0 || length == sizeof path)
+        return length < 0 ? errno : ENAMETOOLONG;
+    path[length] = '\0';
     FileActions actions;
     actions.duplicate(standard.input, STDIN_FILENO);
     actions.duplicate(standard.output, STDOUT_FILENO);
     actions.duplicate(standard.error, STDERR_FILENO);
-    // The interpreter of a script opens it by the path that is executed, so the descriptor has to outlast the exec:
-    // duplicating it onto itself takes the flag off that would close it.
-    actions.duplicate(program.get(), program.get());
     const Attributes attributes;
     if (actions.error() != 0 || attributes.error() != 0)
         return actions.error() != 0 ? actions.error() : attributes.error();
@@ -106,8 +112,7 @@ int spawn(const std::vector<std::string>& argv, const StandardDescriptors& stand
         arguments.push_back(const_cast<char*>(argument.c_str()));
     arguments.push_back(nullptr);
     char* const environment[] = {nullptr};
-    const std::string path = "/proc/self/fd/" + std::to_string(program.get());
-    return ::posix_spawn(&child, path.c_str(), actions.get(), attributes.get(), arguments.data(), environment);
+    return ::posix_spawn(&child, path, actions.get(), attributes.get(), arguments.data(), environment);
 }
 
 Ending waitFor(pid_t child) {
@@ -137,14 +142,32 @@ void makeNonBlocking(int descriptor) {
         ::fcntl(descriptor, F_SETFL, flags | O_NONBLOCK);
 }
 
-Ready waitUntilReady(int writeEnd, int readEnd) {
-    pollfd ends[] = {{writeEnd, POLLOUT, 0}, {readEnd, POLLIN, 0}};
-    int count;
-    do
-        count = ::poll(ends, 2, -1);
-    while (count < 0 && (errno == EINTR || errno == EAGAIN));
-    // When polling itself fails, reading and writing find out what is wrong.
-    return {count < 0 || ends[0].revents != 0, count < 0 || ends[1].revents != 0};
+int openEnding(pid_t child) {
+    return static_cast<int>(::syscall(SYS_pidfd_open, child, 0));
+}
+
+Ready waitUntilReady(int writeEnd, int readEnd, pid_t child, int ending) {
+    constexpr int nowAndThen = 20; // milliseconds
+    pollfd ends[] = {{writeEnd, POLLOUT, 0}, {readEnd, POLLIN, 0}, {ending, POLLIN, 0}};
+    while (true) {
+        const int count = ::poll(ends, 3, ending < 0 ? nowAndThen : -1);
+        if (count < 0 && (errno == EINTR || errno == EAGAIN))
+            continue;
+        bool hasEnded = ends[2].revents != 0;
+        if (ending < 0) {
+            siginfo_t found = {};
+            hasEnded = ::waitid(P_PID, static_cast<id_t>(child), &found, WEXITED | WNOHANG | WNOWAIT) != 0 ||
+                       found.si_pid != 0;
+        }
+        // When polling itself fails, reading and writing find out what is wrong.
+        if (count != 0 || hasEnded)
+            return {count < 0 || ends[0].revents != 0, count < 0 || ends[1].revents != 0, hasEnded};
+    }
+}
+
+std::size_t readableBytes(int readEnd) {
+    int count = 0;
+    return ::ioctl(readEnd, FIONREAD, &count) == 0 && count > 0 ? static_cast<std::size_t>(count) : 0;
 }
 
 ssize_t readSome(int descriptor, void* bytes, std::size_t size) {
@@ -163,9 +186,24 @@ ssize_t writeSome(int descriptor, const void* bytes, std::size_t size) {
     return count < 0 ? -errno : count;
 }
 
-std::string errorText(int number) {
-    char text[256] = "";
-    return ::strerror_r(number, text, sizeof text);
+const char* errorText(int number) {
+    const char* const text = ::strerrordesc_np(number);
+    return text ? text : "Unknown error";
+}
+
+void catchBrokenPipe() {
+    struct sigaction nothing = {};
+    nothing.sa_handler = [](int) {};
+    nothing.sa_flags = SA_RESTART;
+    ::sigaction(SIGPIPE, &nothing, nullptr);
+}
+
+void openStandardDescriptors() {
+    int number;
+    do
+        number = ::open("/dev/null", O_RDWR | O_CLOEXEC);
+    while (number >= 0 && number <= STDERR_FILENO);
+    closeDescriptor(number);
 }
 
 BrokenPipeIgnored::BrokenPipeIgnored() {
