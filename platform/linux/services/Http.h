@@ -18,14 +18,16 @@
 
 #include <curl/curl.h>
 
+#include "platform/ShownText.h"
 #include "platform/Value.h"
 
 namespace http {
 
-// An exchange that had no answer. The code is libcurl's, the text says what went wrong.
+// An exchange that had no answer. The code is libcurl's, the text says what went wrong, without user and password of a
+// URL.
 class Failure : public std::runtime_error {
 public:
-    Failure(CURLcode code, const std::string& reason) : std::runtime_error(reason), code_(code) {}
+    Failure(CURLcode code, const std::string& reason) : std::runtime_error(withoutUserInfo(reason)), code_(code) {}
     CURLcode code() const { return code_; }
 
     // Whether the same request may succeed at another time: the network failed, or the server did, but neither the

@@ -12,11 +12,13 @@
 
 #include "platform/Crypto.h"
 #include "platform/OrloDataStore.h"
+#include "platform/ShownText.h"
 
-// Why an operation of a backend failed.
+// Why an operation of a backend failed. The reason does not tell user and password of a URL.
 class OrloStoreFailure : public std::runtime_error {
 public:
-    OrloStoreFailure(QDOrloErrorCode code, const std::string& reason) : std::runtime_error(reason), code_(code) {}
+    OrloStoreFailure(QDOrloErrorCode code, const std::string& reason)
+        : std::runtime_error(withoutUserInfo(reason)), code_(code) {}
     QDOrloErrorCode code() const { return code_; }
 
 private:
