@@ -1,7 +1,10 @@
 #include "plugin/ZPOrloServices.h"
 
+#include <cstdint>
+#include <exception>
 #include <new>
 #include <optional>
+#include <utility>
 
 #include "Daemon/Common/HSPipeUtil.h"
 #include "platform/BundleInfo.h"
@@ -12,12 +15,18 @@
 namespace {
 
 struct CommandRow {
+    CommandRow(const char* named, Command command, std::int64_t status = -1, Value response = {})
+        : name(named),
+          run(command),
+          withoutMemory(HSMessageResponse::initWithName(named, status, std::move(response))) {}
+
     std::string_view name;
     Command run;
+    std::optional<HSMessageResponse> withoutMemory; // completes a request for which memory does not suffice
 };
 
 // In the order in which a request's command is compared with them.
-constexpr CommandRow commands[] = {
+const CommandRow commands[] = {
     {"OrloExport", OrloExport},
     {"getTCRT", getTCRT},
     {"putTCRT", putTCRT},
@@ -25,15 +34,16 @@ constexpr CommandRow commands[] = {
     {"getPSD2", getPSD2},
     {"corvoSCProv", corvoSCProv},
     {"corvoSCPair", corvoSCPair},
-    {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement},
-    {"setGlobalbCfg", setGlobalbCfg},
+    {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement, 0,
+     Value::Dictionary{{"IsPostSwapEntitled", false}}},
+    {"setGlobalbCfg", setGlobalbCfg, 0},
 };
 
-Command commandNamed(const Value& name) {
+const CommandRow* commandNamed(const Value& name) {
     const std::string* text = name.text();
     for (const CommandRow& row : commands)
         if (text && *text == row.name)
-            return row.run;
+            return &row;
     return nullptr;
 }
 
@@ -54,22 +64,28 @@ void ZPOrloServices::q21isp_loadDAT() try {
     Value response;
     Error error;
     HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
-    serviceLog.info("Output: %@", response["Output"]);
+    serviceLog.info("Output: %@", ProgramOutput{&response["Output"]});
 } catch (const std::bad_alloc&) {
     return; // an output that memory does not suffice for is lost; the load has happened all the same
 }
 
 void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSCompletion& completion) {
-    printPluginVersion();
-    serviceLog.info("Received Request : %@", request.description());
-    serviceLog.info("request.messageDict : %@", request.messageDict);
-    const Value hardwareModel = KACopyAnswerWithError("HWModelStr", {}, nullptr);
-    serviceLog.info("Hardware Model : %@", hardwareModel);
-
-    std::optional<HSMessageResponse> response;
-    if (const Command run = commandNamed(request.messageStr))
-        response = run(request, hardwareModel);
-    completion(true, response);
+    const CommandRow* const command = commandNamed(request.messageStr);
+    std::optional<HSMessageResponse> made;
+    const std::optional<HSMessageResponse>* response = &made;
+    try {
+        printPluginVersion();
+        serviceLog.info("Received Request : %@", request.description());
+        serviceLog.info("request.messageDict : %@", request.messageDict);
+        const Value hardwareModel = KACopyAnswerWithError("HWModelStr", {}, nullptr);
+        serviceLog.info("Hardware Model : %@", hardwareModel);
+        if (command)
+            made = command->run(request, hardwareModel);
+    } catch (const std::exception&) {
+        if (command)
+            response = &command->withoutMemory;
+    }
+    completion(true, *response);
 }
 
 std::string pluginVersion() {

@@ -15,7 +15,9 @@ public:
     static std::unique_ptr<ZPOrloServices> initWithServiceName(std::string_view serviceName);
 
     // Logs the request, runs its command and completes it with the command's response; with no response object when the
-    // command is unknown or absent. Some commands block the calling thread for long.
+    // command is unknown or absent. A command that memory does not suffice for is completed all the same: as a failure
+    // without reason, or, where the command knows no failure, with its plainest success. Some commands block the
+    // calling thread for long.
     void handleMessage(const HSMessageRequest& request, const HSCompletion& completion) override;
 
     // Logs the plug-in version.

@@ -6,8 +6,8 @@
 #include <gtest/gtest.h>
 
 #include "orlo/ZPOrloExport.h"
-#include "tests/orlo/FailingAllocation.h"
 #include "tests/platform/ServicesDouble.h"
+#include "tests/support/FailingAllocation.h"
 #include "tests/support/RecordedLog.h"
 
 namespace {

@@ -6,8 +6,8 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/orlo/FailingAllocation.h"
 #include "tests/platform/DataStoreDouble.h"
+#include "tests/support/FailingAllocation.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
 

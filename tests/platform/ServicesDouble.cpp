@@ -17,8 +17,9 @@
 
 namespace {
 
-void record(const std::string& call) {
-    servicesDouble().calls.push_back(call);
+// Raises nothing, since releases are recorded too.
+void record(std::string_view call) try { servicesDouble().calls.emplace_back(call); } catch (const std::bad_alloc&) {
+    return;
 }
 
 Value look(const std::map<std::string, Value, std::less<>>& answers, const char* operation, std::string_view key) {

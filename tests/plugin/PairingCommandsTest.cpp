@@ -7,6 +7,7 @@
 #include <vector>
 
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include "platform/Format.h"
 #include "plugin/ZPOrloServices.h"
@@ -125,7 +126,7 @@ TEST_F(PairingCommands, theLibraryGetsTheURLAndTheProxyAndDecides) {
 TEST_F(PairingCommands, whatIsNoURLIsRefusedBeforeAnythingIsAsked) {
     for (const char* command : {"corvoSCProv", "corvoSCPair"}) {
         for (const Value& argument : {Value(), Value(7), Value(""), Value("http://a b"), Value("1http://a"),
-                                      Value("http://a/%zz"), Value("line\nbreak")}) {
+                                      Value("http://a/%zz"), Value("line\nbreak"), Value("http://user:secret@a b")}) {
             arrange();
             const HSMessageResponse response =
                 request(command, argument.isNothing() ? Value() : Value(Value::Dictionary{{"waftonUrl", argument}}));
@@ -133,6 +134,8 @@ TEST_F(PairingCommands, whatIsNoURLIsRefusedBeforeAnythingIsAsked) {
             const std::string shown = argument.text() ? *argument.text() : "(null)";
             EXPECT_EQ(response.error(), (Error{"CorvoSCErrorDomain", 500, "Wafton URL not a valid URL:" + shown}));
             EXPECT_EQ(recordedLog().back(), "4 [ZPOrloServices] Wafton URL not a valid URL");
+            for (const std::string& line : recordedLog())
+                EXPECT_EQ(line.find("secret"), std::string::npos) << line;
             EXPECT_EQ(servicesDouble().calls, Lines{"KACopyAnswerWithError HWModelStr"});
         }
     }
@@ -293,6 +296,20 @@ TEST_F(PairingCommands, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
     }
 }
 #endif
+
+TEST_F(PairingCommands, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
+    constexpr long kilobytes = 16 << 10;
+    root_.write(calibration, "#!/bin/sh\nexec head -c 16777216 /dev/zero | tr '\\0' x");
+    inOwnProcess([&] {
+        rusage before = {}, after = {};
+        ASSERT_EQ(::getrusage(RUSAGE_SELF, &before), 0);
+        ZPOrloServices::q21isp_loadDAT();
+        ASSERT_EQ(::getrusage(RUSAGE_SELF, &after), 0);
+        EXPECT_LT(after.ru_maxrss - before.ru_maxrss, 2 * kilobytes + kilobytes / 4);
+        EXPECT_GT(after.ru_maxrss - before.ru_maxrss, kilobytes);
+        EXPECT_TRUE(recordedLog().back().ends_with("x... (16777216 bytes)"));
+    });
+}
 
 TEST_F(PairingCommands, theCalibrationLoadOnlyLogs) {
     const struct {

@@ -11,6 +11,7 @@
 #include "plugin/ZPOrloServices.h"
 #include "tests/platform/DataStoreDouble.h"
 #include "tests/platform/ServicesDouble.h"
+#include "tests/support/FailingAllocation.h"
 #include "tests/support/OwnProcess.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
@@ -237,6 +238,52 @@ TEST_F(RecordCommands, logTheirStepsAndAnswer) {
         EXPECT_EQ(response.statusCode(), row.status);
         EXPECT_EQ(response.response(), row.response);
         EXPECT_EQ(response.error(), row.error);
+    }
+}
+
+TEST_F(RecordCommands, aRequestIsCompletedOnceWhereverMemoryEnds) {
+    const Value nothingElse = Value::Dictionary{{"IsPostSwapEntitled", false}};
+    const struct {
+        const char* command;
+        std::int64_t status;
+        Value response = {};
+    } commands[] = {{"OrloExport", -1},   {"getTCRT", -1},
+                    {"putTCRT", -1},      {"putPSD2", -1},
+                    {"getPSD2", -1},      {"corvoSCProv", -1},
+                    {"corvoSCPair", -1},  {"checkCorvoPostSwapEntitlement", 0, nothingElse},
+                    {"setGlobalbCfg", 0}, {"unknown", 1}};
+    Value::Dictionary arguments = paths;
+    arguments.insert({{"waftonUrl", "http://host"}, {"bcfgDataPath", "/psd2"}});
+    for (const auto& row : commands) {
+        const HSMessageRequest message{row.command, arguments};
+        bool failed = true, sawFailure = false;
+        for (int count = 1; failed; count += 1 + count / 40) {
+            arrange();
+            servicesDouble().reverseProxy.events = {{1}};
+            servicesDouble().pairing.tickets = {{"tick"}};
+            servicesDouble().updater.queryInfo.output = Value::Dictionary{{"Digest", certificate}};
+            ZPOrloServices server;
+            int completions = 0;
+            std::optional<HSMessageResponse> answer;
+            const HSCompletion completion = [&](bool completed, const std::optional<HSMessageResponse>& response) {
+                failed = allocationHasFailed();
+                failAllocation(0);
+                completions += completed ? 1 : 10;
+                answer = response;
+            };
+            failAllocation(count);
+            server.handleMessage(message, completion);
+            ASSERT_EQ(completions, 1) << row.command << count;
+            ASSERT_EQ(answer.has_value(), row.status < 1) << row.command << count;
+            if (!answer)
+                continue;
+            EXPECT_EQ(answer->name(), Value(row.command));
+            if (answer->statusCode() == row.status && answer->response() == row.response && !answer->error())
+                sawFailure = true;
+            else
+                EXPECT_TRUE(answer->statusCode() == 0 || answer->error() || !answer->response().isNothing());
+        }
+        EXPECT_EQ(sawFailure, row.status < 1) << row.command;
     }
 }
 

@@ -1,4 +1,4 @@
-#include "tests/orlo/FailingAllocation.h"
+#include "tests/support/FailingAllocation.h"
 
 #include <cstdlib>
 #include <new>
