@@ -204,7 +204,10 @@ class Frame(ServiceTest):
             self.assertEqual(status, expected, answer)
 
     def test_a_request_cannot_forge_a_log_line(self):
-        self.service.orloctl("call", "x\n2026-01-01 01:01:01-[main:1] forged", "a=b\nc")
+        forged = "x\n2026-01-01 01:01:01-[main:1] forged"
+        self.service.describe({"HWModelStr": forged, "VanterSerialNumber": forged})
+        self.service.orloctl("call", forged, "a=b\nc")
+        self.service.orloctl("export", "psd2", forged)
         self.assertFalse([line for line in self.service.log() if line.startswith("2026-01-01 01:01:01-")])
 
     def test_the_device_description_may_be_missing_or_malformed(self):
@@ -317,6 +320,23 @@ class Client(ServiceTest):
                         self.assertIn("Cannot write to standard output", done.stderr)
         os.close(closed_pipe)
         os.close(full)
+
+    def test_what_is_printed_neither_works_the_terminal_nor_tells_a_password(self):
+        hostile = "x\x1b[2J\x7f\u0085\u009b\u200f\u202e\u2066"
+        url = f"http://user:secret@a b{hostile}\n"
+        says = {"call": f'The plug-in does not know the command "{hostile}".',
+                "provision": f"Wafton URL not a valid URL:http://...@a b{hostile}\n"}
+        for words in (["call", hostile], ["provision", url], ["set-bcfg", hostile], ["show", "der", hostile]):
+            for form in ([], ["--json"]):
+                with self.subTest(words, form=form):
+                    done = self.service.run(BIN / "orloctl", *form, *words, stderr=subprocess.STDOUT)
+                    self.assertRegex(done.stdout, r"\A[\n -~]+\Z")
+                    self.assertNotIn("secret", done.stdout)
+                    self.assertIn(r"\u001b[2J\u007f\u0085\u009b\u200f\u202e\u2066", done.stdout)
+                    if form and words[0] in says:
+                        answer = json.loads(done.stdout)
+                        error = answer.get("response", {}).get("error", {})
+                        self.assertEqual(error.get("description", answer.get("problem")), says[words[0]])
 
     def test_words_become_texts_json_values_and_file_contents(self):
         self.write("bytes", b"\x00\xff")

@@ -13,6 +13,7 @@
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
+#include "platform/ShownText.h"
 #include "platform/linux/services/BusValue.h"
 #include "platform/linux/system/DeviceRoot.h"
 #include "tools/orloctl/Interruption.h"
@@ -87,12 +88,24 @@ std::string whereReasonsAre(const std::string& bus, std::int64_t logSizeBefore) 
                   : "The request left nothing in " + log + "; see what the service printed.";
 }
 
+// The error of a bad URL has it as it was sent; what is printed goes without user and password.
+void hideUserInfo(Value::Dictionary& response) {
+    const auto error = response.find("error");
+    Value::Dictionary* const entries = error == response.end() ? nullptr : error->second.dictionary();
+    if (!entries)
+        return;
+    for (auto& [key, value] : *entries)
+        if (const std::string* text = value.text())
+            value = withoutUserInfo(*text);
+}
+
 // Reads a reply into an answer. A reply without response object is one to an unknown command.
 Answer answerFrom(sd_bus_message* reply, const std::string& command) {
     int completed = 0;
     check(sd_bus_message_read_basic(reply, SD_BUS_TYPE_BOOLEAN, &completed));
     Answer answer;
     answer.response = bus::readDictionary(reply);
+    hideUserInfo(answer.response);
     if (answer.response.empty()) {
         answer.outcome = Outcome::UnknownCommand;
         answer.problem = "The plug-in does not know the command \"" + command + "\".";

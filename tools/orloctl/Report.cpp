@@ -2,12 +2,20 @@
 
 #include <cstdint>
 #include <ostream>
+#include <string_view>
 
 #include "platform/Utf8.h"
 
 namespace {
 
 using nlohmann::ordered_json;
+
+// What is printed passes here, as text and as JSON, whose escapes these are too.
+void printText(std::ostream& out, std::string_view text) {
+    std::string shown;
+    utf8::appendEscaped(shown, text, utf8::Escaping::Lines);
+    out << shown;
+}
 
 class Writer {
 public:
@@ -75,7 +83,7 @@ private:
                                                        : json.is_number_integer() && (json.get<std::int64_t>() > most ||
                                                                                       json.get<std::int64_t>() < -most);
         const std::string text = json.dump(-1, ' ', false, ordered_json::error_handler_t::replace);
-        out_ << (isLarge ? "\"" + text + "\"" : text);
+        printText(out_, isLarge ? "\"" + text + "\"" : text);
     }
 
     std::ostream& out_;
@@ -87,6 +95,11 @@ private:
 
 void writeJson(std::ostream& out, const ordered_json& json, const Lists& lists) {
     Writer(out).value(json, lists);
+    out << '\n';
+}
+
+void print(std::ostream& out, std::string_view text) {
+    printText(out, text);
     out << '\n';
 }
 

@@ -4,6 +4,7 @@
 #include <functional>
 #include <iosfwd>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -49,6 +50,10 @@ struct Report { // NOLINT(bugprone-exception-escape): moving JSON asserts, which
 // Writes `json` on lines of its own, whole, with its lists in their places. An integer that a double cannot hold, as
 // many readers of JSON would have it, is written as a text of its digits.
 void writeJson(std::ostream& out, const nlohmann::ordered_json& json, const Lists& lists = {});
+
+// Writes a line, or several, of text for people. Here as in writeJson, control characters but line ends, and marks of
+// the writing direction, are escaped: what devices, files and servers say does not work the terminal.
+void print(std::ostream& out, std::string_view text);
 
 // The first `most` bytes of a text for people, with an ellipsis in place of the others; no character is cut in two.
 std::string shortened(const std::string& text, std::size_t most);

@@ -17,6 +17,7 @@
 
 #include "Daemon/Conversions.h"
 #include "platform/Files.h"
+#include "platform/Format.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
 #include "tools/orloctl/Completion.h"
@@ -51,28 +52,30 @@ struct Options {
     bool copiesToOutput = false; // -o -
 };
 
+void complain(const std::string& problem) {
+    print(std::cerr, "orloctl: " + problem);
+}
+
 // Reports a failure that has no response: the one JSON object, or a sentence on standard error.
 int fail(const Options& options, Outcome outcome, const std::string& problem) {
     const int status = static_cast<int>(outcome);
     if (options.json)
         writeJson(std::cout, {{"exitStatus", status}, {"problem", problem}});
     else
-        std::cerr << "orloctl: " << problem << '\n';
+        complain(problem);
     return status;
 }
 
 void printResponse(std::ostream& out, const Value::Dictionary& dictionary) {
     const Value response(dictionary);
     const char* verdict = response["statusCode"].integer() == 0 ? "success" : "failure";
-    out << response["name"].description() << ": " << verdict << " (status " << response["statusCode"].description()
-        << ")\n";
+    print(out, formatForLog("%@: %s (status %@)", {response["name"], verdict, response["statusCode"]}));
     if (const Value::Dictionary* entries = response["response"].dictionary())
         for (const auto& [key, value] : *entries)
-            out << "  " << key << " = " << jsonFromValue(value).dump() << '\n';
+            print(out, formatForLog("  %@ = %s", {key, jsonFromValue(value).dump().c_str()}));
     const Value& error = response["error"];
     if (!error.isNothing())
-        out << "  error: " << error["description"].description() << " (" << error["domain"].description() << " "
-            << error["code"].description() << ")\n";
+        print(out, formatForLog("  error: %@ (%@ %@)", {error["description"], error["domain"], error["code"]}));
 }
 
 // What the client itself has to add to an answer.
@@ -102,11 +105,11 @@ int report(const Options& options, const Answer& answer, const Remarks& remarks 
     std::ostream& out = options.copiesToOutput ? std::cerr : std::cout;
     printResponse(out, answer.response);
     if (!remarks.result.empty())
-        out << "  result: " << remarks.result << '\n';
+        print(out, "  result: " + remarks.result);
     if (!remarks.note.empty())
-        std::cerr << "orloctl: " << remarks.note << '\n';
+        complain(remarks.note);
     if (!answer.problem.empty())
-        std::cerr << "orloctl: " << answer.problem << '\n';
+        complain(answer.problem);
     return status;
 }
 
@@ -190,9 +193,10 @@ int show(const Options& options, const Report& found, Outcome failure = Outcome:
         writeJson(std::cout, json, found.lists);
         return status;
     }
-    std::cout << found.text << (found.text.empty() || found.text.ends_with('\n') ? "" : "\n");
+    if (!found.text.empty())
+        print(std::cout, std::string_view(found.text).substr(0, found.text.size() - found.text.ends_with('\n')));
     if (!found.ok)
-        std::cerr << "orloctl: " << found.problem << '\n';
+        complain(found.problem);
     return status;
 }
 
