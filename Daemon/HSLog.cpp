@@ -82,8 +82,8 @@ void consoleLine(std::string_view text, std::initializer_list<FormatArgument> ar
     return; // as above
 }
 
-void LogSource::write(LogLevel level, LineFormat format, std::initializer_list<FormatArgument> arguments) const try {
-    newLog(level, "[%@:%d] %@\n", {file, format.line, formatForLog(format.text, arguments).c_str()});
+void LogSource::write(LogLevel level, LineFormat line, std::initializer_list<FormatArgument> arguments) const try {
+    newLog(level, "[%@:%d] %@\n", {file, line.line, formatForLog(line.text, arguments).c_str()});
 } catch (const std::exception&) {
     return; // as above
 }

@@ -25,17 +25,17 @@ void logInit(const char* name);
 // Formats the arguments for a log line (platform/Format.h) and writes it, prefixed with the local time (12-hour clock)
 // and a hyphen. A level other than 1 to 4 goes to the log file only. Never fails outward: a line that memory does not
 // suffice for is lost.
-void newLog(int level, std::string_view format, std::initializer_list<FormatArgument> arguments);
+void newLog(int level, std::string_view text, std::initializer_list<FormatArgument> arguments);
 
 // Formats the arguments for a log line and writes it to the system console log. Never fails outward, as newLog.
-void consoleLine(std::string_view format, std::initializer_list<FormatArgument> arguments);
+void consoleLine(std::string_view text, std::initializer_list<FormatArgument> arguments);
 
 // The local time `time` as it stands in front of a line: "yyyy-MM-dd hh:mm:ss" on a 12-hour clock without a marker.
 std::string logTimestamp(std::time_t time);
 
 // A format and the line of the source file where it stands.
 struct LineFormat {
-    LineFormat(const char* format, int sourceLine = __builtin_LINE()) : text(format), line(sourceLine) {}
+    LineFormat(const char* words, int sourceLine = __builtin_LINE()) : text(words), line(sourceLine) {}
     const char* text;
     int line;
 };
@@ -47,16 +47,16 @@ struct LogSource {
     const char* file; // base name, without directory and extension
 
     template <class... Arguments>
-    void info(LineFormat format, const Arguments&... arguments) const {
-        write(LogLevelInfo, format, {FormatArgument(arguments)...});
+    void info(LineFormat line, const Arguments&... arguments) const {
+        write(LogLevelInfo, line, {FormatArgument(arguments)...});
     }
     template <class... Arguments>
-    void error(LineFormat format, const Arguments&... arguments) const {
-        write(LogLevelError, format, {FormatArgument(arguments)...});
+    void error(LineFormat line, const Arguments&... arguments) const {
+        write(LogLevelError, line, {FormatArgument(arguments)...});
     }
 
 private:
-    void write(LogLevel level, LineFormat format, std::initializer_list<FormatArgument> arguments) const;
+    void write(LogLevel level, LineFormat line, std::initializer_list<FormatArgument> arguments) const;
 };
 
 #endif

@@ -16,6 +16,9 @@ add_compile_options(-Wall -Wextra -Wpedantic -Wconversion -Wshadow -fstack-prote
 if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
     # GCC 12 sees overlapping copies in std::string, and comparisons beyond the end of std::vector, where there are none.
     add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wno-restrict> $<$<COMPILE_LANGUAGE:CXX>:-Wno-stringop-overread>)
+    if(CMAKE_CXX_COMPILER_VERSION VERSION_GREATER_EQUAL 13) # and GCC 14 writes beyond that end
+        add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wno-stringop-overflow>)
+    endif()
 endif()
 add_compile_definitions(_FILE_OFFSET_BITS=64)
 add_link_options(-Wl,--as-needed)

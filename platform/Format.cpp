@@ -191,7 +191,7 @@ std::string Formatter::format(std::string_view text, std::initializer_list<Forma
     }
 }
 
-std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments) {
+std::string Formatting::operator()(std::string_view text, std::initializer_list<FormatArgument> arguments) const {
     return Formatter(false).format(text, arguments);
 }
 

@@ -64,16 +64,21 @@ private:
 // A width with or without a leading 0 pads numbers ("%02x"), to 64 places at most. An argument of another kind than the
 // conversion asks for is written as "%@" would; a missing one is "(null)"; an unknown conversion stands as it is.
 // A text stands as it is, every other value and an error as its description.
-std::string format(std::string_view text, std::initializer_list<FormatArgument> arguments);
+struct Formatting {
+    std::string operator()(std::string_view text, std::initializer_list<FormatArgument> arguments) const;
+
+    template <class... Arguments>
+    std::string operator()(std::string_view text, const Arguments&... arguments) const {
+        return (*this)(text, std::initializer_list<FormatArgument>{FormatArgument(arguments)...});
+    }
+};
+
+// An object, since beside a function std::format would be a candidate wherever an argument is of namespace std.
+inline constexpr Formatting format;
 
 // The same for a log line, which is the one place where text from outside is made harmless: texts stand as appendShown
 // (platform/ShownText.h) shows them, without a line end where more of the line follows; so does what a program wrote,
 // but for its line ends.
 std::string formatForLog(std::string_view text, std::initializer_list<FormatArgument> arguments);
-
-template <class... Arguments>
-std::string format(std::string_view text, const Arguments&... arguments) {
-    return format(text, std::initializer_list<FormatArgument>{FormatArgument(arguments)...});
-}
 
 #endif

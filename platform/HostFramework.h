@@ -24,10 +24,8 @@ struct HSMessageRequest {
 // A response. Its name is that of the request; statusCode is 0 or -1; response is a dictionary or nothing.
 class HSMessageResponse {
 public:
-    static HSMessageResponse initWithName(Value name, std::int64_t statusCode);
-    static HSMessageResponse initWithName(Value name, std::int64_t statusCode, Value response);
-    static HSMessageResponse initWithName(Value name, std::int64_t statusCode, Value response,
-                                          std::optional<Error> error);
+    static HSMessageResponse initWithName(Value name, std::int64_t statusCode, Value response = {},
+                                          std::optional<Error> error = {});
 
     const Value& name() const { return name_; }
     std::int64_t statusCode() const { return statusCode_; }

@@ -7,14 +7,6 @@ std::string HSMessageRequest::description() const {
     return Value(Value::Dictionary{{"messageStr", messageStr}, {"messageDict", messageDict}}).description();
 }
 
-HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode) {
-    return initWithName(std::move(name), statusCode, {}, {});
-}
-
-HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode, Value response) {
-    return initWithName(std::move(name), statusCode, std::move(response), {});
-}
-
 HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode, Value response,
                                                   std::optional<Error> error) {
     HSMessageResponse result;

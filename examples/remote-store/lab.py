@@ -54,7 +54,7 @@ class Authority:
                 "-subj", "/CN=Authority of the lab", "-keyout", folder / "ca.key", "-out", self.certificate)
 
     def certify(self, name, hosts=(HOST, CA_HOST), days=2, common_name="store"):
-        """Makes <name>.key and <name>.pem; a negative number of days makes a certificate that has expired."""
+        """Makes <name>.key and <name>.pem; one for 0 days has expired."""
         names = ("-addext", "subjectAltName=" + ",".join("DNS:" + host for host in hosts)) if hosts else ()
         key, request, certificate = (self.folder / f"{name}.{suffix}" for suffix in ("key", "csr", "pem"))
         openssl("req", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes", "-subj", "/CN=" + common_name,

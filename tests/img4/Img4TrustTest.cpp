@@ -2,6 +2,7 @@
 
 #include "platform/Crypto.h"
 
+#include <algorithm>
 #include <functional>
 #include <ostream>
 #include <tuple>

@@ -34,14 +34,14 @@ struct Messages {
 Messages* messages = nullptr;
 
 // Keeps a message of the library, without the prototype that most begin with.
-void keepMessage(int, const char* format, ...) {
+void keepMessage(int, const char* text, ...) {
     char line[512];
     va_list arguments;
-    va_start(arguments, format);
-    (void)std::vsnprintf(line, sizeof line, format, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
+    va_start(arguments, text);
+    (void)std::vsnprintf(line, sizeof line, text, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
     va_end(arguments);
     const std::string message = line;
-    const std::size_t prototypeEnd = format[0] == '%' && format[1] == 's' ? message.find(") ") : std::string::npos;
+    const std::size_t prototypeEnd = text[0] == '%' && text[1] == 's' ? message.find(") ") : std::string::npos;
     messages->last = prototypeEnd == std::string::npos ? message : message.substr(prototypeEnd + 2);
     if (messages->first.size() < mostMessages)
         messages->first.push_back(messages->last);
