@@ -11,6 +11,11 @@
 
 namespace crypto {
 
+// Sets the library up whole, as a process does best at its start, while memory is plentiful: where memory ends in the
+// first use of OpenSSL 3.5 the library waits for itself for ever, and what could not be set up is unusable from then
+// on.
+bool prepare() noexcept;
+
 constexpr std::size_t sha1Size = 20;   // FIPS 180-4
 constexpr std::size_t sha256Size = 32; // FIPS 180-4
 constexpr std::size_t sha384Size = 48; // FIPS 180-4

@@ -70,8 +70,9 @@ public:
     void resume();
 
 protected:
-    // Registers the server with the host under `serviceName`. False, after a line on standard error, when there is no
-    // device root, no host to reach, or the name is taken.
+    // Registers the server with the host under `serviceName`, and sets up for its requests what they would otherwise
+    // set up at their first use. False, after a line on standard error, when there is no device root, no host to reach,
+    // the name is taken, or cryptography is not to be had.
     bool initWithServiceName(std::string_view serviceName);
 
 private:

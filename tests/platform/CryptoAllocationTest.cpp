@@ -35,10 +35,9 @@ enum Outcome {
     Wrong = 2
 };
 
-// The HMAC of RFC 4231, test case 2, in a process that uses the library for the first time.
+// The HMAC of RFC 4231, test case 2.
 Outcome computeWith(int allocations) {
     constexpr std::uint8_t expected[] = {0x5b, 0xdc, 0xc1, 0x46, 0xbf, 0x60, 0x75, 0x4e};
-    CRYPTO_set_mem_functions(allocate, reallocate, release);
     allocationsLeft = allocations;
     std::uint8_t out[crypto::sha256Size] = {1};
     crypto::HMACSHA256 hmac;
@@ -52,7 +51,7 @@ Outcome computeWith(int allocations) {
     return Refused;
 }
 
-TEST(CryptoAllocation, anHmacIsRightOrRefusedWhereverMemoryEnds) {
+void expectRightOrRefusedWhereverMemoryEnds() {
     int refused = 0;
     Outcome outcome = Refused;
     for (int allocations = 0; outcome != Computed || refused == 0; ++allocations) {
@@ -66,7 +65,15 @@ TEST(CryptoAllocation, anHmacIsRightOrRefusedWhereverMemoryEnds) {
         ASSERT_NE(outcome, Wrong) << "after " << allocations;
         refused += outcome == Refused;
     }
-    EXPECT_GT(refused, 10);
+    EXPECT_GT(refused, 5);
+}
+
+TEST(CryptoAllocation, anHmacIsRightOrRefusedWhereverMemoryEnds) {
+    CRYPTO_set_mem_functions(allocate, reallocate, release);
+    if (OpenSSL_version_num() < 0x30500000) // a newer one does not end when memory does in its first use
+        expectRightOrRefusedWhereverMemoryEnds();
+    ASSERT_TRUE(crypto::prepare());
+    expectRightOrRefusedWhereverMemoryEnds();
 }
 
 } // namespace

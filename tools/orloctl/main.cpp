@@ -16,6 +16,7 @@
 #include <CLI/CLI.hpp>
 
 #include "Daemon/Conversions.h"
+#include "platform/Crypto.h"
 #include "platform/Files.h"
 #include "platform/Format.h"
 #include "tools/orloctl/Arguments.h"
@@ -183,6 +184,12 @@ int rewriteBlob(const Options& options, const std::string& devicePath, const std
                             : reportCopied(options, answer, remarks, copyPath, result.contents);
 }
 
+// A file for an offline reader, of whatever size. What digests need is set up before, while memory is plentiful.
+Value::Data readJudgedFile(const std::string& path) {
+    (void)crypto::prepare(); // a digest that cannot be computed says so itself
+    return readLocalFile(path);
+}
+
 int show(const Options& options, const Report& found, Outcome failure = Outcome::BadInput) {
     const int status = static_cast<int>(found.ok ? Outcome::Success : failure);
     if (options.json) {
@@ -215,15 +222,15 @@ int verify(const Options& options, const std::string& path, const VerifyOptions&
         request.payloadDigest = fourCharacterCode("--payload-digest", *how.payloadDigest);
     const TrustDomain domain =
         how.trustFolder ? readTrustDomain(*how.trustFolder, how.profile) : builtInTrustDomain(how.profile);
-    const Value::Data file = readLocalFile(path);
+    const Value::Data file = readJudgedFile(path);
     return show(options, verifyImg4({file.data(), file.size()}, domain, request));
 }
 
-int showLocalFile(const Options& options, const std::string& path, const std::string& format,
+int showLocalFile(const Options& options, const std::string& path, const std::string& kind,
                   const std::string& keyPath) {
     const auto key = keyPath.empty() ? std::nullopt : std::optional(readLocalFile(keyPath));
-    const Value::Data file = readLocalFile(path);
-    return show(options, showFile(file, format, key));
+    const Value::Data file = readJudgedFile(path);
+    return show(options, showFile(file, kind, key));
 }
 
 class CommandLine {

@@ -22,9 +22,11 @@
 #include <systemd/sd-daemon.h>
 #include <systemd/sd-event.h>
 
+#include "platform/Crypto.h"
 #include "platform/SystemLog.h"
 #include "platform/linux/services/BusValue.h"
 #include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/Http.h"
 #include "platform/linux/system/DeviceRoot.h"
 
 namespace {
@@ -167,6 +169,11 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     const std::string name(serviceName);
     const std::string which = busInUse();
     connection_ = new Connection;
+    http::prepare();
+    if (!crypto::prepare()) {
+        consoleLog(name + ": cannot set up the cryptographic library");
+        return false;
+    }
     if (!openDeviceRoot()) {
         consoleLog(name + ": cannot open the device root \"" + deviceRootPath() + "\": " + std::strerror(errno));
         return false;

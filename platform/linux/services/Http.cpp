@@ -174,6 +174,15 @@ std::string hexadecimal(const std::uint8_t (&digest)[crypto::sha256Size]) {
 
 } // namespace
 
+void prepare() {
+    static std::once_flag once;
+    std::call_once(once, [] {
+        // libcurl would write the keys of every connection to the file that this names.
+        ::unsetenv("SSLKEYLOGFILE");
+        curl_global_init(CURL_GLOBAL_DEFAULT);
+    });
+}
+
 bool Failure::mayPass() const {
     return std::find(std::begin(passing), std::end(passing), code_) != std::end(passing);
 }
@@ -213,12 +222,7 @@ std::string proxyFor(const std::string& scheme, const Value& description) {
 }
 
 Client::Client() {
-    static std::once_flag once;
-    std::call_once(once, [] {
-        // libcurl would write the keys of every connection to the file that this names.
-        ::unsetenv("SSLKEYLOGFILE");
-        curl_global_init(CURL_GLOBAL_DEFAULT);
-    });
+    prepare();
     handle_.reset(curl_easy_init());
     if (!handle_)
         check(CURLE_FAILED_INIT);

@@ -23,6 +23,10 @@
 
 namespace http {
 
+// Sets libcurl and its TLS library up. As crypto::prepare does for digests, it spares a process that calls it at its
+// start what those do when memory ends in their first use.
+void prepare();
+
 // An exchange that had no answer. The code is libcurl's, the text says what went wrong, without user and password of a
 // URL.
 class Failure : public std::runtime_error {

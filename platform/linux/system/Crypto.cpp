@@ -62,6 +62,16 @@ EVP_MAC_CTX* context(void* pointer) {
 
 } // namespace
 
+bool prepare() noexcept {
+    OPENSSL_init_crypto(OPENSSL_INIT_LOAD_CONFIG | OPENSSL_INIT_LOAD_CRYPTO_STRINGS | OPENSSL_INIT_ADD_ALL_CIPHERS |
+                            OPENSSL_INIT_ADD_ALL_DIGESTS,
+                        nullptr);
+    bool isReady = HMACSHA256().init("", 0);
+    for (DigestAlgorithm& algorithm : digestAlgorithms)
+        isReady = implementation(algorithm) != nullptr && isReady;
+    return isReady;
+}
+
 bool digest(Digest algorithm, Bytes data, std::uint8_t* out) noexcept {
     DigestAlgorithm& description = describe(algorithm);
     const EVP_MD* const md = implementation(description);
