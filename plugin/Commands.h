@@ -49,7 +49,8 @@ HSMessageResponse checkCorvoPostSwapEntitlement(const HSMessageRequest& request,
 
 // "setGlobalbCfg": puts the model's "WCh0" entry and the "MiGB" entry into the configuration blob in the file named by
 // "bcfgDataPath" and writes the result to /tmp/new_bCfg. Always succeeds; a blob that cannot be read or decoded leaves
-// an empty result.
+// an empty result, and a result that cannot be written leaves none: an earlier one is removed, unless what stands there
+// is no regular file.
 HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value& hardwareModel);
 
 // Whether a hardware model names a device of the family `prefix`. A model of nothing belongs to none.

@@ -244,7 +244,8 @@ private:
     http::Answer sendAsItIs(http::Request& request) { return client_.exchange(request); }
 
     // Puts on condition that the object is still what it was before. A put whose client has given up may be carried out
-    // at any time after: its condition does not hold any more once a later one has been answered.
+    // at any time after: its condition does not hold any more once a later one has been answered, unless that one put
+    // the very bytes of before, since tags stand for contents.
     http::Answer sendIfUnchanged(http::Request& request) {
         const http::Request put = request;
         const auto end = std::chrono::steady_clock::now() + put.limits.whole;
