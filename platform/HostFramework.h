@@ -39,7 +39,8 @@ private:
     std::optional<Error> error_;
 };
 
-// Completes a request: whether it was completed, and the response object, if there is one.
+// Completes a request: whether it was completed, and the response object, if there is one. Once it raises
+// std::bad_alloc the request is not completed and may be, with a smaller response.
 using HSCompletion = std::function<void(bool completed, const std::optional<HSMessageResponse>& response)>;
 
 // The framework's own handle of the system log, for lines that do not belong in the plug-in's log. It has one handle,

@@ -41,15 +41,23 @@ void splitAtUserInfo(std::string_view text, Take take) {
 
 bool appendShownText(std::string& out, std::string_view text, std::size_t longest, utf8::Escaping how) {
     const char* const end = text.data() + utf8::beginning(text, longest).size();
-    splitAtUserInfo(text, [&](std::string_view part, bool userInfoFollows) {
+    const auto append = [&](std::string_view part, bool userInfoFollows) {
         if (part.data() >= end)
             return;
         const auto left = static_cast<std::size_t>(end - part.data());
         utf8::appendEscaped(out, part.substr(0, left), how);
         if (userInfoFollows && part.size() <= left)
             out += "...";
-    });
-    return end == text.data() + text.size();
+    };
+    const bool isWhole = end == text.data() + text.size();
+    // Where lines stay, no URL goes on in the next one.
+    while (how == utf8::Escaping::Lines && text.find('\n') != text.npos) {
+        const std::size_t line = text.find('\n') + 1;
+        splitAtUserInfo(text.substr(0, line), append);
+        text.remove_prefix(line);
+    }
+    splitAtUserInfo(text, append);
+    return isWhole;
 }
 
 void appendCutMark(std::string& out, std::string_view text) {

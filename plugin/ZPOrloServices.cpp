@@ -85,7 +85,13 @@ void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSComp
         if (command)
             response = &command->withoutMemory;
     }
-    completion(true, *response);
+    try {
+        completion(true, *response);
+    } catch (const std::bad_alloc&) {
+        if (!command || response != &made)
+            throw;
+        completion(true, command->withoutMemory);
+    }
 }
 
 std::string pluginVersion() {

@@ -1,5 +1,6 @@
 #include <cstdio>
 #include <cstdlib>
+#include <string>
 #include <string_view>
 
 #include "Daemon/HSLog.h"
@@ -19,12 +20,17 @@ Environment:
 
 VeltraOrloServices(8) says more.)";
 
+// The exit status: 2 when the text is lost, on a full disk for one.
+int print(const std::string& text) {
+    return std::puts(text.c_str()) < 0 || std::fflush(stdout) != 0 ? 2 : 0;
+}
+
 // Answers a start with arguments, which serves no request.
 int answer(std::string_view argument, bool isOnlyOne) {
     if (isOnlyOne && argument == "--help")
-        return std::puts(help) < 0;
+        return print(help);
     if (isOnlyOne && argument == "--version")
-        return std::puts(("VeltraOrloServices " + pluginVersion()).c_str()) < 0;
+        return print("VeltraOrloServices " + pluginVersion());
     consoleLog("VeltraOrloServices takes no arguments but --help or --version");
     return 2;
 }

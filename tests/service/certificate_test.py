@@ -43,7 +43,8 @@ class TopModuleTest(unittest.TestCase):
 
     def describe(self, model="M3", holder=RELAY, **sections):
         """Changes the device: `holder` names the class of the service that has the certificate, None removes it."""
-        self.description["answers"]["HWModelStr"] = model
+        self.description["answers"].pop("HWModelStr", None)
+        self.description["answers"].update({} if model is None else {"HWModelStr": model})
         chip = {"class": "Chip", "properties": {"AccessoryCertificate": {"$file": "/sys/tesk/cert.der", "as": "data"}}}
         self.description["registry"] = [{"class": holder, "children": [chip]}] if holder else []
         self.description.update(sections)

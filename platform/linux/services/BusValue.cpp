@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <cstring>
 #include <limits>
+#include <new>
 #include <system_error>
 #include <utility>
 #include <vector>
@@ -16,12 +17,18 @@ namespace bus {
 Failure::Failure(int failureCode)
     : std::runtime_error(std::generic_category().message(-failureCode)), code(failureCode) {}
 
+void fail(int result) {
+    if (result == -ENOMEM)
+        throw std::bad_alloc();
+    throw Failure(result);
+}
+
 namespace {
 
 // Passes a result of libsystemd on, or raises the failure that it reports.
 int check(int result) {
     if (result < 0)
-        throw Failure(result);
+        fail(result);
     return result;
 }
 

@@ -43,6 +43,9 @@ public:
     int code;
 };
 
+// Raises what a negative result of libsystemd stands for: std::bad_alloc for -ENOMEM, otherwise a Failure.
+[[noreturn]] void fail(int result);
+
 // Reads the a{sv} that stands next in `message`. Raises Refusal or Failure.
 Value::Dictionary readDictionary(sd_bus_message* message);
 

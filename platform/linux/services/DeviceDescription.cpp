@@ -20,18 +20,22 @@ void report(const std::string& what) {
     systemLogWrite(getLogHandle(1), SystemLogType::Error, line);
 }
 
-// Whether the description was another when this was last asked.
+// Whether the description was another when this was last asked. One that is missing is empty.
 bool hasChanged(const Value::Data& contents) {
     static std::mutex mutex;
     static auto* const last = new Value::Data; // never destroyed: threads may ask until the process is gone
     const std::lock_guard lock(mutex);
-    return std::exchange(*last, contents) != contents;
+    if (*last == contents)
+        return false;
+    *last = contents;
+    return true;
 }
 
 } // namespace
 
 Value deviceDescription() {
     const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
+    const bool isNew = hasChanged(contents.value_or(Value::Data()));
     if (!contents) {
         report(" is missing or cannot be read");
         return {};
@@ -43,7 +47,7 @@ Value deviceDescription() {
         report(" is malformed: " + refusal);
         return {};
     }
-    if (hasChanged(*contents))
+    if (isNew)
         for (const std::string& fault : descriptionFaults(*description))
             report(": " + fault);
     return std::move(*description);

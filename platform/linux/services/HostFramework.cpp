@@ -75,17 +75,18 @@ Value::Dictionary responseDictionary(const HSMessageResponse& response) {
     return result;
 }
 
+// Raises what bus::fail does when nothing was sent.
 void sendReply(sd_bus_message* request, bool completed, const std::optional<HSMessageResponse>& response) {
     sd_bus_message* reply = nullptr;
     if (const int result = sd_bus_message_new_method_return(request, &reply); result < 0)
-        throw bus::Failure(result);
+        bus::fail(result);
     const std::unique_ptr<sd_bus_message, decltype(&sd_bus_message_unref)> owner(reply, sd_bus_message_unref);
     const int completedValue = completed;
     if (const int result = sd_bus_message_append_basic(reply, SD_BUS_TYPE_BOOLEAN, &completedValue); result < 0)
-        throw bus::Failure(result);
+        bus::fail(result);
     bus::appendDictionary(reply, response ? responseDictionary(*response) : Value::Dictionary{});
     if (const int result = sd_bus_send(nullptr, reply, nullptr); result < 0)
-        throw bus::Failure(result);
+        bus::fail(result);
 }
 
 int serve(VeltraPluginServerInterface& server, sd_bus_message* message) {
