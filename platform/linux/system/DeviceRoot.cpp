@@ -171,16 +171,24 @@ std::optional<DevicePath> splitDevicePath(std::string_view path) {
 std::optional<std::vector<std::string>> namesIn(const FileDescriptor& directory) {
     // A descriptor of its own, since the stream moves its position and closes it.
     FileDescriptor file(::openat(directory.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    const std::unique_ptr<DIR, int (*)(DIR*)> stream(file ? ::fdopendir(file.get()) : nullptr, ::closedir);
+    std::unique_ptr<DIR, int (*)(DIR*)> stream(file ? ::fdopendir(file.get()) : nullptr, ::closedir);
     if (!stream)
         return std::nullopt;
     file.release();
     std::vector<std::string> names;
-    while (const dirent* entry = ::readdir(stream.get())) {
+    const auto next = [&stream] {
+        errno = 0; // at the end it stays so
+        return ::readdir(stream.get());
+    };
+    while (const dirent* entry = next()) {
         const std::string_view name = entry->d_name;
         if (name != "." && name != "..")
             names.emplace_back(name);
     }
+    const int error = errno;
+    stream.reset();
+    if (error != 0)
+        return nothing(error);
     return names;
 }
 
