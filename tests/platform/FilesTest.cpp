@@ -232,7 +232,8 @@ TEST(Files, replaceThatCannotWriteKeepsTheOldFileAndLeavesNoOther) {
 // Another writer removes what a killed one has left, and nothing else that has such a name.
 TEST(Files, replaceRemovesWhatKilledWritersHaveLeft) {
     const TemporaryRoot root;
-    for (const char* name : {".new-1", ".new-18446744073709551615", ".new-2x", ".new", ".new-3", ".new-4", "other"})
+    for (const char* name :
+         {".new-1", ".new-18446744073709551615", ".new-2x", ".new", ".new-", ".new-3", ".new-4", "other"})
         root.write(std::string("/tmp/") + name, "");
     std::filesystem::create_hard_link(root.host("/tmp/other"), root.host("/tmp/.new-5"));
     root.link("/tmp/.new-6", "other");

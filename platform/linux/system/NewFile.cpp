@@ -10,6 +10,7 @@
 #include <sys/file.h>
 #include <sys/random.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include "platform/linux/system/DeviceRoot.h"
 
@@ -47,17 +48,25 @@ bool lock(const FileDescriptor& file, int operation) {
     return result == 0;
 }
 
+bool isOwnFile(const struct stat& status) {
+    return S_ISREG(status.st_mode) && status.st_nlink == 1 && status.st_uid == ::geteuid();
+}
+
 // A writer holds a lock on its file. Anyone may give a file such a name, so only those count that nobody else can have
-// put there, neither as the owner nor as a further link to something.
+// put there, neither as the owner nor as a further link to something; nor something else, at which opening may wait,
+// after the file was looked at.
 void removeLeftovers(const FileDescriptor& directory) {
     for (const std::string& name : namesIn(directory).value_or(std::vector<std::string>())) {
         struct stat status;
-        if (!name.starts_with(prefix) || name.find_first_not_of("0123456789", prefix.size()) != std::string::npos ||
-            ::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISREG(status.st_mode) ||
-            status.st_nlink != 1 || status.st_uid != ::geteuid())
+        if (!name.starts_with(prefix) || name.size() == prefix.size() ||
+            name.find_first_not_of("0123456789", prefix.size()) != std::string::npos ||
+            ::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 || !isOwnFile(status))
             continue;
-        const FileDescriptor file(::openat(directory.get(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-        if (file && lock(file, LOCK_EX | LOCK_NB))
+        const FileDescriptor file(
+            ::openat(directory.get(), name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+        struct stat opened;
+        if (file && ::fstat(file.get(), &opened) == 0 && isOwnFile(opened) && opened.st_dev == status.st_dev &&
+            opened.st_ino == status.st_ino && lock(file, LOCK_EX | LOCK_NB))
             ::unlinkat(directory.get(), name.c_str(), 0);
     }
 }
