@@ -10,6 +10,7 @@
 #include <utility>
 
 #include <fcntl.h>
+#include <unistd.h>
 
 #include "Daemon/HSLog.h"
 #include "platform/Files.h"
@@ -64,9 +65,19 @@ Value systemVersionList() {
     return contents ? propertyListToValue(*contents).value_or(Value()) : Value();
 }
 
-// The first line of the file, or nothing when it is no ASCII text, too long, or cannot be read. The file is gone
-// through piece by piece, since it may be of any size, and its position stays.
-std::optional<std::string> headerOf(const FileDescriptor& report) {
+// Where the bytes of the file go on after a hole at `position`, which may be as large as anyone likes; nothing when the
+// hole goes on to the end. The file is at its start afterwards.
+std::optional<off_t> afterHole(const FileDescriptor& file, off_t position) {
+    const off_t data = ::lseek(file.get(), position, SEEK_DATA);
+    const bool isAtEnd = data < 0 && errno == ENXIO;
+    ::lseek(file.get(), 0, SEEK_SET);
+    return isAtEnd ? std::nullopt : std::optional(std::max(data, position));
+}
+
+// The first line of the file; or nothing, and `problem` says why, when it is no ASCII text, too long, or cannot be
+// read. The file is gone through piece by piece, since it may be of any size, and is at its start afterwards.
+std::optional<std::string> headerOf(const FileDescriptor& report, std::string& problem) {
+    problem = "it is no ASCII text, or has no first line of a report";
     std::string header;
     bool isWhole = false;
     std::array<char, 65536> piece;
@@ -74,8 +85,10 @@ std::optional<std::string> headerOf(const FileDescriptor& report) {
         const ssize_t count = ::pread(report.get(), piece.data(), piece.size(), position);
         if (count < 0 && errno == EINTR)
             continue;
-        if (count < 0)
+        if (count < 0) {
+            problem = std::strerror(errno);
             return std::nullopt;
+        }
         if (count == 0)
             return header;
         const std::string_view text(piece.data(), static_cast<std::size_t>(count));
@@ -89,16 +102,28 @@ std::optional<std::string> headerOf(const FileDescriptor& report) {
                 return std::nullopt;
         }
         position += count;
+        if (!isWhole)
+            continue;
+        const std::optional<off_t> next = afterHole(report, position);
+        if (!next)
+            return header;
+        position = *next;
     }
 }
 
-bool isOfRunningBuild(const FileDescriptor& report) {
+// Whether the build that is running wrote the report. False, and `problem` says why, when that cannot be told.
+bool isOfRunningBuild(const FileDescriptor& report, std::string& problem) {
     const Value systemVersion = systemVersionList();
     const std::string* build = systemVersion["ProductBuildVersion"].text();
-    if (!build || build->empty()) // every text would contain an empty identifier
+    if (!build || build->empty()) { // every text would contain an empty identifier
+        problem = "no build identifier can be read from " + std::string(systemVersionPath);
         return false;
-    const auto header = headerOf(report);
-    const auto version = header ? jsonTextMember(*header, "os_version") : std::nullopt;
+    }
+    const auto header = headerOf(report, problem);
+    if (!header)
+        return false;
+    problem.clear();
+    const auto version = jsonTextMember(*header, "os_version");
     return version && version->find(*build) != std::string::npos;
 }
 
@@ -122,7 +147,10 @@ void visitEntry(const FileDescriptor& directory, const std::string& path, const 
     const Error error = lastError();
     if (!log.file)
         visitor.missed(path, S_ISREG(log.status.st_mode) ? error.text : "it is no regular file");
-    if (log.isPanic && !(log.file && isOfRunningBuild(log.file))) {
+    std::string problem;
+    if (log.isPanic && !(log.file && isOfRunningBuild(log.file, problem))) {
+        if (!problem.empty())
+            visitor.missed(path, problem);
         crashLog.info("Panic Version and System Version does not match. Skipping");
         return;
     }
@@ -192,7 +220,8 @@ int get_ramdisk_logs(Value* response) {
 
 bool check_panic_version(std::string_view path) try {
     const FileDescriptor report = openInRoot(path, O_RDONLY, Links::Refused);
-    return report && isOfRunningBuild(report);
+    std::string problem;
+    return report && isOfRunningBuild(report, problem);
 } catch (const std::bad_alloc&) {
     return false; // as a report that cannot be read
 }

@@ -27,7 +27,8 @@ struct CrashLogVisitor {
 // /private/var/mobile/Library/Logs/Varrow, not in directories below, one at a time and without holding their contents.
 // Users may write there, so neither a directory on the way nor a file may be a symbolic link, and nothing but a regular
 // file is opened. What cannot be looked at is a line in the log and missed; a directory that does not exist is only a
-// line. A panic report is passed over unless check_panic_version holds for it.
+// line. A panic report is passed over unless check_panic_version holds for it, and missed when that cannot be told: it
+// cannot be read as text, or the running build is unknown.
 void visitCrashLogs(const CrashLogVisitor& visitor);
 
 // Reads the files that visitCrashLogs finds into *response:

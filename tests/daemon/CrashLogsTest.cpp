@@ -57,6 +57,16 @@ protected:
         return entries;
     }
 
+    static Lines missed() {
+        Lines paths;
+        visitCrashLogs({[](const CrashLog&) {},
+                        [&](std::string_view path, std::string_view reason) {
+                            EXPECT_FALSE(reason.empty());
+                            paths.emplace_back(path);
+                        }});
+        return paths;
+    }
+
     static bool logged(const std::string& beginning) {
         return std::ranges::any_of(recordedLog(),
                                    [&](const std::string& line) { return line.starts_with("2 [HSLog] " + beginning); });
@@ -102,13 +112,14 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
         const char* build; // null: no version list
         std::string report;
         bool collected;
+        bool missed = false; // it cannot be told which build wrote it
     } rows[] = {
         {"21A55", good + "\nmore {\n", true},
         {"21A55", good, true},
         {"21A5", good + "\n", true},
         {"21A56", good + "\n", false},
-        {nullptr, good + "\n", false},
-        {"", good + "\n", false},
+        {nullptr, good + "\n", false, true},
+        {"", good + "\n", false, true},
         {"21A55", "\n" + good, false},
         {"21A55", "21A55\n", false},
         {"21A55", "", false},
@@ -119,8 +130,8 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
         {"21A55", R"({"inner": {"os_version": "21A55"}})", false},
         {"21A55", R"({"os_version": "21A55")", false},
         {"21A55", R"({"os_version": "21A55"} x)", false},
-        {"21A55", good + "\n\xC3\xA9", false}, // no ASCII text
-        {"21A55", good + '\0' + "\n", false},
+        {"21A55", good + "\n\xC3\xA9", false, true}, // no ASCII text
+        {"21A55", good + '\0' + "\n", false, true},
         {"21A55", R"({"x": )" + nested, false},
         {"21A55", R"({"x": )" + nested + closed + R"(, "os_version": "21A55"})", true},
     };
@@ -130,6 +141,7 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
             runningBuild(row.build);
         root_.write(logs + "panic-full-1.ips", row.report);
         EXPECT_EQ(check_panic_version(logs + "panic-full-1.ips"), row.collected) << row.report.substr(0, 80);
+        EXPECT_EQ(missed(), row.missed ? Lines{logs + "panic-full-1.ips"} : Lines{}) << row.report.substr(0, 80);
         const Lines entries = collect();
         EXPECT_EQ(entries.size(), row.collected ? 1U : 0U) << row.report.substr(0, 80);
         EXPECT_TRUE(logged(row.collected ? "Panic Version and System Version matches. Sending to HOST"
@@ -140,6 +152,7 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
     }
     root_.write("/System/Library/Quennel/SystemVersion.plist", "<plist><dict>");
     EXPECT_FALSE(check_panic_version(logs + "panic-full-1.ips"));
+    EXPECT_EQ(missed(), Lines{logs + "panic-full-1.ips"});
     EXPECT_FALSE(check_panic_version("/missing"));
 }
 

@@ -278,15 +278,23 @@ class CrashLogs(unittest.TestCase):
         self.assertEqual(len(os.listdir(copies)), 3)
 
     def test_what_cannot_be_looked_at_is_missed_and_said_so(self):
-        (self.logs / "huge.log").touch()
-        os.truncate(self.logs / "huge.log", 1 << 42)  # more than memory holds
+        version = self.service.root / "System/Library/Quennel/SystemVersion.plist"
+        version.parent.mkdir(parents=True)
+        version.write_text("<plist><dict><key>ProductBuildVersion</key><string>21A55</string></dict></plist>")
+        header = b'{"os_version": "21A55"}\n'
+        (self.logs / "panic-huge.log").write_bytes(header)
+        os.truncate(self.logs / "panic-huge.log", 1 << 42)  # a hole, more than memory or a disk holds
         os.mkfifo(self.logs / "fifo.log")
         os.symlink("/etc/hostname", self.logs / "out.log")
         varrow = self.service.root / "private/var/mobile/Library/Logs/Varrow"
         varrow.parent.mkdir(parents=True)
         os.symlink("/", varrow)
-        status, answer = self.service.orloctl("crash-logs")
+        copies = self.service.root / "copies"
+        status, answer = self.service.orloctl("crash-logs", "-o", copies)
         self.assertEqual((status, [log["size"] for log in answer["logs"]]), (2, [1 << 42]))
+        self.assertEqual((copies / "panic-huge.log").stat().st_size, 1 << 42)
+        with open(copies / "panic-huge.log", "rb") as copy:
+            self.assertEqual(copy.read(len(header) + 1), header + b"\0")
         self.assertEqual({entry["name"] for entry in answer["missed"] if entry["note"]},
                          {"/private/var/logs/fifo.log", "/private/var/logs/out.log",
                           "/private/var/mobile/Library/Logs/Varrow/"})

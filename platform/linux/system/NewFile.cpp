@@ -102,16 +102,30 @@ bool NewFile::fill(const Value::Data& contents) const {
 }
 
 bool NewFile::fillFrom(const FileDescriptor& source) const {
-    Value::Data piece(std::size_t{1} << 16);
-    ssize_t count;
-    do {
-        count = ::read(source.get(), piece.data(), piece.size());
-        if ((count < 0 && errno != EINTR) ||
-            (count > 0 && !writeAll(file_, piece.data(), static_cast<std::size_t>(count))))
-            return false;
-    } while (count != 0);
     struct stat status;
     if (::fstat(source.get(), &status) != 0)
+        return false;
+    const off_t size = status.st_size;
+    Value::Data piece(std::size_t{1} << 16);
+    for (off_t position = 0; position < size;) {
+        const off_t data = ::lseek(source.get(), position, SEEK_DATA);
+        if (data >= size || (data < 0 && errno == ENXIO))
+            break; // nothing but a hole is left
+        position = std::max(position, data);
+        const off_t hole = ::lseek(source.get(), position, SEEK_HOLE);
+        const off_t left = (hole > position ? std::min(hole, size) : size) - position;
+        const ssize_t count =
+            ::pread(source.get(), piece.data(), std::min(piece.size(), static_cast<std::size_t>(left)), position);
+        if (count == 0)
+            break;
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count < 0 || ::lseek(file_.get(), position, SEEK_SET) < 0 ||
+            !writeAll(file_, piece.data(), static_cast<std::size_t>(count)))
+            return false;
+        position += count;
+    }
+    if (::fstat(source.get(), &status) != 0 || ::ftruncate(file_.get(), std::min(size, status.st_size)) != 0)
         return false;
     const timespec times[] = {status.st_mtim, status.st_mtim};
     return ::futimens(file_.get(), times) == 0 && fill({});

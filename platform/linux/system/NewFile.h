@@ -22,7 +22,8 @@ public:
     // Writes the contents and flushes them to the disk.
     bool fill(const Value::Data& contents) const;
 
-    // The same with the rest of the open file `source`, piece by piece, and with its time of modification.
+    // The same with the whole of the regular file `source`, piece by piece, and with its time of modification. Holes
+    // stay holes, and what is appended meanwhile is left out. Moves the position of `source`.
     bool fillFrom(const FileDescriptor& source) const;
 
     // Moves the file to `name`, in place of what is there.
