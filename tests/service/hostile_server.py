@@ -171,11 +171,13 @@ class Handler(http.server.BaseHTTPRequestHandler):
             if how == "race" and self.command == "PUT" and server.racing > 0:
                 server.racing -= 1
                 server.objects[self.path] = os.urandom(8)
+            is_held = how == "held" and self.command == "PUT" and server.racing > 0
+            server.racing -= is_held
             kept = server.objects.get(self.path)
             tag = f'"{hashlib.md5(kept).hexdigest()}"' if kept is not None else None
             status = 200 if kept is not None else 404
             if self.command == "PUT":
-                status = 200 if self.holds(tag, how) else server.refusal
+                status = 200 if self.holds(tag, how) and not is_held else server.refusal
                 if status == 200:
                     server.objects[self.path] = record
         if late:

@@ -277,8 +277,10 @@ private:
                 return answer;
             std::this_thread::sleep_for(rest);
             http::Answer now = send("HEAD", "");
-            if (now.tag == found.tag) {
-                tagsAreBare = !tagsAreBare;
+            if (now.status == found.status && now.tag == found.tag) {
+                // Nobody has changed it, so that the store did not understand the tag, unless it was only busy (409).
+                if (answer.status == 412 && now.status == 200)
+                    tagsAreBare = !tagsAreBare;
             } else {
                 now = send("GET", "");
                 if (now.status == 200 &&
