@@ -45,8 +45,9 @@ TEST(ShowFile, findsOutTheFormat) {
         {"der", integer(1)},
         {"der", {}},
         {"pem", textOf("-----BEGIN CERTIFICATE-----\nMIIB\n")},
-        {"pem", textOf("subject=CN = x\n-----BEGIN CERTIFICATE-----\nMIIB\n")},
+        {"pem", textOf("subject=CN = x\n-----BEGIN CERTIFICATE-----\n" + std::string(200, 'A') + "\n")},
         {"der", octets(textOf("-----BEGIN "))},
+        {"der", sequence({ia5("x\n-----BEGIN ")})},
     };
     for (const auto& row : rows)
         EXPECT_EQ(show(row.file).json["format"], row.format);

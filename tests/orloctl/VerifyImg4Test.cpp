@@ -110,6 +110,14 @@ Bytes constrained(const List& constraints, Manifest fields = standardManifest())
     return signer.manifest(std::move(fields), signer.chainWith(signer.issue(signer.leaf(constraints))));
 }
 
+TEST(VerifyImg4, showsAValueWholeForProgramsAndItsBeginningForPeople) {
+    const Report report =
+        verify(constrained({object("MANP", {property("NONE", octets(Bytes(300, 7)))})}), testDomain());
+    const std::string demand = report.json["constraints"][0]["demand"];
+    EXPECT_GT(demand.size(), 600U);
+    EXPECT_EQ((report.text + report.problem).find(demand), std::string::npos);
+}
+
 Bytes withProperty(const Bytes& encoding) {
     Manifest fields = standardManifest();
     fields.properties.push_back(encoding);

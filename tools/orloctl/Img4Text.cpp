@@ -8,11 +8,11 @@ constexpr std::uint64_t mostProperties = 10000;
 constexpr std::uint64_t mostCertificates = 100;
 constexpr std::size_t mostCharactersShown = 128;
 
-std::string bytesText(const ordered_json& json) {
+std::string bytesText(const ordered_json& json, std::size_t most = mostCharactersShown) {
     const auto length = json["length"].get<std::uint64_t>();
     std::string text = std::to_string(length) + (length == 1 ? " byte" : " bytes");
     if (json.contains("hex") && length != 0)
-        text += ": " + shortened(json["hex"], mostCharactersShown);
+        text += ": " + shortened(json["hex"], most);
     if (json.contains("sha256"))
         text += " (SHA-256 " + json["sha256"].get<std::string>() + ")";
     return text;
@@ -57,7 +57,7 @@ private:
 std::string propertyLine(const ordered_json& property) {
     std::string line = property["name"];
     if (property.contains("type"))
-        line += "  " + img4ValueText(property);
+        line += "  " + img4ValueText(property, mostCharactersShown);
     if (property.contains("fault"))
         line += "  WRONG: " + property["fault"].get<std::string>();
     if (property.contains("hidden"))
@@ -136,12 +136,12 @@ void Lines::addRestoreInfo(const ordered_json& restoreInfo) {
 
 } // namespace
 
-std::string img4ValueText(const ordered_json& property) {
+std::string img4ValueText(const ordered_json& property, std::size_t most) {
     std::string text = property["type"];
     if (property.contains("value"))
-        text += " " + shortened(property["value"].dump(), mostCharactersShown);
+        text += " " + shortened(property["value"].dump(), most);
     else if (property.contains("length"))
-        text += " " + bytesText(property);
+        text += " " + bytesText(property, most);
     return text;
 }
 

@@ -9,8 +9,8 @@
 std::string img4Text(const Report& report);
 
 // The lines of properties alone, indented for `depth` dictionaries around them; and the type and value of one that has
-// a type, "INTEGER 12".
+// a type, "INTEGER 12", with at most so many characters of the value.
 std::string img4PropertiesText(const Elements& properties, unsigned depth);
-std::string img4ValueText(const nlohmann::ordered_json& property);
+std::string img4ValueText(const nlohmann::ordered_json& property, std::size_t most);
 
 #endif

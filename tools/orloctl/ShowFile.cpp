@@ -15,6 +15,14 @@ std::string_view textOf(const DERItem& item) {
     return {reinterpret_cast<const char*>(item.data), static_cast<std::size_t>(item.length)};
 }
 
+// PEM and what stands before it is text; DER has an octet there that no text has, such as the tag of a string.
+bool isText(std::string_view octets) {
+    return std::ranges::none_of(octets, [](char c) {
+        const auto octet = static_cast<unsigned char>(c);
+        return octet < ' ' && c != '\t' && c != '\n' && c != '\r';
+    });
+}
+
 // By the magic of an Img4 file, or the place of a blob's payload element behind two numbers of four octets.
 std::string formatOf(const DERItem& file) {
     constexpr std::string_view magics[] = {"IMG4", "IM4M", "IM4P"};
@@ -39,7 +47,7 @@ std::string pemProblem(const DERItem& file) {
     constexpr std::size_t longestPreface = 4096;
     const std::string_view text = textOf(file).substr(0, longestPreface);
     const std::size_t place = text.find(mark);
-    if (place == std::string_view::npos || (place != 0 && text[place - 1] != '\n'))
+    if (place == std::string_view::npos || (place != 0 && text[place - 1] != '\n') || !isText(text.substr(0, place)))
         return "";
     return "The file is PEM, text in which DER stands as base64, at offset " + std::to_string(place) +
            ": turn it into DER first, for instance with openssl.";

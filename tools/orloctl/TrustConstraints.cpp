@@ -26,8 +26,11 @@ std::string faultText(const DERItem& rest) {
     return why ? "is no strict DER: " + why->reason : "cannot be decoded";
 }
 
-// Type and value of one encoded property.
-std::string valueText(const DERItem& encoding) {
+// Type and value of one encoded property, whole or as much as a sentence takes.
+constexpr std::size_t whole = std::string::npos;
+constexpr std::size_t inSentence = 128;
+
+std::string valueText(const DERItem& encoding, std::size_t most) {
     Report report;
     img4show::Findings findings(encoding, report);
     nlohmann::ordered_json property;
@@ -35,7 +38,7 @@ std::string valueText(const DERItem& encoding) {
         property = element.json;
         return false;
     });
-    return property.contains("type") ? img4ValueText(property) : "malformed";
+    return property.contains("type") ? img4ValueText(property, most) : "malformed";
 }
 
 struct Element {
@@ -102,15 +105,17 @@ void Reader::judge(const Dictionary& dictionary, const DerItems& element, TrustC
     const auto found =
         isEvaluated(dictionary) ? search(*dictionary.properties, element.item().tag, &fault) : std::nullopt;
     if (found)
-        row.found = valueText(found->encoding);
+        row.found = valueText(found->encoding, whole);
     const bool isMet = kind == mustBeAbsent    ? !found && fault.empty()
                        : kind == mustBePresent ? found.has_value()
                                                : found && haveEqualContents(found->decoded, element.item());
     if (!isMet) {
+        const bool isAnyValue = kind == mustBePresent || kind == mustBeAbsent;
         row.state = TrustConstraint::Broken;
         row.reason = "The leaf certificate says that " + quotedCode(element.item().tag & DERTagNumberMask) + " of " +
-                     dictionary.words + " " + row.demand + ", and " +
-                     (found            ? "it is " + row.found
+                     dictionary.words + " " +
+                     (isAnyValue ? row.demand : "must be " + valueText(element.encoding(), inSentence)) + ", and " +
+                     (found            ? "it is " + valueText(found->encoding, inSentence)
                       : !fault.empty() ? "one of the properties there " + fault
                                        : "there is none");
     }
@@ -132,7 +137,7 @@ void Reader::readConstraint(const Dictionary& dictionary, const DerItems& elemen
     case DERTagBoolean:
     case DERTagInteger:
     case DERTagOctetString:
-        row.demand = "must be " + valueText(element.encoding());
+        row.demand = "must be " + valueText(element.encoding(), whole);
         break;
     case mustBePresent:
         row.demand = "must be there";

@@ -8,6 +8,7 @@ using nlohmann::ordered_json;
 
 constexpr std::size_t mostObjects = 1000;
 constexpr std::size_t longestName = 512;
+constexpr std::size_t longestValue = 512;
 
 std::string textOf(const ordered_json& json, const char* key) {
     return json[key].get<std::string>();
@@ -32,9 +33,9 @@ std::string certificateLine(const ordered_json& certificate) {
 
 std::string constraintLine(const ordered_json& constraint) {
     std::string line = "  " + textOf(constraint, "dictionary") + " " + textOf(constraint, "name") + " " +
-                       textOf(constraint, "demand") + ": " + textOf(constraint, "state");
+                       shortened(textOf(constraint, "demand"), longestValue) + ": " + textOf(constraint, "state");
     if (constraint["state"] == "broken" && constraint.contains("found"))
-        line += ", found " + textOf(constraint, "found");
+        line += ", found " + shortened(textOf(constraint, "found"), longestValue);
     return line + "\n";
 }
 
