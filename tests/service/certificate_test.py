@@ -158,7 +158,11 @@ class GetTcrt(TopModuleTest):
                 )
                 self.assertEqual(lines[-1], "Unable to read Certificate Serial Number")
         self.hold(b"")
-        self.assertEqual(self.get(), {"CertSerialNumber": DUMMY})
+        copy = self.service.root / "copy"
+        status, answer = self.service.orloctl("get-tcrt", "-o", copy)
+        self.assertEqual((status, answer["response"]["response"]), (1, {"CertSerialNumber": DUMMY}))
+        self.assertIn("is empty", answer["problem"])
+        self.assertFalse(copy.exists())
         self.hold(message)
         self.assertEqual(self.get()["CertSerialNumber"], "009a3c5e71d2046b88")
 

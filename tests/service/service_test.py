@@ -292,7 +292,11 @@ class Client(ServiceTest):
             (5, ["show", "bcfg", "/dev/null"]),
             (0, ["show", self.service.root / "blobs/every-kind.bin"]),
             (2, ["show", "bcfg"]),
-            (2, ["show", self.service.root / "images/container.img4", "--hmac-key-file", "/dev/null"]),
+            (2, ["show", self.service.root / "images/container.img4", "--hmac-key-file",
+                 self.service.root / "blobs/hmac-key.bin"]),
+            (2, ["show", self.service.root / "blobs/every-kind.bin", "--hmac-key-file", "/dev/null"]),
+            (2, ["show", self.service.root / "blobs/every-kind.bin", "--hmac-key-file", ""]),
+            (2, ["crash-logs", "-o", "-"]),
         ):
             with self.subTest(words):
                 exit_status, answer = self.service.orloctl(*words)

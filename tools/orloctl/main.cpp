@@ -152,19 +152,22 @@ int reportCopied(const Options& options, Answer answer, Remarks remarks, const s
 }
 
 int getTcrt(const Options& options, const std::string& copyPath) {
-    const Answer answer = sendRequest(options.address, "getTCRT", {});
+    Answer answer = sendRequest(options.address, "getTCRT", {});
     if (answer.outcome != Outcome::Success)
         return report(options, answer);
     const Value response(answer.response);
     const std::string* text = response["response"]["CertData"].text();
+    if (!text || text->empty()) {
+        answer.outcome = Outcome::Failure;
+        answer.problem = "The certificate in the hardware registry is empty.";
+        return report(options, answer);
+    }
     Remarks remarks;
     if (response["response"]["CertSerialNumber"] == Value("DummyCertificateSerialNumber"))
         remarks.note = "the serial number cannot be read: the hardware registry holds no certificate but other bytes";
-    if (!text)
-        remarks.note = "the certificate in the hardware registry is empty";
     if (copyPath.empty())
         return report(options, answer, remarks);
-    const Value::Data certificate = text ? hexString2Binary(*text) : Value::Data{};
+    const Value::Data certificate = hexString2Binary(*text);
     remarks.result = copyPath + ", " + std::to_string(certificate.size()) + " bytes";
     return reportCopied(options, answer, remarks, copyPath, certificate);
 }
@@ -227,8 +230,12 @@ int verify(const Options& options, const std::string& path, const VerifyOptions&
 }
 
 int showLocalFile(const Options& options, const std::string& path, const std::string& kind,
-                  const std::string& keyPath) {
-    const auto key = keyPath.empty() ? std::nullopt : std::optional(readLocalFile(keyPath));
+                  const std::optional<std::string>& keyPath) {
+    if (keyPath == "-" && path == "-")
+        throw UsageError("The file and the key cannot both come from standard input");
+    const auto key = keyPath ? std::optional(readLocalFile(*keyPath)) : std::nullopt;
+    if (key && key->empty())
+        throw UsageError("The key file is empty");
     const Value::Data file = readJudgedFile(path);
     return show(options, showFile(file, kind, key));
 }
@@ -341,7 +348,11 @@ private:
 
     void addReaders() {
         CLI::App* crashLogs = app_.add_subcommand("crash-logs", "List the device's crash and panic logs, offline");
-        crashLogs->add_option("-o,--output", copyPath_, "Copy them into this local directory")->type_name("DIRECTORY");
+        crashLogs->add_option("-o,--output", copyPath_, "Copy them into this local directory")
+            ->type_name("DIRECTORY")
+            ->check([](const std::string& path) {
+                return std::string(path == "-" ? "Logs are copied into a directory, not to standard output" : "");
+            });
         crashLogs->callback(
             [this] { run_ = [this] { return show(options_, collectCrashLogs(copyPath_), Outcome::Usage); }; });
 
@@ -353,9 +364,14 @@ private:
                          "ends; found out unless given")
             ->check(CLI::IsMember({"bcfg", "img4", "der"}));
         addLocalFile(verb);
-        verb->add_option("--hmac-key-file", keyPath_, "Check a blob's HMACs with the key in this local file")
-            ->type_name("FILE");
-        verb->callback([this] { run_ = [this] { return showLocalFile(options_, path_, format_, keyPath_); }; });
+        const CLI::Option* key =
+            verb->add_option("--hmac-key-file", keyPath_, "Check a blob's HMACs with the key in this local file")
+                ->type_name("FILE");
+        verb->callback([this, key] {
+            run_ = [this, isKeyed = key->count() > 0] {
+                return showLocalFile(options_, path_, format_, isKeyed ? std::optional(keyPath_) : std::nullopt);
+            };
+        });
     }
 
     void addVerifier() {
