@@ -15,8 +15,11 @@ using Dictionary = Value::Dictionary;
 
 Value nested(std::size_t levels) {
     Value value = 1;
-    for (std::size_t i = 0; i < levels; ++i)
-        value = Array{std::move(value)};
+    for (std::size_t i = 0; i < levels; ++i) {
+        Array around; // a list in braces would copy the graph
+        around.push_back(std::move(value));
+        value = std::move(around);
+    }
     return value;
 }
 

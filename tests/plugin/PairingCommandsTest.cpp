@@ -295,12 +295,11 @@ TEST_F(PairingCommands, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
         });
     }
 }
-#endif
-
 TEST_F(PairingCommands, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
     constexpr long kilobytes = 16 << 10;
     root_.write(calibration, "#!/bin/sh\nexec head -c 16777216 /dev/zero | tr '\\0' x");
     inOwnProcess([&] {
+        recordLog();
         rusage before = {}, after = {};
         ASSERT_EQ(::getrusage(RUSAGE_SELF, &before), 0);
         ZPOrloServices::q21isp_loadDAT();
@@ -310,6 +309,8 @@ TEST_F(PairingCommands, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
         EXPECT_TRUE(recordedLog().back().ends_with("x... (16777216 bytes)"));
     });
 }
+
+#endif
 
 TEST_F(PairingCommands, theCalibrationLoadOnlyLogs) {
     const struct {
