@@ -361,7 +361,8 @@ class ObjectStore(RemoteTest, StoreCases):
         unchanged, changed = (f"relay-{self.store.values['PROXY']}-{bit}" for bit in (0, 1))
         self.describe(self.service, vanter=changed, connectTo=connect_to)
         lines = self.service.messages_of(lambda: self.assertEqual(self.put(b"x")[2]["code"], 1011))
-        self.assertTrue(any("HTTP status 400 BadDigest" in line for line in lines), lines)
+        # Releases of Swift differ in the name.
+        self.assertRegex("\n".join(lines), "HTTP status 400 (BadDigest|XAmzContentSHA256Mismatch)")
         self.describe(self.service, vanter=unchanged, connectTo=connect_to)
         self.assertEqual(self.put(b"x"), SUCCESS)
         self.describe(self.service, s3={"bucket": "no-such-bucket"})
