@@ -295,6 +295,7 @@ TEST_F(PairingCommands, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
         });
     }
 }
+
 TEST_F(PairingCommands, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
     constexpr long kilobytes = 16 << 10;
     root_.write(calibration, "#!/bin/sh\nexec head -c 16777216 /dev/zero | tr '\\0' x");
