@@ -136,6 +136,15 @@ uint64_t DERLengthOfItem(DERTag tag, uint64_t length) {
     return lengthOfItem(tag, length, &total) ? total : 0;
 }
 
+DERReturn DEREncodeHeaderSized(DERTag tag, uint64_t length, uint8_t* buffer, uint64_t bufferSize, uint64_t* written) {
+    const uint64_t size = lengthOfTag(tag) + DERLengthOfLength(length);
+    if (size > bufferSize)
+        return DERBufferOverflow;
+    writeLength(writeTag(buffer, tag), length);
+    *written = size;
+    return DERSuccess;
+}
+
 DERReturn DEREncodeItemSized(DERTag tag, uint64_t length, const uint8_t* content, uint8_t* buffer, uint64_t bufferSize,
                              uint64_t* written) {
     uint64_t total = 0;

@@ -31,6 +31,10 @@ DER_API DERReturn DEREncodeLength(uint64_t length, uint8_t* buffer, uint64_t* in
 // that exceeds 64 bits.
 DER_API uint64_t DERLengthOfItem(DERTag tag, uint64_t length);
 
+// Writes identifier and length octets of an item whose `length` content octets follow, and their number into *written.
+DER_API DERReturn DEREncodeHeaderSized(DERTag tag, uint64_t length, uint8_t* buffer, uint64_t bufferSize,
+                                       uint64_t* written);
+
 // Writes one item with the `length` octets at `content`. `content` may be null when `length` is 0. *written (and
 // *inOutLength) is set to the whole size once it is known to fit.
 DER_API DERReturn DEREncodeItemSized(DERTag tag, uint64_t length, const uint8_t* content, uint8_t* buffer,

@@ -172,16 +172,9 @@ DERReturn writeInteger(const Octets4& value, Output* output) {
     return result;
 }
 
-// Writes identifier and length octets of an item whose content follows.
 DERReturn writeHeader(DERTag tag, std::uint64_t contentLength, Output* output) {
     std::uint64_t written = 0;
-    DERReturn result = DEREncodeItemSized(tag, 0, nullptr, output->next(), output->left(), &written);
-    if (result != DERSuccess)
-        return result;
-    // That was an item without content. The length goes in the place of its one length octet.
-    output->used += written - 1;
-    written = 0;
-    result = DEREncodeLengthSized(contentLength, output->next(), output->left(), &written);
+    const DERReturn result = DEREncodeHeaderSized(tag, contentLength, output->next(), output->left(), &written);
     output->used += written;
     return result;
 }

@@ -56,11 +56,14 @@ TEST(DEREncode, headersAreAsShortAsCanBe) {
         expectEncoding(row.lengthOctets, [&](std::uint8_t* buffer, std::uint64_t* length) {
             return DEREncodeLength(row.length, buffer, length);
         });
+        const std::string header = std::string(row.identifier) + " " + row.lengthOctets;
+        expectEncoding(header, [&](std::uint8_t* buffer, std::uint64_t* length) {
+            return DEREncodeHeaderSized(row.tag, row.length, buffer, *length, length);
+        });
         if (row.length > 256)
             continue;
         const Bytes content(row.length, 0x5A);
-        const std::string item =
-            std::string(row.identifier) + " " + row.lengthOctets + (content.empty() ? "" : " ") + hexOf(content);
+        const std::string item = header + (content.empty() ? "" : " ") + hexOf(content);
         EXPECT_EQ(DERLengthOfItem(row.tag, row.length), bytes(item).size());
         expectEncoding(item, [&](std::uint8_t* buffer, std::uint64_t* length) {
             return DEREncodeItem(row.tag, row.length, content.data(), buffer, length);
