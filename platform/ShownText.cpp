@@ -2,9 +2,24 @@
 
 #include <algorithm>
 
+#include <strings.h>
+
 namespace {
 
 constexpr std::string_view digits = "0123456789";
+
+// Where an authority begins when one does at `at`, otherwise npos. It stands behind the slashes that follow a scheme or
+// begin a reference. Readers of URLs take any number of slashes for two, also none behind a scheme that they know.
+std::size_t authorityAt(std::string_view text, std::size_t at) {
+    if (text[at] == '/' && (at == 0 ? text.starts_with("//") : text[at - 1] == ':'))
+        return text.find_first_not_of('/', at);
+    if (text[at] != ':' || text.substr(at + 1).starts_with('/'))
+        return text.npos;
+    for (const std::string_view scheme : {"http", "https"})
+        if (at >= scheme.size() && strncasecmp(&text[at - scheme.size()], scheme.data(), scheme.size()) == 0)
+            return at + 1;
+    return text.npos;
+}
 
 // Calls `take` for the parts of `text` before, between and behind the user information of URLs (RFC 3986, 3.2.1).
 template <class Take>
@@ -12,13 +27,11 @@ void splitAtUserInfo(std::string_view text, Take take) {
     const std::size_t lastAt = text.rfind('@');
     std::size_t start = 0;
     for (std::size_t at = 0; lastAt != text.npos && at < lastAt;) {
-        // An authority stands behind the slashes that follow a scheme or begin a reference. Readers of URLs take any
-        // number of slashes for two.
-        if (text[at] != '/' || (at == 0 ? !text.starts_with("//") : text[at - 1] != ':')) {
+        const std::size_t begin = authorityAt(text, at);
+        if (begin == text.npos) {
             ++at;
             continue;
         }
-        const std::size_t begin = std::min(text.find_first_not_of('/', at), lastAt);
         const std::string_view authority = text.substr(begin, text.find_first_of("/?#", begin) - begin);
         std::size_t end = authority.rfind('@');
         if (end != authority.npos) {

@@ -164,6 +164,8 @@ TEST(ShownText, leavesUserAndPasswordOutOfEveryURL) {
         {"http://user:p@ss@host/p@th", "http://...@host/p@th"},
         {"//user:pass@host", "//...@host"},
         {"http:/user:pass@host", "http:/...@host"},
+        {"at HTTPS:user:pass@host", "at HTTPS:...@host"},
+        {"domain:user:pass@host", "domain:user:pass@host"},
         {"http://user:pa/ss@host/", "http://...@host/"},
         {"POST http://a:b@c/d?e@f to https://g@h: no", "POST http://...@c/d?e@f to https://...@h: no"},
         {"http://host:80/a@b", "http://host:80/a@b"},
