@@ -35,13 +35,12 @@ void make(const FileDescriptor& directory, const std::string& name) {
 }
 
 FileDescriptor open(const FileDescriptor& directory, const std::string& name) {
-    constexpr int flags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
-    FileDescriptor file(::openat(directory.get(), name.c_str(), flags));
+    FileDescriptor file = openIn(directory, name, O_RDONLY);
     if (!file && errno == ENOENT) {
         make(directory, name);
-        file = FileDescriptor(::openat(directory.get(), name.c_str(), flags));
+        file = openIn(directory, name, O_RDONLY);
     }
-    if (!file)
+    if (!file && errno != ENXIO) // what is neither a file nor a link is not opened
         failWithErrno("cannot be opened");
     return file;
 }
@@ -49,7 +48,8 @@ FileDescriptor open(const FileDescriptor& directory, const std::string& name) {
 } // namespace
 
 Value::Data readTrustObject(const FileDescriptor& directory, const std::string& name) {
-    std::optional<Value::Data> contents = readRegularFile(open(directory, name), maximumSize);
+    const FileDescriptor file = open(directory, name);
+    std::optional<Value::Data> contents = file ? readRegularFile(file, maximumSize) : std::nullopt;
     if (!contents || contents->empty())
         fail("is damaged: it is empty, no regular file, or larger than 1 MiB");
     return std::move(*contents);

@@ -33,6 +33,25 @@ bool isSame(const struct stat& one, const struct stat& other) {
     return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
+// Opens the regular file or directory that was found under `name` in `directory`, that very one; nothing else is
+// opened, since opening alone can arm a device or wake who waits at a FIFO.
+FileDescriptor openFound(const FileDescriptor& found, const struct stat& status, const FileDescriptor& directory,
+                         const std::string& name, int flags) {
+    if (S_ISDIR(status.st_mode))
+        return FileDescriptor(::openat(found.get(), ".", flags));
+    if (!S_ISREG(status.st_mode))
+        return none(S_ISLNK(status.st_mode) ? ELOOP : ENXIO);
+    if ((flags & O_DIRECTORY) != 0)
+        return none(ENOTDIR);
+    FileDescriptor file(::open(("/proc/self/fd/" + std::to_string(found.get())).c_str(), flags & ~O_NOFOLLOW));
+    if (file || errno != ENOENT)
+        return file;
+    // Without /proc only the name is left, and what it names may have changed since.
+    file = FileDescriptor(::openat(directory.get(), name.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY));
+    struct stat opened;
+    return file && ::fstat(file.get(), &opened) == 0 && isSame(opened, status) ? std::move(file) : none(EAGAIN);
+}
+
 // The way from the device root to what a path names, one name at a time. No name is looked up but in a directory that
 // is held open, links are read and never followed by the kernel, and ".." goes back to the directory that was passed on
 // the way here, wherever that has been moved to meanwhile.
@@ -72,23 +91,8 @@ public:
         return ::fstat(directory.get(), &status_) == 0 ? std::move(directory) : FileDescriptor();
     }
 
-    // Opens the regular file or directory that was found, that very one; nothing else is opened, since opening alone
-    // can arm a device or wake who waits at a FIFO.
     FileDescriptor open(const FileDescriptor& found, int flags) {
-        if (S_ISDIR(status_.st_mode))
-            return FileDescriptor(::openat(found.get(), ".", flags));
-        if (!S_ISREG(status_.st_mode))
-            return none(S_ISLNK(status_.st_mode) ? ELOOP : ENXIO);
-        if ((flags & O_DIRECTORY) != 0)
-            return none(ENOTDIR);
-        FileDescriptor file(::open(("/proc/self/fd/" + std::to_string(found.get())).c_str(), flags & ~O_NOFOLLOW));
-        if (file || errno != ENOENT)
-            return file;
-        // Without /proc only the name is left, and what it names may have changed since.
-        file =
-            FileDescriptor(::openat(passed_.back().get(), name_.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY));
-        struct stat opened;
-        return file && ::fstat(file.get(), &opened) == 0 && isSame(opened, status_) ? std::move(file) : none(EAGAIN);
+        return openFound(found, status_, passed_.back(), name_, flags);
     }
 
 private:
@@ -138,6 +142,13 @@ FileDescriptor openInRoot(std::string_view path, int flags, Links links) {
     Walk walk;
     FileDescriptor found = walk.find(path, (flags & O_NOFOLLOW) == 0, links);
     return !found || (flags & O_PATH) != 0 ? std::move(found) : walk.open(found, flags | O_CLOEXEC);
+}
+
+FileDescriptor openIn(const FileDescriptor& directory, const std::string& name, int flags) {
+    const FileDescriptor found(::openat(directory.get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+    struct stat status;
+    return found && ::fstat(found.get(), &status) == 0 ? openFound(found, status, directory, name, flags | O_CLOEXEC)
+                                                       : FileDescriptor();
 }
 
 FileDescriptor openDirectoryInRoot(std::string_view path, Links links) {

@@ -38,6 +38,10 @@ enum class Links {
 // directories ENAMETOOLONG.
 FileDescriptor openInRoot(std::string_view path, int flags, Links links = Links::Followed);
 
+// Opens what the entry `name` of the open directory is, in the same way: only a regular file or a directory, and no
+// link.
+FileDescriptor openIn(const FileDescriptor& directory, const std::string& name, int flags);
+
 // Opens the directory at the device path `path` for reading and for the *at system calls.
 FileDescriptor openDirectoryInRoot(std::string_view path, Links links = Links::Followed);
 
