@@ -77,7 +77,7 @@ private:
         struct stat status;
         if (::fstatat(directory_.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && !S_ISREG(status.st_mode))
             return "what stands there is no file";
-        NewFile file(directory_);
+        NewFile file(directory_, names_.size() == 1);
         return file && file.fillFrom(log) && file.replace(name) ? "" : std::strerror(errno);
     }
 

@@ -73,8 +73,9 @@ void removeLeftovers(const FileDescriptor& directory) {
 
 } // namespace
 
-NewFile::NewFile(const FileDescriptor& directory) : directory_(directory) {
-    removeLeftovers(directory);
+NewFile::NewFile(const FileDescriptor& directory, bool isFirst) : directory_(directory) {
+    if (isFirst)
+        removeLeftovers(directory);
     // Until it is locked another writer may take the file for a leftover.
     struct stat status;
     do {

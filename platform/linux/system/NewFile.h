@@ -11,8 +11,9 @@
 // writer that was killed has left is removed by the next one in that directory.
 class NewFile {
 public:
-    // Makes an empty file of mode 0600 in `directory`, which must outlive this. False as a whole when that failed.
-    explicit NewFile(const FileDescriptor& directory);
+    // Makes an empty file of mode 0600 in `directory`, which must outlive this. False as a whole when that failed. A
+    // writer of many files says which is its first there: the directory is searched for what others left then alone.
+    explicit NewFile(const FileDescriptor& directory, bool isFirst = true);
     NewFile(const NewFile&) = delete;
     NewFile& operator=(const NewFile&) = delete;
     ~NewFile();
