@@ -53,6 +53,9 @@ HSMessageResponse checkCorvoPostSwapEntitlement(const HSMessageRequest& request,
 // is no regular file.
 HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value& hardwareModel);
 
+// Removes the result of an earlier "setGlobalbCfg", after one for which memory does not suffice.
+void removeGlobalbCfg() noexcept;
+
 // Whether a hardware model names a device of the family `prefix`. A model of nothing belongs to none.
 bool modelContains(const Value& hardwareModel, std::string_view prefix);
 

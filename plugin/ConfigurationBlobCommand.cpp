@@ -1,6 +1,7 @@
 #include <array>
 #include <cstdint>
 #include <limits>
+#include <new>
 #include <optional>
 
 #include "device/ZPDevice.h"
@@ -89,7 +90,7 @@ Value::Data encode(const SysConfig3Ptr& object) {
 
 } // namespace
 
-HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) try {
+HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) {
     serviceLog.info("%s:%d - Received setGlobalbCfg", handlerName, __LINE__);
     const SysConfig3Ptr object = decodeFile(request.messageDict["bcfgDataPath"]);
     serviceLog.info("Decoded recieved data ");
@@ -109,7 +110,8 @@ HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) t
     if (!files::replace(resultPath, *data.data()))
         files::remove(resultPath);
     return HSMessageResponse::initWithName(request.messageStr, 0, {});
-} catch (...) {
-    files::remove(resultPath);
-    throw;
+}
+
+void removeGlobalbCfg() noexcept try { files::remove(resultPath); } catch (const std::bad_alloc&) {
+    return;
 }

@@ -15,14 +15,17 @@
 namespace {
 
 struct CommandRow {
-    CommandRow(const char* named, Command command, std::int64_t status = -1, Value response = {})
+    CommandRow(const char* named, Command command, std::int64_t status = -1, Value response = {},
+               void (*clean)() noexcept = nullptr)
         : name(named),
           run(command),
-          withoutMemory(HSMessageResponse::initWithName(named, status, std::move(response))) {}
+          withoutMemory(HSMessageResponse::initWithName(named, status, std::move(response))),
+          cleanUp(clean) {}
 
     std::string_view name;
     Command run;
     std::optional<HSMessageResponse> withoutMemory; // completes a request for which memory does not suffice
+    void (*cleanUp)() noexcept; // takes away what an earlier request has left where this one's result belongs
 };
 
 // In the order in which a request's command is compared with them.
@@ -36,7 +39,7 @@ const CommandRow commands[] = {
     {"corvoSCPair", corvoSCPair},
     {"checkCorvoPostSwapEntitlement", checkCorvoPostSwapEntitlement, 0,
      Value::Dictionary{{"IsPostSwapEntitled", false}}},
-    {"setGlobalbCfg", setGlobalbCfg, 0},
+    {"setGlobalbCfg", setGlobalbCfg, 0, {}, removeGlobalbCfg},
 };
 
 const CommandRow* commandNamed(const Value& name) {
@@ -45,6 +48,12 @@ const CommandRow* commandNamed(const Value& name) {
         if (text && *text == row.name)
             return &row;
     return nullptr;
+}
+
+void logRequest(const HSMessageRequest& request) try {
+    serviceLog.info("Received Request : %@", request.description());
+} catch (const std::bad_alloc&) {
+    return; // a line that memory does not suffice for is lost, as in the log itself
 }
 
 } // namespace
@@ -56,17 +65,23 @@ std::unique_ptr<ZPOrloServices> ZPOrloServices::initWithServiceName(std::string_
     return server;
 }
 
-void ZPOrloServices::printPluginVersion() const {
+void ZPOrloServices::printPluginVersion() const try {
     serviceLog.info("Plugin  - version %@", pluginVersion());
+} catch (const std::exception&) {
+    return; // a line that memory does not suffice for is lost; the work it tells of goes on
 }
 
-void ZPOrloServices::q21isp_loadDAT() try {
+void ZPOrloServices::q21isp_loadDAT() {
+    const Value none = "";
     Value response;
-    Error error;
-    HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
-    serviceLog.info("Output: %@", ProgramOutput{&response["Output"]});
-} catch (const std::bad_alloc&) {
-    return; // an output that memory does not suffice for is lost; the load has happened all the same
+    try {
+        Error error;
+        HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
+    } catch (const std::bad_alloc&) {
+        response = {}; // an output that memory does not suffice for is lost
+    }
+    const Value& output = response["Output"];
+    serviceLog.info("Output: %@", ProgramOutput{output.isNothing() ? &none : &output});
 }
 
 void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSCompletion& completion) {
@@ -75,7 +90,7 @@ void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSComp
     const std::optional<HSMessageResponse>* response = &made;
     try {
         printPluginVersion();
-        serviceLog.info("Received Request : %@", request.description());
+        logRequest(request);
         serviceLog.info("request.messageDict : %@", request.messageDict);
         const Value hardwareModel = KACopyAnswerWithError("HWModelStr", {}, nullptr);
         serviceLog.info("Hardware Model : %@", hardwareModel);
@@ -84,6 +99,8 @@ void ZPOrloServices::handleMessage(const HSMessageRequest& request, const HSComp
     } catch (const std::exception&) {
         if (command)
             response = &command->withoutMemory;
+        if (command && command->cleanUp)
+            command->cleanUp();
     }
     try {
         completion(true, *response);

@@ -259,6 +259,7 @@ TEST_F(RecordCommands, aRequestIsCompletedOnceWhereverMemoryEnds) {
         bool failed = true, sawFailure = false;
         for (int count = 1; failed; count += 1 + count / 40) {
             arrange();
+            root_.write("/tmp/new_bCfg", "earlier");
             servicesDouble().reverseProxy.events = {{1}};
             servicesDouble().pairing.tickets = {{"tick"}};
             servicesDouble().updater.queryInfo.output = Value::Dictionary{{"Digest", certificate}};
@@ -278,6 +279,8 @@ TEST_F(RecordCommands, aRequestIsCompletedOnceWhereverMemoryEnds) {
             if (!answer)
                 continue;
             EXPECT_EQ(answer->name(), Value(row.command));
+            EXPECT_EQ(root_.read("/tmp/new_bCfg") == "earlier", std::string_view(row.command) != "setGlobalbCfg")
+                << count;
             if (answer->statusCode() == row.status && answer->response() == row.response && !answer->error())
                 sawFailure = true;
             else
