@@ -1,14 +1,20 @@
 #include <bit>
 
-#include "platform/Crypto.h"
 #include "sysconfig/EntryList.h"
 
 namespace sysconfig {
 
 namespace {
 
-struct SipState {
+// SipHash-2-4 over a message that comes as words.
+struct SipHash {
     std::uint64_t v0, v1, v2, v3;
+
+    explicit SipHash(const HashSecret& secret)
+        : v0(secret.words[0] ^ 0x736F6D6570736575),
+          v1(secret.words[1] ^ 0x646F72616E646F6D),
+          v2(secret.words[0] ^ 0x6C7967656E657261),
+          v3(secret.words[1] ^ 0x7465646279746573) {}
 
     void round() {
         v0 += v1;
@@ -29,6 +35,15 @@ struct SipState {
         round();
         v0 ^= word;
     }
+
+    // The hash, with the octets of the message that fill no word, and the message's size.
+    std::uint64_t finish(std::uint64_t tail, std::size_t size) {
+        absorb(tail | std::uint64_t{size & 0xFF} << 56);
+        v2 ^= 0xFF;
+        for (int i = 0; i < 4; ++i)
+            round();
+        return v0 ^ v1 ^ v2 ^ v3;
+    }
 };
 
 // Up to eight characters as a word, the first in the least significant octet.
@@ -41,31 +56,17 @@ std::uint64_t wordOf(const char* characters, std::size_t count) {
 
 } // namespace
 
-bool seedHash(HashSeed* seed) {
-    if (!crypto::randomBytes(seed, sizeof *seed))
-        return false;
-    // Multiplying by an odd number loses nothing.
-    seed->mix |= 1;
-    seed->multiplier |= 1;
-    return true;
+std::uint64_t hashOf(const HashSecret& secret, std::uint32_t key) {
+    return SipHash(secret).finish(key, sizeof key);
 }
 
-std::uint64_t sipHash(const std::uint64_t (&key)[2], std::string_view message) {
-    SipState state = {key[0] ^ 0x736F6D6570736575, key[1] ^ 0x646F72616E646F6D, key[0] ^ 0x6C7967656E657261,
-                      key[1] ^ 0x7465646279746573};
-    const std::size_t tail = message.size() % 8;
-    const char* const end = message.data() + (message.size() - tail);
-    for (const char* next = message.data(); next != end; next += 8)
-        state.absorb(wordOf(next, 8));
-    state.absorb(wordOf(end, tail) | std::uint64_t{message.size() & 0xFF} << 56);
-    state.v2 ^= 0xFF;
-    for (int i = 0; i < 4; ++i)
-        state.round();
-    return state.v0 ^ state.v1 ^ state.v2 ^ state.v3;
-}
-
-std::uint32_t hashOf(const HashSeed& seed, std::string_view key) {
-    return static_cast<std::uint32_t>(sipHash(seed.sip, key) >> 32);
+std::uint64_t hashOf(const HashSecret& secret, std::string_view key) {
+    SipHash hash(secret);
+    const std::size_t tail = key.size() % 8;
+    const char* const end = key.data() + (key.size() - tail);
+    for (const char* next = key.data(); next != end; next += 8)
+        hash.absorb(wordOf(next, 8));
+    return hash.finish(wordOf(end, tail), key.size());
 }
 
 } // namespace sysconfig

@@ -10,33 +10,19 @@
 
 namespace sysconfig {
 
-// Secret parameters of an object's two hash functions. Whoever writes a blob does not know them, and so cannot choose
-// keys that fall together.
-struct HashSeed {
-    std::uint64_t mix;
-    std::uint64_t shift;
-    std::uint64_t multiplier;
-    std::uint64_t sip[2];
+// The secret key of an object's hash function, from the random source. Whoever writes a blob does not know it, and so
+// cannot choose keys that fall together.
+struct HashSecret {
+    std::uint64_t words[2];
 };
 
-// Fills the seed from the random source.
-bool seedHash(HashSeed* seed);
-
-// The hash of a payload key. The last step is multiply-shift hashing, which makes any two keys collide with probability
-// 2/n in n buckets. It alone would map evenly spaced keys to evenly spaced values, which now and then crowd a few
-// buckets; the steps before it, which no two keys leave equal, break such patterns.
-inline std::uint32_t hashOf(const HashSeed& seed, std::uint32_t key) {
-    std::uint64_t value = seed.mix * key + seed.shift;
-    value ^= value >> 32;
-    return static_cast<std::uint32_t>((value * seed.multiplier) >> 32);
-}
-
-// The hash of a metadata key: SipHash-2-4.
-std::uint32_t hashOf(const HashSeed& seed, std::string_view key);
-std::uint64_t sipHash(const std::uint64_t (&key)[2], std::string_view message);
+// SipHash-2-4 of a key: of the four octets of a payload entry's, the least significant first, and of the characters of
+// a metadata entry's.
+std::uint64_t hashOf(const HashSecret& secret, std::uint32_t key);
+std::uint64_t hashOf(const HashSecret& secret, std::string_view key);
 
 // A zeroed list is empty. An Entry is a record from malloc with the members `next`, `previous` and `bucketNext`, and
-// indexKey() and indexHash(seed) to know it by. The list owns its entries.
+// indexKey() to know it by. The list owns its entries, of which no two in the index have one key.
 template <typename Entry, typename Key>
 struct EntryList {
     Entry* first;
@@ -45,47 +31,22 @@ struct EntryList {
     std::uint32_t count;
     std::uint8_t bucketBits;
 
-    Entry* find(std::uint32_t hash, Key key) const {
-        if (buckets == nullptr)
-            return nullptr;
-        Entry* entry = *bucket(hash);
-        while (entry != nullptr && entry->indexKey() != key)
-            entry = entry->bucketNext;
-        return entry;
+    Entry* find(const HashSecret& secret, Key key) const {
+        return buckets != nullptr ? *linkTo(key, bucketOf(secret, key)) : nullptr;
     }
 
-    // Removes and releases every entry with the key, which may be a view into one of them.
-    void remove(std::uint32_t hash, Key key) {
-        if (buckets == nullptr)
-            return;
-        Entry* removed = nullptr;
-        Entry** place = bucket(hash);
-        while (*place != nullptr) {
-            Entry* const entry = *place;
-            if (entry->indexKey() != key) {
-                place = &entry->bucketNext;
-                continue;
-            }
-            *place = entry->bucketNext;
-            unlink(entry);
-            entry->bucketNext = removed;
-            removed = entry;
-        }
-        while (removed != nullptr) {
-            Entry* const entry = removed;
-            removed = entry->bucketNext;
-            std::free(entry);
-        }
+    // Removes and releases the entry with the key, which may be a view into it.
+    void remove(const HashSecret& secret, Key key) {
+        if (buckets != nullptr)
+            releaseAt(linkTo(key, bucketOf(secret, key)));
     }
 
-    // Appends an entry in place of those with the same key. False, with nothing changed, when memory is lacking.
-    bool add(Entry* entry, const HashSeed& seed) {
-        if (!reserveOne(seed))
+    // Appends an entry in place of the one with the same key. False, with nothing changed, when memory is lacking.
+    bool add(Entry* entry, const HashSecret& secret) {
+        if ((buckets == nullptr || count >= bucketCount()) && !makeIndex(std::uint64_t{count} + 1, secret))
             return false;
-        const std::uint32_t hash = entry->indexHash(seed);
-        remove(hash, entry->indexKey());
         appendWithoutIndex(entry);
-        chain(entry, hash);
+        index(entry, secret);
         return true;
     }
 
@@ -100,30 +61,7 @@ struct EntryList {
 
     // Makes the index of a list that was filled without one. Of the entries with one key the last stays, as if each had
     // been added in turn. False, with nothing changed, when memory is lacking.
-    //
-    // In a long list hardly any bucket is in the processor's cache when its turn comes. Two cursors run ahead, of which
-    // the first fetches the bucket of a coming entry and the second the entry that the bucket holds already.
-    bool indexAll(const HashSeed& seed) {
-        constexpr int lead = 8;
-        if (first == nullptr)
-            return true;
-        if (!makeBuckets(count))
-            return false;
-        Entry* bucketCursor = first;
-        Entry* headCursor = first;
-        for (int i = 0; i < 2 * lead; ++i)
-            bucketCursor = fetchBucket(bucketCursor, seed);
-        for (int i = 0; i < lead; ++i)
-            headCursor = fetchHead(headCursor, seed);
-        for (Entry* entry = first; entry != nullptr; entry = entry->next) {
-            bucketCursor = fetchBucket(bucketCursor, seed);
-            headCursor = fetchHead(headCursor, seed);
-            const std::uint32_t hash = entry->indexHash(seed);
-            remove(hash, entry->indexKey());
-            chain(entry, hash);
-        }
-        return true;
-    }
+    bool indexAll(const HashSecret& secret) { return first == nullptr || makeIndex(count, secret); }
 
     // Releases all entries and the index.
     void clear() {
@@ -137,22 +75,41 @@ struct EntryList {
     }
 
     std::uint64_t bucketCount() const { return std::uint64_t{1} << bucketBits; }
-    Entry** bucket(std::uint32_t hash) const { return &buckets[hash >> (32 - bucketBits)]; }
 
 private:
-    // Makes room in the index for one more entry.
-    bool reserveOne(const HashSeed& seed) {
-        if (buckets != nullptr && count < bucketCount())
-            return true;
-        if (!makeBuckets(std::uint64_t{count} + 1))
-            return false;
-        for (Entry* entry = first; entry != nullptr; entry = entry->next)
-            chain(entry, entry->indexHash(seed));
-        return true;
+    Entry** bucketOf(const HashSecret& secret, Key key) const {
+        return &buckets[hashOf(secret, key) >> (64 - bucketBits)];
     }
 
-    // Replaces the index by an empty one for `capacity` entries.
-    bool makeBuckets(std::uint64_t capacity) {
+    // The link, from `link` on, that leads to the entry with the key, or the null one at the end.
+    static Entry** linkTo(Key key, Entry** link) {
+        while (*link != nullptr && (*link)->indexKey() != key)
+            link = &(*link)->bucketNext;
+        return link;
+    }
+
+    // Takes the entry to which the link leads, if any, out of index and list.
+    void releaseAt(Entry** link) {
+        Entry* const entry = *link;
+        if (entry == nullptr)
+            return;
+        *link = entry->bucketNext;
+        (entry->previous != nullptr ? entry->previous->next : first) = entry->next;
+        (entry->next != nullptr ? entry->next->previous : last) = entry->previous;
+        --count;
+        std::free(entry);
+    }
+
+    // Puts an entry of the list into the index, and the one with the same key out of both.
+    void index(Entry* entry, const HashSecret& secret) {
+        Entry** const bucket = bucketOf(secret, entry->indexKey());
+        releaseAt(linkTo(entry->indexKey(), bucket));
+        entry->bucketNext = *bucket;
+        *bucket = entry;
+    }
+
+    // Makes the index anew, for `capacity` entries.
+    bool makeIndex(std::uint64_t capacity, const HashSecret& secret) {
         std::uint8_t bits = 3;
         while (bits < 32 && std::uint64_t{1} << bits < capacity)
             ++bits;
@@ -162,33 +119,9 @@ private:
         std::free(buckets);
         buckets = made;
         bucketBits = bits;
+        for (Entry* entry = first; entry != nullptr; entry = entry->next)
+            index(entry, secret);
         return true;
-    }
-
-    Entry* fetchBucket(Entry* entry, const HashSeed& seed) const {
-        if (entry == nullptr)
-            return nullptr;
-        __builtin_prefetch(bucket(entry->indexHash(seed)));
-        return entry->next;
-    }
-
-    Entry* fetchHead(Entry* entry, const HashSeed& seed) const {
-        if (entry == nullptr)
-            return nullptr;
-        __builtin_prefetch(*bucket(entry->indexHash(seed)));
-        return entry->next;
-    }
-
-    void chain(Entry* entry, std::uint32_t hash) {
-        Entry** const place = bucket(hash);
-        entry->bucketNext = *place;
-        *place = entry;
-    }
-
-    void unlink(Entry* entry) {
-        (entry->previous != nullptr ? entry->previous->next : first) = entry->next;
-        (entry->next != nullptr ? entry->next->previous : last) = entry->previous;
-        --count;
     }
 };
 

@@ -82,29 +82,21 @@ bool isSupportedSysConfig3Version(SysConfig3Version version) {
 __SysConfig3* allocSysConfig3(SysConfig3Magic magic, SysConfig3Version version) {
     using namespace sysconfig;
     constexpr char operation[] = "struct __SysConfig3 *__singleallocSysConfig3(SysConfig3Magic, SysConfig3Version)";
-    if (!isSupportedSysConfig3Magic(magic)) {
-        logHook()(messageLevel, "%s invalid magic provided 0x%08X", operation, magic);
-        return nullptr;
-    }
-    if (!isSupportedSysConfig3Version(version)) {
-        logHook()(messageLevel, "%s invalid version provided 0x%08X", operation, version);
-        return nullptr;
-    }
+    if (!isSupportedSysConfig3Magic(magic))
+        return logHook()(messageLevel, "%s invalid magic provided 0x%08X", operation, magic), nullptr;
+    if (!isSupportedSysConfig3Version(version))
+        return logHook()(messageLevel, "%s invalid version provided 0x%08X", operation, version), nullptr;
     auto* const object = static_cast<__SysConfig3*>(std::calloc(1, sizeof(__SysConfig3)));
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s malloc failed.", operation);
-        return nullptr;
-    }
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s malloc failed.", operation), nullptr;
     object->magic = magic;
     object->version = version;
-    const bool seeded = seedHash(&object->seed);
-    if (!seeded)
+    if (!crypto::randomBytes(&object->secret, sizeof object->secret))
         logHook()(messageLevel, "%s random source failed.", operation);
-    if (!seeded || !installPlaceholderManifest(object)) {
-        deallocSysConfig3(object);
-        return nullptr;
-    }
-    return object;
+    else if (installPlaceholderManifest(object))
+        return object;
+    deallocSysConfig3(object);
+    return nullptr;
 }
 
 void deallocSysConfig3(__SysConfig3* object) {

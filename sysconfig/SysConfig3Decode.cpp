@@ -64,9 +64,7 @@ constexpr DERReturn outOfMemory = DERBufferOverflow;
 
 // The value of four octets, least significant first. Content of any other length gives 0.
 std::uint32_t valueOf(const DERItem& item) {
-    if (item.length != 4)
-        return 0;
-    return valueOf(Octets4{{item.data[0], item.data[1], item.data[2], item.data[3]}});
+    return item.length == 4 ? valueOf(Octets4{{item.data[0], item.data[1], item.data[2], item.data[3]}}) : 0;
 }
 
 // The characters of a string item, up to its first NUL and at most `maximum` of them.
@@ -102,14 +100,10 @@ constexpr Element manifestElement = {DERTagSequence, "Unable to decode manifest 
 
 bool openElement(const DERItem& element, const Element& expected, DERItem* content) {
     DERDecodedInfo item;
-    if (const DERReturn result = DERDecodeItem(&element, &item); result != DERSuccess) {
-        logHook()(messageLevel, expected.undecodable, static_cast<int>(result));
-        return false;
-    }
-    if (item.tag != expected.tag) {
-        logHook()(messageLevel, expected.otherTag, static_cast<unsigned long long>(item.tag));
-        return false;
-    }
+    if (const DERReturn result = DERDecodeItem(&element, &item); result != DERSuccess)
+        return logHook()(messageLevel, expected.undecodable, static_cast<int>(result)), false;
+    if (item.tag != expected.tag)
+        return logHook()(messageLevel, expected.otherTag, static_cast<unsigned long long>(item.tag)), false;
     *content = item.content;
     return true;
 }
@@ -122,11 +116,9 @@ bool decodeList(const DERItem& element, const Element& expected, DERDecodeSequen
     DERItem entries;
     if (!openElement(element, expected, &entries))
         return false;
-    if (const DERReturn result = DERDecodeSequenceContentWithBlock(&entries, addEntry, object); result != DERSuccess) {
-        logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result));
-        return false;
-    }
-    if (list->indexAll(object->seed))
+    if (const DERReturn result = DERDecodeSequenceContentWithBlock(&entries, addEntry, object); result != DERSuccess)
+        return logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result)), false;
+    if (list->indexAll(object->secret))
         return true;
     logHook()(messageLevel, "%s malloc failed.", operation);
     return false;
@@ -178,10 +170,8 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedIn
         return result;
     const PayloadContent content = {valueOf(items.key), textOf(items.comment, maximumStringLength), bytesOf(items.data),
                                     textOf(items.string, maximumStringLength), deleted};
-    if (!isValidContent(content)) {
-        _sysConfig3AddPayloadEntry(object, nullptr);
-        return DERSuccess;
-    }
+    if (!isValidContent(content))
+        return reportNoPayloadEntry(), DERSuccess;
     __SysConfig3PayloadEntry* const entry = makeEntry(content);
     if (entry == nullptr)
         return outOfMemory;
@@ -193,10 +183,8 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
     constexpr char operation[] = "DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo "
                                  "*__single, bool *__single, void *__single)";
     auto* const object = static_cast<__SysConfig3*>(context);
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s the refcon arg was NULL", operation);
-        return DERParamError;
-    }
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s the refcon arg was NULL", operation), DERParamError;
     MetadataItems items;
     const DERReturn result =
         DERParseSequenceContentToObject(&decoded->content, DERDecodeSysConfig3MetadataItemSpecs_count,
@@ -205,14 +193,11 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
         return result;
     const MetadataContent content = {textOf(items.key, maximumKeyLength), bytesOf(items.data),
                                      textOf(items.string, maximumStringLength)};
-    if (!isValidContent(content)) {
-        _sysConfig3AddMetadataEntry(object, nullptr);
-        return DERSuccess;
-    }
+    if (!isValidContent(content))
+        return reportNoMetadataEntry(), DERSuccess;
     __SysConfig3MetadataEntry* const entry = makeEntry(content);
     if (entry == nullptr)
         return outOfMemory;
-    entry->hash = hashOf(object->seed, keyOf(*entry));
     object->metadata.appendWithoutIndex(entry);
     return DERSuccess;
 }
@@ -226,10 +211,8 @@ __SysConfig3* decodeSysConfig3(const std::uint8_t* data, std::uint32_t length) {
         return nullptr;
     const SysConfig3Magic magic = valueOf(items.magic);
     const SysConfig3Version version = valueOf(items.version);
-    if (!isSupportedSysConfig3Magic(magic)) {
-        logHook()(messageLevel, "Sysconfig magic 0x%X is not valid", magic);
-        return nullptr;
-    }
+    if (!isSupportedSysConfig3Magic(magic))
+        return logHook()(messageLevel, "Sysconfig magic 0x%X is not valid", magic), nullptr;
     __SysConfig3* const object = allocSysConfig3(magic, version);
     if (object == nullptr) {
         logHook()(messageLevel,

@@ -1,5 +1,7 @@
 // Every part is measured first. Then the blob is written front to back into a buffer of exactly its size, straight from
 // the object, so that nothing but the blob itself is ever allocated.
+#include <array>
+
 #include "der/DEREncode.h"
 #include "sysconfig/SysConfig3Internal.h"
 #include "sysconfig/SysConfig3Ptr.h"
@@ -20,50 +22,26 @@ struct MetadataItems {
     DERItem value;
 };
 
-constexpr DERItemSpec DEREncodeSysConfig3PayloadDataItemSpecs[] = {
-    {offsetof(PayloadItems, key), DERTagInteger, 0},
-    {offsetof(PayloadItems, comment), DERTagIA5String, 0},
-    {offsetof(PayloadItems, value), DERTagOctetString, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3PayloadDataItemSpecs_count =
-    std::size(DEREncodeSysConfig3PayloadDataItemSpecs);
+// The rows of an entry whose value has the tag `value`.
+constexpr std::array<DERItemSpec, 3> payloadRows(DERTag value) {
+    return {{{offsetof(PayloadItems, key), DERTagInteger, 0},
+             {offsetof(PayloadItems, comment), DERTagIA5String, 0},
+             {offsetof(PayloadItems, value), value, 0}}};
+}
 
-constexpr DERItemSpec DEREncodeSysConfig3PayloadStringItemSpecs[] = {
-    {offsetof(PayloadItems, key), DERTagInteger, 0},
-    {offsetof(PayloadItems, comment), DERTagIA5String, 0},
-    {offsetof(PayloadItems, value), DERTagIA5String, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3PayloadStringItemSpecs_count =
-    std::size(DEREncodeSysConfig3PayloadStringItemSpecs);
+constexpr std::array<DERItemSpec, 2> metadataRows(DERTag value) {
+    return {{{offsetof(MetadataItems, key), DERTagIA5String, 0}, {offsetof(MetadataItems, value), value, 0}}};
+}
 
-constexpr DERItemSpec DEREncodeSysConfig3PayloadDeletedItemSpecs[] = {
-    {offsetof(PayloadItems, key), DERTagInteger, 0},
-    {offsetof(PayloadItems, comment), DERTagIA5String, 0},
-    {offsetof(PayloadItems, value), DERTagBoolean, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3PayloadDeletedItemSpecs_count =
-    std::size(DEREncodeSysConfig3PayloadDeletedItemSpecs);
-
-constexpr DERItemSpec DEREncodeSysConfig3MetadataDataItemSpecs[] = {
-    {offsetof(MetadataItems, key), DERTagIA5String, 0},
-    {offsetof(MetadataItems, value), DERTagOctetString, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3MetadataDataItemSpecs_count =
-    std::size(DEREncodeSysConfig3MetadataDataItemSpecs);
-
-constexpr DERItemSpec DEREncodeSysConfig3MetadataStringItemSpecs[] = {
-    {offsetof(MetadataItems, key), DERTagIA5String, 0},
-    {offsetof(MetadataItems, value), DERTagIA5String, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3MetadataStringItemSpecs_count =
-    std::size(DEREncodeSysConfig3MetadataStringItemSpecs);
-
-constexpr DERItemSpec DEREncodeSysConfig3ManifestItemSpecs[] = {
-    {offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
-    {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
-    {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0},
-};
-constexpr std::uint16_t DEREncodeSysConfig3ManifestItemSpecs_count = std::size(DEREncodeSysConfig3ManifestItemSpecs);
+constexpr auto DEREncodeSysConfig3PayloadDataItemSpecs = payloadRows(DERTagOctetString);
+constexpr auto DEREncodeSysConfig3PayloadStringItemSpecs = payloadRows(DERTagIA5String);
+constexpr auto DEREncodeSysConfig3PayloadDeletedItemSpecs = payloadRows(DERTagBoolean);
+constexpr auto DEREncodeSysConfig3MetadataDataItemSpecs = metadataRows(DERTagOctetString);
+constexpr auto DEREncodeSysConfig3MetadataStringItemSpecs = metadataRows(DERTagIA5String);
+constexpr std::array<DERItemSpec, 3> DEREncodeSysConfig3ManifestItemSpecs = {
+    {{offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
+     {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
+     {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0}}};
 
 DERItem itemOf(std::string_view text) {
     return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
@@ -81,102 +59,68 @@ DERItem itemOf(const Octets4& octets) {
     return {octets.octets, sizeof octets.octets};
 }
 
-// One entry as the items of a SEQUENCE: views of the entry, and of `key`, in a record of the kind that `specs` reads.
-struct PayloadRecord {
-    Octets4 key;
-    PayloadItems items;
-    const DERItemSpec* specs;
-    std::uint16_t count;
+// Calls `job` with the items of a SEQUENCE, views of the entry, and the rows that they go by.
+template <typename Job>
+DERReturn withItems(const __SysConfig3PayloadEntry& entry, const Job& job) {
+    const Octets4 key = octetsOf(entry.key);
+    PayloadItems items = {itemOf(key), itemOf(leadOf(entry)), {&entry.deleted, sizeof entry.deleted}};
+    if (entry.dataLength == 0 && entry.stringLength == noString)
+        return job(items, DEREncodeSysConfig3PayloadDeletedItemSpecs);
+    items.value = entry.dataLength != 0 ? itemOf(dataOf(entry)) : itemOf(stringOf(entry));
+    return job(items, entry.dataLength != 0 ? DEREncodeSysConfig3PayloadDataItemSpecs
+                                            : DEREncodeSysConfig3PayloadStringItemSpecs);
+}
 
-    explicit PayloadRecord(const __SysConfig3PayloadEntry& entry)
-        : key(octetsOf(entry.key)), items{itemOf(key), itemOf(commentOf(entry)), {}} {
-        if (entry.dataLength != 0) {
-            items.value = itemOf(dataOf(entry));
-            specs = DEREncodeSysConfig3PayloadDataItemSpecs;
-            count = DEREncodeSysConfig3PayloadDataItemSpecs_count;
-        } else if (entry.stringLength != noString) {
-            items.value = itemOf(stringOf(entry));
-            specs = DEREncodeSysConfig3PayloadStringItemSpecs;
-            count = DEREncodeSysConfig3PayloadStringItemSpecs_count;
-        } else {
-            items.value = {&entry.deleted, sizeof entry.deleted};
-            specs = DEREncodeSysConfig3PayloadDeletedItemSpecs;
-            count = DEREncodeSysConfig3PayloadDeletedItemSpecs_count;
-        }
-    }
-    // `items` views `key`.
-    PayloadRecord(const PayloadRecord&) = delete;
-    PayloadRecord& operator=(const PayloadRecord&) = delete;
-};
+template <typename Job>
+DERReturn withItems(const __SysConfig3MetadataEntry& entry, const Job& job) {
+    const DERItem key = itemOf(leadOf(entry));
+    if (entry.dataLength != 0)
+        return job(MetadataItems{key, itemOf(dataOf(entry))}, DEREncodeSysConfig3MetadataDataItemSpecs);
+    return job(MetadataItems{key, itemOf(stringOf(entry))}, DEREncodeSysConfig3MetadataStringItemSpecs);
+}
 
-struct MetadataRecord {
-    MetadataItems items;
-    const DERItemSpec* specs;
-    std::uint16_t count;
+ManifestItems itemsOf(const __SysConfig3ManifestEntry& manifest) {
+    return {itemOf(manifest.payloadHMAC), itemOf(manifest.metadataHMAC), itemOf(manifest.fullHMAC)};
+}
 
-    explicit MetadataRecord(const __SysConfig3MetadataEntry& entry) : items{itemOf(keyOf(entry)), {}} {
-        if (entry.dataLength != 0) {
-            items.value = itemOf(dataOf(entry));
-            specs = DEREncodeSysConfig3MetadataDataItemSpecs;
-            count = DEREncodeSysConfig3MetadataDataItemSpecs_count;
-        } else {
-            items.value = itemOf(stringOf(entry));
-            specs = DEREncodeSysConfig3MetadataStringItemSpecs;
-            count = DEREncodeSysConfig3MetadataStringItemSpecs_count;
-        }
-    }
-};
-
-struct ManifestRecord {
-    ManifestItems items;
-    static constexpr const DERItemSpec* specs = DEREncodeSysConfig3ManifestItemSpecs;
-    static constexpr std::uint16_t count = DEREncodeSysConfig3ManifestItemSpecs_count;
-
-    explicit ManifestRecord(const __SysConfig3ManifestEntry& manifest)
-        : items{itemOf(manifest.payloadHMAC), itemOf(manifest.metadataHMAC), itemOf(manifest.fullHMAC)} {}
-};
-
-constexpr char encoding[] = "bool encodeSysConfig3(const struct __SysConfig3 *__single, SysConfigData *__single)";
-
-// The buffer of the blob, filled from the front.
+// What is left of the blob's buffer, which is filled from the front.
 struct Output {
-    BytesPtr bytes;
-    std::uint64_t size = 0;
-    std::uint64_t used = 0;
+    std::uint8_t* next;
+    std::uint64_t left;
 
-    std::uint8_t* next() const { return bytes.get() + used; }
-    std::uint64_t left() const { return size - used; }
+    // Passes on the result of an encoder that has written that many octets.
+    DERReturn advance(std::uint64_t written, DERReturn result) {
+        next += written;
+        left -= written;
+        return result;
+    }
 };
 
-template <typename Record>
-DERReturn measure(const Record& record, std::uint64_t* length) {
-    return DERLengthOfEncodedSequenceFromObject(DERTagSequence, &record.items, sizeof record.items, record.count,
-                                                record.specs, length);
+template <typename Items, std::size_t count>
+DERReturn measure(const Items& items, const std::array<DERItemSpec, count>& rows, std::uint64_t* length) {
+    return DERLengthOfEncodedSequenceFromObject(DERTagSequence, &items, sizeof items, count, rows.data(), length);
 }
 
-template <typename Record>
-DERReturn write(const Record& record, Output* output) {
+template <typename Items, std::size_t count>
+DERReturn write(const Items& items, const std::array<DERItemSpec, count>& rows, Output* output) {
     std::uint64_t written = 0;
-    const DERReturn result =
-        DEREncodeSequenceFromObject(DERTagSequence, &record.items, sizeof record.items, record.count, record.specs,
-                                    output->next(), output->left(), &written);
-    output->used += written;
-    return result;
+    const DERReturn result = DEREncodeSequenceFromObject(DERTagSequence, &items, sizeof items, count, rows.data(),
+                                                         output->next, output->left, &written);
+    return output->advance(written, result);
 }
 
-DERReturn writeInteger(const Octets4& value, Output* output) {
+DERReturn writeInteger(std::uint32_t value, Output* output) {
+    const Octets4 content = octetsOf(value);
     std::uint64_t written = 0;
     const DERReturn result =
-        DEREncodeItemSized(DERTagInteger, sizeof value.octets, value.octets, output->next(), output->left(), &written);
-    output->used += written;
-    return result;
+        DEREncodeItemSized(DERTagInteger, sizeof content.octets, content.octets, output->next, output->left, &written);
+    return output->advance(written, result);
 }
 
 DERReturn writeHeader(DERTag tag, std::uint64_t contentLength, Output* output) {
     std::uint64_t written = 0;
-    const DERReturn result = DEREncodeHeaderSized(tag, contentLength, output->next(), output->left(), &written);
-    output->used += written;
-    return result;
+    const DERReturn result = DEREncodeHeaderSized(tag, contentLength, output->next, output->left, &written);
+    return output->advance(written, result);
 }
 
 // What the two lists differ in is how they are reported.
@@ -217,62 +161,48 @@ bool hasValue(const __SysConfig3MetadataEntry& entry) {
     return false;
 }
 
-void reportEntryFailure(const PayloadRecord&, DERReturn result) {
-    logHook()(messageLevel, "Failed to encode payload entry sequence with return: %d", static_cast<int>(result));
+constexpr char wholeFailure[] = "Failed to encode sequence with return: %d";
+constexpr char payloadFailure[] = "Failed to encode payload sequence with return: %d";
+constexpr char manifestFailure[] = "Failed to encode manifest sequence with return: %d";
+
+const char* failureOf(const __SysConfig3PayloadEntry&) {
+    return "Failed to encode payload entry sequence with return: %d";
 }
 
-void reportEntryFailure(const MetadataRecord&, DERReturn result) {
-    logHook()(messageLevel, "Failed to encode metadata entry sequence with return: %d", static_cast<int>(result));
+const char* failureOf(const __SysConfig3MetadataEntry&) {
+    return "Failed to encode metadata entry sequence with return: %d";
+}
+
+// Whether the result is success. Reports another one.
+bool succeeded(DERReturn result, const char* failure) {
+    if (result != DERSuccess)
+        logHook()(messageLevel, failure, static_cast<int>(result));
+    return result == DERSuccess;
 }
 
 // Adds up the encodings of a list's entries, all of them even when one fails. False, after reporting it, when an entry
 // cannot be written.
-template <typename Record, typename Entry>
+template <typename Entry>
 bool measureEntries(const Entry* first, std::uint64_t* contentLength) {
     bool complete = true;
     for (const Entry* entry = first; entry != nullptr; entry = entry->next) {
         if (!hasValue(*entry))
             return false;
-        const Record record(*entry);
         std::uint64_t length = 0;
-        if (const DERReturn result = measure(record, &length); result != DERSuccess) {
-            reportEntryFailure(record, result);
-            complete = false;
-        }
+        const auto job = [&](const auto& items, const auto& rows) { return measure(items, rows, &length); };
+        complete = succeeded(withItems(*entry, job), failureOf(*entry)) && complete;
         *contentLength += length;
     }
     return complete;
 }
 
-template <typename Record, typename Entry>
+template <typename Entry>
 bool writeEntries(const Entry* first, Output* output) {
+    const auto job = [&](const auto& items, const auto& rows) { return write(items, rows, output); };
     bool complete = true;
-    for (const Entry* entry = first; entry != nullptr; entry = entry->next) {
-        const Record record(*entry);
-        if (const DERReturn result = write(record, output); result != DERSuccess) {
-            reportEntryFailure(record, result);
-            complete = false;
-        }
-    }
+    for (const Entry* entry = first; entry != nullptr; entry = entry->next)
+        complete = succeeded(withItems(*entry, job), failureOf(*entry)) && complete;
     return complete;
-}
-
-bool reportManifest(DERReturn result) {
-    if (result != DERSuccess)
-        logHook()(messageLevel, "Failed to encode manifest sequence with return: %d", static_cast<int>(result));
-    return result == DERSuccess;
-}
-
-bool reportPayload(DERReturn result) {
-    if (result != DERSuccess)
-        logHook()(messageLevel, "Failed to encode payload sequence with return: %d", static_cast<int>(result));
-    return result == DERSuccess;
-}
-
-bool reportWhole(DERReturn result) {
-    if (result != DERSuccess)
-        logHook()(messageLevel, "Failed to encode sequence with return: %d", static_cast<int>(result));
-    return result == DERSuccess;
 }
 
 // The sizes of a blob's parts, from the inside out.
@@ -287,9 +217,10 @@ struct Sizes {
 };
 
 bool measureBlob(const __SysConfig3& object, Sizes* sizes) {
-    if (!measureEntries<PayloadRecord>(object.payload.first, &sizes->payloadEntries) ||
-        !measureEntries<MetadataRecord>(object.metadata.first, &sizes->metadataEntries) ||
-        !reportManifest(measure(ManifestRecord(*object.manifest), &sizes->manifestSequence)))
+    if (!measureEntries(object.payload.first, &sizes->payloadEntries) ||
+        !measureEntries(object.metadata.first, &sizes->metadataEntries) ||
+        !succeeded(measure(itemsOf(*object.manifest), DEREncodeSysConfig3ManifestItemSpecs, &sizes->manifestSequence),
+                   manifestFailure))
         return false;
     sizes->payloadSet = DERLengthOfItem(DERTagSet, sizes->payloadEntries);
     sizes->metadataSet = DERLengthOfItem(DERTagSet, sizes->metadataEntries);
@@ -297,60 +228,41 @@ bool measureBlob(const __SysConfig3& object, Sizes* sizes) {
                      DERLengthOfItem(payloadTag, sizes->payloadSet) + DERLengthOfItem(metadataTag, sizes->metadataSet) +
                      DERLengthOfItem(manifestTag, sizes->manifestSequence);
     sizes->whole = DERLengthOfItem(DERTagSequence, sizes->content);
-    return reportWhole(sizes->whole <= UINT32_MAX ? DERSuccess : DERBufferOverflow);
+    return succeeded(sizes->whole <= UINT32_MAX ? DERSuccess : DERBufferOverflow, wholeFailure);
 }
 
-// The elements of the outer SEQUENCE.
-
-bool writeStart(const __SysConfig3& object, const Sizes& sizes, Output* output) {
-    DERReturn result = writeHeader(DERTagSequence, sizes.content, output);
-    if (result == DERSuccess)
-        result = writeInteger(octetsOf(object.magic), output);
-    if (result == DERSuccess)
-        result = writeInteger(octetsOf(object.version), output);
-    return reportWhole(result);
-}
-
-bool writePayload(const __SysConfig3& object, const Sizes& sizes, Output* output) {
-    return reportWhole(writeHeader(payloadTag, sizes.payloadSet, output)) &&
-           reportPayload(writeHeader(DERTagSet, sizes.payloadEntries, output)) &&
-           writeEntries<PayloadRecord>(object.payload.first, output);
-}
-
-bool writeMetadata(const __SysConfig3& object, const Sizes& sizes, Output* output) {
-    return reportWhole(writeHeader(metadataTag, sizes.metadataSet, output)) &&
+bool writeBlob(const __SysConfig3& object, const Sizes& sizes, Output* output) {
+    return succeeded(writeHeader(DERTagSequence, sizes.content, output), wholeFailure) &&
+           succeeded(writeInteger(object.magic, output), wholeFailure) &&
+           succeeded(writeInteger(object.version, output), wholeFailure) &&
+           succeeded(writeHeader(payloadTag, sizes.payloadSet, output), wholeFailure) &&
+           succeeded(writeHeader(DERTagSet, sizes.payloadEntries, output), payloadFailure) &&
+           writeEntries(object.payload.first, output) &&
+           succeeded(writeHeader(metadataTag, sizes.metadataSet, output), wholeFailure) &&
            writeHeader(DERTagSet, sizes.metadataEntries, output) == DERSuccess &&
-           writeEntries<MetadataRecord>(object.metadata.first, output);
-}
-
-bool writeManifest(const __SysConfig3& object, const Sizes& sizes, Output* output) {
-    return reportWhole(writeHeader(manifestTag, sizes.manifestSequence, output)) &&
-           reportManifest(write(ManifestRecord(*object.manifest), output));
+           writeEntries(object.metadata.first, output) &&
+           succeeded(writeHeader(manifestTag, sizes.manifestSequence, output), wholeFailure) &&
+           succeeded(write(itemsOf(*object.manifest), DEREncodeSysConfig3ManifestItemSpecs, output), manifestFailure);
 }
 
 } // namespace
 
 bool encodeSysConfig3(const __SysConfig3* object, SysConfigData* out) {
+    constexpr char operation[] = "bool encodeSysConfig3(const struct __SysConfig3 *__single, SysConfigData *__single)";
     if (object == nullptr || out == nullptr) {
-        logHook()(messageLevel, "%s Invalid arguments. sysconfig = %p, sData = %p", encoding,
+        logHook()(messageLevel, "%s Invalid arguments. sysconfig = %p, sData = %p", operation,
                   static_cast<const void*>(object), static_cast<const void*>(out));
         return false;
     }
-    if (!hasNoStaleHMAC(object, encoding))
-        return false;
     Sizes sizes;
-    if (!measureBlob(*object, &sizes))
+    if (!hasNoStaleHMAC(object, operation) || !measureBlob(*object, &sizes))
         return false;
-    Output output;
-    output.size = sizes.whole;
-    output.bytes.reset(static_cast<std::uint8_t*>(std::malloc(static_cast<std::size_t>(output.size))));
-    if (output.bytes == nullptr) {
-        logHook()(messageLevel, "%s malloc failed.", encoding);
+    BytesPtr blob(static_cast<std::uint8_t*>(std::malloc(static_cast<std::size_t>(sizes.whole))));
+    if (blob == nullptr)
+        return logHook()(messageLevel, "%s malloc failed.", operation), false;
+    Output output = {blob.get(), sizes.whole};
+    if (!writeBlob(*object, sizes, &output))
         return false;
-    }
-    if (!writeStart(*object, sizes, &output) || !writePayload(*object, sizes, &output) ||
-        !writeMetadata(*object, sizes, &output) || !writeManifest(*object, sizes, &output))
-        return false;
-    *out = {output.bytes.release(), static_cast<std::uint32_t>(output.used)};
+    *out = {blob.release(), static_cast<std::uint32_t>(sizes.whole)};
     return true;
 }

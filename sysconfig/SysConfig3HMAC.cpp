@@ -6,23 +6,9 @@ namespace {
 
 using namespace sysconfig;
 
-void payloadStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
-    _updatePayloadHMAC(object->payload.first, context);
-}
-
-void metadataStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
-    _updateMetadataHMAC(object->metadata.first, context);
-}
-
-void fullStream(const __SysConfig3* object, crypto::HMACSHA256* context) {
-    payloadStream(object, context);
-    metadataStream(object, context);
-}
-
-// One of the three HMACs of an object: the stream that it covers, its place in the manifest, the operation that creates
-// it, and the formats of two messages.
+// One of the three HMACs of an object: its place in the manifest, the operation that creates it, and the formats of two
+// messages.
 struct Kind {
-    void (*feedStream)(const __SysConfig3* object, crypto::HMACSHA256* context);
     SysConfigData __SysConfig3ManifestEntry::*stored;
     const char* creation;
     const char* noKey;
@@ -30,44 +16,39 @@ struct Kind {
 };
 
 constexpr Kind payloadKind = {
-    payloadStream, &__SysConfig3ManifestEntry::payloadHMAC,
+    &__SysConfig3ManifestEntry::payloadHMAC,
     "bool sysConfig3CreatePayloadHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)",
     "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
     "%s Payload HMAC does not match."};
 constexpr Kind metadataKind = {
-    metadataStream, &__SysConfig3ManifestEntry::metadataHMAC,
+    &__SysConfig3ManifestEntry::metadataHMAC,
     "bool sysConfig3CreateMetadataHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)",
-    "%s Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-    "%s Metadata HMAC does not match."};
+    payloadKind.noKey, "%s Metadata HMAC does not match."};
 constexpr Kind fullKind = {
-    fullStream, &__SysConfig3ManifestEntry::fullHMAC,
+    &__SysConfig3ManifestEntry::fullHMAC,
     "bool sysConfig3CreateFullHMAC(const struct __SysConfig3 *__single, SysConfigData *__single)",
     "%s Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
     "%s Full HMAC does not match."};
 constexpr const Kind* kinds[] = {&payloadKind, &metadataKind, &fullKind};
 
-bool hasKey(const __SysConfig3* object) {
-    return object->hmacKey.data != nullptr && object->hmacKey.length > 0;
-}
-
-const void* keyAddress(const __SysConfig3* object) {
+// The address of the key, for messages.
+const void* keyOf(const __SysConfig3* object) {
     return object->hmacKey.data;
 }
 
 // On running out of memory out->data is null and out->length the length that it would have.
 bool createHMAC(const __SysConfig3* object, const Kind& kind, SysConfigData* out) {
-    if (!hasKey(object)) {
-        logHook()(messageLevel, kind.noKey, kind.creation, keyAddress(object), object->hmacKey.length);
-        return false;
-    }
-    if (out == nullptr) {
-        logHook()(messageLevel, "%s hmac is NULL", kind.creation);
-        return false;
-    }
+    if (keyOf(object) == nullptr)
+        return logHook()(messageLevel, kind.noKey, kind.creation, keyOf(object), object->hmacKey.length), false;
+    if (out == nullptr)
+        return logHook()(messageLevel, "%s hmac is NULL", kind.creation), false;
     crypto::HMACSHA256 context;
     std::uint8_t result[crypto::sha256Size];
     context.init(object->hmacKey.data, object->hmacKey.length);
-    kind.feedStream(object, &context);
+    if (&kind != &metadataKind)
+        _updatePayloadHMAC(object->payload.first, &context);
+    if (&kind != &payloadKind)
+        _updateMetadataHMAC(object->metadata.first, &context);
     *out = {static_cast<std::uint8_t*>(std::malloc(sizeof result)), sizeof result};
     if (out->data != nullptr && context.final(result)) {
         std::memcpy(out->data, result, sizeof result);
@@ -99,31 +80,28 @@ bool matches(const __SysConfig3* object, const Kind& kind) {
     return equal;
 }
 
-// Recomputes the HMACs that cover a list, where the version has them.
-void listHasChanged(__SysConfig3* object, const Kind& list) {
-    if (!sysConfig3HMACIsSupported(object->version))
-        return;
-    replaceHMAC(object, list);
-    replaceHMAC(object, fullKind);
+bool listHasChanged(__SysConfig3* object, const Kind& list) {
+    if (sysConfig3HMACIsSupported(object->version)) {
+        replaceHMAC(object, list);
+        replaceHMAC(object, fullKind);
+    }
+    return true;
 }
 
-void feed(crypto::HMACSHA256* context, std::string_view text) {
-    if (!text.empty())
-        context->update(text.data(), text.size());
-}
-
-void feed(crypto::HMACSHA256* context, Bytes data) {
-    if (data.length > 0)
-        context->update(data.data, data.length);
+template <typename Entry>
+void feedParts(crypto::HMACSHA256* context, const Entry& entry) {
+    const std::string_view lead = leadOf(entry), string = stringOf(entry);
+    const Bytes data = dataOf(entry);
+    context->update(lead.data(), lead.size());
+    context->update(string.data(), string.size());
+    context->update(data.data, data.length);
 }
 
 } // namespace
 
 void sysconfig::releaseSecret(SysConfigData* secret) {
     if (secret->data != nullptr) {
-        std::memset(secret->data, 0, secret->length);
-        // Keeps the compiler from leaving out the clearing of memory that is released next.
-        __asm__ __volatile__("" : : "r"(secret->data) : "memory");
+        explicit_bzero(secret->data, secret->length);
         std::free(secret->data);
     }
     *secret = {};
@@ -136,30 +114,25 @@ bool sysconfig::hasNoStaleHMAC(const __SysConfig3* object, const char* operation
     return false;
 }
 
-void sysconfig::payloadHasChanged(__SysConfig3* object) {
-    listHasChanged(object, payloadKind);
+bool sysconfig::payloadHasChanged(__SysConfig3* object) {
+    return listHasChanged(object, payloadKind);
 }
 
-void sysconfig::metadataHasChanged(__SysConfig3* object) {
-    listHasChanged(object, metadataKind);
+bool sysconfig::metadataHasChanged(__SysConfig3* object) {
+    return listHasChanged(object, metadataKind);
 }
 
 void _updatePayloadHMAC(const __SysConfig3PayloadEntry* first, crypto::HMACSHA256* context) {
     for (const __SysConfig3PayloadEntry* entry = first; entry != nullptr; entry = entry->next) {
         const Octets4 key = octetsOf(entry->key);
         context->update(key.octets, sizeof key.octets);
-        feed(context, commentOf(*entry));
-        feed(context, stringOf(*entry));
-        feed(context, dataOf(*entry));
+        feedParts(context, *entry);
     }
 }
 
 void _updateMetadataHMAC(const __SysConfig3MetadataEntry* first, crypto::HMACSHA256* context) {
-    for (const __SysConfig3MetadataEntry* entry = first; entry != nullptr; entry = entry->next) {
-        feed(context, keyOf(*entry));
-        feed(context, stringOf(*entry));
-        feed(context, dataOf(*entry));
-    }
+    for (const __SysConfig3MetadataEntry* entry = first; entry != nullptr; entry = entry->next)
+        feedParts(context, *entry);
 }
 
 bool sysConfig3HMACIsSupported(SysConfig3Version version) {
@@ -168,18 +141,14 @@ bool sysConfig3HMACIsSupported(SysConfig3Version version) {
 
 bool sysConfig3SetHMACKey(__SysConfig3* object, SysConfigData key) {
     constexpr char operation[] = "bool sysConfig3SetHMACKey(struct __SysConfig3 *__single, SysConfigData)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
-        return false;
-    }
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s sysconfig is NULL.", operation), false;
     releaseSecret(&object->hmacKey);
     if (key.data == nullptr || key.length == 0)
         return true;
     auto* const copy = static_cast<std::uint8_t*>(std::malloc(key.length));
-    if (copy == nullptr) {
-        logHook()(messageLevel, "%s malloc() returned NULL.", operation);
-        return false;
-    }
+    if (copy == nullptr)
+        return logHook()(messageLevel, "%s malloc() returned NULL.", operation), false;
     std::memcpy(copy, key.data, key.length);
     object->hmacKey = {copy, key.length};
     return true;
@@ -193,10 +162,8 @@ __SysConfig3* allocSysConfig3WithHMACKey(SysConfig3Magic magic, SysConfig3Versio
         return nullptr;
     }
     __SysConfig3* const object = allocSysConfig3(magic, version);
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s Failed to allocate sysconfig.", operation);
-        return nullptr;
-    }
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s Failed to allocate sysconfig.", operation), nullptr;
     if (!sysConfig3SetHMACKey(object, key))
         logHook()(messageLevel, "%s Failed to set HMAC key.", operation);
     else if (!sysConfig3UpdateHMAC(object))
@@ -224,10 +191,8 @@ bool sysConfig3CreateFullHMAC(const __SysConfig3* object, SysConfigData* out) {
 
 bool sysConfig3UpdateHMAC(__SysConfig3* object) {
     constexpr char operation[] = "bool sysConfig3UpdateHMAC(struct __SysConfig3 *__single)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
-        return false;
-    }
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s sysconfig is NULL.", operation), false;
     if (!sysConfig3HMACIsSupported(object->version)) {
         logHook()(messageLevel, "%s This SysConfig version (0x%X) does not support HMAC.", operation, object->version);
         return false;
@@ -240,15 +205,13 @@ bool sysConfig3UpdateHMAC(__SysConfig3* object) {
 
 bool sysConfig3IsValidHMAC(const __SysConfig3* object) {
     constexpr char operation[] = "bool sysConfig3IsValidHMAC(const struct __SysConfig3 *__single)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s sysconfig is NULL.", operation);
-        return false;
-    }
-    if (!hasKey(object)) {
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s sysconfig is NULL.", operation), false;
+    if (keyOf(object) == nullptr) {
         logHook()(messageLevel,
                   "Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %d. Did you register "
                   "HMAC key?",
-                  keyAddress(object), static_cast<int>(object->hmacKey.length));
+                  keyOf(object), static_cast<int>(object->hmacKey.length));
         return false;
     }
     bool valid = true;

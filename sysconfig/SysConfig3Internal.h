@@ -22,31 +22,28 @@ struct __SysConfig3PayloadEntry {
     __SysConfig3PayloadEntry* next;
     __SysConfig3PayloadEntry* previous;
     __SysConfig3PayloadEntry* bucketNext;
-    std::uint32_t key;
-    std::uint32_t commentLength;
+    // Of the text that every entry of the kind has: here the comment.
+    std::uint32_t leadLength;
     // sysconfig::noString when the entry has no string.
     std::uint32_t stringLength;
     // 0 when the entry has no data.
     std::uint32_t dataLength;
+    std::uint32_t key;
     // The content octet of a DER BOOLEAN: 0x00 or 0xFF.
     std::uint8_t deleted;
 
     std::uint32_t indexKey() const { return key; }
-    std::uint32_t indexHash(const sysconfig::HashSeed& seed) const { return sysconfig::hashOf(seed, key); }
 };
 
 struct __SysConfig3MetadataEntry {
     __SysConfig3MetadataEntry* next;
     __SysConfig3MetadataEntry* previous;
     __SysConfig3MetadataEntry* bucketNext;
-    std::uint32_t keyLength;
+    std::uint32_t leadLength; // of the key
     std::uint32_t stringLength;
     std::uint32_t dataLength;
-    // Kept so that the index grows without hashing every key again. Set when the entry enters a list.
-    std::uint32_t hash;
 
-    std::string_view indexKey() const { return {reinterpret_cast<const char*>(this + 1), keyLength}; }
-    std::uint32_t indexHash(const sysconfig::HashSeed&) const { return hash; }
+    std::string_view indexKey() const { return {reinterpret_cast<const char*>(this + 1), leadLength}; }
 };
 
 // The HMACs own their bytes.
@@ -71,7 +68,7 @@ struct __SysConfig3 {
     sysconfig::MetadataList metadata;
     __SysConfig3ManifestEntry* manifest;
     SysConfigData hmacKey;
-    sysconfig::HashSeed seed;
+    sysconfig::HashSecret secret;
 };
 
 namespace sysconfig {
@@ -94,26 +91,9 @@ struct Bytes {
 
 // The parts of an entry. An absent text has null data.
 
-// The text that every entry of the kind has.
-inline std::uint32_t leadLengthOf(const __SysConfig3PayloadEntry& entry) {
-    return entry.commentLength;
-}
-
-inline std::uint32_t leadLengthOf(const __SysConfig3MetadataEntry& entry) {
-    return entry.keyLength;
-}
-
 template <typename Entry>
 std::string_view leadOf(const Entry& entry) {
-    return {reinterpret_cast<const char*>(&entry + 1), leadLengthOf(entry)};
-}
-
-inline std::string_view commentOf(const __SysConfig3PayloadEntry& entry) {
-    return leadOf(entry);
-}
-
-inline std::string_view keyOf(const __SysConfig3MetadataEntry& entry) {
-    return leadOf(entry);
+    return {reinterpret_cast<const char*>(&entry + 1), entry.leadLength};
 }
 
 template <typename Entry>
@@ -126,7 +106,7 @@ std::string_view stringOf(const Entry& entry) {
 template <typename Entry>
 std::size_t sizeOfTexts(const Entry& entry) {
     const std::size_t stringSize = entry.stringLength == noString ? 0 : std::size_t{entry.stringLength} + 1;
-    return std::size_t{leadLengthOf(entry)} + 1 + stringSize;
+    return std::size_t{entry.leadLength} + 1 + stringSize;
 }
 
 template <typename Entry>
@@ -149,7 +129,7 @@ bool viewData(const Entry& entry, SysConfigData* out) {
 // Whether texts and data are the same.
 template <typename Entry>
 bool sameParts(const Entry& a, const Entry& b) {
-    return leadLengthOf(a) == leadLengthOf(b) && a.stringLength == b.stringLength && a.dataLength == b.dataLength &&
+    return a.leadLength == b.leadLength && a.stringLength == b.stringLength && a.dataLength == b.dataLength &&
            std::memcmp(&a + 1, &b + 1, sizeOfTexts(a) + a.dataLength) == 0;
 }
 
@@ -196,8 +176,8 @@ bool isValidContent(const MetadataContent& content);
 __SysConfig3PayloadEntry* makeEntry(const PayloadContent& content);
 __SysConfig3MetadataEntry* makeEntry(const MetadataContent& content);
 
-// Allocates a zeroed entry with the given parts behind it and their lengths set, except that of `lead`. Null, after
-// reporting it for `operation`, when memory is lacking.
+// Allocates a zeroed entry with the given parts behind it and their lengths set. Null, after reporting it for
+// `operation`, when memory is lacking.
 template <typename Entry>
 Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, const char* operation) {
     const bool hasString = string.data() != nullptr;
@@ -205,11 +185,10 @@ Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, co
         std::uint64_t{sizeof(Entry)} + lead.size() + 1 + (hasString ? string.size() + 1 : 0) + data.length;
     auto* const entry =
         size <= PTRDIFF_MAX ? static_cast<Entry*>(std::malloc(static_cast<std::size_t>(size))) : nullptr;
-    if (entry == nullptr) {
-        logHook()(messageLevel, "%s malloc failed.", operation);
-        return nullptr;
-    }
+    if (entry == nullptr)
+        return logHook()(messageLevel, "%s malloc failed.", operation), nullptr;
     *entry = {};
+    entry->leadLength = static_cast<std::uint32_t>(lead.size());
     auto* out = reinterpret_cast<char*>(entry + 1);
     out = std::copy(lead.begin(), lead.end(), out);
     *out++ = '\0';
@@ -224,9 +203,26 @@ Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, co
     return entry;
 }
 
+// Changing the lists
+
+// Adds an entry, null for none, and releases it when that fails. False, after reporting for `operation` that memory is
+// lacking if it is.
+template <typename List, typename Entry>
+bool addTo(List* list, Entry* entry, const HashSecret& secret, const char* operation) {
+    if (entry == nullptr || list->add(entry, secret))
+        return entry != nullptr;
+    logHook()(messageLevel, "%s malloc failed.", operation);
+    std::free(entry);
+    return false;
+}
+
+// Report that there is no entry to add.
+void reportNoPayloadEntry();
+void reportNoMetadataEntry();
+
 // Manifests
 
-// Installs a new manifest of the object's version with copies of the HMACs. False when memory is lacking.
+// Gives the object a new manifest of its version with copies of the HMACs. False when memory is lacking.
 bool installManifest(__SysConfig3* object, const SysConfigData& payloadHMAC, const SysConfigData& metadataHMAC,
                      const SysConfigData& fullHMAC);
 
@@ -235,9 +231,9 @@ bool installManifest(__SysConfig3* object, const SysConfigData& payloadHMAC, con
 // True when the object's version has no HMACs or they are valid. Otherwise reports it for `operation`.
 bool hasNoStaleHMAC(const __SysConfig3* object, const char* operation);
 
-// Recompute the HMACs that cover the list, where the version has them.
-void payloadHasChanged(__SysConfig3* object);
-void metadataHasChanged(__SysConfig3* object);
+// Recompute the HMACs that cover the list, where the version has them. True, whatever comes of that: the change stands.
+bool payloadHasChanged(__SysConfig3* object);
+bool metadataHasChanged(__SysConfig3* object);
 
 // Overwrites and releases the bytes of a key and leaves it absent.
 void releaseSecret(SysConfigData* secret);

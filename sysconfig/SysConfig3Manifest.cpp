@@ -23,10 +23,8 @@ bool copyIfPresent(const SysConfigData& source, SysConfigData* destination) {
 
 bool viewHMAC(const __SysConfig3ManifestEntry* manifest, SysConfigData __SysConfig3ManifestEntry::*hmac,
               SysConfigData* out, const char* operation) {
-    if (manifest == nullptr || out == nullptr) {
-        logHook()(messageLevel, "%s invalid arguments. entry and data cannot be null", operation);
-        return false;
-    }
+    if (manifest == nullptr || out == nullptr)
+        return logHook()(messageLevel, "%s invalid arguments. entry and data cannot be null", operation), false;
     *out = manifest->*hmac;
     return true;
 }
@@ -37,9 +35,11 @@ bool sysconfig::installManifest(__SysConfig3* object, const SysConfigData& paylo
                                 const SysConfigData& metadataHMAC, const SysConfigData& fullHMAC) {
     __SysConfig3ManifestEntry* const manifest =
         allocSysConfig3Manifest(object->version, &payloadHMAC, &metadataHMAC, &fullHMAC);
-    const bool installed = manifest != nullptr && _sysConfig3SetManifest(object, manifest);
-    deallocSysConfig3Manifest(manifest);
-    return installed;
+    if (manifest == nullptr)
+        return false;
+    deallocSysConfig3Manifest(object->manifest);
+    object->manifest = manifest;
+    return true;
 }
 
 std::string_view sysconfig::viewOf(const char* text, std::size_t maximum) {
@@ -51,25 +51,19 @@ std::string_view sysconfig::viewOf(const char* text, std::size_t maximum) {
 
 std::uint8_t* _allocAndCopyData(const std::uint8_t* source, std::uint32_t length) {
     constexpr char operation[] = "uint8_t *__single_allocAndCopyData(const uint8_t *, uint32_t)";
-    if (source == nullptr || length == 0) {
-        logHook()(messageLevel, "%s data was zero length", operation);
-        return nullptr;
-    }
+    if (source == nullptr || length == 0)
+        return logHook()(messageLevel, "%s data was zero length", operation), nullptr;
     auto* const copy = static_cast<std::uint8_t*>(std::malloc(length));
-    if (copy == nullptr) {
-        logHook()(messageLevel, "%s malloc failed.", operation);
-        return nullptr;
-    }
+    if (copy == nullptr)
+        return logHook()(messageLevel, "%s malloc failed.", operation), nullptr;
     std::memcpy(copy, source, length);
     return copy;
 }
 
 bool _copySysConfigData(const SysConfigData* source, SysConfigData* destination) {
     constexpr char operation[] = "bool _copySysConfigData(const SysConfigData *__single, SysConfigData *__single)";
-    if (source == nullptr || destination == nullptr) {
-        logHook()(messageLevel, "%s sourceData or destData was NULL", operation);
-        return false;
-    }
+    if (source == nullptr || destination == nullptr)
+        return logHook()(messageLevel, "%s sourceData or destData was NULL", operation), false;
     if (!isPresent(*source)) {
         *destination = {};
         logHook()(messageLevel, "%s sourceData was 0 length", operation);
@@ -94,10 +88,8 @@ __SysConfig3ManifestEntry* allocSysConfig3Manifest(SysConfig3Version version, co
         return nullptr;
     }
     auto* const manifest = static_cast<__SysConfig3ManifestEntry*>(std::calloc(1, sizeof(__SysConfig3ManifestEntry)));
-    if (manifest == nullptr) {
-        logHook()(messageLevel, "%s malloc failed.", operation);
-        return nullptr;
-    }
+    if (manifest == nullptr)
+        return logHook()(messageLevel, "%s malloc failed.", operation), nullptr;
     manifest->version = version;
     if (copyIfPresent(*payloadHMAC, &manifest->payloadHMAC) && copyIfPresent(*metadataHMAC, &manifest->metadataHMAC) &&
         copyIfPresent(*fullHMAC, &manifest->fullHMAC))
@@ -135,21 +127,14 @@ bool _sysConfig3SetManifest(__SysConfig3* object, const __SysConfig3ManifestEntr
                   object->version, manifest->version);
         return false;
     }
-    __SysConfig3ManifestEntry* const copy = copySysConfig3Manifest(manifest);
-    if (copy == nullptr)
-        return false;
-    deallocSysConfig3Manifest(object->manifest);
-    object->manifest = copy;
-    return true;
+    return installManifest(object, manifest->payloadHMAC, manifest->metadataHMAC, manifest->fullHMAC);
 }
 
 bool _sysConfig3HMACsAreEqual(SysConfig3Version version, const SysConfigData* a, const SysConfigData* b) {
     constexpr char operation[] = "bool _sysConfig3HMACsAreEqual(SysConfig3Version, const SysConfigData *__single, "
                                  "const SysConfigData *__single)";
-    if (!isSupportedSysConfig3Version(version)) {
-        logHook()(messageLevel, "%s Unsupported sysconfig version: 0x%X", operation, version);
-        return false;
-    }
+    if (!isSupportedSysConfig3Version(version))
+        return logHook()(messageLevel, "%s Unsupported sysconfig version: 0x%X", operation, version), false;
     if (a == nullptr || b == nullptr)
         return false;
     if (a->data == nullptr)

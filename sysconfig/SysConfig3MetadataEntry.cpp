@@ -7,6 +7,8 @@ using namespace sysconfig;
 
 constexpr char allocation[] = "struct __SysConfig3MetadataEntry *__singleallocSysConfig3MetadataEntry(const char *, "
                               "const uint8_t *, uint32_t, const char *)";
+constexpr char addition[] = "bool _sysConfig3AddMetadataEntry(struct __SysConfig3 *__single, const struct "
+                            "__SysConfig3MetadataEntry *__single)";
 
 } // namespace
 
@@ -27,10 +29,7 @@ bool sysconfig::isValidContent(const MetadataContent& content) {
 }
 
 __SysConfig3MetadataEntry* sysconfig::makeEntry(const MetadataContent& content) {
-    auto* const entry = allocEntry<__SysConfig3MetadataEntry>(content.key, content.string, content.data, allocation);
-    if (entry != nullptr)
-        entry->keyLength = static_cast<std::uint32_t>(content.key.size());
-    return entry;
+    return allocEntry<__SysConfig3MetadataEntry>(content.key, content.string, content.data, allocation);
 }
 
 __SysConfig3MetadataEntry* allocSysConfig3MetadataEntry(const char* key, const std::uint8_t* data,
@@ -43,7 +42,7 @@ __SysConfig3MetadataEntry* allocSysConfig3MetadataEntry(const char* key, const s
 __SysConfig3MetadataEntry* copySysConfig3MetadataEntry(const __SysConfig3MetadataEntry* entry) {
     if (entry == nullptr)
         return nullptr;
-    const MetadataContent content = {keyOf(*entry), dataOf(*entry), stringOf(*entry)};
+    const MetadataContent content = {leadOf(*entry), dataOf(*entry), stringOf(*entry)};
     return isValidContent(content) ? makeEntry(content) : nullptr;
 }
 
@@ -58,7 +57,7 @@ bool sysConfig3MetadataEntriesAreEqual(const __SysConfig3MetadataEntry* a, const
 }
 
 const char* sysConfig3MetadataEntryGetKey(const __SysConfig3MetadataEntry* entry) {
-    return entry != nullptr ? keyOf(*entry).data() : nullptr;
+    return entry != nullptr ? leadOf(*entry).data() : nullptr;
 }
 
 const char* sysConfig3MetadataEntryGetString(const __SysConfig3MetadataEntry* entry) {
@@ -73,33 +72,22 @@ const __SysConfig3MetadataEntry* sysConfig3MetadataEntryGetNextEntry(const __Sys
     return entry != nullptr ? entry->next : nullptr;
 }
 
+void sysconfig::reportNoMetadataEntry() {
+    logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", addition);
+}
+
 bool _sysConfig3AddMetadataEntry(__SysConfig3* object, const __SysConfig3MetadataEntry* entry) {
-    constexpr char operation[] = "bool _sysConfig3AddMetadataEntry(struct __SysConfig3 *__single, const struct "
-                                 "__SysConfig3MetadataEntry *__single)";
-    if (object == nullptr || entry == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", operation);
-        return false;
-    }
-    __SysConfig3MetadataEntry* const copy = copySysConfig3MetadataEntry(entry);
-    if (copy == nullptr)
-        return false;
-    copy->hash = hashOf(object->seed, keyOf(*copy));
-    if (object->metadata.add(copy, object->seed))
-        return true;
-    logHook()(messageLevel, "%s malloc failed.", operation);
-    deallocSysConfig3MetadataEntry(copy);
-    return false;
+    if (object == nullptr || entry == nullptr)
+        return reportNoMetadataEntry(), false;
+    return addTo(&object->metadata, copySysConfig3MetadataEntry(entry), object->secret, addition);
 }
 
 bool _sysConfig3DeleteMetadataEntryForKey(__SysConfig3* object, const char* key) {
     constexpr char operation[] =
         "bool _sysConfig3DeleteMetadataEntryForKey(struct __SysConfig3 *__single, const char *)";
-    if (object == nullptr || key == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and key cannot be NULL", operation);
-        return false;
-    }
-    const std::string_view text = viewOf(key, maximumKeyLength);
-    object->metadata.remove(hashOf(object->seed, text), text);
+    if (object == nullptr || key == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig and key cannot be NULL", operation), false;
+    object->metadata.remove(object->secret, viewOf(key, maximumKeyLength));
     return true;
 }
 
@@ -107,39 +95,26 @@ bool sysConfig3AddMetadataEntry(__SysConfig3* object, const __SysConfig3Metadata
     constexpr char operation[] =
         "bool sysConfig3AddMetadataEntry(struct __SysConfig3 *__single, const struct __SysConfig3MetadataEntry "
         "*__single)";
-    if (object == nullptr || entry == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", operation);
-        return false;
-    }
-    if (!hasNoStaleHMAC(object, operation) || !_sysConfig3AddMetadataEntry(object, entry))
-        return false;
-    metadataHasChanged(object);
-    return true;
+    if (object == nullptr || entry == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", operation), false;
+    return hasNoStaleHMAC(object, operation) && _sysConfig3AddMetadataEntry(object, entry) &&
+           metadataHasChanged(object);
 }
 
 bool sysConfig3DeleteMetadataEntryForKey(__SysConfig3* object, const char* key) {
     constexpr char operation[] =
         "bool sysConfig3DeleteMetadataEntryForKey(struct __SysConfig3 *__single, const char *)";
-    if (object == nullptr || key == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and key cannot be NULL", operation);
-        return false;
-    }
-    if (!hasNoStaleHMAC(object, operation) || !_sysConfig3DeleteMetadataEntryForKey(object, key))
-        return false;
-    metadataHasChanged(object);
-    return true;
+    if (object == nullptr || key == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig and key cannot be NULL", operation), false;
+    return hasNoStaleHMAC(object, operation) && _sysConfig3DeleteMetadataEntryForKey(object, key) &&
+           metadataHasChanged(object);
 }
 
 const __SysConfig3MetadataEntry* sysConfig3GetMetadataEntryForKey(const __SysConfig3* object, const char* key) {
     constexpr char operation[] =
         "const struct __SysConfig3MetadataEntry *__singlesysConfig3GetMetadataEntryForKey(const struct __SysConfig3 "
         "*__single, const char *)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation);
-        return nullptr;
-    }
-    if (key == nullptr)
-        return nullptr;
-    const std::string_view text = viewOf(key, maximumKeyLength);
-    return object->metadata.find(hashOf(object->seed, text), text);
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation), nullptr;
+    return key != nullptr ? object->metadata.find(object->secret, viewOf(key, maximumKeyLength)) : nullptr;
 }

@@ -7,6 +7,8 @@ using namespace sysconfig;
 
 constexpr char allocation[] = "struct __SysConfig3PayloadEntry *__single_allocSysConfig3PayloadEntryInternal(uint32_t, "
                               "const char *, const uint8_t *, uint32_t, const char *, bool)";
+constexpr char addition[] = "bool _sysConfig3AddPayloadEntry(struct __SysConfig3 *__single, const struct "
+                            "__SysConfig3PayloadEntry *__single)";
 
 } // namespace
 
@@ -32,11 +34,10 @@ bool sysconfig::isValidContent(const PayloadContent& content) {
 __SysConfig3PayloadEntry* sysconfig::makeEntry(const PayloadContent& content) {
     const std::string_view comment = content.comment.empty() ? "." : content.comment;
     auto* const entry = allocEntry<__SysConfig3PayloadEntry>(comment, content.string, content.data, allocation);
-    if (entry == nullptr)
-        return nullptr;
-    entry->key = content.key;
-    entry->commentLength = static_cast<std::uint32_t>(comment.size());
-    entry->deleted = content.deleted ? trueOctet : falseOctet;
+    if (entry != nullptr) {
+        entry->key = content.key;
+        entry->deleted = content.deleted ? trueOctet : falseOctet;
+    }
     return entry;
 }
 
@@ -65,7 +66,7 @@ __SysConfig3PayloadEntry* allocSysConfig3PayloadEntryDeleted(std::uint32_t key, 
 __SysConfig3PayloadEntry* copySysConfig3PayloadEntry(const __SysConfig3PayloadEntry* entry) {
     if (entry == nullptr)
         return nullptr;
-    const PayloadContent content = {entry->key, commentOf(*entry), dataOf(*entry), stringOf(*entry),
+    const PayloadContent content = {entry->key, leadOf(*entry), dataOf(*entry), stringOf(*entry),
                                     entry->deleted != falseOctet};
     return isValidContent(content) ? makeEntry(content) : nullptr;
 }
@@ -85,7 +86,7 @@ std::uint32_t sysConfig3PayloadEntryGetKey(const __SysConfig3PayloadEntry* entry
 }
 
 const char* sysConfig3PayloadEntryGetComment(const __SysConfig3PayloadEntry* entry) {
-    return entry != nullptr ? commentOf(*entry).data() : nullptr;
+    return entry != nullptr ? leadOf(*entry).data() : nullptr;
 }
 
 bool sysConfig3PayloadEntryGetDeleted(const __SysConfig3PayloadEntry* entry) {
@@ -103,47 +104,34 @@ const __SysConfig3PayloadEntry* sysConfig3PayloadEntryGetNextEntry(const __SysCo
 bool sysConfig3PayloadEntryGetData(const __SysConfig3PayloadEntry* entry, SysConfigData* out) {
     constexpr char operation[] =
         "bool sysConfig3PayloadEntryGetData(const struct __SysConfig3PayloadEntry *__single, SysConfigData *__single)";
-    if (entry == nullptr || out == nullptr) {
-        logHook()(messageLevel, "%s invalid arguments. Either entry or data was NULL", operation);
-        return false;
-    }
+    if (entry == nullptr || out == nullptr)
+        return logHook()(messageLevel, "%s invalid arguments. Either entry or data was NULL", operation), false;
     return viewData(*entry, out);
 }
 
+void sysconfig::reportNoPayloadEntry() {
+    logHook()(messageLevel, "%s invalid argument. sysconfig and etnry cannot be NULL", addition);
+}
+
 bool _sysConfig3AddPayloadEntry(__SysConfig3* object, const __SysConfig3PayloadEntry* entry) {
-    constexpr char operation[] = "bool _sysConfig3AddPayloadEntry(struct __SysConfig3 *__single, const struct "
-                                 "__SysConfig3PayloadEntry *__single)";
-    if (object == nullptr || entry == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and etnry cannot be NULL", operation);
-        return false;
-    }
-    __SysConfig3PayloadEntry* const copy = copySysConfig3PayloadEntry(entry);
-    if (copy == nullptr)
-        return false;
-    if (object->payload.add(copy, object->seed))
-        return true;
-    logHook()(messageLevel, "%s malloc failed.", operation);
-    deallocSysConfig3PayloadEntry(copy);
-    return false;
+    if (object == nullptr || entry == nullptr)
+        return reportNoPayloadEntry(), false;
+    return addTo(&object->payload, copySysConfig3PayloadEntry(entry), object->secret, addition);
 }
 
 bool _sysConfig3DeletePayloadEntryForKey(__SysConfig3* object, std::uint32_t key) {
     constexpr char operation[] = "bool _sysConfig3DeletePayloadEntryForKey(struct __SysConfig3 *__single, uint32_t)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation);
-        return false;
-    }
-    object->payload.remove(hashOf(object->seed, key), key);
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation), false;
+    object->payload.remove(object->secret, key);
     return true;
 }
 
 bool sysConfig3AddPayloadEntry(__SysConfig3* object, const __SysConfig3PayloadEntry* entry) {
     constexpr char operation[] = "bool sysConfig3AddPayloadEntry(struct __SysConfig3 *__single, const struct "
                                  "__SysConfig3PayloadEntry *__single)";
-    if (object == nullptr || entry == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", operation);
-        return false;
-    }
+    if (object == nullptr || entry == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", operation), false;
     if (!hasNoStaleHMAC(object, operation))
         return false;
     if (entry->deleted != falseOctet && object->version < deletedFlagVersion) {
@@ -151,31 +139,22 @@ bool sysConfig3AddPayloadEntry(__SysConfig3* object, const __SysConfig3PayloadEn
                   operation, deletedFlagVersion);
         return false;
     }
-    if (!_sysConfig3AddPayloadEntry(object, entry))
-        return false;
-    payloadHasChanged(object);
-    return true;
+    return _sysConfig3AddPayloadEntry(object, entry) && payloadHasChanged(object);
 }
 
 bool sysConfig3DeletePayloadEntryForKey(__SysConfig3* object, std::uint32_t key) {
     constexpr char operation[] = "bool sysConfig3DeletePayloadEntryForKey(struct __SysConfig3 *__single, uint32_t)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation);
-        return false;
-    }
-    if (!hasNoStaleHMAC(object, operation) || !_sysConfig3DeletePayloadEntryForKey(object, key))
-        return false;
-    payloadHasChanged(object);
-    return true;
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation), false;
+    return hasNoStaleHMAC(object, operation) && _sysConfig3DeletePayloadEntryForKey(object, key) &&
+           payloadHasChanged(object);
 }
 
 const __SysConfig3PayloadEntry* sysConfig3GetPayloadEntryForKey(const __SysConfig3* object, std::uint32_t key) {
     constexpr char operation[] =
         "const struct __SysConfig3PayloadEntry *__singlesysConfig3GetPayloadEntryForKey(const struct __SysConfig3 "
         "*__single, uint32_t)";
-    if (object == nullptr) {
-        logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation);
-        return nullptr;
-    }
-    return object->payload.find(hashOf(object->seed, key), key);
+    if (object == nullptr)
+        return logHook()(messageLevel, "%s invalid argument. sysconfig cannot be NULL", operation), nullptr;
+    return object->payload.find(object->secret, key);
 }

@@ -1,4 +1,4 @@
-// The index of the lists: its hash functions, and what keys of an adversary do to it.
+// The index of the lists: its hash function, and what keys of an adversary do to it.
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -14,7 +14,7 @@ using sysconfig::SysConfig3Ptr;
 
 TEST(SipHash, givesThePublishedValues) {
     // Of the algorithm's reference vectors: key octets 00 to 0F, message octets 00, 01, 02 and so on.
-    constexpr std::uint64_t key[2] = {0x0706050403020100, 0x0F0E0D0C0B0A0908};
+    constexpr sysconfig::HashSecret key = {{0x0706050403020100, 0x0F0E0D0C0B0A0908}};
     const std::pair<std::size_t, std::uint64_t> rows[] = {{0, 0x726FDB47DD0E0E31},
                                                           {1, 0x74F839C593DC67FD},
                                                           {7, 0xAB0200F58B01D137},
@@ -24,7 +24,8 @@ TEST(SipHash, givesThePublishedValues) {
     for (char octet = 0; octet < 15; ++octet)
         message += octet;
     for (const auto& [length, hash] : rows)
-        EXPECT_EQ(sysconfig::sipHash(key, std::string_view(message).substr(0, length)), hash) << length;
+        EXPECT_EQ(sysconfig::hashOf(key, std::string_view(message).substr(0, length)), hash) << length;
+    EXPECT_EQ(sysconfig::hashOf(key, std::uint32_t{0x03020100}), sysconfig::hashOf(key, message.substr(0, 4)));
 }
 
 // The number of entries that looking up every key once would pass.
@@ -87,11 +88,10 @@ TEST(Index, spreadsMetadataKeysToo) {
     EXPECT_LT(costOfAllLookups(object->metadata), 2 * count);
 }
 
-TEST(Index, isSeededForEachObject) {
+TEST(Index, hasASecretOfTheObjectsOwn) {
     const SysConfig3Ptr a = newObject();
     const SysConfig3Ptr b = newObject();
-    EXPECT_NE(sysconfig::hashOf(a->seed, keyWCh0), sysconfig::hashOf(b->seed, keyWCh0));
-    EXPECT_NE(sysconfig::hashOf(a->seed, "key"), sysconfig::hashOf(b->seed, "key"));
+    EXPECT_NE(sysconfig::hashOf(a->secret, keyWCh0), sysconfig::hashOf(b->secret, keyWCh0));
 }
 
 } // namespace
