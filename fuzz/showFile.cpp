@@ -21,7 +21,8 @@ class Nowhere : public std::streambuf {
 void print(const Report& report) {
     Nowhere nowhere;
     std::ostream out(&nowhere);
-    writeJson(out, report.json, report.lists);
+    writeJson(out, report);
+    writeText(out, report);
 }
 
 void check(const Report& report, std::size_t size) {

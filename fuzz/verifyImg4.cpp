@@ -58,7 +58,7 @@ void check(const DERItem& file, const TrustDomain& domain, std::optional<std::ui
     FUZZ_REQUIRE(report.ok == report.problem.empty());
     FUZZ_REQUIRE(report.ok || report.json["problemOffset"] <= file.length);
     std::ostringstream printed;
-    writeJson(printed, report.json, report.lists);
+    writeJson(printed, report);
     for (const std::string& text : {report.text, report.problem})
         FUZZ_REQUIRE(std::all_of(text.begin(), text.end(), isPrintable));
     const std::string step = report.json.value("failedStep", "");

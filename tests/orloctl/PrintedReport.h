@@ -6,11 +6,14 @@
 
 #include "tools/orloctl/Report.h"
 
-// The report with its JSON as a program reads it from what is printed, lists and all.
+// The report with its JSON as a program reads it from what is printed, lists and all, and its text as people do.
 inline Report printed(Report report) {
     std::ostringstream out;
-    writeJson(out, report.json, report.lists);
+    std::ostringstream text;
+    writeJson(out, report);
+    writeText(text, report);
     report.json = nlohmann::ordered_json::parse(out.str());
+    report.text = text.str();
     return report;
 }
 

@@ -93,7 +93,7 @@ TEST(ShowDer, spellsTagsAndValues) {
     EXPECT_EQ(items[9]["tag"], "context [2]");
     EXPECT_EQ(items[10]["value"], "9007199254740993") << "no double holds it";
     EXPECT_NE(report.text.find("private \"sepi\"\n"), std::string::npos) << report.text;
-    EXPECT_NE(report.text.find("IA5String \"a\"b\\x5c\\x0a\"\n"), std::string::npos) << report.text;
+    EXPECT_NE(report.text.find("IA5String a\"b\\x5c\\x0a\n"), std::string::npos) << report.text;
     EXPECT_EQ(report.text.find(items[6]["value"].get<std::string>()), std::string::npos) << "shortened";
 }
 
@@ -165,7 +165,7 @@ TEST(ShowDer, boundsDepthAndNumber) {
     const Report wide = show(many);
     EXPECT_TRUE(wide.ok);
     EXPECT_EQ(wide.json["items"].size(), 60000U);
-    EXPECT_NE(wide.text.find("50000 further items are not shown"), std::string::npos);
+    EXPECT_NE(wide.text.find("... and 50000 more\n"), std::string::npos);
     many.push_back(0x05);
     EXPECT_FALSE(show(many).ok) << "items that are not shown are checked all the same";
 }

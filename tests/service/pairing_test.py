@@ -336,21 +336,19 @@ class CrashLogs(unittest.TestCase):
 
     def test_the_list_for_people(self):
         crash_logs = [BIN / "orloctl", "crash-logs"]
-        self.assertEqual(self.service.run(*crash_logs).stdout, "The device keeps no crash logs.\n")
+        self.assertEqual(self.service.run(*crash_logs).stdout, "status: 45\nlogs: none\n")
         self.assertEqual(self.service.run(*crash_logs, "-o", self.service.root / "copies").returncode, 0)
         (self.logs / "a\n.log").write_bytes(b"x" * 1000)
         os.utime(self.logs / "a\n.log", (0, 1_700_000_000))
         self.assertEqual(
             self.service.run(*crash_logs).stdout,
-            "DATE                  NAME                               SIZE  PANIC\n"
-            "2023-11-14T22:13:20Z  /private/var/logs/a\\n.log          1000  no\n",
+            "status: 0\nlogs:\n  DATE                          SIZE  PANIC  NAME\n"
+            "  2023-11-14T22:13:20Z          1000  false  /private/var/logs/a\\n.log\n",
         )
         (self.service.root / "copies/a\n.log").mkdir()
         done = self.service.run(*crash_logs, "-o", self.service.root / "copies", stderr=subprocess.PIPE)
-        lines = done.stdout.splitlines()
-        self.assertEqual((done.returncode, len(lines)), (2, 4), done)
-        self.assertTrue(lines[2].startswith("/private/var/logs/a\\n.log: not copied to "), lines[2])
-        self.assertEqual(lines[3], f"0 copied to {self.service.root}/copies")
+        self.assertEqual((done.returncode, len(done.stdout.splitlines())), (2, 4), done)
+        self.assertIn("/private/var/logs/a\\n.log  not copied to ", done.stdout)
         self.assertTrue(done.stderr.startswith("orloctl: Not all logs were copied to "), done.stderr)
 
     def test_a_device_without_logs_is_a_success(self):

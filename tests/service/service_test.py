@@ -360,7 +360,7 @@ class Client(ServiceTest):
         done = subprocess.run([BIN / "orloctl", "set-bcfg", "/blobs/holds-WCh0.bin", "-o", "-"],
                               env=self.service.environment, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
         self.assertEqual(done.stdout, self.read(RESULT))
-        self.assertTrue(done.stderr.startswith(b"setGlobalbCfg: success"))
+        self.assertTrue(done.stderr.startswith(b"response:\n  name: setGlobalbCfg\n  statusCode: 0\n"))
         (self.service.root / "link").symlink_to(copy)
         for target in ("link", "blobs", "missing/copy"):
             status, answer = self.service.orloctl("set-bcfg", "/blobs/holds-WCh0.bin", "-o", self.service.root / target)

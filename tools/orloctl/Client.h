@@ -9,16 +9,7 @@
 #include <sys/types.h>
 
 #include "platform/Value.h"
-
-// What became of a request. The values are the exit statuses of orloctl.
-enum class Outcome {
-    Success = 0,        // the plug-in answered with status 0
-    Failure = 1,        // the plug-in answered with another status
-    Usage = 2,          // the arguments are wrong, or the request holds what the plug-in does not take
-    Unreachable = 3,    // there is no bus, no service on it, or no answer within the timeout
-    UnknownCommand = 4, // the request was completed with no response object
-    BadInput = 5,       // an offline reader met bad input
-};
+#include "tools/orloctl/Report.h"
 
 struct Answer {
     Outcome outcome = Outcome::Unreachable;

@@ -7,11 +7,9 @@
 #include <ctime>
 #include <filesystem>
 #include <functional>
-#include <iomanip>
 #include <map>
 #include <optional>
 #include <set>
-#include <sstream>
 #include <string_view>
 #include <system_error>
 #include <utility>
@@ -87,32 +85,12 @@ private:
     std::map<std::string, int> copies_; // how many more logs had the name
 };
 
-std::string onOneLine(const std::string& text) {
-    std::string line;
-    utf8::appendOnOneLine(line, text);
-    return line;
-}
-
 std::string dateOf(const CrashLog& log) {
     std::tm utc = {};
     char text[64] = "";
     if (::gmtime_r(&log.status.st_mtime, &utc))
         std::strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%SZ", &utc);
     return text;
-}
-
-void printTable(std::ostringstream& text, const ordered_json& logs) {
-    std::size_t width = 4;
-    for (const ordered_json& log : logs)
-        width = std::max(width, onOneLine(log["name"]).size());
-    const auto row = [&](const std::string& date, const std::string& name, const std::string& size, const char* panic) {
-        text << std::left << std::setw(22) << date << std::setw(static_cast<int>(width) + 2) << name << std::right
-             << std::setw(12) << size << "  " << panic << '\n';
-    };
-    row("DATE", "NAME", "SIZE", "PANIC");
-    for (const ordered_json& log : logs)
-        row(log["date"], onOneLine(log["name"]), std::to_string(log["size"].get<std::int64_t>()),
-            log["panic"] ? "yes" : "no");
 }
 
 } // namespace
@@ -140,26 +118,13 @@ Report collectCrashLogs(const std::string& copyDirectory) {
     ordered_json logs = ordered_json::array();
     for (auto& [time, entry] : found)
         logs.push_back(std::move(entry));
-    std::ostringstream text;
-    if (!logs.empty())
-        printTable(text, logs);
-    else if (missed.empty())
-        text << "The device keeps no crash logs.\n";
-    for (const ordered_json* list : {&logs, &missed})
-        for (const ordered_json& entry : *list)
-            if (entry.contains("note"))
-                text << onOneLine(entry["name"]) << ": " << onOneLine(entry["note"]) << '\n';
     Report report;
+    report.failure = Outcome::Usage;
     if (!missed.empty())
         report.problem = "Not everything could be looked at";
-    if (copies && !logs.empty()) {
-        const auto copied = std::ranges::count_if(logs, [](const ordered_json& log) { return log.contains("copy"); });
-        text << copied << " copied to " << copyDirectory << '\n';
-        if (static_cast<std::size_t>(copied) != logs.size())
-            report.problem = "Not all logs were copied to " + copyDirectory;
-    }
+    if (copies && !std::ranges::all_of(logs, [](const ordered_json& log) { return log.contains("copy"); }))
+        report.problem = "Not all logs were copied to " + copyDirectory;
     report.ok = report.problem.empty();
-    report.text = text.str();
     report.json = {{"status", logs.empty() ? 45 : 0}, {"logs", std::move(logs)}};
     if (!missed.empty())
         report.json["missed"] = std::move(missed);

@@ -20,8 +20,6 @@ using ObjectPtr = std::shared_ptr<__SysConfig3>;
 
 using nlohmann::ordered_json;
 
-constexpr std::size_t mostEntriesShown = 1000;
-constexpr std::size_t mostCharactersShown = 64;
 constexpr std::size_t mostMessages = 100;
 
 // The library's messages, of which a blob can cause several for each of its entries.
@@ -191,57 +189,6 @@ std::string outerProblem(const Value::Data& blob) {
     return "Octets follow the manifest element, at offset " + std::to_string(sequence.next - blob.data()) + ".";
 }
 
-std::string quoted(const std::string& text) {
-    return ordered_json(shortened(text, mostCharactersShown))
-        .dump(-1, ' ', true, ordered_json::error_handler_t::replace);
-}
-
-std::string valueText(const ordered_json& entry) {
-    if (entry.contains("data")) {
-        const auto& digits = entry["data"].get_ref<const std::string&>();
-        return "data, " + std::to_string(digits.size() / 2) + " bytes: " + shortened(digits, mostCharactersShown);
-    }
-    if (entry.contains("string"))
-        return "string: " + quoted(entry["string"]);
-    return entry["deleted"].get<bool>() ? "deleted" : "no value";
-}
-
-std::string entriesText(const char* title, std::size_t count, const Elements& entries) {
-    std::string text = std::string(title) + ": " + std::to_string(count) + "\n";
-    std::size_t shown = 0;
-    entries([&](const Element& element) {
-        const ordered_json& entry = element.json;
-        text += "  " + quoted(entry["key"]);
-        if (entry.contains("comment"))
-            text += "  comment " + quoted(entry["comment"]);
-        text += "  " + valueText(entry) + "\n";
-        return ++shown < mostEntriesShown;
-    });
-    if (count > shown)
-        text += "  ... " + std::to_string(count - shown) + " more\n";
-    return text;
-}
-
-std::string reportText(const Report& report, const __SysConfig3* object) {
-    const ordered_json& json = report.json;
-    std::string text = "Configuration blob \"" + json["magic"].get<std::string>() + "\", version " +
-                       json["version"].get<std::string>() + "\n";
-    text += entriesText("Payload entries", sysConfig3GetPayloadEntryCount(object), report.lists.at(json["payload"]));
-    text += entriesText("Metadata entries", sysConfig3GetMetadataEntryCount(object), report.lists.at(json["metadata"]));
-    text += "HMACs: " + json["hmacState"].get<std::string>() + "\n";
-    for (const auto& [name, digits] : json["hmacs"].items()) {
-        const auto& all = digits.get_ref<const std::string&>();
-        text += "  " + name + ": " + (all.empty() ? "absent" : shortened(all, mostCharactersShown)) + "\n";
-    }
-    for (const ordered_json& message : json["messages"])
-        text += "Note: " + message.get<std::string>() + "\n";
-    if (json.contains("messagesLeftOut"))
-        text += "Note: ... " + json["messagesLeftOut"].dump() + " more\n";
-    if (json.contains("octetsBehind"))
-        text += "Note: " + json["octetsBehind"].dump() + " octets follow the blob\n";
-    return text;
-}
-
 Report refused(const Messages& why, const Value::Data& blob) {
     Report report;
     report.ok = false;
@@ -269,16 +216,16 @@ Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
     if (!object)
         return refused(collector.collected(), blob);
     Report report;
-    report.json = {{"magic", fourCharacters(sysConfig3GetMagic(object.get()))},
-                   {"version", hexadecimal(sysConfig3GetVersion(object.get()))},
-                   {"payload", report.lists.add(payloadEntries(object))},
-                   {"metadata", report.lists.add(metadataEntries(object))},
-                   {"hmacState", hmacState(object.get(), hmacKey)},
-                   {"hmacs", manifestHMACs(object.get())}};
+    report.json = {
+        {"magic", fourCharacters(sysConfig3GetMagic(object.get()))},
+        {"version", hexadecimal(sysConfig3GetVersion(object.get()))},
+        {"payload", report.lists.add(payloadEntries(object), sysConfig3GetPayloadEntryCount(object.get()))},
+        {"metadata", report.lists.add(metadataEntries(object), sysConfig3GetMetadataEntryCount(object.get()))},
+        {"hmacState", hmacState(object.get(), hmacKey)},
+        {"hmacs", manifestHMACs(object.get())}};
     addMessages(report.json, collector.collected());
     if (const std::uint64_t behind = octetsBehind(blob); behind != 0)
         report.json["octetsBehind"] = behind;
-    report.text = reportText(report, object.get());
     if (report.json["hmacState"] == "do not match") {
         report.ok = false;
         report.problem = "The HMACs do not match the entries under this key.";

@@ -10,8 +10,6 @@ namespace {
 using nlohmann::ordered_json;
 
 constexpr unsigned deepest = 64;
-constexpr std::uint64_t mostShown = 10000;
-constexpr std::size_t mostCharactersOfValue = 128;
 
 ordered_json integerValue(const DERItem& content) {
     if (content.length == 0 || content.length > sizeof(std::int64_t))
@@ -46,18 +44,6 @@ ordered_json valueOf(DERTag tag, const DERItem& content) {
     if (tag == DERTagObjectIdentifier)
         return oidValue(content);
     return content.length != 0 ? ordered_json(hexText(content)) : ordered_json();
-}
-
-std::string padded(std::uint64_t number, std::size_t width) {
-    const std::string digits = std::to_string(number);
-    return digits.size() < width ? std::string(width - digits.size(), ' ') + digits : digits;
-}
-
-// A value as one reads it, by the name of its tag.
-std::string valueText(const ordered_json& value, const std::string& tag) {
-    const std::string text =
-        shortened(value.is_string() ? value.get<std::string>() : value.dump(), mostCharactersOfValue);
-    return tag.ends_with("String") || tag.ends_with("Time") ? "\"" + text + "\"" : text;
 }
 
 class Tree {
@@ -159,45 +145,13 @@ void Tree::check(Report& report) {
         check(whole_, 0, report);
 }
 
-class Lines {
-public:
-    bool add(const Element& element, std::size_t depth) {
-        const ordered_json& item = element.json;
-        const auto number = [&](const char* key, std::size_t width) {
-            return padded(item[key].get<std::uint64_t>(), width);
-        };
-        text_ += number("offset", 8) + number("headerLength", 4) + number("contentLength", 9) + "  " +
-                 std::string(2 * depth, ' ') + item["tag"].get<std::string>();
-        if (item.contains("value"))
-            text_ += " " + valueText(item["value"], item["tag"]);
-        text_ += '\n';
-        if (item.contains("fault"))
-            text_ += std::string(23 + 2 * depth, ' ') + "not DER: " + item["fault"].get<std::string>() + "\n";
-        if (++count_ < mostShown && item.contains("items"))
-            element.lists.at(item["items"])([&](const Element& inner) { return add(inner, depth + 1); });
-        return count_ < mostShown;
-    }
-
-    std::string text(std::uint64_t all) && {
-        return "  offset  hdr  content  item\n" + text_ +
-               (all > count_ ? std::to_string(all - count_) + " further items are not shown\n" : "");
-    }
-
-private:
-    std::string text_;
-    std::uint64_t count_ = 0;
-};
-
 } // namespace
 
 Report showDer(const std::uint8_t* data, std::size_t length) {
     Report report;
     Tree tree(data, length);
-    Lines lines;
     report.json["length"] = length;
     tree.check(report);
-    tree.items()([&](const Element& element) { return lines.add(element, 0); });
-    report.json["items"] = report.lists.add(tree.items());
-    report.text = std::move(lines).text(tree.count());
+    report.json["items"] = report.lists.add(tree.items(), tree.count());
     return report;
 }

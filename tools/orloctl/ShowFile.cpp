@@ -68,6 +68,8 @@ Report showFile(const Value::Data& file, std::string format, const std::optional
     report = format == "bcfg"   ? showBcfg(file, hmacKey.value_or(Value::Data()))
              : format == "img4" ? showImg4(item.data, item.length)
                                 : showDer(item.data, item.length);
-    report.json["format"] = format;
+    nlohmann::ordered_json json{{"format", format}};
+    json.update(report.json);
+    report.json = std::move(json);
     return report;
 }
