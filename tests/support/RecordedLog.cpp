@@ -13,8 +13,9 @@ namespace {
 
 SystemLog pluginLog, frameworkLog, defaultLog;
 std::mutex mutex;
-std::vector<std::string> lines;
-std::vector<std::string> consoleLines;
+std::vector<std::string> lines; // of every destination, in order
+
+constexpr std::string_view consoleMark = "console: ", callMark = "> ";
 
 // "<time>-[<file>:<number>] <message>\n" as "[<file>] <message>".
 std::string withoutTimeAndNumber(std::string_view line) {
@@ -22,6 +23,20 @@ std::string withoutTimeAndNumber(std::string_view line) {
     line.remove_suffix(1);
     const std::size_t number = line.find(':');
     return std::string(line.substr(0, number)) + std::string(line.substr(line.find(']', number)));
+}
+
+void append(std::string line) {
+    const std::lock_guard lock(mutex);
+    lines.push_back(std::move(line));
+}
+
+// The lines that `isWanted` chooses, without their marks.
+std::vector<std::string> recorded(bool (*isWanted)(std::string_view), std::size_t markSize = 0) {
+    std::vector<std::string> wanted;
+    for (const std::string& line : recordedLines())
+        if (isWanted(line))
+            wanted.push_back(line.substr(markSize));
+    return wanted;
 }
 
 } // namespace
@@ -41,8 +56,7 @@ bool systemLogTypeEnabled(const SystemLog*, SystemLogType) {
 void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message) {
     const std::string level = std::to_string(static_cast<int>(type) + 1) + " ";
     const std::string handle = log == &frameworkLog || log == &pluginLog ? "" : "to no handle of ours: ";
-    const std::lock_guard lock(mutex);
-    lines.push_back(level + handle + (log == &pluginLog ? withoutTimeAndNumber(message) : std::string(message)));
+    append(level + handle + (log == &pluginLog ? withoutTimeAndNumber(message) : std::string(message)));
 }
 
 // "<operation>:<number> - <message>" loses its number; every other line stays as it is.
@@ -52,23 +66,33 @@ void consoleLog(std::string_view line) {
     std::string kept(line);
     if (end != std::string_view::npos && number != std::string_view::npos)
         kept.erase(number, end - number);
-    const std::lock_guard lock(mutex);
-    consoleLines.push_back(std::move(kept));
+    append(std::string(consoleMark) + kept);
 }
 
 void recordLog() {
     logInit(nullptr);
     const std::lock_guard lock(mutex);
     lines.clear();
-    consoleLines.clear();
+}
+
+void recordCall(std::string_view call) {
+    append(std::string(callMark) + std::string(call));
+}
+
+std::vector<std::string> recordedLines() {
+    const std::lock_guard lock(mutex);
+    return lines;
 }
 
 std::vector<std::string> recordedConsole() {
-    const std::lock_guard lock(mutex);
-    return consoleLines;
+    return recorded([](std::string_view line) { return line.starts_with(consoleMark); }, consoleMark.size());
+}
+
+std::vector<std::string> recordedCalls() {
+    return recorded([](std::string_view line) { return line.starts_with(callMark); }, callMark.size());
 }
 
 std::vector<std::string> recordedLog() {
-    const std::lock_guard lock(mutex);
-    return lines;
+    return recorded(
+        [](std::string_view line) { return !line.starts_with(consoleMark) && !line.starts_with(callMark); });
 }
