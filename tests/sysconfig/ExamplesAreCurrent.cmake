@@ -1,12 +1,15 @@
 # cmake -DMAKE_EXAMPLES=<program> -DEXAMPLES=<folder> -DWORK=<folder> -P <this file>
 #
-# Fails unless the program makes exactly the blobs that the folder holds.
+# Fails unless the program makes exactly the blobs, the boot ticket and the container that the folder holds.
 file(REMOVE_RECURSE ${WORK})
 file(MAKE_DIRECTORY ${WORK})
 execute_process(COMMAND ${MAKE_EXAMPLES} ${WORK} COMMAND_ERROR_IS_FATAL ANY)
-file(GLOB made RELATIVE ${WORK} ${WORK}/*)
-file(GLOB kept RELATIVE ${EXAMPLES} ${EXAMPLES}/*.bin)
-if(NOT made STREQUAL kept OR made STREQUAL "")
+file(GLOB_RECURSE made RELATIVE ${WORK} ${WORK}/*)
+file(GLOB kept RELATIVE ${EXAMPLES} ${EXAMPLES}/blobs/*.bin)
+list(APPEND kept System/Library/Caches/apticket.der images/container.img4)
+list(SORT kept)
+list(SORT made)
+if(NOT made STREQUAL kept)
     message(FATAL_ERROR "made: ${made}\nkept: ${kept}")
 endif()
 foreach(name IN LISTS made)

@@ -1,19 +1,19 @@
-// make-examples FOLDER: writes the example blobs of examples/device/blobs into a folder that exists. The same octets
-// come out every time.
+// make-examples ROOT: writes the blobs, the boot ticket and the Img4 container of examples/device below a device root.
+// The same octets come out every time.
+#include <filesystem>
 #include <fstream>
+#include <initializer_list>
 #include <iostream>
 #include <string>
-#include <vector>
 
 #include "sysconfig/SysConfig3Ptr.h"
+#include "tools/makers/Img4Maker.h"
 
 namespace {
 
-using sysconfig::BytesPtr;
-using sysconfig::MetadataEntryPtr;
-using sysconfig::PayloadEntryPtr;
-using sysconfig::SysConfig3Ptr;
-using Bytes = std::vector<std::uint8_t>;
+using img4maker::Bytes;
+using img4maker::fourCC;
+using std::filesystem::path;
 
 // The key of the examples' HMACs: the octets 00 to 1F. It protects nothing.
 Bytes exampleKey() {
@@ -23,104 +23,75 @@ Bytes exampleKey() {
     return key;
 }
 
-constexpr std::uint32_t fourCharacterCode(const char (&characters)[5]) {
-    std::uint32_t code = 0;
-    for (int i = 0; i < 4; ++i)
-        code = code << 8 | static_cast<unsigned char>(characters[i]);
-    return code;
+void require(bool done) {
+    if (!done)
+        throw std::runtime_error("an example cannot be made");
 }
 
-SysConfig3Ptr newObject(SysConfig3Magic magic, SysConfig3Version version) {
-    if (!sysConfig3HMACIsSupported(version))
-        return SysConfig3Ptr(allocSysConfig3(magic, version));
+void write(const path& file, const Bytes& bytes) {
+    create_directories(file.parent_path());
+    std::ofstream stream(file, std::ios::binary);
+    stream.exceptions(std::ios::failbit | std::ios::badbit);
+    stream.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+    stream.close();
+}
+
+__SysConfig3PayloadEntry* data(std::string_view key, const char* comment, const Bytes& bytes) {
+    return allocSysConfig3PayloadEntryWithData(fourCC(key), comment, bytes.data(),
+                                               static_cast<std::uint32_t>(bytes.size()));
+}
+
+// Writes a blob with the entries, which it releases.
+void writeBlob(const path& file, std::string_view magic, SysConfig3Version version,
+               std::initializer_list<__SysConfig3PayloadEntry*> payload,
+               std::initializer_list<__SysConfig3MetadataEntry*> metadata) {
     Bytes key = exampleKey();
-    return SysConfig3Ptr(
-        allocSysConfig3WithHMACKey(magic, version, {key.data(), static_cast<std::uint32_t>(key.size())}));
-}
-
-bool add(const SysConfig3Ptr& object, __SysConfig3PayloadEntry* entry) {
-    const PayloadEntryPtr owner(entry);
-    return sysConfig3AddPayloadEntry(object.get(), entry);
-}
-
-bool add(const SysConfig3Ptr& object, __SysConfig3MetadataEntry* entry) {
-    const MetadataEntryPtr owner(entry);
-    return sysConfig3AddMetadataEntry(object.get(), entry);
-}
-
-bool addData(const SysConfig3Ptr& object, std::uint32_t key, const char* comment, const Bytes& data) {
-    return add(object,
-               allocSysConfig3PayloadEntryWithData(key, comment, data.data(), static_cast<std::uint32_t>(data.size())));
-}
-
-bool write(const std::string& path, const std::uint8_t* data, std::size_t length) {
-    std::ofstream file(path, std::ios::binary);
-    file.write(reinterpret_cast<const char*>(data), static_cast<std::streamsize>(length));
-    file.close();
-    if (!file)
-        std::cerr << "make-examples: cannot write " << path << "\n";
-    return static_cast<bool>(file);
-}
-
-bool writeBlob(const std::string& path, const SysConfig3Ptr& object) {
+    const SysConfigData hmacKey = {key.data(), static_cast<std::uint32_t>(key.size())};
+    const sysconfig::SysConfig3Ptr object(sysConfig3HMACIsSupported(version)
+                                              ? allocSysConfig3WithHMACKey(fourCC(magic), version, hmacKey)
+                                              : allocSysConfig3(fourCC(magic), version));
+    for (auto* entry : payload)
+        require(sysConfig3AddPayloadEntry(object.get(), sysconfig::PayloadEntryPtr(entry).get()));
+    for (auto* entry : metadata)
+        require(sysConfig3AddMetadataEntry(object.get(), sysconfig::MetadataEntryPtr(entry).get()));
     SysConfigData out = {};
-    if (!encodeSysConfig3(object.get(), &out)) {
-        std::cerr << "make-examples: cannot encode " << path << "\n";
-        return false;
-    }
-    const BytesPtr owner(out.data);
-    return write(path, out.data, out.length);
+    require(encodeSysConfig3(object.get(), &out));
+    const sysconfig::BytesPtr owner(out.data);
+    write(file, {out.data, out.data + out.length});
 }
 
-// One blob for each magic and version, all with the same two entries.
-bool writeEveryMagicAndVersion(const std::string& folder) {
-    constexpr char magics[][5] = {"0Cfg", "appv", "bCfg", "dCfg", "eCfg", "fCfg", "mCfg", "seal", "tCfg"};
-    const struct {
-        SysConfig3Version number;
-        const char* name;
-    } versions[] = {{0x30001, "30001"}, {0x30002, "30002"}, {0x30003, "30003"}};
-    for (const auto& magic : magics) {
-        for (const auto& version : versions) {
-            const SysConfig3Ptr object = newObject(fourCharacterCode(magic), version.number);
-            if (!addData(object, fourCharacterCode("ExDt"), "example", {0x01, 0x02, 0x03, 0x04}) ||
-                !add(object, allocSysConfig3MetadataEntry("magic", nullptr, 0, magic)) ||
-                !writeBlob(folder + "/" + magic + "-" + version.name + ".bin", object))
-                return false;
-        }
-    }
-    return true;
-}
-
-// Every kind of value that an entry may have.
-bool writeEveryKind(const std::string& folder) {
-    const SysConfig3Ptr object = newObject(fourCharacterCode("bCfg"), 0x30003);
+void writeExamples(const path& root) {
+    const path blobs = root / "blobs";
+    for (const char* magic : {"0Cfg", "appv", "bCfg", "dCfg", "eCfg", "fCfg", "mCfg", "seal", "tCfg"})
+        for (SysConfig3Version version = 0x30001; version <= 0x30003; ++version)
+            writeBlob(blobs / (magic + ("-3000" + std::to_string(version & 0xF)) + ".bin"), magic, version,
+                      {data("ExDt", "example", {0x01, 0x02, 0x03, 0x04})},
+                      {allocSysConfig3MetadataEntry("magic", nullptr, 0, magic)});
     const std::uint8_t date[] = {0x20, 0x26, 0x01, 0x31};
-    return addData(object, fourCharacterCode("ExDt"), "data", Bytes(200, 0x5A)) &&
-           add(object, allocSysConfig3PayloadEntryWithString(fourCharacterCode("ExSt"), "string", "EXAMPLE 1")) &&
-           add(object, allocSysConfig3PayloadEntryDeleted(fourCharacterCode("OldK"), "deleted")) &&
-           add(object, allocSysConfig3MetadataEntry("calibrated", date, sizeof date, nullptr)) &&
-           add(object, allocSysConfig3MetadataEntry("station", nullptr, 0, "bench 7")) &&
-           writeBlob(folder + "/every-kind.bin", object);
-}
-
-// "WCh0" in first place and another key behind it, so that replacing it shows.
-bool writeHoldsWCh0(const std::string& folder) {
-    const SysConfig3Ptr object = newObject(fourCharacterCode("bCfg"), 0x30003);
-    return addData(object, fourCharacterCode("WCh0"), nullptr, Bytes(152, 0x00)) &&
-           addData(object, fourCharacterCode("ExDt"), "example", {0x01, 0x02, 0x03, 0x04}) &&
-           writeBlob(folder + "/holds-WCh0.bin", object);
+    writeBlob(blobs / "every-kind.bin", "bCfg", 0x30003,
+              {data("ExDt", "data", Bytes(200, 0x5A)),
+               allocSysConfig3PayloadEntryWithString(fourCC("ExSt"), "string", "EXAMPLE 1"),
+               allocSysConfig3PayloadEntryDeleted(fourCC("OldK"), "deleted")},
+              {allocSysConfig3MetadataEntry("calibrated", date, sizeof date, nullptr),
+               allocSysConfig3MetadataEntry("station", nullptr, 0, "bench 7")});
+    // "WCh0" in first place and another key behind it, so that replacing it shows.
+    writeBlob(blobs / "holds-WCh0.bin", "bCfg", 0x30003,
+              {data("WCh0", nullptr, Bytes(152, 0x00)), data("ExDt", "example", {0x01, 0x02, 0x03, 0x04})}, {});
+    write(blobs / "hmac-key.bin", exampleKey());
+    write(root / "System/Library/Caches/apticket.der", img4maker::exampleTicket());
+    write(root / "images/container.img4", img4maker::exampleContainer());
 }
 
 } // namespace
 
-int main(int argc, char** argv) {
-    if (argc != 2) {
-        std::cerr << "usage: make-examples FOLDER\n";
+int main(int count, char** arguments) try {
+    if (count != 2) {
+        std::cerr << "usage: make-examples ROOT\n";
         return 2;
     }
-    const std::string folder = argv[1];
-    const Bytes key = exampleKey();
-    const bool written = writeEveryMagicAndVersion(folder) && writeEveryKind(folder) && writeHoldsWCh0(folder) &&
-                         write(folder + "/hmac-key.bin", key.data(), key.size());
-    return written ? 0 : 1;
+    writeExamples(arguments[1]);
+    return 0;
+} catch (const std::exception& error) {
+    std::cerr << "make-examples: " << error.what() << "\n";
+    return 1;
 }

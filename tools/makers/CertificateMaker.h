@@ -4,8 +4,11 @@
 #define VELTRA_TOOLS_MAKERS_CERTIFICATEMAKER_H
 
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <vector>
+
+#include <openssl/types.h>
 
 namespace certificatemaker {
 
@@ -17,11 +20,12 @@ enum class KeyKind {
     Ed25519,
 };
 
-// A private key as PEM text, and a certificate for it, in DER, whose serialNumber has these content octets. It is for
-// digital signatures and no authority's. A key is made afresh each time.
+// A private key as PEM text, a certificate for it, in DER, whose serialNumber has these content octets, and the key as
+// it signs. It is for digital signatures and no authority's. A key is made afresh each time.
 struct Module {
     std::string key;
     Bytes certificate;
+    std::shared_ptr<EVP_PKEY> signer;
 };
 Module module(const Bytes& serialNumber, KeyKind kind = KeyKind::P256);
 

@@ -10,33 +10,23 @@
 #include <openssl/rsa.h>
 #include <openssl/x509.h>
 
+#include "tools/makers/OpenSSL.h"
+
 namespace signedmanifest {
 
 using namespace img4maker;
+using namespace makers;
 
 namespace {
 
 Key own(EVP_PKEY* key) {
-    if (key == nullptr)
-        throw std::runtime_error("no key");
-    return {key, EVP_PKEY_free};
-}
-
-Bytes contentOf(const DERItem& item) {
-    return {item.data, item.data + item.length};
+    return {require(key), EVP_PKEY_free};
 }
 
 const EVP_MD* digestOf(std::uint64_t length) {
-    switch (length) {
-    case 20:
+    if (length == 20)
         return EVP_sha1();
-    case 32:
-        return EVP_sha256();
-    case 48:
-        return EVP_sha384();
-    default:
-        return EVP_sha512();
-    }
+    return length == 32 ? EVP_sha256() : length == 48 ? EVP_sha384() : EVP_sha512();
 }
 
 Bytes time(std::string_view text) {
@@ -53,8 +43,8 @@ Bytes readFile(const std::string& path) {
 }
 
 Key readKey(const std::string& pemFile) {
-    const std::unique_ptr<BIO, decltype(&BIO_free)> file(BIO_new_file(pemFile.c_str(), "r"), BIO_free);
-    return own(file != nullptr ? PEM_read_bio_PrivateKey(file.get(), nullptr, nullptr, nullptr) : nullptr);
+    const Owner<BIO, BIO_free_all> file(require(BIO_new_file(pemFile.c_str(), "r")));
+    return own(PEM_read_bio_PrivateKey(file.get(), nullptr, nullptr, nullptr));
 }
 
 Key makeRSAKey(unsigned bits) {
@@ -64,14 +54,13 @@ Key makeRSAKey(unsigned bits) {
 Key makeMultiPrimeRSAKey(unsigned bits, const Bytes& exponent) {
     constexpr int primes = 3;
     EVP_PKEY* key = nullptr;
-    const std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free)> maker(
-        EVP_PKEY_CTX_new_from_name(nullptr, "RSA", nullptr), EVP_PKEY_CTX_free);
-    const std::unique_ptr<BIGNUM, decltype(&BN_free)> e(
-        BN_bin2bn(exponent.data(), static_cast<int>(exponent.size()), nullptr), BN_free);
-    if (EVP_PKEY_keygen_init(maker.get()) != 1 || EVP_PKEY_CTX_set1_rsa_keygen_pubexp(maker.get(), e.get()) != 1 ||
-        EVP_PKEY_CTX_set_rsa_keygen_bits(maker.get(), static_cast<int>(bits)) != 1 ||
-        EVP_PKEY_CTX_set_rsa_keygen_primes(maker.get(), primes) != 1 || EVP_PKEY_generate(maker.get(), &key) != 1)
-        throw std::runtime_error("cannot make a key");
+    const Owner<EVP_PKEY_CTX, EVP_PKEY_CTX_free> maker(EVP_PKEY_CTX_new_from_name(nullptr, "RSA", nullptr));
+    const Owner<BIGNUM, BN_free> e(BN_bin2bn(exponent.data(), static_cast<int>(exponent.size()), nullptr));
+    require(EVP_PKEY_keygen_init(maker.get()));
+    require(EVP_PKEY_CTX_set1_rsa_keygen_pubexp(maker.get(), e.get()));
+    require(EVP_PKEY_CTX_set_rsa_keygen_bits(maker.get(), static_cast<int>(bits)));
+    require(EVP_PKEY_CTX_set_rsa_keygen_primes(maker.get(), primes));
+    require(EVP_PKEY_generate(maker.get(), &key));
     return own(key);
 }
 
@@ -80,30 +69,19 @@ Key makeECKey(const char* curve) {
 }
 
 Bytes publicKeyInfo(const Key& key) {
-    unsigned char* encoding = nullptr;
-    const int length = i2d_PUBKEY(key.get(), &encoding);
-    Bytes bytes(encoding, encoding + length);
-    OPENSSL_free(encoding);
-    return bytes;
+    return encode<EVP_PKEY>(key.get(), i2d_PUBKEY);
 }
 
 Bytes publicKeyBits(const Key& key) {
-    unsigned char* bits = nullptr;
-    const int length = i2d_PublicKey(key.get(), &bits);
-    Bytes bytes(bits, bits + length);
-    OPENSSL_free(bits);
-    return bytes;
+    return encode<EVP_PKEY>(key.get(), i2d_PublicKey);
 }
 
 Bytes sign(const Key& key, std::uint64_t digestLength, const Bytes& message) {
-    const std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> signer(EVP_MD_CTX_new(), EVP_MD_CTX_free);
-    std::size_t length = 0;
-    if (EVP_DigestSignInit(signer.get(), nullptr, digestOf(digestLength), nullptr, key.get()) != 1 ||
-        EVP_DigestSign(signer.get(), nullptr, &length, message.data(), message.size()) != 1)
-        throw std::runtime_error("cannot sign");
+    const Owner<EVP_MD_CTX, EVP_MD_CTX_free> signer(EVP_MD_CTX_new());
+    std::size_t length = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
     Bytes signature(length);
-    if (EVP_DigestSign(signer.get(), signature.data(), &length, message.data(), message.size()) != 1)
-        throw std::runtime_error("cannot sign");
+    require(EVP_DigestSignInit(signer.get(), nullptr, digestOf(digestLength), nullptr, key.get()));
+    require(EVP_DigestSign(signer.get(), signature.data(), &length, message.data(), message.size()));
     signature.resize(length);
     return signature;
 }
@@ -117,7 +95,7 @@ Bytes algorithm(const Bytes& oid, const Bytes& parameters) {
 }
 
 Bytes oid(const DERItem& content) {
-    return item(DERTagObjectIdentifier, contentOf(content));
+    return item(DERTagObjectIdentifier, {content.data, content.data + content.length});
 }
 
 Bytes distinguishedName(std::string_view commonName, DERTag type) {
@@ -127,15 +105,8 @@ Bytes distinguishedName(std::string_view commonName, DERTag type) {
 
 Bytes subjectOf(const Bytes& certificate) {
     const unsigned char* start = certificate.data();
-    const std::unique_ptr<X509, decltype(&X509_free)> parsed(
-        d2i_X509(nullptr, &start, static_cast<long>(certificate.size())), X509_free);
-    if (parsed == nullptr)
-        throw std::runtime_error("no certificate");
-    unsigned char* name = nullptr;
-    const int length = i2d_X509_NAME(X509_get_subject_name(parsed.get()), &name);
-    Bytes encoding(name, name + length);
-    OPENSSL_free(name);
-    return encoding;
+    const Owner<X509, X509_free> parsed(require(d2i_X509(nullptr, &start, static_cast<long>(certificate.size()))));
+    return encode<X509_NAME>(X509_get_subject_name(parsed.get()), i2d_X509_NAME);
 }
 
 Bytes mustBePresent(std::string_view name) {
