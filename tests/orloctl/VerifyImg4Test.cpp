@@ -23,11 +23,11 @@ constexpr const char* rsa3k = "kImg4DecodeSecureBootRsa3kSha384";
 constexpr const char* rsa4k = "kImg4DecodeSecureBootRsa4kSha384";
 constexpr const char* localPolicy = "kImg4DecodeLocalPolicyEc384Sha384";
 
-const Signer& signerOf(const std::string& profile) {
+const Signer& signerOf(std::string_view profile) {
     static std::map<std::string, Signer> signers;
     for (unsigned i = 0; i < Img4NumTrustProfiles; ++i)
         if (profile == Img4TrustProfiles[i].name)
-            return signers.try_emplace(profile, TEST_TRUST_DOMAIN, Img4TrustProfiles[i]).first->second;
+            return signers.try_emplace(std::string(profile), TEST_TRUST_DOMAIN, Img4TrustProfiles[i]).first->second;
     std::abort();
 }
 
