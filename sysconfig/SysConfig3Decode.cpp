@@ -1,3 +1,5 @@
+#include <array>
+
 #include "der/DERDecode.h"
 #include "sysconfig/SysConfig3Internal.h"
 #include "sysconfig/SysConfig3Wire.h"
@@ -28,39 +30,49 @@ struct MetadataItems {
     DERItem string;
 };
 
-constexpr DERItemSpec DERDecodeSysConfig3ItemSpecs[] = {
-    {offsetof(BlobItems, magic), DERTagInteger, 0},  {offsetof(BlobItems, version), DERTagInteger, 0},
-    {offsetof(BlobItems, payload), payloadTag, 0},   {offsetof(BlobItems, metadata), metadataTag, 0},
+constexpr std::array<DERItemSpec, 5> DERDecodeSysConfig3ItemSpecs = {{
+    {offsetof(BlobItems, magic), DERTagInteger, 0},
+    {offsetof(BlobItems, version), DERTagInteger, 0},
+    {offsetof(BlobItems, payload), payloadTag, 0},
+    {offsetof(BlobItems, metadata), metadataTag, 0},
     {offsetof(BlobItems, manifest), manifestTag, 0},
-};
-constexpr std::uint16_t DERDecodeSysConfig3ItemSpecs_count = std::size(DERDecodeSysConfig3ItemSpecs);
+}};
 
-constexpr DERItemSpec DERDecodeSysConfig3PayloadItemSpecs[] = {
+constexpr std::array<DERItemSpec, 5> DERDecodeSysConfig3PayloadItemSpecs = {{
     {offsetof(PayloadItems, key), DERTagInteger, 0},
     {offsetof(PayloadItems, comment), DERTagIA5String, 0},
     {offsetof(PayloadItems, data), DERTagOctetString, DEROptionOptional},
     {offsetof(PayloadItems, string), DERTagIA5String, DEROptionOptional},
     {offsetof(PayloadItems, deleted), DERTagBoolean, DEROptionOptional},
-};
-constexpr std::uint16_t DERDecodeSysConfig3PayloadItemSpecs_count = std::size(DERDecodeSysConfig3PayloadItemSpecs);
+}};
 
-constexpr DERItemSpec DERDecodeSysConfig3MetadataItemSpecs[] = {
+constexpr std::array<DERItemSpec, 3> DERDecodeSysConfig3MetadataItemSpecs = {{
     {offsetof(MetadataItems, key), DERTagIA5String, 0},
     {offsetof(MetadataItems, data), DERTagOctetString, DEROptionOptional},
     {offsetof(MetadataItems, string), DERTagIA5String, DEROptionOptional},
-};
-constexpr std::uint16_t DERDecodeSysConfig3MetadataItemSpecs_count = std::size(DERDecodeSysConfig3MetadataItemSpecs);
+}};
 
-constexpr DERItemSpec DERDecodeSysConfig3ManifestItemSpecs[] = {
+constexpr std::array<DERItemSpec, 3> DERDecodeSysConfig3ManifestItemSpecs = {{
     {offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
     {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
     {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0},
-};
-constexpr std::uint16_t DERDecodeSysConfig3ManifestItemSpecs_count = std::size(DERDecodeSysConfig3ManifestItemSpecs);
+}};
 
-// What a callback returns when memory for an entry is lacking, so that the entry is not silently left out. The codec
-// has no code of its own for it.
-constexpr DERReturn outOfMemory = DERBufferOverflow;
+// Fills `items` from the content of a SEQUENCE.
+template <typename Items, std::size_t count>
+DERReturn parse(const DERItem& content, const std::array<DERItemSpec, count>& rows, Items* items) {
+    return DERParseSequenceContentToObject(&content, count, rows.data(), items, sizeof *items, sizeof *items);
+}
+
+// Appends an entry, null when memory is lacking, so that it is not silently left out. The codec has no code of its own
+// for that.
+template <typename Entry, typename List>
+DERReturn append(Entry* entry, List* list) {
+    if (entry == nullptr)
+        return DERBufferOverflow;
+    list->appendWithoutIndex(entry);
+    return DERSuccess;
+}
 
 // The value of four octets, least significant first. Content of any other length gives 0.
 std::uint32_t valueOf(const DERItem& item) {
@@ -76,7 +88,7 @@ std::string_view textOf(const DERItem& item, std::size_t maximum) {
 }
 
 Bytes bytesOf(const DERItem& item) {
-    return {item.data, static_cast<std::uint32_t>(item.length)};
+    return viewOf(item.data, static_cast<std::uint32_t>(item.length));
 }
 
 // The bytes for a new manifest, which copies them.
@@ -139,10 +151,7 @@ bool decodeManifest(const DERItem& element, __SysConfig3* object) {
     if (!openElement(element, manifestElement, &content))
         return false;
     ManifestItems items;
-    const DERReturn result =
-        DERParseSequenceContentToObject(&content, DERDecodeSysConfig3ManifestItemSpecs_count,
-                                        DERDecodeSysConfig3ManifestItemSpecs, &items, sizeof items, sizeof items);
-    if (result != DERSuccess) {
+    if (const DERReturn result = parse(content, DERDecodeSysConfig3ManifestItemSpecs, &items); result != DERSuccess) {
         // A blob whose HMACs cannot be read is still worth having: the object keeps the manifest it was made with.
         logHook()(messageLevel, "Decode manifest sequence error: %d", static_cast<int>(result));
         return true;
@@ -159,24 +168,17 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedIn
     if (object == nullptr)
         return DERParamError;
     PayloadItems items;
-    DERReturn result =
-        DERParseSequenceContentToObject(&decoded->content, DERDecodeSysConfig3PayloadItemSpecs_count,
-                                        DERDecodeSysConfig3PayloadItemSpecs, &items, sizeof items, sizeof items);
-    if (result != DERSuccess)
-        return result;
     bool deleted = false;
-    result = DERParseBooleanWithDefault(&items.deleted, false, &deleted);
+    DERReturn result = parse(decoded->content, DERDecodeSysConfig3PayloadItemSpecs, &items);
+    if (result == DERSuccess)
+        result = DERParseBooleanWithDefault(&items.deleted, false, &deleted);
     if (result != DERSuccess)
         return result;
     const PayloadContent content = {valueOf(items.key), textOf(items.comment, maximumStringLength), bytesOf(items.data),
                                     textOf(items.string, maximumStringLength), deleted};
     if (!isValidContent(content))
         return reportNoPayloadEntry(), DERSuccess;
-    __SysConfig3PayloadEntry* const entry = makeEntry(content);
-    if (entry == nullptr)
-        return outOfMemory;
-    object->payload.appendWithoutIndex(entry);
-    return DERSuccess;
+    return append(makeEntry(content), &object->payload);
 }
 
 DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo* decoded, bool*, void* context) {
@@ -186,28 +188,21 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
     if (object == nullptr)
         return logHook()(messageLevel, "%s the refcon arg was NULL", operation), DERParamError;
     MetadataItems items;
-    const DERReturn result =
-        DERParseSequenceContentToObject(&decoded->content, DERDecodeSysConfig3MetadataItemSpecs_count,
-                                        DERDecodeSysConfig3MetadataItemSpecs, &items, sizeof items, sizeof items);
-    if (result != DERSuccess)
+    if (const DERReturn result = parse(decoded->content, DERDecodeSysConfig3MetadataItemSpecs, &items);
+        result != DERSuccess)
         return result;
     const MetadataContent content = {textOf(items.key, maximumKeyLength), bytesOf(items.data),
                                      textOf(items.string, maximumStringLength)};
     if (!isValidContent(content))
         return reportNoMetadataEntry(), DERSuccess;
-    __SysConfig3MetadataEntry* const entry = makeEntry(content);
-    if (entry == nullptr)
-        return outOfMemory;
-    object->metadata.appendWithoutIndex(entry);
-    return DERSuccess;
+    return append(makeEntry(content), &object->metadata);
 }
 
 __SysConfig3* decodeSysConfig3(const std::uint8_t* data, std::uint32_t length) {
     const DERItem blob = {data, data != nullptr ? length : 0};
     BlobItems items;
-    const DERReturn result = DERParseSequenceToObject(&blob, DERDecodeSysConfig3ItemSpecs_count,
-                                                      DERDecodeSysConfig3ItemSpecs, &items, sizeof items, sizeof items);
-    if (result != DERSuccess)
+    if (DERParseSequenceToObject(&blob, DERDecodeSysConfig3ItemSpecs.size(), DERDecodeSysConfig3ItemSpecs.data(),
+                                 &items, sizeof items, sizeof items) != DERSuccess)
         return nullptr;
     const SysConfig3Magic magic = valueOf(items.magic);
     const SysConfig3Version version = valueOf(items.version);
