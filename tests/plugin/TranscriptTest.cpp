@@ -13,6 +13,7 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include "platform/DeviceAnswers.h"
 #include "platform/Format.h"
 #include "platform/HardwareRegistry.h"
 #include "platform/OrloDataStore.h"
@@ -209,6 +210,7 @@ Lines play(const Case& played) {
 
     const auto before = arrangement.root().contents();
     Lines answers;
+    KACopyAnswer("", {}); // what is wrong with the description is said at the first query
     recordLog();
     ZPOrloServices().handleMessage(
         request, [&](bool completed, const auto& response) { answers.push_back(shown(request, completed, response)); });
