@@ -82,9 +82,6 @@ enum class Curve {
 // on the curve verifies nothing, nor does one in another form. False also when memory has run out.
 bool verifyECDSASignature(Curve curve, Bytes point, Bytes hash, Bytes signature) noexcept;
 
-// Whether `point` is a public key on `curve`, in uncompressed form. False also when memory has run out.
-bool isPublicKey(Curve curve, Bytes point) noexcept;
-
 // Fills `out` with `length` octets of a cryptographically secure random source.
 bool randomBytes(void* out, std::size_t length) noexcept;
 

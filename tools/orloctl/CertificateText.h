@@ -1,5 +1,5 @@
-// Words for X.509 certificates (RFC 5280): whose they are, who issued them, with which key and algorithm. What cannot
-// be read is named as such, so that any octets have words. Only printable ASCII comes out.
+// Words for X.509 certificates (RFC 5280): whose they are, who issued them, with which key and algorithm. OpenSSL finds
+// them; what it cannot read is shown by its octets, so that any octets have words. Only printable ASCII comes out.
 #ifndef VELTRA_TOOLS_ORLOCTL_CERTIFICATETEXT_H
 #define VELTRA_TOOLS_ORLOCTL_CERTIFICATETEXT_H
 
@@ -19,12 +19,14 @@ struct Certificate {
 // The fields of the encoded certificate; nothing when the outer structures are not those of a certificate.
 std::optional<Certificate> readCertificate(const DERItem& encoding);
 
-// The content of a Name in the form of RFC 4514, "CN=Tevari Root CA,O=Tevari". Octets that are no printable ASCII are
-// escaped, and so are values that are no text. A name of more than `longest` characters ends in an ellipsis.
+// The content of a Name in the form of RFC 2253, "CN=Tevari Root CA,O=Tevari". Octets that are no printable ASCII are
+// escaped, and values that are no text are in hexadecimal. A name of more than `longest` characters ends in an
+// ellipsis.
 std::string nameText(const DERItem& name, std::size_t longest = 512);
 
-// The content of a SubjectPublicKeyInfo: "RSA 4096 bits", "EC P-384".
-std::string keyText(const DERItem& subjectPublicKeyInfo);
+// The content of a SubjectPublicKeyInfo: "RSA 4096 bits", "EC P-384". Of a key that cannot be read at most `most`
+// octets are shown.
+std::string keyText(const DERItem& subjectPublicKeyInfo, std::uint64_t most = 256);
 
 // The size of an RSA key's modulus; nothing for other keys.
 std::optional<std::size_t> rsaBits(const DERItem& subjectPublicKeyInfo);

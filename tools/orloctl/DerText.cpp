@@ -1,16 +1,19 @@
 #include "tools/orloctl/DerText.h"
 
 #include "der/DERDecode.h"
+#include "der/DEREncode.h"
 
 #include <algorithm>
 #include <array>
+#include <memory>
+
+#include <openssl/objects.h>
 
 namespace {
 
 constexpr std::uint64_t classShift = 62;
 constexpr DERTag constructedFlag = UINT64_C(1) << 61;
 constexpr std::uint8_t moreBit = 0x80;
-constexpr std::size_t longestOid = 128;
 
 enum Form {
     Primitive,
@@ -280,25 +283,21 @@ std::string hexText(const DERItem& data, std::uint64_t most) {
     return digits + (data.length > most ? "..." : "");
 }
 
-std::string oidText(const DERItem& content) {
-    std::string text;
-    std::uint64_t component = 0;
-    bool first = true;
-    for (std::uint64_t i = 0; i < content.length; ++i) {
-        if (component > UINT64_MAX >> 7 || text.size() > longestOid)
-            return text + "...";
-        component = component << 7 | (content.data[i] & 0x7F);
-        if ((content.data[i] & 0x80) != 0)
-            continue;
-        if (first) {
-            // The first octets hold two components (X.690 8.19.4).
-            const std::uint64_t root = component < 80 ? component / 40 : 2;
-            text = std::to_string(root) + "." + std::to_string(component - root * 40);
-            first = false;
-        } else {
-            text += "." + std::to_string(component);
-        }
-        component = 0;
-    }
-    return text;
+std::vector<std::uint8_t> derEncoding(DERTag tag, const DERItem& content) {
+    std::vector<std::uint8_t> encoding(DERLengthOfItem(tag, content.length));
+    std::uint64_t written = 0;
+    DEREncodeItemSized(tag, content.length, content.data, encoding.data(), encoding.size(), &written);
+    return encoding;
+}
+
+std::string oidText(const DERItem& content, bool isNamed) {
+    char text[128];
+    if (content.length >= sizeof text) // each octet takes a character and more
+        return "";
+    const auto encoding = derEncoding(DERTagObjectIdentifier, content);
+    const std::uint8_t* place = encoding.data();
+    const std::unique_ptr<ASN1_OBJECT, decltype(&ASN1_OBJECT_free)> object(
+        d2i_ASN1_OBJECT(nullptr, &place, static_cast<long>(encoding.size())), ASN1_OBJECT_free);
+    const int length = object ? OBJ_obj2txt(text, sizeof text, object.get(), isNamed ? 0 : 1) : 0;
+    return length > 0 && static_cast<std::size_t>(length) < sizeof text ? text : "";
 }

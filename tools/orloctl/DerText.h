@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
 
 struct DerFault {
     std::uint64_t offset;
@@ -37,10 +38,14 @@ std::string quotedCode(std::uint64_t number);
 std::string escapedText(const DERItem& text, std::uint64_t most = UINT64_MAX);
 std::string quotedText(const DERItem& text, std::uint64_t most);
 
-// The content of an OBJECT IDENTIFIER as numbers with dots. A very long one ends in an ellipsis.
-std::string oidText(const DERItem& content);
+// The content of an OBJECT IDENTIFIER as numbers with dots or, where it has one, by its name; empty when it is
+// malformed or longer than 127 characters.
+std::string oidText(const DERItem& content, bool isNamed = false);
 
 // Two lower-case digits an octet; at most `most` octets, then an ellipsis.
 std::string hexText(const DERItem& data, std::uint64_t most = UINT64_MAX);
+
+// The whole encoding of an item with that content.
+std::vector<std::uint8_t> derEncoding(DERTag tag, const DERItem& content);
 
 #endif

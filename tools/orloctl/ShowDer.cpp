@@ -29,7 +29,7 @@ bool isText(DERTag tag) {
 // Numbers with dots, or the octets when a number is too large for them.
 std::string oidValue(const DERItem& content) {
     const std::string numbers = oidText(content);
-    return numbers.ends_with("...") ? "0x" + hexText(content) : numbers;
+    return numbers.empty() ? "0x" + hexText(content) : numbers;
 }
 
 // The value of a primitive item; null when it has none to show.

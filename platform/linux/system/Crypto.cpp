@@ -333,13 +333,6 @@ bool verifyECDSASignature(Curve curve, Bytes point, Bytes hash, Bytes signature)
     return verifier != nullptr && EVP_PKEY_verify_init(verifier.get()) == 1 && verify(verifier.get(), hash, signature);
 }
 
-bool isPublicKey(Curve curve, Bytes point) noexcept {
-    if (!libraryIsUsable())
-        return false;
-    const QuietErrors quiet;
-    return importPoint(curve, point) != nullptr;
-}
-
 bool randomBytes(void* out, std::size_t length) noexcept {
     auto* next = static_cast<std::uint8_t*>(out);
     std::size_t left = length;
