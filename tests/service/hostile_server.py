@@ -44,6 +44,12 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.connection.shutdown(socket.SHUT_RDWR)
         self.close_connection = True
 
+    def close_notify(self):
+        """Ends the connection as what its protocol counts as an end: with TLS that is no mere end of the octets."""
+        if self.server.context:
+            self.connection.unwrap()
+        self.drop()
+
     def plain(self, count, *_):
         self.body()
         with self.server.lock:
@@ -98,7 +104,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
     def half(self, count):
         self.body()
         self.answer(200, b"half", Content_Length=8)
-        self.drop()
+        self.close_notify()
 
     def cut(self, count, seeming=""):
         """Half of an answer that does not say where it ends, though it, or an interim one before it, may seem to."""
@@ -112,7 +118,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
             self.send_header("Content-Length", "9" * 30)
         self.end_headers()
         self.wfile.write(b"half")
-        self.close_connection = True
+        self.close_notify()
 
     def encoded(self, count):
         self.body()

@@ -430,8 +430,8 @@ class Failures(HostileTest):
             ("stall", TRANSPORT, "timed out"),
             ("trickle", TRANSPORT, "timed out"),
             ("headers_", TRANSPORT, "The answer has too many headers"),
-            ("half", TRANSPORT, "closed"),
-            ("noise", TRANSPORT, "HTTP/0.9"),
+            ("half", TRANSPORT, "with 4 bytes"),
+            ("noise", TRANSPORT, "HTTP/0.9|Invalid status line"),
             ("endless-500", TRANSPORT, "HTTP status 500"),
             ("encoded", TRANSPORT, "Content-Encoding"),
         )
@@ -446,7 +446,7 @@ class Failures(HostileTest):
             ("get", "endless", TRANSPORT, "larger than 67108864 bytes"),
             ("get", "announced", TRANSPORT, "larger than 67108864 bytes"),
             ("put", "endless", TRANSPORT, "larger than 1048576 bytes"),
-            ("put", "mid", TRANSPORT, ""),
+            ("put", "mid", TRANSPORT, "."),
         ]
         for verb, behaviour, code, reason in rows:
             with self.subTest((verb, behaviour)):
@@ -458,7 +458,7 @@ class Failures(HostileTest):
                 self.assertEqual(result, code, text)
                 name = urllib.parse.quote(behaviour, safe="")
                 self.assertTrue(text.startswith(f"{verb.upper()} {DATA_STORE}/v1/records/psd2/{name}: "), text)
-                self.assertIn(reason, text)
+                self.assertRegex(text, reason)
         self.assertEqual({path for _, path in self.server.seen if path.endswith("plain")}, set(), "was redirected")
         self.assertEqual((hasty.get("plain"), patient.get("plain")), ((0, ""), (0, "")))
         self.assertLess(patient.peak_megabytes(), 200)
@@ -475,7 +475,7 @@ class Failures(HostileTest):
         description["store"]["connectTo"][f"{CA_HOST}:8080"] = f"127.0.0.1:{trust.server_port}"
         path.write_text(json.dumps(description))
         record = f"{DATA_STORE}/v2/records/psd2/VAN0001"
-        for behaviour, reason in (("endless", "larger than"), ("announced", "larger than"), ("half", "closed"),
+        for behaviour, reason in (("endless", "larger than"), ("announced", "larger than"), ("half", "with 4 bytes"),
                                   ("noise", "HTTP/0.9")):
             with self.subTest(behaviour):
                 self.server.instead = behaviour
@@ -484,7 +484,7 @@ class Failures(HostileTest):
                 self.assertEqual(self.put(b"x")[2]["code"], 1011)
                 error = self.answer("export")[2]
                 self.assertEqual((error["code"], reason in error["description"]), (2012, True), error)
-        for behaviour, reason in (("endless", "larger than 1048576 bytes"), ("half", "closed"), ("cut", "where it ends")):
+        for behaviour, reason in (("endless", "larger than 1048576 bytes"), ("half", "with 4 bytes"), ("cut", "where it ends")):
             with self.subTest(behaviour):
                 trust.instead = behaviour
                 for words, code in ((["get-psd2", "/tmp/out"], 1008), (["put-psd2", "/tmp/in"], 1008), (["export"], 2007)):
