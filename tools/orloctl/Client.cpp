@@ -103,41 +103,28 @@ void hideUserInfo(Value::Dictionary& response) {
 Answer answerFrom(sd_bus_message* reply, const std::string& command) {
     int completed = 0;
     check(sd_bus_message_read_basic(reply, SD_BUS_TYPE_BOOLEAN, &completed));
-    Answer answer;
-    answer.response = bus::readDictionary(reply);
-    hideUserInfo(answer.response);
-    if (answer.response.empty()) {
-        answer.outcome = Outcome::UnknownCommand;
-        answer.problem = "The plug-in does not know the command \"" + command + "\".";
-        return answer;
-    }
-    const Value response(answer.response);
-    answer.outcome = response["statusCode"].integer() == 0 ? Outcome::Success : Outcome::Failure;
-    if (answer.outcome == Outcome::Failure)
-        answer.problem = "The plug-in answered \"" + command + "\" with a failure.";
-    return answer;
+    Value::Dictionary response = bus::readDictionary(reply);
+    if (response.empty())
+        return {Outcome::UnknownCommand, {}, "The plug-in does not know the command \"" + command + "\"."};
+    hideUserInfo(response);
+    if (Value(response)["statusCode"].integer() == 0)
+        return {Outcome::Success, std::move(response)};
+    return {Outcome::Failure, std::move(response), "The plug-in answered \"" + command + "\" with a failure."};
 }
 
 Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address) {
-    Answer answer;
+    const std::string_view name = error.name;
     const std::string text = error.message ? error.message : error.name;
-    if (std::string_view(error.name) == SD_BUS_ERROR_INVALID_ARGS) {
-        answer.outcome = Outcome::Usage;
-        answer.problem = "The service refused the request: " + text;
-        return answer;
-    }
     const std::string where = " on the bus \"" + address.bus + "\"";
-    if (std::string_view(error.name) == SD_BUS_ERROR_ACCESS_DENIED && geteuid() != 0) {
-        answer.problem = "Only root may call the service" + where + ".";
-        return answer;
-    }
-    if (std::string_view(error.name) == SD_BUS_ERROR_NO_REPLY)
-        answer.problem = "The service" + where + " did not answer: " + text;
-    else if (std::string_view(error.name) == SD_BUS_ERROR_SERVICE_UNKNOWN)
-        answer.problem = "The service " + std::string(serviceName) + " is not running" + where + ".";
-    else
-        answer.problem = "The service" + where + " cannot be used: " + text;
-    return answer;
+    if (name == SD_BUS_ERROR_INVALID_ARGS)
+        return {Outcome::Usage, {}, "The service refused the request: " + text};
+    if (name == SD_BUS_ERROR_ACCESS_DENIED && geteuid() != 0)
+        return {Outcome::Unreachable, {}, "Only root may call the service" + where + "."};
+    if (name == SD_BUS_ERROR_NO_REPLY)
+        return {Outcome::Unreachable, {}, "The service" + where + " did not answer: " + text};
+    if (name == SD_BUS_ERROR_SERVICE_UNKNOWN)
+        return {Outcome::Unreachable, {}, "The service " + std::string(serviceName) + " is not running" + where + "."};
+    return {Outcome::Unreachable, {}, "The service" + where + " cannot be used: " + text};
 }
 
 std::chrono::microseconds timeLeft(const ServiceAddress& address) {
@@ -175,8 +162,7 @@ int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
         if (const char* sender = sd_bus_message_get_sender(reply); sender && !error)
             pending.sender = sender;
     } catch (const std::exception& failure) {
-        pending.answer =
-            Answer{Outcome::Unreachable, {}, std::string("The answer cannot be read: ") + failure.what(), {}};
+        pending.answer = {Outcome::Unreachable, {}, std::string("The answer cannot be read: ") + failure.what()};
     }
     return 0;
 }
@@ -201,8 +187,7 @@ Answer converse(sd_bus* connection, const ServiceAddress& address, const std::st
             return {Outcome::Unreachable,
                     {},
                     noAnswerReason(address) + " while the service on the bus \"" + address.bus + "\" was to answer. " +
-                        fateOf(connection),
-                    {}};
+                        fateOf(connection)};
         const int waited = sd_bus_wait(connection, static_cast<std::uint64_t>(std::min(left, tick).count()));
         if (waited != -EINTR)
             check(waited);

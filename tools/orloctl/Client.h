@@ -13,10 +13,10 @@
 
 struct Answer {
     Outcome outcome = Outcome::Unreachable;
-    Value::Dictionary response; // as the plug-in sent it; empty unless it answered
-    std::string problem;        // sentences for a person; empty on success
+    Value::Dictionary response = {}; // as the plug-in sent it; empty unless it answered
+    std::string problem = {};        // sentences for a person; empty on success
     // The user whom the bus names as the one who runs the service that answered; none when it has left meanwhile.
-    std::optional<uid_t> serviceUser;
+    std::optional<uid_t> serviceUser = {};
     std::string reasons = {}; // a sentence that says where the service has said why it answered so
 };
 

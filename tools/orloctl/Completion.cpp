@@ -53,57 +53,39 @@ constexpr struct {
     {"PROFILE", offerTrustProfiles},
 };
 
-// The words of an option or operand that takes no others, which stand in braces in the name of its type.
-void offerMembers(const std::string& typeName, const std::string& typed) {
-    const std::size_t open = typeName.find('{');
-    if (open == std::string::npos)
-        return;
-    std::istringstream words(typeName.substr(open + 1, typeName.find('}') - open - 1));
-    for (std::string word; std::getline(words, word, ',');)
-        offer(word, typed);
-}
-
 void offerKind(std::string_view placeholder, const std::string& typed) {
     for (const auto& kind : kinds)
         if (kind.placeholder == placeholder)
             kind.offer(typed);
 }
 
-// The names of an option with their dashes.
-std::vector<std::string> namesOf(const CLI::Option& option) {
-    std::vector<std::string> names;
-    for (const std::string& name : option.get_snames())
-        names.push_back("-" + name);
-    for (const std::string& name : option.get_lnames())
-        names.push_back("--" + name);
-    return names;
+// What stands between the commas of a name or type that CLI11 has made.
+std::vector<std::string> partsOf(const std::string& list) {
+    std::vector<std::string> parts;
+    std::istringstream rest(list);
+    for (std::string part; std::getline(rest, part, ',');)
+        parts.push_back(part);
+    return parts;
 }
 
 // A verb takes the options of those above it too.
 const CLI::Option* optionNamed(const CLI::App* verb, const std::string& word) {
-    for (; verb; verb = verb->get_parent())
-        for (const CLI::Option* option : verb->get_options()) {
-            const auto names = namesOf(*option);
-            if (std::find(names.begin(), names.end(), word) != names.end())
-                return option;
-        }
-    return nullptr;
+    const CLI::Option* option = nullptr;
+    for (; verb && !option; verb = verb->get_parent())
+        option = verb->get_option_no_throw(word);
+    return option;
 }
 
 void offerOptions(const CLI::App& verb, const std::string& typed) {
     for (const CLI::App* level = &verb; level; level = level->get_parent())
         for (const CLI::Option* option : level->get_options())
-            for (const std::string& name : namesOf(*option))
-                if (level == &verb || option != level->get_help_ptr())
+            if (!option->get_positional() && (level == &verb || option != level->get_help_ptr()))
+                for (const std::string& name : partsOf(option->get_name(false, true)))
                     offer(name, typed, option->get_description());
 }
 
-std::vector<const CLI::App*> verbsOf(const CLI::App& app) {
-    return app.get_subcommands([](const CLI::App* verb) { return !verb->get_group().empty(); });
-}
-
 void offerOperands(const CLI::App& verb, std::size_t before, const std::string& typed) {
-    for (const CLI::App* next : verbsOf(verb))
+    for (const CLI::App* next : verb.get_subcommands(nullptr))
         offer(next->get_name(), typed, next->get_description());
     std::size_t position = 0;
     for (const CLI::Option* operand : verb.get_options()) {
@@ -111,7 +93,11 @@ void offerOperands(const CLI::App& verb, std::size_t before, const std::string& 
             continue;
         const bool takesAllThatFollow = operand->get_expected_max() > 1;
         if (position == before || (takesAllThatFollow && position < before)) {
-            offerMembers(operand->get_type_name(), typed);
+            // The words of an operand that takes no others stand in braces in the name of its type.
+            const std::string type = operand->get_type_name();
+            if (const std::size_t open = type.find('{'); open != std::string::npos)
+                for (const std::string& word : partsOf(type.substr(open + 1, type.find('}') - open - 1)))
+                    offer(word, typed);
             offerKind(operand->get_name(true), typed);
             // What may be left out may be left out now.
             before += operand->get_required() || takesAllThatFollow ? 0 : 1;
@@ -129,17 +115,15 @@ void printCompletions(const CLI::App& app, const std::vector<std::string>& words
     bool optionsHaveEnded = false;
     for (std::size_t i = 0; i + 1 < words.size(); ++i) {
         const std::string& word = words[i];
-        const auto verbs = verbsOf(*verb);
-        const auto next =
-            std::find_if(verbs.begin(), verbs.end(), [&](const CLI::App* known) { return known->get_name() == word; });
+        const auto verbs = verb->get_subcommands([&](const CLI::App* known) { return known->get_name() == word; });
         if (waiting)
             waiting = nullptr;
         else if (!optionsHaveEnded && word.starts_with('-') && word.size() > 1) {
             optionsHaveEnded = word == "--";
             const CLI::Option* option = optionNamed(verb, word);
             waiting = option && option->get_items_expected_max() > 0 ? option : nullptr;
-        } else if (operands == 0 && next != verbs.end())
-            verb = *next;
+        } else if (operands == 0 && !verbs.empty())
+            verb = verbs.front();
         else
             ++operands;
     }

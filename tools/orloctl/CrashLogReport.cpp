@@ -15,13 +15,10 @@
 #include <utility>
 
 #include <fcntl.h>
-#include <sys/stat.h>
 
 #include "Daemon/CrashLogs.h"
 #include "platform/Utf8.h"
 #include "platform/linux/system/DeviceRoot.h"
-#include "platform/linux/system/NewFile.h"
-#include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/LocalFiles.h"
 
 namespace {
@@ -55,7 +52,9 @@ public:
     void copy(ordered_json& entry, const CrashLog& log) {
         const std::string path = utf8::repaired(log.path);
         const std::string name = unusedName(path.substr(path.rfind('/') + 1));
-        if (const std::string problem = write(name, log.file); problem.empty())
+        const std::string problem = replaceFile(
+            directory_, name, [&log](const NewFile& file) { return file.fillFrom(log.file); }, names_.size() == 1);
+        if (problem.empty())
             entry["copy"] = (path_ / name).string();
         else
             entry["note"] = "not copied to " + (path_ / name).string() + ": " + problem;
@@ -67,16 +66,6 @@ private:
         for (int& number = copies_[unused]; !names_.insert(unused).second;)
             unused = copyName(std::to_string(++number + 1) + "-", name);
         return unused;
-    }
-
-    // A regular file that is there is replaced, anything else stays as it is. The reason of a failure, or an empty
-    // text.
-    std::string write(const std::string& name, const FileDescriptor& log) const {
-        struct stat status;
-        if (::fstatat(directory_.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && !S_ISREG(status.st_mode))
-            return "what stands there is no file";
-        NewFile file(directory_, names_.size() == 1);
-        return file && file.fillFrom(log) && file.replace(name) ? "" : std::strerror(errno);
     }
 
     const std::filesystem::path path_;

@@ -9,7 +9,6 @@
 #include <sys/stat.h>
 
 #include "platform/Files.h"
-#include "platform/linux/system/NewFile.h"
 
 namespace {
 
@@ -28,21 +27,6 @@ Value::Data readAll(std::istream& file, const std::string& name) {
     return contents;
 }
 
-// The reason of a failure, or an empty text.
-std::string replaceFile(const std::string& path, const Value::Data& contents) {
-    const std::size_t slash = path.rfind('/');
-    const std::string folder = slash == std::string::npos ? "." : path.substr(0, slash + 1);
-    const std::string name = path.substr(slash == std::string::npos ? 0 : slash + 1);
-    const FileDescriptor directory(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!directory)
-        return std::strerror(errno);
-    struct stat status;
-    if (::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && !S_ISREG(status.st_mode))
-        return "what stands there is no file";
-    NewFile file(directory);
-    return file && file.fill(contents) && file.replace(name) ? "" : std::strerror(errno);
-}
-
 } // namespace
 
 Value::Data readLocalFile(const std::string& path) {
@@ -52,9 +36,26 @@ Value::Data readLocalFile(const std::string& path) {
     return readAll(file, path);
 }
 
+std::string replaceFile(const FileDescriptor& directory, const std::string& name,
+                        const std::function<bool(const NewFile&)>& fill, bool isFirst) {
+    struct stat status;
+    if (::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && !S_ISREG(status.st_mode))
+        return "what stands there is no file";
+    NewFile file(directory, isFirst);
+    return file && fill(file) && file.replace(name) ? "" : std::strerror(errno);
+}
+
 void writeLocalFile(const std::string& path, const Value::Data& contents) {
-    if (path == standardStream)
+    if (path == standardStream) {
         std::cout.write(reinterpret_cast<const char*>(contents.data()), static_cast<std::streamsize>(contents.size()));
-    else if (const std::string problem = replaceFile(path, contents); !problem.empty())
+        return;
+    }
+    const std::size_t name = path.rfind('/') + 1; // 0 without one
+    const std::string folder = name == 0 ? "." : path.substr(0, name);
+    const FileDescriptor directory(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const std::string problem =
+        directory ? replaceFile(directory, path.substr(name), [&](const NewFile& file) { return file.fill(contents); })
+                  : std::strerror(errno);
+    if (!problem.empty())
         throw UsageError("Cannot write " + path + ": " + problem);
 }

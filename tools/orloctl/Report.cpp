@@ -21,58 +21,48 @@ std::string dump(const ordered_json& json) {
     return json.dump(-1, ' ', false, ordered_json::error_handler_t::replace);
 }
 
+bool isScalar(const ordered_json& json) {
+    return !json.is_structured() && !json.is_binary();
+}
+
 class JsonWriter {
 public:
     explicit JsonWriter(std::ostream& out) : out_(out) {}
 
     void value(const ordered_json& json, const Lists& lists) {
-        if (json.is_binary()) {
-            open('[');
-            lists.at(json)([this](const Element& element) {
-                next();
+        if (isScalar(json)) {
+            scalar(json);
+            return;
+        }
+        bool isFirst = true;
+        ++depth_;
+        out_ << (json.is_object() ? '{' : '[');
+        if (json.is_binary())
+            lists.at(json)([&](const Element& element) {
+                next(isFirst);
                 value(element.json, element.lists);
                 return out_.good();
             });
-            close(']');
-        } else if (json.is_object()) {
-            open('{');
+        else
             for (const auto& [name, member] : json.items()) {
-                next();
-                scalar(name);
-                out_ << ": ";
+                next(isFirst);
+                if (json.is_object()) {
+                    scalar(name);
+                    out_ << ": ";
+                }
                 value(member, lists);
             }
-            close('}');
-        } else if (json.is_array()) {
-            open('[');
-            for (const ordered_json& element : json) {
-                next();
-                value(element, lists);
-            }
-            close(']');
-        } else
-            scalar(json);
+        --depth_;
+        if (!isFirst)
+            newLine();
+        out_ << (json.is_object() ? '}' : ']');
     }
 
 private:
-    void open(char bracket) {
-        out_ << bracket;
-        ++depth_;
-        isFirst_ = true;
-    }
-
-    void next() {
-        out_ << (isFirst_ ? "" : ",");
+    void next(bool& isFirst) {
+        out_ << (isFirst ? "" : ",");
         newLine();
-        isFirst_ = false;
-    }
-
-    void close(char bracket) {
-        --depth_;
-        if (!isFirst_)
-            newLine();
-        out_ << bracket;
-        isFirst_ = false;
+        isFirst = false;
     }
 
     void newLine() { out_ << '\n' << std::string(2 * depth_, ' '); }
@@ -88,7 +78,6 @@ private:
 
     std::ostream& out_;
     std::size_t depth_ = 0;
-    bool isFirst_ = true;
 };
 
 // How people see a member. In the line of an element, {name} is the value of that name, {name:8} the same to the right
@@ -130,10 +119,6 @@ constexpr Layout layouts[] = {
 const Layout& layoutOf(std::string_view name, const Layout& outer) {
     const auto* const own = std::ranges::find(layouts, name, &Layout::name);
     return own == std::end(layouts) ? outer : *own;
-}
-
-bool isScalar(const ordered_json& json) {
-    return !json.is_structured() && !json.is_binary();
 }
 
 std::string valueText(const ordered_json& json, std::size_t longest, bool isQuoted) {

@@ -1,6 +1,5 @@
 #include "tools/orloctl/ShowBcfg.h"
 
-#include <cctype>
 #include <cstdarg>
 #include <cstdio>
 #include <limits>
@@ -8,10 +7,10 @@
 #include <string>
 #include <vector>
 
-#include "Daemon/Conversions.h"
 #include "der/DERDecode.h"
 #include "sysconfig/SysConfig3.h"
 #include "sysconfig/SysConfig3Ptr.h"
+#include "tools/orloctl/DerText.h"
 
 namespace {
 
@@ -80,26 +79,12 @@ std::string hexadecimal(std::uint32_t number) {
     return digits;
 }
 
-// A number as its four characters when all of them can be shown, in hexadecimal otherwise.
-std::string fourCharacters(std::uint32_t code) {
-    std::string characters;
-    for (int shift = 24; shift >= 0; shift -= 8)
-        characters += static_cast<char>(code >> shift & 0xFF);
-    for (const char character : characters)
-        if (character < 0x20 || character > 0x7E)
-            return hexadecimal(code);
-    return characters;
-}
-
 std::string hexDigits(const SysConfigData& view) {
-    if (!view.data)
-        return "";
-    const Value digits = DatatoHexString(Value::Data(view.data, view.data + view.length));
-    return digits.isNothing() ? "" : *digits.text();
+    return hexText({view.data, view.length});
 }
 
 ordered_json payloadEntry(const __SysConfig3PayloadEntry* entry) {
-    ordered_json json{{"key", fourCharacters(sysConfig3PayloadEntryGetKey(entry))},
+    ordered_json json{{"key", codeText(sysConfig3PayloadEntryGetKey(entry))},
                       {"comment", sysConfig3PayloadEntryGetComment(entry)}};
     SysConfigData data = {};
     if (sysConfig3PayloadEntryGetData(entry, &data))
@@ -217,7 +202,7 @@ Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
         return refused(collector.collected(), blob);
     Report report;
     report.json = {
-        {"magic", fourCharacters(sysConfig3GetMagic(object.get()))},
+        {"magic", codeText(sysConfig3GetMagic(object.get()))},
         {"version", hexadecimal(sysConfig3GetVersion(object.get()))},
         {"payload", report.lists.add(payloadEntries(object), sysConfig3GetPayloadEntryCount(object.get()))},
         {"metadata", report.lists.add(metadataEntries(object), sysConfig3GetMetadataEntryCount(object.get()))},

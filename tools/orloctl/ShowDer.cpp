@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "der/DERDecode.h"
+#include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
 
 namespace {
@@ -48,7 +48,7 @@ ordered_json valueOf(DERTag tag, const DERItem& content) {
 
 class Tree {
 public:
-    Tree(const std::uint8_t* data, std::size_t length) : data_(data), whole_{data, length}, end_(data + length) {}
+    Tree(const std::uint8_t* data, std::size_t length) : whole_{data, length}, end_(data + length) {}
 
     // Goes through all items, and keeps where the tree ends and what is wrong first.
     void check(Report& report);
@@ -60,31 +60,31 @@ public:
 
 private:
     void check(const DERItem& content, unsigned depth, Report& report);
-    void note(Report& report, std::uint64_t offset, const DerFault& fault) const;
+    void note(Report& report, const std::uint8_t* item, const DerFault& fault) const;
 
     Elements itemsIn(const DERItem& content) const;
-    Element describe(const DERItem& rest, const DERDecodedInfo& item) const;
+    Element describe(const DERItem& encoding, const DERDecodedInfo& item) const;
 
-    std::uint64_t offsetOf(const DERItem& place) const { return static_cast<std::uint64_t>(place.data - data_); }
+    std::uint64_t offsetOf(const std::uint8_t* place) const { return static_cast<std::uint64_t>(place - whole_.data); }
 
-    const std::uint8_t* data_;
     DERItem whole_;
     const std::uint8_t* end_; // of what can be read
     std::uint64_t count_ = 0;
 };
 
-void Tree::note(Report& report, std::uint64_t offset, const DerFault& fault) const {
+void Tree::note(Report& report, const std::uint8_t* item, const DerFault& fault) const {
     if (!report.ok)
         return;
+    const std::uint64_t offset = offsetOf(item) + fault.offset;
     report.ok = false;
-    report.json["problemOffset"] = offset + fault.offset;
-    report.problem = "Strict DER ends at offset " + std::to_string(offset + fault.offset) + ", in the item at offset " +
-                     std::to_string(offset) + ": " + fault.reason + ".";
+    report.json["problemOffset"] = offset;
+    report.problem = "Strict DER ends at offset " + std::to_string(offset) + ", in the item at offset " +
+                     std::to_string(offsetOf(item)) + ": " + fault.reason + ".";
 }
 
-Element Tree::describe(const DERItem& rest, const DERDecodedInfo& item) const {
-    Element element{{{"offset", offsetOf(rest)},
-                     {"headerLength", static_cast<std::uint64_t>(item.content.data - rest.data)},
+Element Tree::describe(const DERItem& encoding, const DERDecodedInfo& item) const {
+    Element element{{{"offset", offsetOf(encoding.data)},
+                     {"headerLength", encoding.length - item.content.length},
                      {"contentLength", item.content.length},
                      {"tag", derTagName(item.tag)},
                      {"constructed", isConstructed(item.tag)}},
@@ -100,47 +100,38 @@ Element Tree::describe(const DERItem& rest, const DERDecodedInfo& item) const {
 
 Elements Tree::itemsIn(const DERItem& content) const {
     return [tree = *this, content](const auto& take) {
-        DERSequence sequence;
-        DERDecodedInfo item;
-        DERDecodeSeqContentInit(&content, &sequence);
-        while (sequence.next < tree.end_) {
-            const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
-            if (DERDecodeSeqNext(&sequence, &item) != DERSuccess || !take(tree.describe(rest, item)))
-                return;
-        }
+        DerItems items(content);
+        while (items.next() && items.encoding().data < tree.end_ && take(tree.describe(items.encoding(), items.item())))
+            ;
     };
 }
 
 void Tree::check(const DERItem& content, unsigned depth, Report& report) {
-    DERSequence sequence;
-    DERDecodedInfo item;
-    DERDecodeSeqContentInit(&content, &sequence);
-    while (sequence.next != sequence.end && sequence.next < end_) {
-        const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
-        if (const auto fault = derHeaderFault(rest)) {
-            note(report, offsetOf(rest), *fault);
-            end_ = rest.data;
-            return;
-        }
-        if (DERDecodeSeqNext(&sequence, &item) != DERSuccess)
-            return;
+    DerItems items(content);
+    while (items.next() && items.encoding().data < end_) {
+        const DERDecodedInfo& item = items.item();
         ++count_;
         if (auto fault = derContentFault(item.tag, item.content)) {
-            fault->offset += offsetOf(item.content) - offsetOf(rest);
-            note(report, offsetOf(rest), *fault);
+            fault->offset += items.encoding().length - item.content.length;
+            note(report, items.encoding().data, *fault);
         }
         if (isConstructed(item.tag) && depth == deepest) {
-            note(report, offsetOf(item.content),
-                 {0, "items are nested deeper than " + std::to_string(deepest) + " levels"});
+            note(report, item.content.data, {0, "items are nested deeper than " + std::to_string(deepest) + " levels"});
             end_ = item.content.data;
         } else if (isConstructed(item.tag))
             check(item.content, depth + 1, report);
     }
+    if (!items.isBroken() || items.encoding().data >= end_)
+        return;
+    if (const auto fault = derHeaderFault(items.encoding())) {
+        note(report, items.encoding().data, *fault);
+        end_ = items.encoding().data;
+    }
 }
 
 void Tree::check(Report& report) {
-    if (data_ == end_)
-        note(report, 0, {0, "there are no octets"});
+    if (whole_.length == 0)
+        note(report, whole_.data, {0, "there are no octets"});
     else
         check(whole_, 0, report);
 }
