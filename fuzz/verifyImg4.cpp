@@ -58,8 +58,10 @@ void check(const DERItem& file, const TrustDomain& domain, std::optional<std::ui
     FUZZ_REQUIRE(report.ok == report.problem.empty());
     FUZZ_REQUIRE(report.ok || report.json["problemOffset"] <= file.length);
     std::ostringstream printed;
+    std::ostringstream lines;
     writeJson(printed, report);
-    for (const std::string& text : {report.text, report.problem})
+    writeText(lines, report);
+    for (const std::string& text : {lines.str(), report.problem})
         FUZZ_REQUIRE(std::all_of(text.begin(), text.end(), isPrintable));
     const std::string step = report.json.value("failedStep", "");
     FUZZ_REQUIRE(isExplained(report.problem, step));

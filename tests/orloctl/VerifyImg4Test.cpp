@@ -92,7 +92,7 @@ TEST(VerifyImg4, showsWhatTheManifestSaysAndTheLeafDemands) {
     EXPECT_EQ(object.json["object"]["name"], "sepi");
     EXPECT_EQ(object.json["object"]["properties"][2]["value"], 300);
     EXPECT_EQ(object.json["constraints"][1]["state"], "met");
-    EXPECT_NE(object.text.find("\nResult: trusted under kImg4DecodeSecureBootEc384Sha384: "), std::string::npos);
+    EXPECT_NE(object.text.find("\nresult: trusted under kImg4DecodeSecureBootEc384Sha384: "), std::string::npos);
 }
 
 // A file that is refused, and what is said of it.
@@ -307,7 +307,7 @@ TEST(VerifyImg4, saysWhyItRefusesAndWhere) {
         EXPECT_EQ(report.json["failedStep"], row.step) << row.problem;
         EXPECT_LE(report.json["problemOffset"], row.bytes.size()) << row.problem;
         EXPECT_EQ(report.json["trusted"], false);
-        EXPECT_NE(report.text.find("\nResult: not trusted\n"), std::string::npos);
+        EXPECT_NE(report.text.find("\ntrusted: false\n"), std::string::npos);
     }
 }
 
@@ -337,7 +337,7 @@ TEST(VerifyImg4, aRootOfTheSameNameIsNotTheRoot) {
 
 TEST(VerifyImg4, hostileNamesStayWithinTheLine) {
     Manifest fields = standardManifest();
-    fields.properties.push_back(property("EVIL", ia5("\x1B[2J\nResult: trusted")));
+    fields.properties.push_back(property("EVIL", ia5("\x1B[2J\nresult: trusted")));
     const Signer& signer = signerOf(ec384);
     Certificate leaf = signer.leaf({});
     leaf.subject = distinguishedName("a,O=b\x1B[31m\n\"+\\;<> ");
@@ -345,7 +345,7 @@ TEST(VerifyImg4, hostileNamesStayWithinTheLine) {
     ASSERT_TRUE(report.ok) << report.problem;
     EXPECT_EQ(report.json["chain"][1]["subject"], "CN=a\\,O=b\\1B[31m\\0A\\\"\\+\\\\\\;\\<\\>\\ ");
     EXPECT_EQ(report.text.find('\x1B'), std::string::npos);
-    EXPECT_EQ(report.text.find("\nResult: trusted\n"), std::string::npos);
+    EXPECT_EQ(report.text.find("\nresult: trusted\n"), std::string::npos);
 
     leaf.subject = set({integer(1)});
     EXPECT_FALSE(verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain()).ok);
@@ -359,7 +359,7 @@ TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
     const Report report = verify(withProperty(property("BAD!", item(DERTagBoolean, {1}))), testDomain());
     EXPECT_TRUE(report.ok) << report.problem;
     ASSERT_EQ(report.json["notes"].size(), 1U);
-    EXPECT_NE(report.text.find("Note: \"BAD!\" of the manifest is a BOOLEAN that is not 00 or FF"), std::string::npos)
+    EXPECT_NE(report.text.find("\n  \"BAD!\" of the manifest is a BOOLEAN that is not 00 or FF"), std::string::npos)
         << report.text;
 }
 

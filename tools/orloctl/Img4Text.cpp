@@ -145,13 +145,6 @@ std::string img4ValueText(const ordered_json& property, std::size_t most) {
     return text;
 }
 
-std::string img4PropertiesText(const Elements& properties, unsigned depth) {
-    const Lists none;
-    Lines lines(none);
-    lines.addProperties(depth, properties);
-    return std::move(lines).text();
-}
-
 std::string img4Text(const Report& report) {
     const ordered_json& json = report.json;
     Lines lines(report.lists);

@@ -8,9 +8,7 @@
 // The lines for people of what showImg4 found; of many properties and certificates the first.
 std::string img4Text(const Report& report);
 
-// The lines of properties alone, indented for `depth` dictionaries around them; and the type and value of one that has
-// a type, "INTEGER 12", with at most so many characters of the value.
-std::string img4PropertiesText(const Elements& properties, unsigned depth);
+// The type and value of a property that has a type, "INTEGER 12", with at most so many characters of the value.
 std::string img4ValueText(const nlohmann::ordered_json& property, std::size_t most);
 
 #endif

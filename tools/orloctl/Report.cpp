@@ -95,7 +95,9 @@ constexpr std::uint64_t all = std::numeric_limits<std::uint64_t>::max();
 constexpr std::string_view property = "{name}[  {type}][ {\"value\"}][, {length} octets][: {hex}][ (SHA-256 {sha256})]"
                                       "[  WRONG: {fault}][  hidden {hidden}]";
 constexpr Layout layouts[] = {
-    {"", 1000, 128},
+    {"", 1000, 512},
+    {"notes", 1000, 2048},
+    {"result", all, SIZE_MAX},
     {"response", all, SIZE_MAX},
     {"items", 10000, 128, "{offset:8}{headerLength:5}{contentLength:9}\t{tag}[ {value}][  not DER: {fault}]",
      "  offset  hdr  content  item"},

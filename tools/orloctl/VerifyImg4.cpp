@@ -13,7 +13,6 @@
 #include "tools/orloctl/ShowImg4.h"
 #include "tools/orloctl/TrustConstraints.h"
 #include "tools/orloctl/TrustEvaluation.h"
-#include "tools/orloctl/VerifyText.h"
 
 namespace {
 
@@ -331,7 +330,6 @@ void Verification::run() {
         }
     }
     report_.json["notes"] = std::move(notes_);
-    report_.text = verifyText(report_);
 }
 
 } // namespace
