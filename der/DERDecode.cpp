@@ -23,73 +23,104 @@ uint64_t leftOf(const Reader& reader) {
     return static_cast<uint64_t>(reader.end - reader.next);
 }
 
+// The readers of a header's parts give out what is wrong, and then leave the reader at the octet at fault.
+
 // Reads the digits of a high tag number (X.690 8.1.2.4). Every octet read leaves at least one for the length, so that
 // no check is needed before the first length octet.
-inline bool readHighTagNumber(Reader* reader, uint64_t* number) {
+inline DERFault readHighTagNumber(Reader* reader, uint64_t* number) {
     constexpr uint64_t mostDigits = 9; // a tenth would take any number beyond the largest
     constexpr uint64_t codeDigits = 5;
     constexpr uint8_t leadingZeroDigit = moreBit;
     constexpr uint8_t lowestHighNumber = 31;
     const uint8_t* next = reader->next;
-    if (*next == leadingZeroDigit || *next < lowestHighNumber)
-        return false;
+    if (*next == leadingZeroDigit)
+        return DERFaultTagLeadingZero;
+    if (*next < lowestHighNumber)
+        return DERFaultTagForm;
     // Containers are full of tags that spell four characters, which take five digits. Read at fixed places, they let
     // the next item's place be known sooner than a loop does.
     if (leftOf(*reader) > codeDigits && (next[0] & next[1] & next[2] & next[3] & ~next[4] & moreBit) != 0) {
         *number = (next[0] & 0x7FULL) << 28 | (next[1] & 0x7FU) << 21 | (next[2] & 0x7FU) << 14 |
                   (next[3] & 0x7FU) << 7 | next[4];
         reader->next += codeDigits;
-        return true;
+        return DERFaultNone;
     }
-    const uint8_t* const limit = leftOf(*reader) > mostDigits ? next + mostDigits : reader->end - 1;
+    const bool isRoomy = leftOf(*reader) > mostDigits;
+    const uint8_t* const limit = isRoomy ? next + mostDigits : reader->end - 1;
     uint64_t value = 0;
     uint8_t digit = moreBit;
     while ((digit & moreBit) != 0) {
-        if (next == limit)
-            return false;
+        if (next == limit) {
+            reader->next = next;
+            return isRoomy ? DERFaultTagNumber : DERFaultHeaderCutShort;
+        }
         digit = *next++;
         value = value << 7 | (digit & 0x7FU);
     }
-    reader->next = next;
     *number = value;
-    return value <= DERTagNumberMask;
+    if (value > DERTagNumberMask) {
+        reader->next = next - 1;
+        return DERFaultTagNumber;
+    }
+    reader->next = next;
+    return DERFaultNone;
 }
 
 // Reads the identifier octets into a tag word. At least two octets are left.
-inline bool readTag(Reader* reader, DERTag* tag) {
+inline DERFault readTag(Reader* reader, DERTag* tag) {
     const uint8_t first = *reader->next++;
     uint64_t number = first & tagNumberBits;
-    if (number == tagNumberBits && !readHighTagNumber(reader, &number))
-        return false;
+    if (number == tagNumberBits)
+        if (const DERFault fault = readHighTagNumber(reader, &number); fault != DERFaultNone)
+            return fault;
     *tag = tagWord(first, number);
-    return true;
+    return DERFaultNone;
 }
 
 // Reads the length octets: definite and as short as can be (X.690 10.1). At least one octet is left.
-inline bool readLength(Reader* reader, uint64_t* length) {
-    const uint8_t first = *reader->next++;
-    if ((first & moreBit) == 0) {
-        *length = first;
-        return true;
+inline DERFault readLength(Reader* reader, uint64_t* length) {
+    const uint8_t* next = reader->next;
+    const uint8_t first = *next++;
+    uint64_t value = first;
+    if ((first & moreBit) != 0) {
+        const uint64_t count = first & 0x7FU;
+        if (count == 0)
+            return DERFaultLengthIndefinite;
+        if (count > sizeof(uint64_t))
+            return DERFaultLengthOctets;
+        if (count > static_cast<uint64_t>(reader->end - next))
+            return DERFaultHeaderCutShort;
+        value = 0;
+        const uint8_t leading = *next;
+        for (const uint8_t* const end = next + count; next != end; ++next)
+            value = value << 8 | *next;
+        if (leading == 0 || value <= 0x7F)
+            return DERFaultLengthForm;
     }
-    const uint64_t count = first & 0x7FU;
-    if (count == 0 || count > sizeof(uint64_t) || count > leftOf(*reader) || *reader->next == 0)
-        return false;
-    uint64_t value = 0;
-    for (const uint8_t* const end = reader->next + count; reader->next != end; ++reader->next)
-        value = value << 8 | *reader->next;
     *length = value;
-    return value > 0x7F;
+    reader->next = next;
+    return DERFaultNone;
+}
+
+inline void explain(DERRefusal* refusal, DERFault fault, const uint8_t* place, const uint8_t* item) {
+    if (refusal != nullptr)
+        *refusal = {fault, 0, place, item, 0, 0};
 }
 
 // Decodes the header of the item at the start of `der`. The content in *decoded starts behind it and has the declared
 // length, which the caller compares with *left, the number of octets that are there.
-inline DERReturn decodeHeader(DERItem der, DERDecodedInfo* decoded, uint64_t* left) {
-    if (der.length < 2)
-        return DERDecodeError;
+inline DERReturn decodeHeader(DERItem der, DERDecodedInfo* decoded, uint64_t* left, DERRefusal* refusal) {
     Reader reader = {der.data, der.data + der.length};
-    if (!readTag(&reader, &decoded->tag) || !readLength(&reader, &decoded->content.length))
+    DERFault fault = DERFaultHeaderCutShort;
+    if (der.length >= 2) {
+        fault = readTag(&reader, &decoded->tag);
+        if (fault == DERFaultNone)
+            fault = readLength(&reader, &decoded->content.length);
+    }
+    if (fault != DERFaultNone) {
+        explain(refusal, fault, fault == DERFaultHeaderCutShort ? reader.end : reader.next, der.data);
         return DERDecodeError;
+    }
     decoded->content.data = reader.next;
     *left = leftOf(reader);
     return DERSuccess;
@@ -110,23 +141,26 @@ inline bool decodeShortItem(DERItem der, DERDecodedInfo* decoded) {
 }
 
 // Within a walk, kept from a call of its own, which would cost as much again.
-[[gnu::always_inline]] inline DERReturn decodeItemOfAnyForm(DERItem der, DERDecodedInfo* decoded) {
+[[gnu::always_inline]] inline DERReturn decodeItemOfAnyForm(DERItem der, DERDecodedInfo* decoded, DERRefusal* refusal) {
     uint64_t left = 0;
-    if (const DERReturn result = decodeHeader(der, decoded, &left); result != DERSuccess)
+    if (const DERReturn result = decodeHeader(der, decoded, &left, refusal); result != DERSuccess)
         return result;
-    return decoded->content.length > left ? DERDecodeError : DERSuccess;
+    if (decoded->content.length <= left)
+        return DERSuccess;
+    explain(refusal, DERFaultContentCutShort, der.data + der.length, der.data);
+    return DERDecodeError;
 }
 
 // Decodes the item at the start of `der`, all of which must be there.
-inline DERReturn decodeWholeItem(DERItem der, DERDecodedInfo* decoded) {
-    return decodeShortItem(der, decoded) ? DERSuccess : decodeItemOfAnyForm(der, decoded);
+inline DERReturn decodeWholeItem(DERItem der, DERDecodedInfo* decoded, DERRefusal* refusal = nullptr) {
+    return decodeShortItem(der, decoded) ? DERSuccess : decodeItemOfAnyForm(der, decoded, refusal);
 }
 
-inline DERReturn decodeNext(DERSequence* sequence, DERDecodedInfo* decoded) {
+inline DERReturn decodeNext(DERSequence* sequence, DERDecodedInfo* decoded, DERRefusal* refusal = nullptr) {
     if (sequence->next >= sequence->end)
         return DEREndOfSequence;
     const DERItem rest = {sequence->next, static_cast<uint64_t>(sequence->end - sequence->next)};
-    const DERReturn result = decodeWholeItem(rest, decoded);
+    const DERReturn result = decodeWholeItem(rest, decoded, refusal);
     if (result == DERSuccess)
         sequence->next = decoded->content.data + decoded->content.length;
     return result;
@@ -175,17 +209,77 @@ DERReturn storeItem(const DERItemSpec& row, const uint8_t* encoding, DERItem ite
     return DERSuccess;
 }
 
+struct Rows {
+    const DERItemSpec* first;
+    const DERItemSpec* end;
+};
+
+// Passes `status` on. `row` is the first that was not matched, `item` the one at hand.
+DERReturn refuse(DERReturn status, DERFault fault, const Rows& rows, const DERItemSpec* row, const uint8_t* item,
+                 DERTag tag, DERRefusal* refusal) {
+    if (refusal == nullptr)
+        return status;
+    while (row != rows.end && hasOption(*row, DEROptionOptional))
+        ++row;
+    if (fault == DERFaultTag && row == rows.end)
+        fault = DERFaultExcess;
+    *refusal = {fault, static_cast<uint16_t>(row - rows.first), item, item, tag, row != rows.end ? row->tag : 0};
+    return status;
+}
+
+// Sees to it that nothing follows the item of the last row.
+DERReturn checkEnd(DERSequence sequence, const Rows& rows, DERRefusal* refusal) {
+    if (sequence.next == sequence.end)
+        return DERSuccess;
+    const uint8_t* const item = sequence.next;
+    DERDecodedInfo decoded;
+    if (refusal != nullptr && decodeNext(&sequence, &decoded, refusal) == DERSuccess)
+        refuse(DERDecodeError, DERFaultExcess, rows, rows.end, item, decoded.tag, refusal);
+    return DERDecodeError;
+}
+
+inline DERReturn parseContent(const DERItem& content, const Rows& rows, void* dest, uint64_t destSize,
+                              uint64_t sizeToZero, DERRefusal* refusal) {
+    DERSequence sequence = walkOf(content);
+    if (sizeToZero != 0)
+        std::memset(dest, 0, static_cast<size_t>(sizeToZero));
+    for (const DERItemSpec* row = rows.first; row != rows.end; ++row) {
+        const uint8_t* const encoding = sequence.next;
+        DERDecodedInfo decoded;
+        const DERReturn result = decodeNext(&sequence, &decoded, refusal);
+        if (result == DEREndOfSequence)
+            return allOptional(row, rows.end)
+                       ? DERSuccess
+                       : refuse(DERIncompleteSequence, DERFaultMissing, rows, row, encoding, 0, refusal);
+        if (result != DERSuccess)
+            return result;
+        const DERItemSpec* const match = matchingRow(row, rows.end, decoded.tag);
+        if (match == nullptr)
+            return refuse(DERUnexpectedTag, DERFaultTag, rows, row, encoding, decoded.tag, refusal);
+        row = match;
+        if (hasOption(*row, DEROptionSkip))
+            continue;
+        if (const DERReturn stored = storeItem(*row, encoding, decoded.content, dest, destSize); stored != DERSuccess)
+            return refuse(stored, DERFaultRecord, rows, row, encoding, decoded.tag, refusal);
+    }
+    return checkEnd(sequence, rows, refusal);
+}
+
 } // namespace
 
 DERReturn DERDecodeItem(const DERItem* der, DERDecodedInfo* decoded) {
     return decodeWholeItem(*der, decoded);
 }
 
+DERReturn DERDecodeItemExplained(const DERItem* der, DERDecodedInfo* decoded, DERRefusal* refusal) {
+    return decodeWholeItem(*der, decoded, refusal);
+}
+
 DERReturn DERDecodeItemPartialBufferGetLength(const DERItem* der, DERDecodedInfo* decoded, uint64_t* declaredLength) {
     if (declaredLength == nullptr)
         return decodeWholeItem(*der, decoded);
     uint64_t left = 0;
-    if (const DERReturn result = decodeHeader(*der, decoded, &left); result != DERSuccess)
+    if (const DERReturn result = decodeHeader(*der, decoded, &left, nullptr); result != DERSuccess)
         return result;
     *declaredLength = decoded->content.length;
     if (decoded->content.length > left)
@@ -195,7 +289,7 @@ DERReturn DERDecodeItemPartialBufferGetLength(const DERItem* der, DERDecodedInfo
 
 DERReturn DERDecodeItemPartialBuffer(const DERItem* der, DERDecodedInfo* decoded, bool allowPartial) {
     uint64_t left = 0;
-    if (const DERReturn result = decodeHeader(*der, decoded, &left); result != DERSuccess)
+    if (const DERReturn result = decodeHeader(*der, decoded, &left, nullptr); result != DERSuccess)
         return result;
     if (!allowPartial && decoded->content.length > left)
         return DERDecodeError;
@@ -251,39 +345,29 @@ DERReturn DERDecodeSequenceContentWithBlock(const DERItem* content, DERDecodeSeq
 
 DERReturn DERParseSequenceToObject(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs, void* dest,
                                    uint64_t destSize, uint64_t sizeToZero) {
-    DERDecodedInfo decoded;
-    if (const DERReturn result = decodeWholeItem(*der, &decoded); result != DERSuccess)
-        return result;
-    if (decoded.tag != DERTagSequence)
-        return DERUnexpectedTag;
-    return DERParseSequenceContentToObject(&decoded.content, numItems, itemSpecs, dest, destSize, sizeToZero);
+    return DERParseSequenceExplained(der, numItems, itemSpecs, dest, destSize, sizeToZero, nullptr);
 }
 
 DERReturn DERParseSequenceContentToObject(const DERItem* content, uint16_t numItems, const DERItemSpec* itemSpecs,
                                           void* dest, uint64_t destSize, uint64_t sizeToZero) {
-    DERSequence sequence = walkOf(*content);
-    if (sizeToZero != 0)
-        std::memset(dest, 0, static_cast<size_t>(sizeToZero));
-    if (numItems == 0)
-        return sequence.next == sequence.end ? DERSuccess : DERDecodeError;
-    const DERItemSpec* const endOfRows = itemSpecs + numItems;
-    for (const DERItemSpec* row = itemSpecs; row != endOfRows; ++row) {
-        const uint8_t* const encoding = sequence.next;
-        DERDecodedInfo decoded;
-        const DERReturn result = decodeNext(&sequence, &decoded);
-        if (result == DEREndOfSequence)
-            return allOptional(row, endOfRows) ? DERSuccess : DERIncompleteSequence;
-        if (result != DERSuccess)
-            return result;
-        row = matchingRow(row, endOfRows, decoded.tag);
-        if (row == nullptr)
-            return DERUnexpectedTag;
-        if (hasOption(*row, DEROptionSkip))
-            continue;
-        if (const DERReturn stored = storeItem(*row, encoding, decoded.content, dest, destSize); stored != DERSuccess)
-            return stored;
-    }
-    return sequence.next == sequence.end ? DERSuccess : DERDecodeError;
+    return parseContent(*content, {itemSpecs, itemSpecs + numItems}, dest, destSize, sizeToZero, nullptr);
+}
+
+DERReturn DERParseSequenceExplained(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs, void* dest,
+                                    uint64_t destSize, uint64_t sizeToZero, DERRefusal* refusal) {
+    DERDecodedInfo decoded;
+    if (const DERReturn result = decodeWholeItem(*der, &decoded, refusal); result != DERSuccess)
+        return result;
+    if (decoded.tag == DERTagSequence)
+        return parseContent(decoded.content, {itemSpecs, itemSpecs + numItems}, dest, destSize, sizeToZero, refusal);
+    if (refusal != nullptr)
+        *refusal = {DERFaultNoSequence, 0, der->data, der->data, decoded.tag, DERTagSequence};
+    return DERUnexpectedTag;
+}
+
+DERReturn DERParseSequenceContentExplained(const DERItem* content, uint16_t numItems, const DERItemSpec* itemSpecs,
+                                           void* dest, uint64_t destSize, uint64_t sizeToZero, DERRefusal* refusal) {
+    return parseContent(*content, {itemSpecs, itemSpecs + numItems}, dest, destSize, sizeToZero, refusal);
 }
 
 DERReturn DERParseSequence(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs, void* dest,

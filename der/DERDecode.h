@@ -24,6 +24,9 @@ extern "C" {
 // past the end of *der.
 DER_API DERReturn DERDecodeItem(const DERItem* der, DERDecodedInfo* decoded);
 
+// As DERDecodeItem, and says in *refusal why it refuses the item. *refusal is written on failure only; null is allowed.
+DER_API DERReturn DERDecodeItemExplained(const DERItem* der, DERDecodedInfo* decoded, DERRefusal* refusal);
+
 // As DERDecodeItem while `declaredLength` is null. With it, a content that runs past the end of *der is accepted:
 // decoded->content is clipped to what is there. On success *declaredLength is the length that the encoding declares,
 // clipped or not.
@@ -92,6 +95,14 @@ DER_API DERReturn DERParseSequence(const DERItem* der, uint16_t numItems, const 
                                    uint64_t sizeToZero);
 DER_API DERReturn DERParseSequenceContent(const DERItem* content, uint16_t numItems, const DERItemSpec* itemSpecs,
                                           void* dest, uint64_t sizeToZero);
+
+// The first two of these operations, and in *refusal why they refuse what they were given. *refusal is written on
+// failure only; null is allowed.
+DER_API DERReturn DERParseSequenceExplained(const DERItem* der, uint16_t numItems, const DERItemSpec* itemSpecs,
+                                            void* dest, uint64_t destSize, uint64_t sizeToZero, DERRefusal* refusal);
+DER_API DERReturn DERParseSequenceContentExplained(const DERItem* content, uint16_t numItems,
+                                                   const DERItemSpec* itemSpecs, void* dest, uint64_t destSize,
+                                                   uint64_t sizeToZero, DERRefusal* refusal);
 
 // Primitive contents
 //

@@ -105,6 +105,36 @@ enum {
     DERBufferOverflow = 7
 };
 
+// Why an item or a SEQUENCE was refused.
+typedef enum DERFault {
+    DERFaultNone,
+    // An item's header, or an item that is not all there (X.690 8.1.2.4, 10.1).
+    DERFaultHeaderCutShort,
+    DERFaultTagLeadingZero,
+    DERFaultTagForm,   // a number that fits one octet is written in the long form
+    DERFaultTagNumber, // does not fit 61 bits
+    DERFaultLengthIndefinite,
+    DERFaultLengthOctets, // more than 8 of them
+    DERFaultLengthForm,   // not the shortest
+    DERFaultContentCutShort,
+    // What an operation or a table of item specs asks for.
+    DERFaultNoSequence, // an item of another tag
+    DERFaultTag,        // an item of another tag than the row's
+    DERFaultMissing,    // the content ends before the row
+    DERFaultExcess,     // an item behind the last one that a row takes
+    DERFaultRecord      // the record has no place for the row
+} DERFault;
+
+// What an operation refused, and where. `place` and `item` point into the input, or one past its end.
+typedef struct DERRefusal {
+    DERFault fault;
+    uint16_t row;         // of the table: the first that is not optional and was not matched
+    const uint8_t* place; // the octet at fault
+    const uint8_t* item;  // the start of the item that it belongs to
+    DERTag tag;           // of that item, when it is its tag that is refused
+    DERTag expected;      // the row's, when it is not any
+} DERRefusal;
+
 #ifdef __cplusplus
 }
 #endif

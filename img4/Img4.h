@@ -113,6 +113,66 @@ typedef struct Img4Property {
     DERTag valueTag;
 } Img4Property;
 
+// Refusals
+//
+// The operations that end in Explained say what they refused, where, and why, in a record of the caller's, for programs
+// that tell people. Their results are those of the operations they are named after.
+
+// What was refused, in the order in which it is looked at.
+typedef enum Img4Subject {
+    Img4SubjectNone,
+    // The file and the parts of it that an initialisation checks.
+    Img4SubjectFile,
+    Img4SubjectContainer,
+    Img4SubjectPayload,
+    Img4SubjectCompression,
+    Img4SubjectPayloadProperties,
+    Img4SubjectManifest,
+    Img4SubjectRestoreInfo,
+    // One property that the caller holds.
+    Img4SubjectProperty,
+    // The steps of trust evaluation (Img4Trust.h).
+    Img4SubjectArguments,
+    Img4SubjectManifestDigest,
+    Img4SubjectChain,
+    Img4SubjectBodyDigest,
+    Img4SubjectSignature,
+    Img4SubjectBody, // "MANB" in the manifest's body
+    Img4SubjectManb, // "MANP" in "MANB"
+    Img4SubjectObject,
+    Img4SubjectConstraints,
+    Img4SubjectPayloadDigest,
+    Img4SubjectManifestProperties,
+    Img4SubjectObjectProperties
+} Img4Subject;
+
+// Why. What is "it" is the subject, and for properties the one that the refusal's tag and place tell.
+typedef enum Img4Fault {
+    Img4FaultNone,
+    Img4FaultEncoding,  // it is no DER, or not the SEQUENCE that it should be: `encoding` says why
+    Img4FaultMagic,     // its magic, `found`, is another
+    Img4FaultNumber,    // its number, `found`, is negative, not in its shortest form, or exceeds 32 bits
+    Img4FaultRange,     // its number, `found`, is above the last that there is
+    Img4FaultLength,    // octets follow it
+    Img4FaultAbsent,    // a property of that tag is not there
+    Img4FaultTag,       // an element with this tag is no property, or none that may stand there
+    Img4FaultName,      // the property is named `found` inside, or has no name
+    Img4FaultValueType, // the property's value has another tag, `encoding.tag`, than may stand there
+    Img4FaultValue,     // the property has another value than a constraint demands
+    Img4FaultPresent,   // the property is there, and a constraint forbids it
+    Img4FaultOther      // `status`, which a callback or a digest has given, says all there is
+} Img4Fault;
+
+typedef struct Img4Refusal {
+    Img4Subject subject;
+    Img4Fault fault;
+    DERReturn status;     // the result of the operation
+    const uint8_t* place; // the octet at fault, in the input or one past its end
+    DERTag tag;           // of the property; 0 when the header of one cannot be read
+    DERItem found;
+    DERRefusal encoding;
+} Img4Refusal;
+
 // Initialisation
 //
 // Each zeroes the whole record before anything else, then checks the `length` octets at `buffer` in the order of the
@@ -129,6 +189,21 @@ IMG4_API DERReturn Img4DecodeInitPayload(const uint8_t* buffer, uint64_t length,
 // chain.
 IMG4_API DERReturn Img4DecodeInitManifest(const uint8_t* buffer, uint64_t length, Img4Record* record);
 IMG4_API DERReturn Img4DecodeInitUnsignedManifest(const uint8_t* buffer, uint64_t length, Img4Record* record);
+
+// What a buffer holds, by its magic. A manifest is unsigned when it can be read as nothing but that.
+typedef enum Img4Kind {
+    Img4KindUnknown,
+    Img4KindContainer,
+    Img4KindPayload,
+    Img4KindManifest,
+    Img4KindUnsignedManifest
+} Img4Kind;
+
+// Finds out the kind and does that kind's initialisation, which gives the result; no kind is DERUnexpectedTag, or
+// DERDecodeError for no DER. *refusal, which may not be null, says what was refused first. After a failure the record
+// holds what could be read all the same, the parts behind the refused one included: to be shown, not to be queried.
+IMG4_API DERReturn Img4DecodeInitExplained(const uint8_t* buffer, uint64_t length, Img4Record* record, Img4Kind* kind,
+                                           Img4Refusal* refusal);
 
 // Payload
 //
@@ -266,6 +341,14 @@ IMG4_API DERReturn DERImg4DecodeFindProperty(const DERItem* dictionary, DERTag t
 // have any tag, which is recorded in *property. A third element gives DERUnexpectedTag, a missing value
 // DERIncompleteSequence. *property is written on success only.
 IMG4_API DERReturn DERImg4DecodeProperty(const DERItem* item, DERTag tag, Img4Property* property);
+
+// The same, and unless `refusal` is null, in *refusal why it fails: with Img4FaultNone when it does not.
+IMG4_API DERReturn DERImg4DecodePropertyExplained(const DERItem* item, DERTag tag, Img4Property* property,
+                                                  Img4Refusal* refusal);
+
+// The values of "MANB" and "MANP", which every lookup in a manifest stands on, and on failure why they are not found.
+IMG4_API DERReturn Img4DecodeFindDictionariesExplained(const Img4Record* record, DERItem* manb, DERItem* manp,
+                                                       Img4Refusal* refusal);
 
 // The value of such a property with the four-character code `name`. A failure clears numbers and data and leaves a
 // boolean as it was.

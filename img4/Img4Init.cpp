@@ -83,50 +83,82 @@ bool prepare(const uint8_t* buffer, Img4Record* record) {
     return buffer != nullptr;
 }
 
-bool isCompressionInfo(const DERItem& content) {
+// Where no refusal is asked for, the first failure ends an initialisation.
+bool goesOn(DERReturn result, const Img4Refusal* refusal) {
+    return result == DERSuccess || refusal != nullptr;
+}
+
+DERReturn firstOf(DERReturn earlier, DERReturn later) {
+    return earlier != DERSuccess ? earlier : later;
+}
+
+DERReturn checkMagic(const DERItem& magic, uint32_t expected, Img4Refusal* refusal) {
+    return equalsFourCC(magic, expected) ? DERSuccess
+                                         : refuse(refusal, DERUnexpectedTag, Img4FaultMagic, magic.data, magic);
+}
+
+DERReturn checkNumber(const DERItem& number, uint32_t highest, Img4Refusal* refusal) {
+    uint32_t value = 0;
+    if (const DERReturn result = DERParseInteger(&number, &value); result != DERSuccess)
+        return refuse(refusal, result, Img4FaultNumber, number.data, number);
+    return value <= highest ? DERSuccess : refuse(refusal, DERUnexpectedTag, Img4FaultRange, number.data, number);
+}
+
+// Whatever is wrong, the status is that of a bad parameter.
+DERReturn checkCompressionInfo(const DERItem& content, Img4Refusal* refusal) {
     Img4Compression compression;
-    uint32_t algorithm = 0;
-    return DERParseSequenceContent(&content, DERNumImg4CompressionItemSpecs, DERImg4CompressionItemSpecs, &compression,
-                                   sizeof compression) == DERSuccess &&
-           DERParseInteger(&compression.algorithm, &algorithm) == DERSuccess &&
-           algorithm <= highestCompressionAlgorithm;
+    DERRefusal why = {};
+    enter(refusal, Img4SubjectCompression);
+    if (DERParseSequenceContentExplained(&content, DERNumImg4CompressionItemSpecs, DERImg4CompressionItemSpecs,
+                                         &compression, sizeof compression, sizeof compression, &why) != DERSuccess)
+        return refuse(refusal, DERParamError, why);
+    return checkNumber(compression.algorithm, highestCompressionAlgorithm, refusal) == DERSuccess ? DERSuccess
+                                                                                                  : DERParamError;
 }
 
-bool isPayloadProperties(const DERItem& encoding) {
+// Whatever is wrong, the status is that of an unexpected tag.
+DERReturn checkPayloadProperties(const DERItem& encoding, Img4Refusal* refusal) {
     Img4PayloadProperties fields;
-    return DERParseSequence(&encoding, DERNumImg4PayloadPropertiesItemSpecs, DERImg4PayloadPropertiesItemSpecs, &fields,
-                            sizeof fields) == DERSuccess &&
-           equalsFourCC(fields.magic, payloadPropertiesMagic);
+    enter(refusal, Img4SubjectPayloadProperties);
+    const DERReturn result = parseSequence(encoding, DERNumImg4PayloadPropertiesItemSpecs,
+                                           DERImg4PayloadPropertiesItemSpecs, &fields, refusal);
+    return result == DERSuccess ? checkMagic(fields.magic, payloadPropertiesMagic, refusal) : DERUnexpectedTag;
 }
 
-// Splits the payload into its fields. The status of a payload that fits neither table is that of the shorter one.
-DERReturn parsePayload(const DERItem& encoding, Img4PayloadWithProperties* fields) {
-    if (DERParseSequence(&encoding, DERNumImg4PayloadWithPropertiesItemSpecs, DERImg4PayloadWithPropertiesItemSpecs,
-                         fields, sizeof *fields) == DERSuccess)
+// Splits the payload into its fields. The status of a payload that fits neither table is that of the shorter one; what
+// is wrong with it the longer one tells.
+DERReturn parsePayload(const DERItem& encoding, Img4PayloadWithProperties* fields, Img4Refusal* refusal) {
+    Img4Refusal why = {};
+    if (parseSequence(encoding, DERNumImg4PayloadWithPropertiesItemSpecs, DERImg4PayloadWithPropertiesItemSpecs, fields,
+                      refusal != nullptr ? &why : nullptr) == DERSuccess)
         return DERSuccess;
     static_assert(offsetof(Img4PayloadRecord, digest) == offsetof(Img4PayloadWithProperties, properties),
                   "both tables fill the same fields");
-    return DERParseSequenceToObject(&encoding, DERNumImg4PayloadItemSpecs, DERImg4PayloadItemSpecs, fields,
-                                    offsetof(Img4PayloadWithProperties, properties), sizeof *fields);
+    const DERReturn result =
+        DERParseSequenceToObject(&encoding, DERNumImg4PayloadItemSpecs, DERImg4PayloadItemSpecs, fields,
+                                 offsetof(Img4PayloadWithProperties, properties), sizeof *fields);
+    return result == DERSuccess ? result : refuse(refusal, result, why.encoding);
 }
 
-DERReturn decodePayload(const DERItem& encoding, Img4PayloadRecord* payload) {
-    Img4PayloadWithProperties fields;
-    if (const DERReturn result = parsePayload(encoding, &fields); result != DERSuccess)
+DERReturn decodePayload(const DERItem& encoding, Img4PayloadRecord* payload, Img4Refusal* refusal) {
+    Img4PayloadWithProperties fields = {};
+    enter(refusal, Img4SubjectPayload);
+    DERReturn result = parsePayload(encoding, &fields, refusal);
+    if (result == DERSuccess)
+        result = checkMagic(fields.magic, payloadMagic, refusal);
+    if (goesOn(result, refusal) && isPresent(fields.compression))
+        result = firstOf(result, checkCompressionInfo(fields.compression, refusal));
+    if (goesOn(result, refusal) && isPresent(fields.properties))
+        result = firstOf(result, checkPayloadProperties(fields.properties, refusal));
+    if (!goesOn(result, refusal))
         return result;
-    if (!equalsFourCC(fields.magic, payloadMagic))
-        return DERUnexpectedTag;
-    if (isPresent(fields.compression) && !isCompressionInfo(fields.compression))
-        return DERParamError;
-    if (isPresent(fields.properties) && !isPayloadProperties(fields.properties))
-        return DERUnexpectedTag;
     payload->magic = fields.magic;
     payload->type = fields.type;
     payload->version = fields.version;
     payload->data = fields.data;
     payload->keybag = fields.keybag;
     payload->compression = fields.compression;
-    return DERSuccess;
+    return result;
 }
 
 enum class Signing {
@@ -134,93 +166,147 @@ enum class Signing {
     Unsigned
 };
 
-DERReturn decodeManifest(const DERItem& encoding, Signing signing, Img4ManifestRecord* manifest) {
+DERReturn decodeManifest(const DERItem& encoding, Signing signing, Img4ManifestRecord* manifest, Img4Refusal* refusal) {
     const bool isSigned = signing == Signing::Signed;
-    const uint16_t rows = isSigned ? DERNumImg4ManifestItemSpecs : DERNumImg4UnsignedManifestItemSpecs;
-    const DERItemSpec* specs = isSigned ? DERImg4ManifestItemSpecs : DERImg4UnsignedManifestItemSpecs;
-    if (const DERReturn result = DERParseSequence(&encoding, rows, specs, manifest, sizeof *manifest);
-        result != DERSuccess)
-        return result;
-    if (!equalsFourCC(manifest->magic, manifestMagic))
-        return DERUnexpectedTag;
-    uint32_t version = 0;
-    if (const DERReturn result = DERParseInteger(&manifest->version, &version); result != DERSuccess)
-        return result;
-    return version > highestManifestVersion ? DERUnexpectedTag : DERSuccess;
+    enter(refusal, Img4SubjectManifest);
+    DERReturn result =
+        isSigned ? parseSequence(encoding, DERNumImg4ManifestItemSpecs, DERImg4ManifestItemSpecs, manifest, refusal)
+                 : parseSequence(encoding, DERNumImg4UnsignedManifestItemSpecs, DERImg4UnsignedManifestItemSpecs,
+                                 manifest, refusal);
+    if (result == DERSuccess)
+        result = checkMagic(manifest->magic, manifestMagic, refusal);
+    return result == DERSuccess ? checkNumber(manifest->version, highestManifestVersion, refusal) : result;
 }
 
-DERReturn decodeRestoreInfo(const DERItem& encoding, Img4RestoreInfoRecord* restoreInfo) {
-    if (const DERReturn result = DERParseSequence(&encoding, DERNumImg4RestoreInfoItemSpecs,
-                                                  DERImg4RestoreInfoItemSpecs, restoreInfo, sizeof *restoreInfo);
-        result != DERSuccess)
-        return result;
-    return equalsFourCC(restoreInfo->magic, restoreInfoMagic) ? DERSuccess : DERUnexpectedTag;
+DERReturn decodeRestoreInfo(const DERItem& encoding, Img4RestoreInfoRecord* restoreInfo, Img4Refusal* refusal) {
+    enter(refusal, Img4SubjectRestoreInfo);
+    const DERReturn result =
+        parseSequence(encoding, DERNumImg4RestoreInfoItemSpecs, DERImg4RestoreInfoItemSpecs, restoreInfo, refusal);
+    return result == DERSuccess ? checkMagic(restoreInfo->magic, restoreInfoMagic, refusal) : result;
 }
 
-DERReturn parseContainer(const DERItem& buffer, Img4Container* container) {
+DERReturn parseContainer(const DERItem& buffer, Img4Container* container, Img4Refusal* refusal) {
     DERDecodedInfo whole;
-    if (const DERReturn result = DERDecodeItem(&buffer, &whole); result != DERSuccess)
-        return result;
+    DERRefusal why = {};
+    enter(refusal, Img4SubjectContainer);
+    if (const DERReturn result = DERDecodeItemExplained(&buffer, &whole, &why); result != DERSuccess)
+        return refuse(refusal, result, why);
     if (whole.tag != DERTagSequence)
-        return DERUnexpectedTag;
-    if (whole.content.data + whole.content.length != buffer.data + buffer.length)
-        return DERBufferOverflow;
-    if (const DERReturn result = DERParseSequenceContent(&whole.content, DERNumImg4ItemSpecs, DERImg4ItemSpecs,
-                                                         container, sizeof *container);
-        result != DERSuccess)
+        return refuse(refusal, DERUnexpectedTag,
+                      {DERFaultNoSequence, 0, buffer.data, buffer.data, whole.tag, DERTagSequence});
+    const uint8_t* const end = whole.content.data + whole.content.length;
+    DERReturn result = DERSuccess;
+    if (end != buffer.data + buffer.length)
+        result = refuse(refusal, DERBufferOverflow, Img4FaultLength, end);
+    if (!goesOn(result, refusal))
         return result;
-    return equalsFourCC(container->magic, containerMagic) ? DERSuccess : DERUnexpectedTag;
+    const DERReturn parsed = DERParseSequenceContentExplained(&whole.content, DERNumImg4ItemSpecs, DERImg4ItemSpecs,
+                                                              container, sizeof *container, sizeof *container, &why);
+    if (parsed != DERSuccess)
+        return firstOf(result, refuse(refusal, parsed, why));
+    return firstOf(result, checkMagic(container->magic, containerMagic, refusal));
 }
 
-DERReturn decodeBareManifest(const DERItem& buffer, Signing signing, Img4Record* record) {
-    if (const DERReturn result = decodeManifest(buffer, signing, &record->manifest); result != DERSuccess)
-        return result;
-    if (!isPresent(record->manifest.body))
-        return DERDecodeError;
+DERReturn decodeContainer(const DERItem& buffer, Img4Record* record, Img4Refusal* refusal) {
+    Img4Container container = {};
+    DERReturn result = parseContainer(buffer, &container, refusal);
+    if (goesOn(result, refusal) && isPresent(container.payload))
+        result = firstOf(result, decodePayload(container.payload, &record->payload, refusal));
+    if (goesOn(result, refusal) && isPresent(container.manifest))
+        result = firstOf(result, decodeManifest(container.manifest, Signing::Signed, &record->manifest, refusal));
+    if (goesOn(result, refusal) && isPresent(container.restoreInfo))
+        result = firstOf(result, decodeRestoreInfo(container.restoreInfo, &record->restoreInfo, refusal));
+    if (goesOn(result, refusal)) {
+        record->payloadRaw = container.payload;
+        record->manifestRaw = container.manifest;
+    }
+    return result;
+}
+
+DERReturn decodeBarePayload(const DERItem& buffer, Img4Record* record, Img4Refusal* refusal) {
+    record->payloadRaw = buffer;
+    return decodePayload(buffer, &record->payload, refusal);
+}
+
+DERReturn decodeBareManifest(const DERItem& buffer, Signing signing, Img4Record* record, Img4Refusal* refusal) {
+    DERReturn result = decodeManifest(buffer, signing, &record->manifest, refusal);
+    if (result == DERSuccess && !isPresent(record->manifest.body))
+        result = DERDecodeError;
     DERDecodedInfo whole;
-    if (const DERReturn result = DERDecodeItem(&buffer, &whole); result != DERSuccess)
+    if (!goesOn(result, refusal) || DERDecodeItem(&buffer, &whole) != DERSuccess)
         return result;
-    const uint64_t headerLength = static_cast<uint64_t>(whole.content.data - buffer.data);
-    record->manifestRaw = {buffer.data, headerLength + whole.content.length};
-    return record->manifestRaw.length == buffer.length ? DERSuccess : DERBufferOverflow;
+    const uint8_t* const end = whole.content.data + whole.content.length;
+    record->manifestRaw = {buffer.data, static_cast<uint64_t>(end - buffer.data)};
+    if (record->manifestRaw.length == buffer.length)
+        return result;
+    return firstOf(result, refuse(refusal, DERBufferOverflow, Img4FaultLength, end));
+}
+
+// The kind that the magic in front tells. Anything else is refused.
+DERReturn findKind(const DERItem& buffer, Img4Kind* kind, Img4Refusal* refusal) {
+    DERDecodedInfo whole;
+    DERDecodedInfo magic = {};
+    DERRefusal why;
+    enter(refusal, Img4SubjectFile);
+    if (const DERReturn result = DERDecodeItemExplained(&buffer, &whole, &why); result != DERSuccess)
+        return refuse(refusal, result, why);
+    if (whole.tag != DERTagSequence)
+        return refuse(refusal, DERUnexpectedTag,
+                      {DERFaultNoSequence, 0, buffer.data, buffer.data, whole.tag, DERTagSequence});
+    const bool hasMagic = DERDecodeItem(&whole.content, &magic) == DERSuccess && magic.tag == DERTagIA5String;
+    *kind = !hasMagic                                     ? Img4KindUnknown
+            : equalsFourCC(magic.content, containerMagic) ? Img4KindContainer
+            : equalsFourCC(magic.content, payloadMagic)   ? Img4KindPayload
+            : equalsFourCC(magic.content, manifestMagic)  ? Img4KindManifest
+                                                          : Img4KindUnknown;
+    return *kind != Img4KindUnknown ? DERSuccess
+                                    : refuse(refusal, DERUnexpectedTag, Img4FaultMagic, whole.content.data,
+                                             hasMagic ? magic.content : DERItem{});
+}
+
+DERReturn decodeKind(const DERItem& buffer, Img4Record* record, Img4Kind* kind, Img4Refusal* refusal) {
+    if (const DERReturn result = findKind(buffer, kind, refusal); result != DERSuccess)
+        return result;
+    if (*kind == Img4KindContainer)
+        return decodeContainer(buffer, record, refusal);
+    if (*kind == Img4KindPayload)
+        return decodeBarePayload(buffer, record, refusal);
+    if (decodeBareManifest(buffer, Signing::Unsigned, record, nullptr) == DERSuccess) {
+        *kind = Img4KindUnsignedManifest;
+        return DERSuccess;
+    }
+    *record = Img4Record{};
+    return decodeBareManifest(buffer, Signing::Signed, record, refusal);
 }
 
 } // namespace
 
 DERReturn Img4DecodeInit(const uint8_t* buffer, uint64_t length, Img4Record* record) {
-    if (!prepare(buffer, record))
-        return DERParamError;
-    Img4Container container;
-    if (const DERReturn result = parseContainer({buffer, length}, &container); result != DERSuccess)
-        return result;
-    if (const DERReturn result = decodePayload(container.payload, &record->payload); result != DERSuccess)
-        return result;
-    if (isPresent(container.manifest)) {
-        if (const DERReturn result = decodeManifest(container.manifest, Signing::Signed, &record->manifest);
-            result != DERSuccess)
-            return result;
-    }
-    if (isPresent(container.restoreInfo)) {
-        if (const DERReturn result = decodeRestoreInfo(container.restoreInfo, &record->restoreInfo);
-            result != DERSuccess)
-            return result;
-    }
-    record->payloadRaw = container.payload;
-    record->manifestRaw = container.manifest;
-    return DERSuccess;
+    return prepare(buffer, record) ? decodeContainer({buffer, length}, record, nullptr) : DERParamError;
 }
 
 DERReturn Img4DecodeInitPayload(const uint8_t* buffer, uint64_t length, Img4Record* record) {
-    if (!prepare(buffer, record))
-        return DERParamError;
-    record->payloadRaw = {buffer, length};
-    return decodePayload(record->payloadRaw, &record->payload);
+    return prepare(buffer, record) ? decodeBarePayload({buffer, length}, record, nullptr) : DERParamError;
 }
 
 DERReturn Img4DecodeInitManifest(const uint8_t* buffer, uint64_t length, Img4Record* record) {
-    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, Signing::Signed, record) : DERParamError;
+    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, Signing::Signed, record, nullptr)
+                                   : DERParamError;
 }
 
 DERReturn Img4DecodeInitUnsignedManifest(const uint8_t* buffer, uint64_t length, Img4Record* record) {
-    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, Signing::Unsigned, record) : DERParamError;
+    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, Signing::Unsigned, record, nullptr)
+                                   : DERParamError;
+}
+
+DERReturn Img4DecodeInitExplained(const uint8_t* buffer, uint64_t length, Img4Record* record, Img4Kind* kind,
+                                  Img4Refusal* refusal) {
+    if (!prepare(buffer, record) || kind == nullptr || refusal == nullptr)
+        return DERParamError;
+    *kind = Img4KindUnknown;
+    *refusal = Img4Refusal{};
+    const DERReturn result = decodeKind({buffer, length}, record, kind, refusal);
+    if (result == DERSuccess)
+        refusal->subject = Img4SubjectNone;
+    return refusal->status = result;
 }

@@ -75,11 +75,55 @@ inline bool hasContent(const DERItem& item) {
 // True when `text` is the four-character code `code`.
 bool equalsFourCC(const DERItem& text, uint32_t code);
 
-// The first element with the tag `tag` in the octets of `content`.
-DERReturn findFirst(const DERItem& content, DERTag tag, DERItem* found);
+// The first element with the tag `tag` in the octets of `content`. A search that fails leaves in *end, unless that is
+// null, the place where it ended.
+DERReturn findFirst(const DERItem& content, DERTag tag, DERItem* found, const uint8_t** end = nullptr);
+
+// Says what the refusals behind this call are about.
+inline void enter(Img4Refusal* refusal, Img4Subject subject) {
+    if (refusal != nullptr && refusal->fault == Img4FaultNone)
+        refusal->subject = subject;
+}
+
+// Passes `status` on. Where a refusal is asked for and none was noted before, it becomes this one.
+inline DERReturn refuse(Img4Refusal* refusal, DERReturn status, Img4Fault fault, const uint8_t* place,
+                        const DERItem& found = {}) {
+    if (refusal != nullptr && refusal->fault == Img4FaultNone) {
+        refusal->fault = fault;
+        refusal->status = status;
+        refusal->place = place;
+        refusal->found = found;
+    }
+    return status;
+}
+
+// The same for the status of a DER operation that has said in `encoding` what it refused.
+inline DERReturn refuse(Img4Refusal* refusal, DERReturn status, const DERRefusal& encoding) {
+    if (refusal != nullptr && refusal->fault == Img4FaultNone)
+        refusal->encoding = encoding;
+    return refuse(refusal, status, Img4FaultEncoding, encoding.place);
+}
+
+// DERParseSequenceExplained into `fields`, all of which are cleared first.
+template <typename Fields>
+DERReturn parseSequence(const DERItem& encoding, uint16_t rows, const DERItemSpec* specs, Fields* fields,
+                        Img4Refusal* refusal) {
+    DERRefusal why;
+    const DERReturn result = DERParseSequenceExplained(&encoding, rows, specs, fields, sizeof *fields, sizeof *fields,
+                                                       refusal != nullptr ? &why : nullptr);
+    return result == DERSuccess || refusal == nullptr ? result : refuse(refusal, result, why);
+}
+
+// Passes the failure of a search in `dictionary` on that ended at `end`.
+DERReturn refuseSearch(DERReturn result, const DERItem& dictionary, const uint8_t* end, Img4Refusal* refusal);
+
+// As DERImg4DecodeFindProperty, for arguments that are there.
+DERReturn findProperty(const DERItem& dictionary, DERTag tag, DERTag valueType, Img4Property* property,
+                       Img4Refusal* refusal);
 
 // The values of "MANB" and "MANP" of a record with a manifest.
-DERReturn findManifestDictionaries(const Img4Record& record, DERItem* manb, DERItem* manp);
+DERReturn findManifestDictionaries(const Img4Record& record, DERItem* manb, DERItem* manp,
+                                   Img4Refusal* refusal = nullptr);
 
 // Parsers of a value's content have the shape of DERParseInteger. This one takes the content as it is.
 template <typename T>

@@ -92,24 +92,35 @@ DERReturn parseNumber64(const DERItem* item, uint64_t* value) {
 
 } // namespace
 
-DERReturn img4::findManifestDictionaries(const Img4Record& record, DERItem* manb, DERItem* manp) {
+DERReturn img4::findManifestDictionaries(const Img4Record& record, DERItem* manb, DERItem* manp, Img4Refusal* refusal) {
     DERDecodedInfo body;
     uint32_t version = 0;
     Img4Property found;
+    enter(refusal, Img4SubjectBody);
     if (const DERReturn result = DERDecodeItem(&record.manifest.body, &body); result != DERSuccess)
-        return result;
+        return refuse(refusal, result, Img4FaultOther, record.manifest.body.data);
     if (const DERReturn result = DERParseInteger(&record.manifest.version, &version); result != DERSuccess)
-        return result;
+        return refuse(refusal, result, Img4FaultOther, record.manifest.version.data);
     const DERTag type = version == highestManifestVersion ? DERTagSequence : DERTagSet;
-    if (const DERReturn result = DERImg4DecodeFindProperty(&body.content, manifestBodyTag, type, &found);
+    if (const DERReturn result = findProperty(body.content, manifestBodyTag, type, &found, refusal);
         result != DERSuccess)
         return result;
     *manb = found.value;
-    if (const DERReturn result = DERImg4DecodeFindProperty(manb, manifestPropertiesTag, DERTagSet, &found);
+    enter(refusal, Img4SubjectManb);
+    if (const DERReturn result = findProperty(*manb, manifestPropertiesTag, DERTagSet, &found, refusal);
         result != DERSuccess)
         return result;
     *manp = found.value;
     return DERSuccess;
+}
+
+DERReturn Img4DecodeFindDictionariesExplained(const Img4Record* record, DERItem* manb, DERItem* manp,
+                                              Img4Refusal* refusal) {
+    if (record == nullptr || manb == nullptr || manp == nullptr)
+        return DERParamError;
+    if (refusal != nullptr)
+        *refusal = Img4Refusal{};
+    return findManifestDictionaries(*record, manb, manp, refusal);
 }
 
 DERReturn Img4DecodeManifestExists(const Img4Record* record, bool* exists) {

@@ -11,27 +11,43 @@ bool isNameOf(const DERItem& name, DERTag tag) {
     return tag == Img4PropertyTag(code) && equalsFourCC(name, code);
 }
 
+// Why an item of a property could not be decoded, or is not there at all.
+DERReturn refuseItem(DERReturn result, DERReturn missing, uint16_t row, const DERSequence& elements,
+                     Img4Refusal* refusal) {
+    DERRefusal why = {DERFaultMissing, row, elements.next, elements.next, 0, 0};
+    const DERItem rest = {elements.next, static_cast<uint64_t>(elements.end - elements.next)};
+    DERDecodedInfo decoded;
+    if (result == DEREndOfSequence)
+        result = missing;
+    else if (refusal != nullptr)
+        DERDecodeItemExplained(&rest, &decoded, &why);
+    return refuse(refusal, result, why);
+}
+
 // Decodes the property in `item`, whose name must be that of *tag unless `tag` is null.
-DERReturn decodeProperty(const DERItem& item, const DERTag* tag, Img4Property* property) {
+DERReturn decodeProperty(const DERItem& item, const DERTag* tag, Img4Property* property,
+                         Img4Refusal* refusal = nullptr) {
     DERDecodedInfo whole;
     DERDecodedInfo name;
     DERDecodedInfo value;
     DERSequence elements;
     if (const DERReturn result = DERDecodeItem(&item, &whole); result != DERSuccess)
-        return result;
+        return refuseItem(result, result, 0, {item.data, item.data + item.length}, refusal);
     if (whole.tag != DERTagSequence)
-        return DERUnexpectedTag;
+        return refuse(refusal, DERUnexpectedTag,
+                      {DERFaultNoSequence, 0, item.data, item.data, whole.tag, DERTagSequence});
     DERDecodeSeqContentInit(&whole.content, &elements);
     if (const DERReturn result = DERDecodeSeqNext(&elements, &name); result != DERSuccess)
-        return result == DEREndOfSequence ? DERUnexpectedTag : result;
+        return refuseItem(result, DERUnexpectedTag, 0, elements, refusal);
     if (name.tag != DERTagIA5String || (tag != nullptr && !isNameOf(name.content, *tag)))
-        return DERUnexpectedTag;
+        return refuse(refusal, DERUnexpectedTag, Img4FaultName, whole.content.data,
+                      name.tag == DERTagIA5String ? name.content : DERItem{});
     if (const DERReturn result = DERDecodeSeqNext(&elements, &value); result != DERSuccess)
-        return result == DEREndOfSequence ? DERIncompleteSequence : result;
+        return refuseItem(result, DERIncompleteSequence, 1, elements, refusal);
     if (elements.next != elements.end)
-        return DERUnexpectedTag;
+        return refuse(refusal, DERUnexpectedTag, {DERFaultExcess, 2, elements.next, elements.next, 0, 0});
     if (elements.end != item.data + item.length)
-        return DERBufferOverflow;
+        return refuse(refusal, DERBufferOverflow, Img4FaultLength, elements.end);
     *property = {name.content, tag != nullptr ? *tag : 0, value.content, value.tag};
     return DERSuccess;
 }
@@ -54,7 +70,7 @@ bool img4::equalsFourCC(const DERItem& text, uint32_t code) {
     return text.length == sizeof code && DERParseInteger(&text, &spelled) == DERSuccess && spelled == code;
 }
 
-DERReturn img4::findFirst(const DERItem& content, DERTag tag, DERItem* found) {
+DERReturn img4::findFirst(const DERItem& content, DERTag tag, DERItem* found, const uint8_t** end) {
     DERSequence elements;
     DERDecodedInfo element;
     DERDecodeSeqContentInit(&content, &elements);
@@ -63,34 +79,65 @@ DERReturn img4::findFirst(const DERItem& content, DERTag tag, DERItem* found) {
         result = DERDecodeSeqNext(&elements, &element);
     if (result == DERSuccess)
         *found = element.content;
+    else if (end != nullptr)
+        *end = elements.next;
     return result;
 }
 
-DERReturn DERImg4DecodeFindProperty(const DERItem* dictionary, DERTag tag, DERTag valueType, Img4Property* property) {
+DERReturn img4::refuseSearch(DERReturn result, const DERItem& dictionary, const uint8_t* end, Img4Refusal* refusal) {
+    if (result == DEREndOfSequence)
+        return refuse(refusal, result, Img4FaultAbsent, dictionary.data);
+    if (refusal != nullptr)
+        refusal->tag = 0;
+    return refuseItem(result, result, 0, {end, dictionary.data + dictionary.length}, refusal);
+}
+
+DERReturn img4::findProperty(const DERItem& dictionary, DERTag tag, DERTag valueType, Img4Property* property,
+                             Img4Refusal* refusal) {
     struct NameAndValue {
         DERItem name;
         DERItem value;
     };
-    if (dictionary == nullptr || property == nullptr)
-        return DERParamError;
     DERItem element;
-    if (const DERReturn result = findFirst(*dictionary, tag, &element); result != DERSuccess)
-        return result;
+    const uint8_t* end = nullptr;
+    if (refusal != nullptr)
+        refusal->tag = tag;
+    if (const DERReturn result = findFirst(dictionary, tag, &element, &end); result != DERSuccess)
+        return refuseSearch(result, dictionary, end, refusal);
     const DERItemSpec specs[] = {
         {offsetof(NameAndValue, name), DERTagIA5String, 0},
         {offsetof(NameAndValue, value), valueType, 0},
     };
     NameAndValue fields;
-    if (const DERReturn result = DERParseSequence(&element, std::size(specs), specs, &fields, 0); result != DERSuccess)
-        return result;
-    if (!isNameOf(fields.name, tag))
-        return DERUnexpectedTag;
-    *property = {fields.name, tag, fields.value, valueType};
-    return DERSuccess;
+    DERReturn result = parseSequence(element, std::size(specs), specs, &fields, refusal);
+    if (refusal != nullptr && result == DERUnexpectedTag && refusal->encoding.fault == DERFaultTag)
+        refusal->fault = refusal->encoding.row == 0 ? Img4FaultName : Img4FaultValueType;
+    if (result == DERSuccess && !isNameOf(fields.name, tag))
+        result = refuse(refusal, DERUnexpectedTag, Img4FaultName, fields.name.data, fields.name);
+    if (result == DERSuccess)
+        *property = {fields.name, tag, fields.value, valueType};
+    return result;
+}
+
+DERReturn DERImg4DecodeFindProperty(const DERItem* dictionary, DERTag tag, DERTag valueType, Img4Property* property) {
+    return dictionary != nullptr && property != nullptr ? findProperty(*dictionary, tag, valueType, property, nullptr)
+                                                        : DERParamError;
 }
 
 DERReturn DERImg4DecodeProperty(const DERItem* item, DERTag tag, Img4Property* property) {
     return item != nullptr && property != nullptr ? decodeProperty(*item, &tag, property) : DERParamError;
+}
+
+DERReturn DERImg4DecodePropertyExplained(const DERItem* item, DERTag tag, Img4Property* property,
+                                         Img4Refusal* refusal) {
+    if (item == nullptr || property == nullptr)
+        return DERParamError;
+    if (refusal != nullptr)
+        *refusal = {Img4SubjectProperty, Img4FaultNone, DERSuccess, nullptr, tag, {}, {}};
+    const DERReturn result = decodeProperty(*item, &tag, property, refusal);
+    if (refusal != nullptr && result != DERSuccess && tag != Img4PropertyTag(tag))
+        *refusal = {Img4SubjectProperty, Img4FaultTag, result, item->data, tag, {}, {}};
+    return result;
 }
 
 DERReturn Img4DecodeGetPropertyBoolean(const DERItem* item, uint32_t name, bool* value) {

@@ -57,35 +57,44 @@ TEST(DERRecord, isFilledRowByRow) {
         const char* content;
         DERReturn code;
         const char* record;
+        DERFault fault = DERFaultNone;
+        std::uint16_t refusedRow = 0;
+        std::ptrdiff_t place = 0;
     } rows[] = {
         {"every row matched", plain, "02 01 05 80 01 AA 04 00", DERSuccess, "05 | AA | "},
         {"optional row missing", plain, "02 01 05 04 01 BB", DERSuccess, "05 | absent | BB"},
-        {"required row missing at the end", plain, "02 01 05", DERIncompleteSequence, "05 | absent | absent"},
-        {"nothing at all", plain, "", DERIncompleteSequence, "absent | absent | absent"},
+        {"required row missing at the end", plain, "02 01 05", DERIncompleteSequence, "05 | absent | absent",
+         DERFaultMissing, 2, 3},
+        {"nothing at all", plain, "", DERIncompleteSequence, "absent | absent | absent", DERFaultMissing, 0, 0},
         {"required row missing though a later one matches", plain, "04 01 BB", DERUnexpectedTag,
-         "absent | absent | absent"},
-        {"form differs", plain, "02 01 05 A0 00 04 00", DERUnexpectedTag, "05 | absent | absent"},
-        {"class differs", plain, "82 01 05", DERUnexpectedTag, "absent | absent | absent"},
-        {"item twice", plain, "02 01 05 80 00 80 00", DERUnexpectedTag, "05 |  | absent"},
-        {"item behind the last row", plain, "02 01 05 04 01 BB 05 00", DERDecodeError, "05 | absent | BB"},
-        {"octet behind the last row", plain, "02 01 05 04 01 BB 05", DERDecodeError, "05 | absent | BB"},
-        {"bad item", plain, "02 01 05 80 02 AA", DERDecodeError, "05 | absent | absent"},
+         "absent | absent | absent", DERFaultTag, 0, 0},
+        {"form differs", plain, "02 01 05 A0 00 04 00", DERUnexpectedTag, "05 | absent | absent", DERFaultTag, 2, 3},
+        {"class differs", plain, "82 01 05", DERUnexpectedTag, "absent | absent | absent", DERFaultTag, 0, 0},
+        {"item twice", plain, "02 01 05 80 00 80 00", DERUnexpectedTag, "05 |  | absent", DERFaultTag, 2, 5},
+        {"item behind the last row", plain, "02 01 05 04 01 BB 05 00", DERDecodeError, "05 | absent | BB",
+         DERFaultExcess, 3, 6},
+        {"octet behind the last row", plain, "02 01 05 04 01 BB 05", DERDecodeError, "05 | absent | BB",
+         DERFaultHeaderCutShort, 0, 7},
+        {"bad item", plain, "02 01 05 80 02 AA", DERDecodeError, "05 | absent | absent", DERFaultContentCutShort, 0, 6},
         {"optional rows missing at the end", optionalEnd, "02 01 05", DERSuccess, "05 | absent | absent"},
         {"last of the optional rows", optionalEnd, "02 01 05 04 01 BB", DERSuccess, "05 | absent | BB"},
-        {"optional rows out of order", optionalEnd, "02 01 05 04 00 01 00", DERDecodeError, "05 | absent | "},
-        {"no row left that matches", optionalEnd, "02 01 05 05 00", DERUnexpectedTag, "05 | absent | absent"},
-        {"any tag, saved whole", anyTag, "06 01 2A FF 1F 81 80", DERDecodeError, "2A | absent | absent"},
+        {"optional rows out of order", optionalEnd, "02 01 05 04 00 01 00", DERDecodeError, "05 | absent | ",
+         DERFaultExcess, 3, 5},
+        {"no row left that matches", optionalEnd, "02 01 05 05 00", DERUnexpectedTag, "05 | absent | absent",
+         DERFaultExcess, 3, 3},
+        {"any tag, saved whole", anyTag, "06 01 2A FF 1F 81 80", DERDecodeError, "2A | absent | absent",
+         DERFaultContentCutShort, 0, 7},
         {"any tag with a long header", anyTag, "06 01 2A FF 85 9A C1 82 59 01 EE", DERSuccess,
          "2A | FF 85 9A C1 82 59 01 EE | absent"},
         {"any tag missing", anyTag, "06 01 2A", DERSuccess, "2A | absent | absent"},
         {"skipped rows are consumed", skipping, "02 01 05 30 02 05 00 13 00", DERSuccess,
          "absent | 30 02 05 00 | absent"},
-        {"skipped row missing", skipping, "30 00", DERUnexpectedTag, "absent | absent | absent"},
+        {"skipped row missing", skipping, "30 00", DERUnexpectedTag, "absent | absent | absent", DERFaultTag, 0, 0},
         {"octets behind a skipped last row", skipping, "02 01 05 30 00 13 00 13 00", DERDecodeError,
-         "absent | 30 00 | absent"},
+         "absent | 30 00 | absent", DERFaultExcess, 3, 7},
         {"options of the encoder", encoderOptions, "02 02 00 80", DERSuccess, "absent | 00 80 | absent"},
         {"no rows, no content", {}, "", DERSuccess, "absent | absent | absent"},
-        {"no rows but content", {}, "05 00", DERDecodeError, "absent | absent | absent"},
+        {"no rows but content", {}, "05 00", DERDecodeError, "absent | absent | absent", DERFaultExcess, 0, 0},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
@@ -93,6 +102,13 @@ TEST(DERRecord, isFilledRowByRow) {
         const DERItem content = itemOf(input);
         const auto count = static_cast<std::uint16_t>(row.table.size());
         Record record;
+        DERRefusal refusal = {DERFaultNone, 0, input.data(), nullptr, 0, 0};
+        EXPECT_EQ(DERParseSequenceContentExplained(&content, count, row.table.data(), &record, sizeof record,
+                                                   sizeof record, &refusal),
+                  row.code);
+        EXPECT_EQ(refusal.fault, row.fault);
+        EXPECT_EQ(refusal.row, row.refusedRow);
+        EXPECT_EQ(refusal.place - input.data(), row.place);
         EXPECT_EQ(
             DERParseSequenceContentToObject(&content, count, row.table.data(), &record, sizeof record, sizeof record),
             row.code);

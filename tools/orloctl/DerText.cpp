@@ -69,53 +69,6 @@ bool isUniversal(DERTag tag) {
     return tag >> classShift == 0;
 }
 
-// The faults of the digits of a high tag number, which begin at `at`. Otherwise *at becomes the place behind them.
-std::optional<DerFault> tagFault(const DERItem& der, std::uint64_t* at) {
-    constexpr std::uint64_t roomForDigit = UINT64_C(1) << 57;
-    if (der.data[*at] == moreBit)
-        return DerFault{*at, "the tag number begins with a zero digit"};
-    if (der.data[*at] < universalTypes.size())
-        return DerFault{*at, "the tag number fits one octet and is written in the long form"};
-    std::uint64_t number = 0;
-    std::uint8_t digit = moreBit;
-    while ((digit & moreBit) != 0) {
-        if (*at + 1 >= der.length)
-            return DerFault{der.length, "the header is cut short"};
-        digit = der.data[*at];
-        if (number >= roomForDigit || (number << 7 | (digit & 0x7F)) > DERTagNumberMask)
-            return DerFault{*at, "the tag number does not fit 61 bits"};
-        number = number << 7 | (digit & 0x7F);
-        ++*at;
-    }
-    return std::nullopt;
-}
-
-// The faults of the length octets, which begin at `at`, and of a content that is not all there.
-std::optional<DerFault> lengthFault(const DERItem& der, std::uint64_t at) {
-    const std::uint8_t first = der.data[at];
-    std::uint64_t length = first;
-    std::uint64_t contentAt = at + 1;
-    if ((first & moreBit) != 0) {
-        const std::uint64_t octets = first & 0x7F;
-        if (octets == 0)
-            return DerFault{at, "the length is indefinite, which DER does not allow"};
-        if (octets > sizeof length)
-            return DerFault{at, "the length takes " + std::to_string(octets) + " octets, and at most 8 are allowed"};
-        if (octets > der.length - contentAt)
-            return DerFault{der.length, "the header is cut short"};
-        length = 0;
-        for (std::uint64_t i = 0; i < octets; ++i)
-            length = length << 8 | der.data[contentAt + i];
-        if (der.data[contentAt] == 0 || length < moreBit)
-            return DerFault{at, "the length is not in its shortest form"};
-        contentAt += octets;
-    }
-    if (length <= der.length - contentAt)
-        return std::nullopt;
-    return DerFault{der.length, "the content is cut short: " + std::to_string(der.length - contentAt) + " of " +
-                                    std::to_string(length) + " octets are there"};
-}
-
 std::optional<DerFault> integerFault(const DERItem& content) {
     if (content.length == 0)
         return DerFault{0, "the number has no octets"};
@@ -184,17 +137,38 @@ std::string hexOctet(std::uint8_t octet) {
 
 } // namespace
 
+std::string derFaultText(const DERRefusal& refusal) {
+    const DERItem der = {refusal.item, static_cast<std::uint64_t>(refusal.place - refusal.item)};
+    DERDecodedInfo there;
+    std::uint64_t declared = 0;
+    switch (refusal.fault) {
+    case DERFaultHeaderCutShort:
+        return "the header is cut short";
+    case DERFaultTagLeadingZero:
+        return "the tag number begins with a zero digit";
+    case DERFaultTagForm:
+        return "the tag number fits one octet and is written in the long form";
+    case DERFaultTagNumber:
+        return "the tag number does not fit 61 bits";
+    case DERFaultLengthIndefinite:
+        return "the length is indefinite, which DER does not allow";
+    case DERFaultLengthOctets:
+        return "the length takes " + std::to_string(*refusal.place & 0x7F) + " octets, and at most 8 are allowed";
+    case DERFaultLengthForm:
+        return "the length is not in its shortest form";
+    default:
+        DERDecodeItemPartialBufferGetLength(&der, &there, &declared);
+        return "the content is cut short: " + std::to_string(there.content.length) + " of " + std::to_string(declared) +
+               " octets are there";
+    }
+}
+
 std::optional<DerFault> derHeaderFault(const DERItem& der) {
     DERDecodedInfo decoded;
-    if (DERDecodeItem(&der, &decoded) == DERSuccess)
+    DERRefusal refusal;
+    if (DERDecodeItemExplained(&der, &decoded, &refusal) == DERSuccess)
         return std::nullopt;
-    if (der.length < 2)
-        return DerFault{der.length, "the header is cut short"};
-    std::uint64_t at = 1;
-    if ((der.data[0] & 0x1F) == 0x1F)
-        if (auto fault = tagFault(der, &at))
-            return fault;
-    return lengthFault(der, at);
+    return DerFault{static_cast<std::uint64_t>(refusal.place - der.data), derFaultText(refusal)};
 }
 
 std::optional<DerFault> derContentFault(DERTag tag, const DERItem& content) {

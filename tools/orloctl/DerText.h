@@ -15,6 +15,9 @@ struct DerFault {
     std::string reason; // a clause without a full stop
 };
 
+// A clause for an item that cannot be decoded.
+std::string derFaultText(const DERRefusal& refusal);
+
 // Why DERDecodeItem refuses the item at the start of `der`; nothing when it does not.
 std::optional<DerFault> derHeaderFault(const DERItem& der);
 

@@ -11,8 +11,6 @@
 
 namespace img4show {
 
-constexpr std::uint64_t mostCharactersShown = 256;
-
 // What is wrong with a file, and what is worth a remark. `report` outlives it.
 class Findings {
 public:

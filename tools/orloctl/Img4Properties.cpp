@@ -2,8 +2,9 @@
 
 #include <set>
 
-#include "der/DERDecode.h"
+#include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
+#include "tools/orloctl/Img4Words.h"
 
 namespace img4show {
 
@@ -18,47 +19,6 @@ bool looksLikeDictionary(const DERItem& content) {
     return content.length == 0 ||
            (DERDecodeItem(&content, &first) == DERSuccess && first.tag == Img4PropertyTag(first.tag));
 }
-
-} // namespace
-
-PropertyFault propertyFault(const DERItem& content, DERTag tag) {
-    DERDecodedInfo whole;
-    DERDecodedInfo item;
-    DERSequence elements;
-    const auto headerFault = [](const std::uint8_t* place, const std::uint8_t* end) -> PropertyFault {
-        const auto why = derHeaderFault({place, static_cast<std::uint64_t>(end - place)});
-        return why ? PropertyFault{place + why->offset, "is no strict DER inside: " + why->reason}
-                   : PropertyFault{place, "cannot be decoded"};
-    };
-    if (DERDecodeItem(&content, &whole) != DERSuccess)
-        return headerFault(content.data, content.data + content.length);
-    if (whole.tag != DERTagSequence)
-        return {content.data, "holds " + derTagName(whole.tag) + " instead of SEQUENCE"};
-    DERDecodeSeqContentInit(&whole.content, &elements);
-    const std::uint8_t* place = elements.next;
-    DERReturn result = DERDecodeSeqNext(&elements, &item);
-    std::uint32_t code = 0;
-    if (result == DERSuccess && (item.tag != DERTagIA5String || item.content.length != sizeof code ||
-                                 DERParseInteger(&item.content, &code) != DERSuccess))
-        return {place, "has no four-character name inside"};
-    if (result == DERSuccess && Img4PropertyTag(code) != tag)
-        return {place, "is named " + quotedText(item.content, sizeof code) + " inside"};
-    if (result == DEREndOfSequence)
-        return {place, "is empty inside"};
-    if (result == DERSuccess) {
-        place = elements.next;
-        result = DERDecodeSeqNext(&elements, &item);
-    }
-    if (result == DEREndOfSequence)
-        return {place, "has no value"};
-    if (result != DERSuccess)
-        return headerFault(place, elements.end);
-    if (elements.next != elements.end)
-        return {elements.next, "goes on behind its value"};
-    return {elements.end, "goes on behind the SEQUENCE of name and value"};
-}
-
-namespace {
 
 class Reader {
 public:
@@ -89,43 +49,39 @@ private:
 void Reader::walk(const DERItem& content, const std::string& where, unsigned depth,
                   const std::function<bool(const Element&)>& take) const {
     std::set<DERTag> seen;
-    DERSequence sequence;
-    DERDecodedInfo element;
-    DERDecodeSeqContentInit(&content, &sequence);
-    while (sequence.next != sequence.end) {
-        const DERItem rest = {sequence.next, static_cast<std::uint64_t>(sequence.end - sequence.next)};
-        if (DERDecodeSeqNext(&sequence, &element) != DERSuccess) {
-            if (findings_)
-                findings_->headerFault(rest, "A property of " + where);
-            return;
-        }
-        const DERItem encoding = {rest.data, static_cast<std::uint64_t>(sequence.next - rest.data)};
-        Element property = describe(element, encoding, where, depth);
-        if (!seen.insert(element.tag).second)
+    DerItems elements(content);
+    while (elements.next()) {
+        Element property = describe(elements.item(), elements.encoding(), where, depth);
+        if (!seen.insert(elements.item().tag).second)
             property.json["hidden"] = "behind an earlier one of that tag, which a lookup takes";
         if (!take(property))
             return;
     }
+    if (elements.isBroken() && findings_)
+        findings_->headerFault(elements.encoding(), "A property of " + where);
 }
 
 // One element of a dictionary, which should be a property.
 Element Reader::describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
                          unsigned depth) const {
     const std::uint64_t number = element.tag & DERTagNumberMask;
-    const bool isProperty = element.tag == Img4PropertyTag(number);
-    const std::ptrdiff_t offset = encoding.data - file_.data;
-    Element shown{{{"name", isProperty ? codeText(number) : derTagName(element.tag)}, {"offset", offset}}, {}};
-    const std::string what = (isProperty ? quotedCode(number) : derTagName(element.tag)) + " of " + where;
+    const std::string place = std::to_string(encoding.data - file_.data);
     Img4Property property;
-    if (!isProperty) {
-        fault(encoding.data, what + " is no property");
-        shown.json["fault"] = "is no property";
-    } else if (DERImg4DecodeProperty(&element.content, element.tag, &property) == DERSuccess) {
+    Img4Refusal refusal;
+    const DERReturn result = DERImg4DecodePropertyExplained(&element.content, element.tag, &property, &refusal);
+    const bool isProperty = refusal.fault != Img4FaultTag;
+    Element shown{
+        {{"name", isProperty ? codeText(number) : derTagName(element.tag)}, {"offset", encoding.data - file_.data}},
+        {}};
+    const std::string what = (isProperty ? quotedCode(number) : derTagName(element.tag)) + " of " + where;
+    if (result == DERSuccess) {
         describeValue(property, what, depth, shown);
     } else {
-        const PropertyFault why = propertyFault(element.content, element.tag);
-        fault(why.place, what + ", which begins at offset " + std::to_string(offset) + ", " + why.reason);
-        shown.json["fault"] = why.reason;
+        shown.json["fault"] = propertyReason(refusal);
+        if (isProperty)
+            fault(refusal.place, what + ", which begins at offset " + place + ", " + propertyReason(refusal));
+        else
+            fault(encoding.data, what + " is no property");
     }
     return shown;
 }
@@ -152,13 +108,10 @@ void Reader::describeValue(const Img4Property& property, const std::string& what
             valueFault(property, what, "is a BOOLEAN that is not 00 or FF", json);
         break;
     case DERTagInteger:
-        if (const DERReturn result = DERParseInteger64(&value, &number); result == DERSuccess)
+        if (DERParseInteger64(&value, &number) == DERSuccess)
             json["value"] = number;
         else
-            valueFault(property, what,
-                       result == DERBufferOverflow ? "is an INTEGER of more than 64 bits"
-                                                   : "is no non-negative INTEGER in its shortest form",
-                       json);
+            valueFault(property, what, numberReason(value, 64), json);
         break;
     case DERTagIA5String:
         json["value"] = escapedText(value);

@@ -7,14 +7,6 @@
 
 namespace img4show {
 
-struct PropertyFault {
-    const std::uint8_t* place;
-    std::string reason; // a clause whose subject is the property
-};
-
-// Why the decoder refuses the property in `content`, an element with the tag `tag`.
-PropertyFault propertyFault(const DERItem& content, DERTag tag);
-
 // The properties in the content of a SET or SEQUENCE, which `where` names in the words of a fault. A value that holds
 // properties itself is a dictionary too, to a depth that nobody exceeds. What is wrong goes into `findings` at once.
 Elements readProperties(const DERItem& content, const std::string& where, Findings& findings);

@@ -8,6 +8,7 @@
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Properties.h"
 #include "tools/orloctl/Img4Text.h"
+#include "tools/orloctl/Img4Words.h"
 
 namespace {
 
@@ -125,9 +126,9 @@ void Reader::judge(const Dictionary& dictionary, const DerItems& element, TrustC
 void Reader::readConstraint(const Dictionary& dictionary, const DerItems& element) {
     const DERDecodedInfo& item = element.item();
     Img4Property constraint;
-    if (DERImg4DecodeProperty(&item.content, item.tag, &constraint) != DERSuccess) {
-        const img4show::PropertyFault fault = img4show::propertyFault(item.content, item.tag);
-        refuse(dictionary, derTagName(item.tag), fault.place, fault.reason);
+    Img4Refusal refusal;
+    if (DERImg4DecodePropertyExplained(&item.content, item.tag, &constraint, &refusal) != DERSuccess) {
+        refuse(dictionary, derTagName(item.tag), refusal.place, img4show::propertyReason(refusal));
         return;
     }
     TrustConstraint row = {
@@ -156,9 +157,9 @@ void Reader::readConstraint(const Dictionary& dictionary, const DerItems& elemen
 void Reader::readDictionary(const Dictionary& dictionary, const DerItems& element) {
     const DERDecodedInfo& item = element.item();
     Img4Property constraining;
-    if (DERImg4DecodeProperty(&item.content, item.tag, &constraining) != DERSuccess) {
-        const img4show::PropertyFault fault = img4show::propertyFault(item.content, item.tag);
-        refuse(dictionary, derTagName(item.tag), fault.place, fault.reason);
+    Img4Refusal refusal;
+    if (DERImg4DecodePropertyExplained(&item.content, item.tag, &constraining, &refusal) != DERSuccess) {
+        refuse(dictionary, derTagName(item.tag), refusal.place, img4show::propertyReason(refusal));
         return;
     }
     if (constraining.valueTag != DERTagSet) {

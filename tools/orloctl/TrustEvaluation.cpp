@@ -8,6 +8,7 @@
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Findings.h"
 #include "tools/orloctl/Img4Properties.h"
+#include "tools/orloctl/Img4Words.h"
 #include "tools/orloctl/TrustConstraints.h"
 
 namespace {
@@ -44,8 +45,10 @@ Cause headerCause(const std::string& what, const DERItem& rest) {
 }
 
 Cause propertyCause(const DERDecodedInfo& element, const std::string& owner) {
-    const img4show::PropertyFault fault = img4show::propertyFault(element.content, element.tag);
-    return {derTagName(element.tag) + " of " + owner + " " + fault.reason, fault.place};
+    Img4Property property;
+    Img4Refusal refusal;
+    DERImg4DecodePropertyExplained(&element.content, element.tag, &property, &refusal);
+    return {derTagName(element.tag) + " of " + owner + " " + img4show::propertyReason(refusal), refusal.place};
 }
 
 // Why the decoder does not find the property `code` of the type `type` in `dictionary`, which is `owner`'s.
