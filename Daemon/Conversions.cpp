@@ -1,10 +1,12 @@
 #include "Daemon/Conversions.h"
 
+#include <charconv>
 #include <optional>
 
 #include "Daemon/HSLog.h"
 #include "platform/Base64.h"
 #include "platform/Format.h"
+#include "platform/Hexadecimal.h"
 #include "platform/KeyedArchive.h"
 #include "platform/Utf8.h"
 
@@ -35,28 +37,13 @@ void removeEvery(std::string& text, std::string_view part) {
     text = std::move(kept);
 }
 
-std::optional<unsigned> digit(char character) {
-    if (character >= '0' && character <= '9')
-        return static_cast<unsigned>(character - '0');
-    if (character >= 'a' && character <= 'f')
-        return static_cast<unsigned>(character - 'a' + 10);
-    if (character >= 'A' && character <= 'F')
-        return static_cast<unsigned>(character - 'A' + 10);
-    return std::nullopt;
-}
-
 // The number that the hexadecimal digits of a pair form, which white space may precede and anything may follow; none
 // without a digit. A "0x" is the digit 0 and what follows it.
 std::optional<std::uint8_t> scanPair(std::string_view pair) {
     pair.remove_prefix(std::min(pair.find_first_not_of(" \t\n\v\f\r"), pair.size()));
-    std::optional<unsigned> number;
-    for (const char character : pair) {
-        const std::optional<unsigned> value = digit(character);
-        if (!value)
-            break;
-        number = number.value_or(0) << 4 | *value;
-    }
-    return number;
+    std::uint8_t number = 0;
+    const auto end = std::from_chars(pair.data(), pair.data() + pair.size(), number, 16);
+    return end.ec == std::errc() ? std::optional(number) : std::nullopt;
 }
 
 } // namespace
@@ -72,29 +59,21 @@ Value convertDictionaryToData(const Value& dictionary) try {
 Value convertDataToDictionary(const Value& data) {
     if (!data.data())
         return {};
-    Error error;
+    std::optional<Error> error;
     const std::optional<ArchiveDecoder> decoder = ArchiveDecoder::create(*data.data(), &error);
-    const FormatArgument shownError = decoder ? FormatArgument(nullptr) : FormatArgument(error);
-    consoleLine("Unarchive Error : %@", {shownError});
-    if (!decoder)
-        consoleLine("Error : %@", {shownError});
+    consoleLine("Unarchive Error : %@", {error});
+    if (error)
+        consoleLine("Error : %@", {error});
     Value object = decoder ? decoder->decode(rootKey) : Value();
     consoleLine("recvDict : %@", {object});
-    consoleLine("err : %@", {shownError});
+    consoleLine("err : %@", {error});
     return object;
 }
 
 Value DatatoHexString(const Value& data) {
     if (!data.data() || data.data()->empty())
         return {};
-    constexpr char digits[] = "0123456789abcdef";
-    std::string text;
-    text.reserve(data.data()->size() * 2);
-    for (const std::uint8_t byte : *data.data()) {
-        text += digits[byte >> 4];
-        text += digits[byte & 0xF];
-    }
-    return text;
+    return hexadecimal(*data.data());
 }
 
 Value stringFromHexString(std::string_view text) {

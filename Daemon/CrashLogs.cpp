@@ -13,11 +13,11 @@
 #include <unistd.h>
 
 #include "Daemon/HSLog.h"
+#include "platform/DeviceRoot.h"
 #include "platform/Files.h"
+#include "platform/Json.h"
+#include "platform/PropertyList.h"
 #include "platform/Utf8.h"
-#include "platform/linux/system/DeviceRoot.h"
-#include "platform/linux/system/Json.h"
-#include "platform/linux/system/PropertyList.h"
 
 namespace {
 

@@ -8,8 +8,8 @@
 
 #include <sys/stat.h>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Value.h"
-#include "platform/linux/system/FileDescriptor.h"
 
 struct CrashLog {
     std::string path;     // the device path, as the file system has it

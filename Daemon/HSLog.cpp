@@ -22,15 +22,9 @@ struct LogState {
 // Null until logInit has run. Never released, since any thread may log until the process is gone.
 std::atomic<const LogState*> logInitialized = nullptr;
 
-constexpr struct {
-    int level;
-    SystemLogType type;
-} types[] = {
-    {LogLevelDefault, SystemLogType::Default},
-    {LogLevelInfo, SystemLogType::Info},
-    {LogLevelDebug, SystemLogType::Debug},
-    {LogLevelError, SystemLogType::Error},
-};
+// Of the levels from LogLevelDefault on.
+constexpr SystemLogType types[] = {SystemLogType::Default, SystemLogType::Info, SystemLogType::Debug,
+                                   SystemLogType::Error};
 
 void initialize(const char* name) {
     auto* const state = new LogState;
@@ -43,9 +37,10 @@ void initialize(const char* name) {
 }
 
 void writeLine(const LogState& state, int level, const std::string& line) {
-    for (const auto& row : types) {
-        if (row.level == level && systemLogTypeEnabled(state.connObj, row.type))
-            systemLogWrite(state.connObj, row.type, line);
+    if (level >= LogLevelDefault && level <= LogLevelError) {
+        const SystemLogType type = types[level - LogLevelDefault];
+        if (systemLogTypeEnabled(state.connObj, type))
+            systemLogWrite(state.connObj, type, line);
     }
     if (state.logFileName)
         files::append(format("/private/var/log/%@.log", *state.logFileName), line);

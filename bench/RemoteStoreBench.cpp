@@ -15,8 +15,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "platform/Json.h"
 #include "platform/OrloDataStore.h"
-#include "platform/linux/system/Json.h"
 
 namespace {
 

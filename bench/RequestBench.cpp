@@ -24,7 +24,7 @@ constexpr const char* serviceName = "com.tevari.VeltraOrloServices";
 int check(int result) {
     if (result >= 0)
         return result;
-    std::fprintf(stderr, "bench-request: %s\n", bus::Failure(result).what());
+    std::fprintf(stderr, "bench-request: %s\n", bus::reasonOf(result).c_str());
     std::exit(EXIT_FAILURE);
 }
 

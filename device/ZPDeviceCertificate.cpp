@@ -35,27 +35,6 @@ Error certificateError(const char* description) {
     return {"TcrtErrorDomain", 400, description};
 }
 
-// A service of the hardware registry that is given back at the end.
-struct HeldService {
-    HeldService() = default;
-    HeldService(const HeldService&) = delete;
-    HeldService& operator=(const HeldService&) = delete;
-    ~HeldService() {
-        if (handle != 0)
-            HardwareRegistry::releaseService(handle);
-    }
-
-    HardwareRegistry::Service handle = 0;
-};
-
-// The first certificate of a certificates-only message, or the one certificate that the bytes are; null for neither.
-CertificateService::CertificateRef parseCertificate(const Value::Data& bytes) {
-    const auto list = CertificateService::copyCertificatesFromCertsOnlyMessage(bytes);
-    if (list && !list->empty())
-        return list->front();
-    return CertificateService::createCertificateWithBytes(bytes.data(), bytes.size());
-}
-
 // What an authentication's completion writes. The completion shares it, since it may come when nobody waits any more.
 struct Authentication {
     bool passed = false; // written before the signal, read after it or not at all
@@ -98,7 +77,7 @@ std::optional<Error> ZPDevice::getService(std::string_view className, std::uint3
 std::optional<Error> ZPDevice::getTcrtCertificate(Value* certificate) const {
     constexpr const char* operation = "-[ZPDevice getTcrtCertificate:]";
     trace(operation, "Entering");
-    HeldService service;
+    HardwareRegistry::HeldService service;
     if (getService(relayClass, &service.handle)) {
         if (auto error = getService(authenticatorClass, &service.handle)) {
             zplog.error("cannot get service. Giving up.");
@@ -122,7 +101,8 @@ Value ZPDevice::getCertificateSerialNumber(const Value& certificate) const {
     const Value::Data* bytes = certificate.data();
     std::optional<Value::Data> serialNumber;
     if (bytes)
-        serialNumber = CertificateService::copySerialNumberData(parseCertificate(*bytes), nullptr);
+        serialNumber =
+            CertificateService::copySerialNumberData(CertificateService::copyFirstCertificate(*bytes), nullptr);
     if (!serialNumber) {
         zplog.error("Unable to read Certificate Serial Number");
         return {};

@@ -1,11 +1,11 @@
+#include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <memory>
-#include <mutex>
 
 #include "Daemon/HSLog.h"
 #include "device/ZPDevice.h"
 #include "platform/ReverseProxy.h"
+#include "platform/Semaphore.h"
 
 namespace {
 
@@ -18,33 +18,16 @@ constexpr std::int32_t endOfWaiting = 3;
 
 // What the callback and the call that waits for it share. Each owns a part of it, so that a callback that comes after
 // the call has returned finds it still there.
-class Availability {
-public:
+struct Availability {
     void report(std::int32_t status) {
-        if (status != available && status != endOfWaiting)
-            return;
-        const std::lock_guard lock(mutex_);
         if (status == available)
-            available_ = true;
-        ++signals_;
-        signalled_.notify_one();
+            isAvailable = true;
+        if (status == available || status == endOfWaiting)
+            reported.signal();
     }
 
-    void wait() {
-        std::unique_lock lock(mutex_);
-        signalled_.wait_for(lock, waitLimit, [this] { return signals_ > 0; });
-    }
-
-    bool isAvailable() const {
-        const std::lock_guard lock(mutex_);
-        return available_;
-    }
-
-private:
-    mutable std::mutex mutex_;
-    std::condition_variable signalled_;
-    unsigned signals_ = 0;
-    bool available_ = false;
+    std::atomic<bool> isAvailable = false;
+    CountingSemaphore reported;
 };
 
 using RegistrationPtr = std::unique_ptr<RPRegistration, decltype(&RPRelease)>;
@@ -62,9 +45,9 @@ Value ZPDevice::setupReverseProxy(const std::string& url) const {
         return {};
     }
     RPRegistrationResume(registration.get());
-    availability->wait();
+    availability->reported.waitFor(waitLimit);
     RPRegistrationInvalidate(registration.get());
-    if (!availability->isAvailable()) {
+    if (!availability->isAvailable) {
         zplog.info("Failed to get proxy info");
         return {};
     }

@@ -15,13 +15,13 @@
 #include "Daemon/CrashLogs.h"
 #include "fuzz/Growth.h"
 #include "platform/Base64.h"
+#include "platform/Json.h"
+#include "platform/PropertyList.h"
 #include "platform/URL.h"
 #include "platform/linux/services/Http.h"
 #include "platform/linux/services/OrloRemoteSettings.h"
 #include "platform/linux/services/OrloStoreBackend.h"
 #include "platform/linux/system/DescriptionCheck.h"
-#include "platform/linux/system/Json.h"
-#include "platform/linux/system/PropertyList.h"
 #include "tests/support/TemporaryRoot.h"
 
 namespace {

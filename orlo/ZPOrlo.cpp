@@ -69,11 +69,11 @@ ZPOrlo::ZPOrlo(const Value& options) {
     QDOrloLogSetHandler(orloLogHandler);
     zplog.info("Calling initWithOptions : %@", options);
     const bool isOrlo2 = options["orlo2Data"].boolean().value_or(false);
-    Value::Dictionary merged = createDefaultOrloOptions(true, isOrlo2);
-    zplog.info("Default Orlo Options: %@", Value(merged));
+    Value merged = createDefaultOrloOptions(true, isOrlo2);
+    zplog.info("Default Orlo Options: %@", merged);
     if (const Value::Dictionary* given = options.dictionary())
         for (const auto& [key, value] : *given)
-            merged.insert_or_assign(key, value);
+            merged.dictionary()->insert_or_assign(key, value);
     setOrloRef(QDOrloCreateWithOptions(std::move(merged)));
 }
 
@@ -83,7 +83,8 @@ ZPOrlo::~ZPOrlo() {
 
 Value::Dictionary ZPOrlo::createDefaultOrloOptions(bool isRemote, bool isOrlo2) {
     std::optional<Value::Data> ticket = readApTicket(zplog);
-    const std::uint32_t dataVersion = QDOrloSealingMapGetOrloDataVersionForDevice(ticket ? *ticket : Value::Data{});
+    const Value::Data none;
+    const std::uint32_t dataVersion = QDOrloSealingMapGetOrloDataVersionForDevice(ticket ? *ticket : none);
     zplog.info("Setting Data Local Encode version to : %u", dataVersion);
 
     Value::Dictionary options;
@@ -103,11 +104,11 @@ Value ZPOrlo::makePermissionsWithOrloAction(OrloAction action, const Value& data
 }
 
 std::optional<Error> ZPOrlo::setPermissionString(OrloAction action, const Value& dataClass, const Value& dataInstance) {
-    const Value permissions = makePermissionsWithOrloAction(action, dataClass, dataInstance);
+    Value permissions = makePermissionsWithOrloAction(action, dataClass, dataInstance);
     if (permissions.isNothing())
         return makeError(permissionNil);
     zplog.info("permission string : %@", permissions);
-    QDOrloSetOption(orloRef(), "Permissions", permissions);
+    QDOrloSetOption(orloRef(), "Permissions", std::move(permissions));
     return std::nullopt;
 }
 

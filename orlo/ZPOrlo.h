@@ -30,7 +30,7 @@ public:
     ZPOrlo& operator=(const ZPOrlo&) = delete;
     ~ZPOrlo();
 
-    // The default options: for a remote or a local store, of the first generation or the second. They lack "APTicket"
+    // The default options: for a remote or a local store, of the first generation or the second. "APTicket" is missing
     // when the device's boot ticket cannot be read.
     static Value::Dictionary createDefaultOrloOptions(bool isRemote, bool isOrlo2);
 

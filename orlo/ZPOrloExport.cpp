@@ -16,7 +16,7 @@ constexpr const char* errorDomain = "OrloExport";
 constexpr const char* operationName = "+[ZPOrloExport orloExportCommandWithResponse:options:response:]";
 constexpr std::int64_t dataVersion = 1;
 constexpr std::chrono::milliseconds pauseAfterFailure{10};
-constexpr std::size_t usualGrantLength = 32;
+constexpr std::size_t expectedGrantLength = 32;
 
 constexpr OrloErrorRow noInstances{2002, "Orlo Export Failed Not being able to get data instances due to %@",
                                    "Could not generate data instances"};
@@ -109,7 +109,7 @@ private:
 
     std::optional<Error> makePermissions() {
         if (!madeIfMemorySuffices([this] {
-                permissions_.reserve(dictionary_.size() * usualGrantLength);
+                permissions_.reserve(dictionary_.size() * expectedGrantLength);
                 return true;
             }))
             return makeError(noPermissions);
@@ -127,7 +127,7 @@ private:
         zplog.info("Adding apTicket Data  : %lu", ticket->size());
         zplog.info("Setting Data Local Encode version to : %u", dataVersion);
         Value::Dictionary options(std::begin(fixedOptions), std::end(fixedOptions));
-        options.emplace("Permissions", permissions_);
+        options.emplace("Permissions", std::move(permissions_));
         options.emplace("APTicket", std::move(*ticket));
         session_.reset(QDOrloCreateWithOptions(std::move(options)));
         if (!session_)

@@ -73,7 +73,7 @@ bool stops(const DataClass& dataClass, const IdentityRow& row, const Value& iden
     if (!row.missing || !identity.isNothing())
         return false;
     report(row.missing, error);
-    return !dataClass.mayLackOne;
+    return !dataClass.mayMissOne;
 }
 
 // The instance of one class, or nothing when the gathering stops here.

@@ -28,10 +28,16 @@ std::optional<std::vector<CertificateRef>> copyCertificatesFromCertsOnlyMessage(
 // none.
 CertificateRef createCertificateWithBytes(const std::uint8_t* bytes, std::size_t length);
 
+// The first certificate of such a message, or the one certificate that `bytes` are; null for neither.
+inline CertificateRef copyFirstCertificate(const Value::Data& bytes) {
+    const auto list = copyCertificatesFromCertsOnlyMessage(bytes);
+    return list && !list->empty() ? list->front() : createCertificateWithBytes(bytes.data(), bytes.size());
+}
+
 // The content octets of the certificate's serialNumber INTEGER exactly as encoded: big-endian two's complement, with
 // the leading zero of a number whose first bit is set. Nothing, and *error filled when `error` is given, for no
 // certificate.
-std::optional<Value::Data> copySerialNumberData(const CertificateRef& certificate, Error* error);
+std::optional<Value::Data> copySerialNumberData(const CertificateRef& certificate, std::optional<Error>* error);
 
 } // namespace CertificateService
 

@@ -26,7 +26,7 @@ struct DataClass {
     // The instance is the first identity, or both with a dash between them.
     ComponentIdentity first;
     ComponentIdentity second = ComponentIdentity::None;
-    bool mayLackOne = false;        // whether an instance is made with "(null)" for an identity that is missing
+    bool mayMissOne = false;        // whether an instance is made with "(null)" for an identity that is missing
     bool secondIsReadFirst = false; // otherwise the identities are read in the order in which they stand
 };
 

@@ -6,6 +6,7 @@
 #ifndef VELTRA_PLATFORM_DEVICE_ANSWERS_H
 #define VELTRA_PLATFORM_DEVICE_ANSWERS_H
 
+#include <optional>
 #include <string_view>
 
 #include "platform/Error.h"
@@ -27,9 +28,9 @@ extern const std::string_view LoddenUIDKey;
 Value KACopyAnswer(std::string_view key, const Value& options);
 
 // The same; *error, when `error` is given, says why there is no answer.
-Value KACopyAnswerWithError(std::string_view key, const Value& options, Error* error);
+Value KACopyAnswerWithError(std::string_view key, const Value& options, std::optional<Error>* error);
 
 // The Tansu service's value for `key`, in the same way.
-Value TansuCopyValueWithError(std::string_view key, const Value& options, Error* error);
+Value TansuCopyValueWithError(std::string_view key, const Value& options, std::optional<Error>* error);
 
 #endif

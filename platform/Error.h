@@ -5,7 +5,8 @@
 #include <string>
 
 // A failure as it travels through the plug-in and into a response. An operation that "returns an Error or nothing"
-// returns std::optional<Error>; an Error out-value is a pointer that may be null and is then not filled.
+// returns std::optional<Error>; an Error out-value is a pointer to one, which may be null and is filled on failure
+// only.
 struct Error {
     std::string domain;
     std::int64_t code = 0;

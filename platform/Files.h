@@ -4,7 +4,9 @@
 #define VELTRA_PLATFORM_FILES_H
 
 #include <cstddef>
+#include <cstdint>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -19,7 +21,8 @@ constexpr std::size_t maximumSize = std::size_t{256} << 20;
 
 // The whole contents of the regular file at `path`, or nothing when it is missing, unreadable, no regular file (a FIFO
 // or device is never waited for) or larger than `maximum`. *error, when `error` is given, then says why.
-std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum = maximumSize, Error* error = nullptr);
+std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum = maximumSize,
+                                     std::optional<Error>* error = nullptr);
 
 // What there is at `path`; a symbolic link counts as what it leads to.
 enum class Kind {
@@ -41,7 +44,7 @@ bool exists(std::string_view path);
 // everything as it was, when the directory is missing or the target exists and is no regular file. The same goes for a
 // new file that was made but could not be filled or moved to its place; *writeError, when given, is then set and says
 // why.
-bool replace(std::string_view path, const Value::Data& contents, std::optional<Error>* writeError = nullptr);
+bool replace(std::string_view path, std::span<const std::uint8_t> contents, std::optional<Error>* writeError = nullptr);
 
 // Removes the regular file at `path`; a symbolic link or anything else that stands there stays.
 void remove(std::string_view path);

@@ -1,62 +1,30 @@
 #include "platform/Format.h"
 
-#include <algorithm>
 #include <charconv>
+#include <iterator>
 
 #include "platform/ShownText.h"
 
 namespace {
 
-constexpr unsigned widest = 64;
 constexpr std::string_view noArgument = "(null)";
 
 // A conversion as it stands behind a per cent sign.
 struct Conversion {
-    bool zeroPadded = false;
-    unsigned width = 0;
-    bool wide = false;
+    bool is64Bit = false;
     char letter = 0;
     std::size_t length = 0; // of the text that was read, the letter included; 0 for an unknown conversion
 };
 
 Conversion readConversion(std::string_view text) {
     Conversion conversion;
-    std::size_t at = 0;
-    if (at < text.size() && text[at] == '0') {
-        conversion.zeroPadded = true;
-        ++at;
-    }
-    for (; at < text.size() && text[at] >= '0' && text[at] <= '9'; ++at)
-        conversion.width = std::min(conversion.width * 10 + static_cast<unsigned>(text[at] - '0'), widest);
-    for (const std::string_view size : {"ll", "l", "z"}) {
-        if (text.substr(at).starts_with(size)) {
-            conversion.wide = true;
-            at += size.size();
-            break;
-        }
-    }
-    if (at < text.size() && std::string_view("@sdiuxXp").find(text[at]) != std::string_view::npos) {
+    conversion.is64Bit = text.starts_with('l') || text.starts_with('z');
+    const std::size_t at = conversion.is64Bit ? 1 : 0;
+    if (at < text.size() && std::string_view("@sdiup").find(text[at]) != std::string_view::npos) {
         conversion.letter = text[at];
         conversion.length = at + 1;
     }
     return conversion;
-}
-
-std::string digits(std::uint64_t number, int base) {
-    char buffer[20];
-    const auto end = std::to_chars(std::begin(buffer), std::end(buffer), number, base);
-    return std::string(buffer, end.ptr);
-}
-
-void appendPadded(std::string& out, std::string_view sign, const std::string& number, bool zeroPadded, unsigned width) {
-    const std::size_t length = sign.size() + number.size();
-    const std::size_t padding = width > length ? width - length : 0;
-    if (!zeroPadded)
-        out.append(padding, ' ');
-    out += sign;
-    if (zeroPadded)
-        out.append(padding, '0');
-    out += number;
 }
 
 } // namespace
@@ -74,6 +42,7 @@ private:
     void appendValue(const Value& value, const Conversion& conversion);
     void appendText(std::string_view text, utf8::Escaping how = utf8::Escaping::OneLine);
     void appendNumber(std::uint64_t number, bool negative, const Conversion& conversion);
+    void appendPointer(const void* pointer);
 
     const bool forLog_;
     std::string out_;
@@ -82,6 +51,8 @@ private:
 void Formatter::append(const FormatArgument& argument, const Conversion& conversion) {
     if (const Value* const* value = std::get_if<const Value*>(&argument.content_))
         appendValue(**value, conversion);
+    else if (const auto* data = std::get_if<std::span<const std::uint8_t>>(&argument.content_))
+        out_ += Value::descriptionOf(*data);
     else if (const Error* const* error = std::get_if<const Error*>(&argument.content_))
         out_ += (*error)->description();
     else if (const auto* literal = std::get_if<FormatArgument::Literal>(&argument.content_))
@@ -93,8 +64,7 @@ void Formatter::append(const FormatArgument& argument, const Conversion& convers
     else if (const auto* number = std::get_if<std::uint64_t>(&argument.content_))
         appendNumber(*number, argument.negative_, conversion);
     else if (const void* const* pointer = std::get_if<const void*>(&argument.content_))
-        appendPadded(out_, "0x", digits(reinterpret_cast<std::uintptr_t>(*pointer), 16), conversion.zeroPadded,
-                     conversion.width);
+        appendPointer(*pointer);
     else
         out_ += noArgument;
 }
@@ -128,36 +98,19 @@ void Formatter::appendText(std::string_view text, utf8::Escaping how) {
 }
 
 void Formatter::appendNumber(std::uint64_t number, bool negative, const Conversion& conversion) {
-    const std::uint64_t unsignedNumber = conversion.wide ? number : static_cast<std::uint32_t>(number);
-    std::string sign, text;
-    switch (conversion.letter) {
-    case 'd':
-    case 'i': {
-        const bool below =
-            conversion.wide ? static_cast<std::int64_t>(number) < 0 : static_cast<std::int32_t>(number) < 0;
-        sign = below ? "-" : "";
-        text = digits(!below            ? unsignedNumber
-                      : conversion.wide ? 0 - number
-                                        : static_cast<std::uint32_t>(0 - number),
-                      10);
-        break;
-    }
-    case 'u':
-        text = digits(unsignedNumber, 10);
-        break;
-    case 'x':
-        text = digits(unsignedNumber, 16);
-        break;
-    case 'X':
-        text = digits(unsignedNumber, 16);
-        std::transform(text.begin(), text.end(), text.begin(),
-                       [](char digit) { return digit >= 'a' ? static_cast<char>(digit - 'a' + 'A') : digit; });
-        break;
-    default:
-        sign = negative ? "-" : "";
-        text = digits(negative ? 0 - number : number, 10);
-    }
-    appendPadded(out_, sign, text, conversion.zeroPadded, conversion.width);
+    const auto signedNumber = static_cast<std::int64_t>(number);
+    if (conversion.letter == 'd' || conversion.letter == 'i')
+        out_ += std::to_string(conversion.is64Bit ? signedNumber : static_cast<std::int32_t>(number));
+    else if (conversion.letter == 'u')
+        out_ += std::to_string(conversion.is64Bit ? number : static_cast<std::uint32_t>(number));
+    else
+        out_ += negative ? std::to_string(signedNumber) : std::to_string(number);
+}
+
+void Formatter::appendPointer(const void* pointer) {
+    char digits[2 * sizeof pointer];
+    const auto end = std::to_chars(std::begin(digits), std::end(digits), reinterpret_cast<std::uintptr_t>(pointer), 16);
+    out_.append("0x").append(digits, end.ptr);
 }
 
 std::string Formatter::format(std::string_view text, std::initializer_list<FormatArgument> arguments) {

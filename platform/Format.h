@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <initializer_list>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -26,6 +27,7 @@ class FormatArgument {
 public:
     FormatArgument(std::nullptr_t) {}
     FormatArgument(const Value& value) : content_(&value) {}
+    FormatArgument(std::span<const std::uint8_t> data) : content_(data) {}
     FormatArgument(const Error& error) : content_(&error) {}
     FormatArgument(const std::optional<Error>& error) {
         if (error)
@@ -48,8 +50,8 @@ private:
         const char* text;
     };
 
-    std::variant<std::monostate, const Value*, const Error*, Literal, std::string_view, ProgramOutput, std::uint64_t,
-                 const void*>
+    std::variant<std::monostate, const Value*, std::span<const std::uint8_t>, const Error*, Literal, std::string_view,
+                 ProgramOutput, std::uint64_t, const void*>
         content_;
     bool negative_ = false;
 };
@@ -57,13 +59,12 @@ private:
 // Replaces each conversion of `text` by its argument, in order:
 //   %@            any argument: its description, "(null)" for nothing
 //   %s            a text
-//   %d %i         a number, signed, 32 bits; with l, ll or z 64 bits
-//   %u %x %X      a number, unsigned, 32 bits, decimal or hexadecimal; with l, ll or z 64 bits
+//   %d %i         a number, signed, 32 bits; with l or z 64 bits
+//   %u            a number, unsigned, 32 bits; with l or z 64 bits
 //   %p            a pointer
 //   %%            a per cent sign
-// A width with or without a leading 0 pads numbers ("%02x"), to 64 places at most. An argument of another kind than the
-// conversion asks for is written as "%@" would; a missing one is "(null)"; an unknown conversion stands as it is.
-// A text stands as it is, every other value and an error as its description.
+// An argument of another kind than the conversion asks for is written as "%@" would; a missing one is "(null)"; an
+// unknown conversion stands as it is. A text stands as it is, every other value and an error as its description.
 struct Formatting {
     std::string operator()(std::string_view text, std::initializer_list<FormatArgument> arguments) const;
 

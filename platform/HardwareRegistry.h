@@ -41,6 +41,16 @@ Value searchProperty(Service service, std::string_view plane, std::string_view k
 // Gives a handle back. Nothing happens for 0 and for a handle that is not held.
 void releaseService(Service service);
 
+// A handle that is given back at the end.
+struct HeldService {
+    explicit HeldService(Service held = 0) : handle(held) {}
+    HeldService(const HeldService&) = delete;
+    HeldService& operator=(const HeldService&) = delete;
+    ~HeldService() { releaseService(handle); }
+
+    Service handle;
+};
+
 // How many handles are held. 0 between requests; for tests and diagnosis.
 std::size_t heldServices();
 

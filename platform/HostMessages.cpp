@@ -4,7 +4,7 @@
 #include <utility>
 
 std::string HSMessageRequest::description() const {
-    return Value(Value::Dictionary{{"messageStr", messageStr}, {"messageDict", messageDict}}).description();
+    return Value::descriptionOf({{"messageDict", &messageDict}, {"messageStr", &messageStr}});
 }
 
 HSMessageResponse HSMessageResponse::initWithName(Value name, std::int64_t statusCode, Value response,

@@ -26,7 +26,7 @@ Value::Data archiveEncode(std::string_view rootKey, const Value& root);
 class ArchiveDecoder {
 public:
     // None, and *error filled, when `bytes` are no archive at all: empty, or not a map.
-    static std::optional<ArchiveDecoder> create(const Value::Data& bytes, Error* error);
+    static std::optional<ArchiveDecoder> create(const Value::Data& bytes, std::optional<Error>* error);
 
     // The object under `rootKey`, or nothing when the archive has no such key. Raises ArchiveFailure when the contents
     // are malformed, hold another kind of object than the five (a fraction, an integer beyond 64 signed bits, a tagged

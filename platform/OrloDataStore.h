@@ -69,12 +69,12 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler);
 //   "CAURL"                    https URL whose "/orlotrustobject" is the measure of the trust object
 //   "EnableProxy"              true: http URLs are fetched through the device's proxy (ReverseProxy.h), if there is one
 //   "EnableProxySsl"           "ForHttps": if "EnableProxy" is true, so are https URLs
-//   "HTTPTimeout"              how many seconds an attempt may take, all in all: 1 to 3600, usually 30
-//   "HTTPMaxAttempts"          how often the trust object is asked for, and a record put or got: 1 to 10, usually once
-//   "MultiRequestMaxAttempts"  the same for an export
-// A larger number counts as the largest, and what is no number of 1 or more as the usual one. What is tried again are
+//   "HTTPTimeout"              how many seconds an attempt may take, all in all: 1 to 3600, by default 30
+//   "HTTPMaxAttempts"          how often the trust object is asked for, and a record put or got: 1 to 10, by default
+//   once "MultiRequestMaxAttempts"  the same for an export
+// A larger number counts as the largest, and what is no number of 1 or more as the default. What is tried again are
 // failures of the network and answers with a status from 500 on.
-__QDOrlo* QDOrloCreateWithOptions(const Value& options);
+__QDOrlo* QDOrloCreateWithOptions(Value options);
 
 // Sets or replaces one option of the session.
 void QDOrloSetOption(__QDOrlo* session, std::string_view key, Value value);

@@ -1,6 +1,6 @@
 // Child processes and the pipes to them. Programs are device paths, resolved below the device root, which they cannot
-// leave. Descriptors are plain numbers that the caller owns and closes; -1 is none. Pipe ends are closed on exec, so
-// that no other program inherits them. All operations may be called from any thread. An error number is one of
+// leave. Descriptors are plain numbers, which stay the caller's; -1 is none. Pipe ends are closed on exec, so that no
+// other program inherits them. All operations may be called from any thread. An error number is one of
 // errno(3), and 0 is none.
 #ifndef VELTRA_PLATFORM_PROCESSES_H
 #define VELTRA_PLATFORM_PROCESSES_H
@@ -13,18 +13,18 @@
 
 #include <sys/types.h>
 
+#include "platform/FileDescriptor.h"
+
 namespace processes {
 
 struct Pipe {
-    int readEnd = -1;
-    int writeEnd = -1;
+    FileDescriptor readEnd;
+    FileDescriptor writeEnd;
 };
 
 // Makes a pipe and returns 0, or an error number. Both ends lie above the standard descriptors, also in a process that
 // was started without them, so that spawn can put them in any place.
 int createPipe(Pipe& pipe);
-
-void closeDescriptor(int descriptor);
 
 // What becomes the child's standard descriptors; one that is -1 is inherited.
 struct StandardDescriptors {
@@ -60,8 +60,8 @@ void killAndWait(pid_t child);
 // Makes writes to this end answer at once, with what fits. The other end is not affected.
 void makeNonBlocking(int descriptor);
 
-// A descriptor that can be read once the child has ended; -1 when the kernel has none to give.
-int openEnding(pid_t child);
+// A descriptor that can be read once the child has ended; none when the kernel has none to give.
+FileDescriptor openEnding(pid_t child);
 
 // Waits until `writeEnd` takes bytes or shows that nobody reads them, `readEnd` has bytes or its end, or the child has
 // ended. Either end may be -1; `ending` is what openEnding gave, and without it the child is looked at now and then.

@@ -3,12 +3,13 @@
 #include <algorithm>
 #include <iterator>
 
+#include "platform/Hexadecimal.h"
+
 namespace utf8 {
 
 namespace {
 
 constexpr std::string_view replacement = "\xEF\xBF\xBD"; // U+FFFD
-constexpr char hexDigits[] = "0123456789abcdef";
 
 // The first bytes of the characters beyond ASCII, with what may follow (RFC 3629, section 4).
 struct Lead {
@@ -26,21 +27,14 @@ bool leavesTheLine(char32_t point) {
            (point >= 0x2066 && point <= 0x2069) || point == 0x200E || point == 0x200F || point == 0x061C;
 }
 
-void appendHex(std::string& out, char32_t number, unsigned digits) {
-    for (unsigned shift = digits * 4; shift > 0; shift -= 4)
-        out += hexDigits[(number >> (shift - 4)) & 0xF];
-}
-
 void appendEscape(std::string& out, char32_t point) {
     constexpr std::string_view named = "\n\r\t", letters = "nrt";
     const std::size_t index = point < 0x80 ? named.find(static_cast<char>(point)) : std::string_view::npos;
     out += '\\';
-    if (index != std::string_view::npos) {
+    if (index != std::string_view::npos)
         out += letters[index];
-        return;
-    }
-    out += 'u';
-    appendHex(out, point, 4);
+    else
+        out += 'u' + hexadecimal({{static_cast<std::uint8_t>(point >> 8), static_cast<std::uint8_t>(point)}});
 }
 
 } // namespace
@@ -51,10 +45,8 @@ void appendEscaped(std::string& out, std::string_view text, Escaping how) {
         const std::string_view bytes = text.substr(0, step.length);
         text.remove_prefix(step.length);
         if (step.kind != Step::Character) {
-            for (const char byte : bytes) {
-                out += "\\x";
-                appendHex(out, static_cast<unsigned char>(byte), 2);
-            }
+            for (const char byte : bytes)
+                out += "\\x" + hexadecimal({{static_cast<std::uint8_t>(byte)}});
         } else if (leavesTheLine(step.point) && !(how == Escaping::Lines && step.point == '\n')) {
             appendEscape(out, step.point);
         } else {

@@ -1,5 +1,6 @@
 #include "platform/Value.h"
 
+#include "platform/Hexadecimal.h"
 #include "platform/ShownText.h"
 
 namespace {
@@ -10,25 +11,12 @@ constexpr std::size_t shownData = 16;         // bytes at each end of longer dat
 constexpr std::size_t shownCollection = 4096; // a collection takes up no further element from here on
 constexpr unsigned shownNesting = 32;
 
-void appendHex(std::string& out, const std::uint8_t* bytes, std::size_t length) {
-    constexpr char digits[] = "0123456789abcdef";
-    for (std::size_t i = 0; i < length; ++i) {
-        out += digits[bytes[i] >> 4];
-        out += digits[bytes[i] & 0xF];
-    }
-}
-
-void appendData(std::string& out, const Value::Data& data) {
-    out += '<';
-    if (data.size() <= wholeData) {
-        appendHex(out, data.data(), data.size());
-    } else {
-        out += std::to_string(data.size()) + " bytes: ";
-        appendHex(out, data.data(), shownData);
-        out += "...";
-        appendHex(out, data.data() + data.size() - shownData, shownData);
-    }
-    out += '>';
+void appendData(std::string& out, std::span<const std::uint8_t> data) {
+    if (data.size() <= wholeData)
+        out += "<" + hexadecimal(data) + ">";
+    else
+        out += "<" + std::to_string(data.size()) + " bytes: " + hexadecimal(data.first(shownData)) + "..." +
+               hexadecimal(data.last(shownData)) + ">";
 }
 
 void appendText(std::string& out, std::string_view text) {
@@ -45,10 +33,18 @@ void appendElement(std::string& out, const Value& element, unsigned nesting) {
     append(out, element, nesting);
 }
 
-void appendElement(std::string& out, const Value::Dictionary::value_type& element, unsigned nesting) {
-    appendText(out, element.first);
+void appendEntry(std::string& out, std::string_view key, const Value& value, unsigned nesting) {
+    appendText(out, key);
     out += ": ";
-    append(out, element.second, nesting);
+    append(out, value, nesting);
+}
+
+void appendElement(std::string& out, const Value::Dictionary::value_type& element, unsigned nesting) {
+    appendEntry(out, element.first, element.second, nesting);
+}
+
+void appendElement(std::string& out, const Value::BorrowedEntries::value_type& element, unsigned nesting) {
+    appendEntry(out, element.first, *element.second, nesting);
 }
 
 template <class Collection>
@@ -117,5 +113,17 @@ std::string Value::description() const {
         appendShown(out, *content);
     else
         append(out, *this, 0);
+    return out;
+}
+
+std::string Value::descriptionOf(std::span<const std::uint8_t> data) {
+    std::string out;
+    appendData(out, data);
+    return out;
+}
+
+std::string Value::descriptionOf(BorrowedEntries entries) {
+    std::string out;
+    appendCollection(out, entries, "{}", 0);
     return out;
 }

@@ -4,8 +4,10 @@
 
 #include <concepts>
 #include <cstdint>
+#include <initializer_list>
 #include <map>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -20,6 +22,9 @@ public:
     using Data = std::vector<std::uint8_t>;
     using Array = std::vector<Value>;
     using Dictionary = std::map<std::string, Value, std::less<>>;
+
+    // Entries of a dictionary that stay where they are.
+    using BorrowedEntries = std::initializer_list<std::pair<std::string_view, const Value*>>;
 
     Value() = default; // nothing
     Value(bool value) : content_(value) {}
@@ -41,7 +46,8 @@ public:
     const Data* data() const { return std::get_if<Data>(&content_); }
     const Array* array() const { return std::get_if<Array>(&content_); }
     const Dictionary* dictionary() const { return std::get_if<Dictionary>(&content_); }
-    Dictionary* dictionary() { return std::get_if<Dictionary>(&content_); } // to be changed in place
+    Array* array() { return std::get_if<Array>(&content_); } // these two to be changed in place
+    Dictionary* dictionary() { return std::get_if<Dictionary>(&content_); }
 
     // A number as an integer or as true (not 0) or false.
     std::optional<std::int64_t> integer() const;
@@ -55,6 +61,10 @@ public:
     // bytes. Texts inside a collection stand in quotes with control characters escaped and URLs without user and
     // password.
     std::string description() const;
+
+    // The same of data, and of a dictionary with these entries, in their order.
+    static std::string descriptionOf(std::span<const std::uint8_t> data);
+    static std::string descriptionOf(BorrowedEntries entries);
 
     friend bool operator==(const Value&, const Value&) = default;
 

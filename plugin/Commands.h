@@ -15,8 +15,8 @@ constexpr const char* handlerName = "-[ZPOrloServices handleMessage:completion:]
 using Command = HSMessageResponse (*)(const HSMessageRequest& request, const Value& hardwareModel);
 
 // "OrloExport": exports the identities of the device's components, of the classes in the array "ExportList" or, when
-// the request has none and the model is neither of the M8 nor of the M9 family, of seven usual ones. The error is that
-// of the export, or one of "OrloExport" 2002 that says which identity could not be gathered.
+// the request has none and the model is neither of the M8 nor of the M9 family, of seven default ones. The error is
+// that of the export, or one of "OrloExport" 2002 that says which identity could not be gathered.
 HSMessageResponse OrloExport(const HSMessageRequest& request, const Value& hardwareModel);
 
 // "getTCRT": answers with the top module's certificate as hexadecimal text under "CertData" (left out when it is empty)

@@ -3,6 +3,7 @@
 #include <limits>
 #include <new>
 #include <optional>
+#include <span>
 
 #include "device/ZPDevice.h"
 #include "platform/Files.h"
@@ -81,13 +82,6 @@ void addEntry(const SysConfig3Ptr& object, std::uint32_t key, const std::array<s
     sysConfig3AddPayloadEntry(object.get(), entry.get());
 }
 
-Value::Data encode(const SysConfig3Ptr& object) {
-    SysConfigData encoded = {};
-    encodeSysConfig3(object.get(), &encoded);
-    const BytesPtr owner(encoded.data);
-    return Value::Data(encoded.data, encoded.data + encoded.length);
-}
-
 } // namespace
 
 HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) {
@@ -101,13 +95,16 @@ HSMessageResponse setGlobalbCfg(const HSMessageRequest& request, const Value&) {
     addEntry(object, keyMiGB, &miGBPayload);
 
     serviceLog.info("Encoding new data");
-    const Value data = encode(object);
+    SysConfigData encoded = {};
+    encodeSysConfig3(object.get(), &encoded);
+    const BytesPtr owner(encoded.data);
+    const std::span<const std::uint8_t> data(encoded.data, encoded.length);
     serviceLog.info("Printing the LXData: ");
     serviceLog.info("New data %@", data);
     serviceLog.info("Writting new data to file");
     // Whether the file could be written is no part of the answer; the host looks at the file, which is never that of an
     // earlier request.
-    if (!files::replace(resultPath, *data.data()))
+    if (!files::replace(resultPath, data))
         files::remove(resultPath);
     return HSMessageResponse::initWithName(request.messageStr, 0, {});
 }

@@ -7,7 +7,7 @@ namespace {
 constexpr const char* errorDomain = "OrloExport";
 constexpr std::int64_t nothingGathered = 2002;
 
-const Value::Array usualExportList = {"pfcl", "CtCl", "IfCl", "HmCl", "GpC2", "tcrt", "dCfg"};
+const Value::Array defaultExportList = {"pfcl", "CtCl", "IfCl", "HmCl", "GpC2", "tcrt", "dCfg"};
 
 const Value response; // of the export, which never fills it
 
@@ -21,13 +21,13 @@ HSMessageResponse exportInstances(const HSMessageRequest& request, const Value& 
     return error ? fail(request, std::move(error)) : HSMessageResponse::initWithName(request.messageStr, 0, {});
 }
 
-HSMessageResponse exportList(const HSMessageRequest& request, const Value::Array& list, bool isUsualList) {
+HSMessageResponse exportList(const HSMessageRequest& request, const Value::Array& list, bool isDefault) {
     Value reason;
     const Value instances = ZPOrloExport::getDataInstances(list, &reason);
     serviceLog.info("Export Dict : %@", instances);
     if (!instances.isNothing())
         return exportInstances(request, instances);
-    if (isUsualList)
+    if (isDefault)
         serviceLog.error("Key doesn't exist or Error reading IDs");
     else
         serviceLog.error("Orlo Export Failed due to - %@", reason);
@@ -40,7 +40,7 @@ HSMessageResponse OrloExport(const HSMessageRequest& request, const Value& hardw
     const Value& given = request.messageDict["ExportList"];
     if (given.isNothing() && !modelContains(hardwareModel, "M8") && !modelContains(hardwareModel, "M9")) {
         serviceLog.info("Adding ExportList for overlays before M8xM9y");
-        return exportList(request, usualExportList, true);
+        return exportList(request, defaultExportList, true);
     }
     if (!given.array()) {
         serviceLog.error("Expected a list");

@@ -75,7 +75,7 @@ void ZPOrloServices::q21isp_loadDAT() {
     const Value none = "";
     Value response;
     try {
-        Error error;
+        std::optional<Error> error;
         HSPipeUtil::HSPipeUtilExecCommand("/usr/local/bin/q21isp", {"-ns", "/tmp/q21_isp_load.txt"}, &response, &error);
     } catch (const std::bad_alloc&) {
         response = {}; // an output that memory does not suffice for is lost

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <new>
+#include <optional>
 #include <string_view>
 #include <utility>
 
@@ -21,22 +22,6 @@ constexpr std::size_t chunkSize = 1023;
 std::string_view programOf(const std::vector<std::string>& argv) {
     return argv.empty() ? std::string_view() : argv.front();
 }
-
-// Closes a descriptor at the end of its life, or earlier.
-class Descriptor {
-public:
-    explicit Descriptor(int number) : number_(number) {}
-    Descriptor(const Descriptor&) = delete;
-    Descriptor& operator=(const Descriptor&) = delete;
-    ~Descriptor() { close(); }
-
-    void close() { processes::closeDescriptor(std::exchange(number_, -1)); }
-    int get() const { return number_; }
-    int release() { return std::exchange(number_, -1); }
-
-private:
-    int number_;
-};
 
 // Waits for a child that nobody else has waited for, so that it is reaped also when memory runs out on the way.
 class Child {
@@ -64,14 +49,14 @@ public:
 
 private:
     pid_t process_;
-    Descriptor ending_;
+    FileDescriptor ending_;
     bool waited_ = false;
 };
 
 // The output of a child as it comes in, chunk by chunk.
 class Output {
 public:
-    explicit Output(int readEnd) : readEnd_(readEnd) {}
+    explicit Output(FileDescriptor readEnd) : readEnd_(std::move(readEnd)) {}
 
     // Reads one chunk of at most `longest` bytes and returns how many it had: none at the end of the output and when it
     // cannot be read or kept.
@@ -81,19 +66,19 @@ public:
         const std::size_t read = count > 0 ? static_cast<std::size_t>(count) : 0;
         if (read > 0 && append({chunk, read}))
             return read;
-        readEnd_.close();
+        readEnd_ = FileDescriptor();
         return 0;
     }
 
     // Reads to the end of the output or, once the child has ended, what is there by then: those that have the other end
     // from the child and live on are not waited for.
     void readToEnd(const Child& child) {
-        while (readEnd_.get() >= 0) {
+        while (readEnd_) {
             const processes::Ready ready = child.waitUntilReady(-1, readEnd_.get());
             if (ready.hasEnded) {
-                for (std::size_t left = processes::readableBytes(readEnd_.get()); left > 0 && readEnd_.get() >= 0;)
+                for (std::size_t left = processes::readableBytes(readEnd_.get()); left > 0 && readEnd_;)
                     left -= readChunk(left);
-                readEnd_.close();
+                readEnd_ = FileDescriptor();
             } else {
                 readChunk();
             }
@@ -136,14 +121,14 @@ private:
         return 0;
     }
 
-    Descriptor readEnd_;
+    FileDescriptor readEnd_;
     std::string text_;
     std::string incomplete_;
 };
 
 // Writes the input and reads what comes meanwhile; the child then sees the end of its input. Once the child has ended,
 // nobody else is waited for to take the rest.
-void feed(std::string_view program, const Child& child, Descriptor& input, const void* bytes, std::size_t length,
+void feed(std::string_view program, const Child& child, FileDescriptor input, const void* bytes, std::size_t length,
           Output& output) {
     const char* next = static_cast<const char*>(bytes);
     processes::makeNonBlocking(input.get());
@@ -164,7 +149,6 @@ void feed(std::string_view program, const Child& child, Descriptor& input, const
             break;
         }
     }
-    input.close();
 }
 
 // The result that an ending stands for. An exit is a word in the log of a call with input only.
@@ -201,7 +185,7 @@ Outcome run(const std::vector<std::string>& argv) {
     if (readEnd < 0)
         return {};
     Child child(process);
-    Output output(readEnd);
+    Output output{FileDescriptor(readEnd)};
     pipeLog.info("Start Reading output from shell command\n");
     output.readToEnd(child);
     const int result = resultOf(child.wait(), programOf(argv), false);
@@ -217,9 +201,9 @@ Outcome runWithInput(const std::vector<std::string>& argv, const void* bytes, ss
     if (readEnd < 0)
         return {};
     Child child(process);
-    Output output(readEnd);
-    Descriptor input(writeEnd);
-    feed(programOf(argv), child, input, bytes, length > 0 ? static_cast<std::size_t>(length) : 0, output);
+    Output output{FileDescriptor(readEnd)};
+    feed(programOf(argv), child, FileDescriptor(writeEnd), bytes, length > 0 ? static_cast<std::size_t>(length) : 0,
+         output);
     pipeLog.info("Start Reading output from shell command\n");
     output.readToEnd(child);
     pipeLog.info("waiting for child to exit\n");
@@ -228,14 +212,14 @@ Outcome runWithInput(const std::vector<std::string>& argv, const void* bytes, ss
 }
 
 // Reports the outcome of a call; a response of null means that nothing was run.
-int conclude(Outcome outcome, const char* failureFormat, Value* response, Error* error) {
+int conclude(Outcome outcome, const char* failureFormat, Value* response, std::optional<Error>* error) {
     Value::Dictionary dictionary{{"Status", outcome.result == 0 ? 0 : failed}, {"Error", ""}};
     dictionary["Output"] = std::move(outcome.output); // in the list it would be copied
     if (outcome.result != 0) {
         const std::string description = format(failureFormat, outcome.result);
         pipeLog.info("%@", description);
         if (error) {
-            *error = {"HSErrorDomain", failed, description};
+            *error = Error{"HSErrorDomain", failed, description};
             dictionary["Error"] = description;
             pipeLog.info("%@", *error);
         }
@@ -258,26 +242,25 @@ int hs_spawn_command(const std::vector<std::string>& argv, pid_t& child, bool co
     pipeLog.info("executing %s\n", program);
     processes::Pipe outputPipe, inputPipe;
     int problem = processes::createPipe(outputPipe);
-    Descriptor readEnd(outputPipe.readEnd), childOutput(outputPipe.writeEnd);
     if (problem == 0 && input)
         problem = processes::createPipe(inputPipe);
-    Descriptor childInput(inputPipe.readEnd), writeEnd(inputPipe.writeEnd);
     if (problem != 0) {
         pipeLog.info("pipe failed while preparing to execute %s: %s\n", program, processes::errorText(problem));
         return -1;
     }
-    const int childError = collectStandardError ? childOutput.get() : -1;
-    problem = processes::spawn(argv, {childInput.get(), childOutput.get(), childError}, child);
+    const int childOutput = outputPipe.writeEnd.get();
+    const int childError = collectStandardError ? childOutput : -1;
+    problem = processes::spawn(argv, {inputPipe.readEnd.get(), childOutput, childError}, child);
     if (problem != 0) {
         pipeLog.info("posix_spawn %s failed: %s\n", program, processes::errorText(problem));
         return -1;
     }
     if (input)
-        *input = writeEnd.release();
-    return readEnd.release();
+        *input = inputPipe.writeEnd.release();
+    return outputPipe.readEnd.release();
 }
 
-int hs_execute_command(const std::vector<std::string>& argv, Value* response, Error* error) {
+int hs_execute_command(const std::vector<std::string>& argv, Value* response, std::optional<Error>* error) {
     Outcome outcome;
     if (response)
         outcome = run(argv);
@@ -287,7 +270,7 @@ int hs_execute_command(const std::vector<std::string>& argv, Value* response, Er
 }
 
 int hs_execute_command_with_input_data(const std::vector<std::string>& argv, const void* input, ssize_t length,
-                                       Value* response, Error* error) {
+                                       Value* response, std::optional<Error>* error) {
     Outcome outcome;
     if (response)
         outcome = runWithInput(argv, input, length);
@@ -297,7 +280,7 @@ int hs_execute_command_with_input_data(const std::vector<std::string>& argv, con
 }
 
 int HSPipeUtil::HSPipeUtilExecCommand(const std::string& command, const std::vector<std::string>& options,
-                                      Value* response, Error* error) {
+                                      Value* response, std::optional<Error>* error) {
     constexpr const char* name = "+[HSPipeUtil HSPipeUtilExecCommand:options:response:error:]";
     pipeLog.info("Enter %s at line %d\n", name, __LINE__);
     const int code = hs_execute_command(argumentVector(command, options), response, error) == 0 ? 0 : failed;
@@ -306,7 +289,7 @@ int HSPipeUtil::HSPipeUtilExecCommand(const std::string& command, const std::vec
 }
 
 int HSPipeUtil::HSPipeUtilExecCommandWithData(const std::string& command, const std::vector<std::string>& options,
-                                              const Value::Data& data, Value* response, Error* error) {
+                                              const Value::Data& data, Value* response, std::optional<Error>* error) {
     constexpr const char* name = "+[HSPipeUtil HSPipeUtilExecCommandWithData:options:data:response:error:]";
     pipeLog.info("Enter %s at line %d\n", name, __LINE__);
     const std::vector<std::string> argv = argumentVector(command, options);

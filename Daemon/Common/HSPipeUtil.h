@@ -18,6 +18,7 @@
 #define VELTRA_DAEMON_COMMON_HS_PIPE_UTIL_H
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -33,21 +34,21 @@ public:
     // Runs the program at the device path `command` with the arguments `options` and inherited standard input; its
     // standard error is collected with its standard output. Returns 0 when it exited with status 0, otherwise 7.
     static int HSPipeUtilExecCommand(const std::string& command, const std::vector<std::string>& options,
-                                     Value* response, Error* error);
+                                     Value* response, std::optional<Error>* error);
 
     // The same with `data` as the program's standard input; its standard error is inherited.
     static int HSPipeUtilExecCommandWithData(const std::string& command, const std::vector<std::string>& options,
-                                             const Value::Data& data, Value* response, Error* error);
+                                             const Value::Data& data, Value* response, std::optional<Error>* error);
 };
 
 // What stands under the two operations. `argv` is the program's path and its arguments. The result is the child's exit
 // status, or -1 when it could not be started, was killed or stopped by a signal, or could not be waited for.
-int hs_execute_command(const std::vector<std::string>& argv, Value* response, Error* error);
+int hs_execute_command(const std::vector<std::string>& argv, Value* response, std::optional<Error>* error);
 
 // With `length` bytes at `input` as standard input; without any when the length is below 1. Input is fed while output
 // is read, so that neither process waits for the other. When the child stops reading, the rest is dropped.
 int hs_execute_command_with_input_data(const std::vector<std::string>& argv, const void* input, ssize_t length,
-                                       Value* response, Error* error);
+                                       Value* response, std::optional<Error>* error);
 
 // Starts the child, with its process id in `child`, and returns the read end of its output pipe, which the caller
 // closes; -1 when it could not be started. With `input`, its standard input is a pipe whose write end goes there for

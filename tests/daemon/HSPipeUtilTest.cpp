@@ -107,7 +107,7 @@ protected:
 
     TemporaryRoot root_;
     Value response_;
-    Error error_;
+    std::optional<Error> error_;
 
 private:
     const std::size_t descriptors_;
@@ -130,7 +130,7 @@ TEST_F(HSPipeUtilTest, theOutcomeIsDescribedInTheResultTheResponseAndTheError) {
         for (const bool withInput : {false, true}) {
             SCOPED_TRACE(row.end);
             recordLog();
-            Error error;
+            std::optional<Error> error;
             const int result = withInput ? hs_execute_command_with_input_data({program}, nullptr, 0, &response_, &error)
                                          : hs_execute_command({program}, &response_, &error);
             EXPECT_EQ(result, row.result);
@@ -141,7 +141,7 @@ TEST_F(HSPipeUtilTest, theOutcomeIsDescribedInTheResultTheResponseAndTheError) {
             EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", good ? 0 : 7},
                                                          {"Output", withInput ? "out\n" : "out\nerr\n"},
                                                          {"Error", description}}));
-            EXPECT_EQ(error, good ? Error() : (Error{"HSErrorDomain", 7, description}));
+            EXPECT_EQ(error, good ? std::nullopt : std::optional(Error{"HSErrorDomain", 7, description}));
             EXPECT_EQ(timesLogged(row.log), *row.log ? 1 : 0);
         }
     }
@@ -156,7 +156,7 @@ TEST_F(HSPipeUtilTest, aStoppedChildIsReportedAndDoesNotStay) {
            "/usr/bin/python3");
     EXPECT_EQ(run(), 7);
     EXPECT_EQ(output(), "out");
-    EXPECT_EQ(error_.text, "Error executing command, result = -1\n");
+    EXPECT_EQ(error_->text, "Error executing command, result = -1\n");
     EXPECT_EQ(timesLogged("/usr/bin/program was stopped by signal 19\n"), 1);
 }
 
@@ -167,7 +167,7 @@ TEST_F(HSPipeUtilTest, everyStepIsLogged) {
     run({"-x"});
     const char* name = "+[HSPipeUtil HSPipeUtilExecCommand:options:response:error:]";
     EXPECT_EQ(log(), (Lines{format("Enter %s at line *\n", name), "executing /usr/bin/program\n",
-                            "Start Reading output from shell command\n", failure, error_.description(),
+                            "Start Reading output from shell command\n", failure, error_->description(),
                             format("Exit %s at line *, success = 7\n", name)}));
     recordLog();
     runWith(bytes("input"), {"-x", "y"});
@@ -176,7 +176,7 @@ TEST_F(HSPipeUtilTest, everyStepIsLogged) {
                             "argv[2] = y\n", "entering hs_execute_command_with_input_data: /usr/bin/program (* - 5)\n",
                             "executing /usr/bin/program\n", "Start Reading output from shell command\n",
                             "waiting for child to exit\n", "child exited\n", "exit status: 3\n", failureWithData,
-                            error_.description(), format("Exit %s at line *, success = 7\n", name)}));
+                            error_->description(), format("Exit %s at line *, success = 7\n", name)}));
 }
 
 TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
@@ -198,7 +198,7 @@ TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
         EXPECT_EQ(hs_execute_command_with_input_data({path}, "x", 1, &response_, nullptr), -1);
         EXPECT_EQ(timesLogged(failed), 2) << path;
         EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", 7}, {"Output", ""}, {"Error", ""}}));
-        EXPECT_EQ(error_.text, "Error executing command, result = -1\n");
+        EXPECT_EQ(error_->text, "Error executing command, result = -1\n");
     }
 }
 
@@ -253,7 +253,7 @@ TEST_F(HSPipeUtilTest, aChildThatCannotBeWaitedForIsAFailureWithItsOutput) {
         for (const bool withInput : {false, true}) {
             recordLog();
             EXPECT_EQ(withInput ? runWith({}) : run(), 7);
-            EXPECT_EQ(error_.text,
+            EXPECT_EQ(error_->text,
                       std::string("Error executing command") + (withInput ? " with data" : "") + ", result = -1\n");
             EXPECT_EQ(output(), "out\n");
             EXPECT_EQ(std::ranges::count(log(), "waitpid failed for /usr/bin/program: " + text(ECHILD)), 1);
@@ -273,7 +273,7 @@ TEST_F(HSPipeUtilTest, aChildThatWritesMoreThanMemoryHoldsDecidesByItsEnd) {
         EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
 
         EXPECT_EQ(runWith(Value::Data(1 << 20)), 7); // SIGPIPE is ignored, so the child sees that writing fails
-        EXPECT_EQ(error_.text, "Error executing command with data, result = 1\n");
+        EXPECT_EQ(error_->text, "Error executing command with data, result = 1\n");
         EXPECT_EQ(response_["Output"].text()->substr(0, 4), "y\ny\n");
     });
 }
@@ -285,7 +285,7 @@ TEST_F(HSPipeUtilTest, withoutAResponseNothingIsRun) {
     EXPECT_EQ(HSPipeUtil::HSPipeUtilExecCommand(program, {trace}, nullptr, &error_), 7);
     EXPECT_EQ(error_, (Error{"HSErrorDomain", 7, "Error executing command, result = -1\n"}));
     EXPECT_EQ(HSPipeUtil::HSPipeUtilExecCommandWithData(program, {trace}, {}, nullptr, &error_), 7);
-    EXPECT_EQ(error_.text, "Error executing command with data, result = -1\n");
+    EXPECT_EQ(error_->text, "Error executing command with data, result = -1\n");
     EXPECT_EQ(timesLogged("4 [HSPipeUtil] Input response dictionary pointer is NULL."), 2);
     EXPECT_EQ(root_.read("/trace"), "(missing)");
 }

@@ -87,9 +87,9 @@ TEST(CertificateService, onlyAWholeCertificateIsOne) {
     serialNumber[3] = 0x01;
     EXPECT_FALSE(parse(padded));
 
-    Error error;
+    std::optional<Error> error;
     EXPECT_FALSE(copySerialNumberData(nullptr, &error));
-    EXPECT_FALSE(error.text.empty());
+    EXPECT_TRUE(error && !error->text.empty());
 }
 
 TEST(CertificateService, certificatesComeInTheOrderOfTheMessage) {

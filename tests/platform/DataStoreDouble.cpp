@@ -33,7 +33,7 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler) {
     store().logHandler = handler;
 }
 
-__QDOrlo* QDOrloCreateWithOptions(const Value& options) {
+__QDOrlo* QDOrloCreateWithOptions(Value options) {
     record("create");
     store().createdWith = store().options = *options.dictionary();
     if (!store().makesSessions)

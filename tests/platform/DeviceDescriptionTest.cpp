@@ -7,7 +7,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/linux/system/Json.h"
+#include "platform/Json.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/TemporaryRoot.h"
 

@@ -18,7 +18,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/DeviceRoot.h"
 #include "tests/support/OwnProcess.h"
 #include "tests/support/TemporaryRoot.h"
 

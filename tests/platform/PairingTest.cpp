@@ -14,7 +14,7 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/linux/system/FileDescriptor.h"
+#include "platform/FileDescriptor.h"
 
 namespace {
 

@@ -57,11 +57,11 @@ Value KACopyAnswer(std::string_view key, const Value&) {
     return look(servicesDouble().answers, "KACopyAnswer", key);
 }
 
-Value KACopyAnswerWithError(std::string_view key, const Value&, Error*) {
+Value KACopyAnswerWithError(std::string_view key, const Value&, std::optional<Error>*) {
     return look(servicesDouble().answers, "KACopyAnswerWithError", key);
 }
 
-Value TansuCopyValueWithError(std::string_view key, const Value&, Error*) {
+Value TansuCopyValueWithError(std::string_view key, const Value&, std::optional<Error>*) {
     return look(servicesDouble().tansu, "TansuCopyValueWithError", key);
 }
 
@@ -119,7 +119,8 @@ CertificateService::CertificateRef CertificateService::createCertificateWithByte
     return std::make_shared<const Certificate>(std::move(certificate));
 }
 
-std::optional<Value::Data> CertificateService::copySerialNumberData(const CertificateRef& certificate, Error*) {
+std::optional<Value::Data> CertificateService::copySerialNumberData(const CertificateRef& certificate,
+                                                                    std::optional<Error>*) {
     const auto* found = certificate ? lookUp(servicesDouble().serialNumbers, certificate->bytes) : nullptr;
     return found ? std::optional(*found) : std::nullopt;
 }

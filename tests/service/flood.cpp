@@ -29,7 +29,7 @@ int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
 void check(int result) {
     if (result >= 0)
         return;
-    std::fprintf(stderr, "flood: %s\n", bus::Failure(result).what());
+    std::fprintf(stderr, "flood: %s\n", bus::reasonOf(result).c_str());
     std::exit(2);
 }
 

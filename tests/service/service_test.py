@@ -283,6 +283,7 @@ class Client(ServiceTest):
             (2, ["call", "x", "word"]),
             (2, ["call", "x", "a:={"]),
             (2, ["call", "x", "a:=1.5"]),
+            (2, ["call", "x", 'a:=[{"$data": "0"}]']),
             (2, ["call", "x", "a@=/nonexistent"]),
             (2, ["call", "x", "a=1", "a=2"]),
             (2, ["call"]),

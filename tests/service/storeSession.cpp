@@ -8,9 +8,9 @@
 #include <string>
 
 #include "platform/Files.h"
+#include "platform/Json.h"
 #include "platform/OrloDataStore.h"
 #include "platform/linux/services/DeviceDescription.h"
-#include "platform/linux/system/Json.h"
 
 namespace {
 

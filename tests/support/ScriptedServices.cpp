@@ -102,7 +102,7 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler) {
     logHandler = handler;
 }
 
-__QDOrlo* QDOrloCreateWithOptions(const Value& given) {
+__QDOrlo* QDOrloCreateWithOptions(Value given) {
     const Outcome& outcome = called("QDOrloCreateWithOptions");
     logHandler(nullptr, "from the library");
     options = *given.dictionary();

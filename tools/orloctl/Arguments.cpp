@@ -1,18 +1,18 @@
 #include "tools/orloctl/Arguments.h"
 
+#include <optional>
 #include <utility>
 
-#include "tools/orloctl/Json.h"
+#include "platform/Json.h"
 #include "tools/orloctl/LocalFiles.h"
 
 namespace {
 
 Value parseJson(const std::string& key, const std::string& json) {
-    try {
-        return valueFromJson(json);
-    } catch (const JsonFailure& failure) {
-        throw UsageError(key + ":= " + failure.what());
-    }
+    std::string refusal;
+    if (std::optional<Value> value = jsonToMessageValue(json, &refusal))
+        return std::move(*value);
+    throw UsageError(key + ":= holds " + refusal);
 }
 
 // Splits at the first "=": what stands before it tells how the rest is read.

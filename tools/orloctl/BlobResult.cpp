@@ -5,10 +5,10 @@
 
 #include <fcntl.h>
 
+#include "platform/DeviceRoot.h"
 #include "platform/Files.h"
+#include "platform/Json.h"
 #include "platform/linux/system/DescribedValue.h"
-#include "platform/linux/system/DeviceRoot.h"
-#include "platform/linux/system/Json.h"
 #include "sysconfig/SysConfig3Ptr.h"
 
 namespace {
@@ -34,11 +34,11 @@ SysConfig3Ptr decoded(const Value::Data& blob) {
 
 // Why the service makes nothing of the blob at `devicePath`.
 std::string whyEmpty(const std::string& devicePath) {
-    Error error;
+    std::optional<Error> error;
     const auto blob = files::readWhole(devicePath, files::maximumSize, &error);
     if (!blob)
-        return error.code == ENOENT ? devicePath + " is missing on the device"
-                                    : devicePath + " cannot be read on the device: " + error.text;
+        return error->code == ENOENT ? devicePath + " is missing on the device"
+                                     : devicePath + " cannot be read on the device: " + error->text;
     const SysConfig3Ptr object = decoded(*blob);
     if (!object)
         return devicePath + " is no configuration blob";

@@ -7,15 +7,16 @@
 #include <memory>
 #include <optional>
 #include <string_view>
+#include <system_error>
 
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
+#include "platform/DeviceRoot.h"
 #include "platform/ShownText.h"
 #include "platform/linux/services/BusValue.h"
-#include "platform/linux/system/DeviceRoot.h"
 #include "tools/orloctl/Interruption.h"
 
 namespace {
@@ -34,7 +35,7 @@ using SlotPtr = std::unique_ptr<sd_bus_slot, decltype(&sd_bus_slot_unref)>;
 
 int check(int result) {
     if (result < 0)
-        throw bus::Failure(result);
+        throw std::system_error(-result, std::generic_category());
     return result;
 }
 
@@ -213,17 +214,14 @@ Answer sendRequest(const ServiceAddress& address, const std::string& command, co
     const Interruption interruption;
     sd_bus* opened = nullptr;
     if (const int result = bus::open(address.bus, &opened); result < 0)
-        return {Outcome::Unreachable,
-                {},
-                "Cannot reach the bus \"" + address.bus + "\": " + bus::Failure(result).what(),
-                {}};
+        return {Outcome::Unreachable, {}, "Cannot reach the bus \"" + address.bus + "\": " + bus::reasonOf(result), {}};
     const BusPtr connection(opened, sd_bus_close_unref);
     try {
         return converse(connection.get(), address, command, arguments);
     } catch (const bus::Refusal& refusal) {
         return {Outcome::Usage, {}, refusal.what(), {}};
-    } catch (const bus::Failure& failure) {
-        if (failure.code == -E2BIG || failure.code == -EMSGSIZE || failure.code == -ENOBUFS)
+    } catch (const std::system_error& failure) {
+        if (const int code = failure.code().value(); code == E2BIG || code == EMSGSIZE || code == ENOBUFS)
             return {Outcome::Usage, {}, std::string("The request is too large for a message: ") + failure.what(), {}};
         return {Outcome::Unreachable, {}, "Lost the bus \"" + address.bus + "\": " + failure.what(), {}};
     }

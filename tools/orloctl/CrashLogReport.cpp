@@ -17,8 +17,8 @@
 #include <fcntl.h>
 
 #include "Daemon/CrashLogs.h"
+#include "platform/DeviceRoot.h"
 #include "platform/Utf8.h"
-#include "platform/linux/system/DeviceRoot.h"
 #include "tools/orloctl/LocalFiles.h"
 
 namespace {

@@ -10,7 +10,7 @@
 #include <sys/file.h>
 #include <sys/time.h>
 
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/DeviceRoot.h"
 #include "tools/orloctl/Interruption.h"
 #include "tools/orloctl/LocalFiles.h"
 

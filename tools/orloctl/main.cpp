@@ -17,11 +17,11 @@
 
 #include "Daemon/Conversions.h"
 #include "platform/Crypto.h"
+#include "platform/linux/system/JsonReader.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
 #include "tools/orloctl/Completion.h"
 #include "tools/orloctl/CrashLogReport.h"
-#include "tools/orloctl/Json.h"
 #include "tools/orloctl/LocalFiles.h"
 #include "tools/orloctl/Report.h"
 #include "tools/orloctl/SetBcfg.h"

@@ -14,13 +14,14 @@
 
 namespace bus {
 
-Failure::Failure(int failureCode)
-    : std::runtime_error(std::generic_category().message(-failureCode)), code(failureCode) {}
-
 void fail(int result) {
     if (result == -ENOMEM)
         throw std::bad_alloc();
-    throw Failure(result);
+    throw std::system_error(-result, std::generic_category());
+}
+
+std::string reasonOf(int result) {
+    return std::generic_category().message(-result);
 }
 
 namespace {
@@ -210,14 +211,15 @@ public:
 
     void dictionary(const Value::Dictionary& dictionary) {
         open(SD_BUS_TYPE_ARRAY, "{sv}");
-        for (const auto& [key, value] : dictionary) {
-            if (value.isNothing())
-                continue;
-            open(SD_BUS_TYPE_DICT_ENTRY, "sv");
-            text(key);
-            variant(value);
-            close();
-        }
+        for (const auto& [key, value] : dictionary)
+            entry(key, value);
+        close();
+    }
+
+    void dictionary(Value::BorrowedEntries entries) {
+        open(SD_BUS_TYPE_ARRAY, "{sv}");
+        for (const auto& [key, value] : entries)
+            entry(key, *value);
         close();
     }
 
@@ -236,11 +238,20 @@ private:
     // Raises when the message would grow beyond what a bus carries, before anything that long is copied.
     void count(std::size_t octets) {
         if (octets > maximumOctets - octets_)
-            throw Failure(-EMSGSIZE);
+            fail(-EMSGSIZE);
         octets_ += octets;
     }
 
-    void text(const std::string& text) {
+    void entry(std::string_view key, const Value& value) {
+        if (value.isNothing())
+            return;
+        open(SD_BUS_TYPE_DICT_ENTRY, "sv");
+        text(key);
+        variant(value);
+        close();
+    }
+
+    void text(std::string_view text) {
         count(text.size());
         const std::string repaired = utf8::repaired(text);
         std::string carried;
@@ -305,6 +316,10 @@ Value::Dictionary readDictionary(sd_bus_message* message) {
 
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary) {
     Writer(message).dictionary(dictionary);
+}
+
+void appendEntries(sd_bus_message* message, Value::BorrowedEntries entries) {
+    Writer(message).dictionary(entries);
 }
 
 int open(std::string_view which, sd_bus** connection) {

@@ -31,28 +31,25 @@ constexpr std::size_t maximumValues = 100'000;
 constexpr std::size_t maximumOctets = std::size_t{28} << 20;
 
 // Raised for a message that holds what no Value can. The sentence names the key.
-class Refusal : public std::runtime_error {
-public:
-    using std::runtime_error::runtime_error;
-};
+using Refusal = std::invalid_argument;
 
-// Raised when libsystemd reports a failure; `code` is the negative errno.
-class Failure : public std::runtime_error {
-public:
-    explicit Failure(int failureCode);
-    int code;
-};
-
-// Raises what a negative result of libsystemd stands for: std::bad_alloc for -ENOMEM, otherwise a Failure.
+// Raises what a negative result of libsystemd, a negative errno, stands for: std::bad_alloc for -ENOMEM, otherwise a
+// std::system_error.
 [[noreturn]] void fail(int result);
 
-// Reads the a{sv} that stands next in `message`. Raises Refusal or Failure.
+// The words for such a result.
+std::string reasonOf(int result);
+
+// Reads the a{sv} that stands next in `message`. Raises Refusal, and as fail.
 Value::Dictionary readDictionary(sd_bus_message* message);
 
 // Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
-// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and Failure, which
-// is -EMSGSIZE for more than a message holds.
+// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and as fail, which is for
+// -EMSGSIZE for more than a message holds.
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary);
+
+// The same with entries in their order, none of which is copied.
+void appendEntries(sd_bus_message* message, Value::BorrowedEntries entries);
 
 // Opens the bus that `which` names: "system", "session" or a D-Bus address. Returns a negative errno on failure; on
 // success *connection belongs to the caller.

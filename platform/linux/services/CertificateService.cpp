@@ -82,14 +82,14 @@ CertificateRef createCertificateWithBytes(const std::uint8_t* bytes, std::size_t
     return x509 && isEncodedAs(x509.get(), bytes, length) ? wrap(std::move(x509)) : nullptr;
 }
 
-std::optional<Value::Data> copySerialNumberData(const CertificateRef& certificate, Error* error) {
+std::optional<Value::Data> copySerialNumberData(const CertificateRef& certificate, std::optional<Error>* error) {
     const openssl::QuietErrors quiet;
     unsigned char* encoding = nullptr;
     // The library reads only minimal INTEGERs (X.690 8.3.2), so that writing one gives the octets that were read.
     const int length = certificate ? i2d_ASN1_INTEGER(X509_get0_serialNumber(certificate->x509.get()), &encoding) : -1;
     if (length < 0) {
         if (error)
-            *error = {"CertificateServiceErrorDomain", 1, "There is no serial number to read"};
+            *error = Error{"CertificateServiceErrorDomain", 1, "There is no serial number to read"};
         return std::nullopt;
     }
     const unsigned char* content = encoding;

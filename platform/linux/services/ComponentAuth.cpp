@@ -2,16 +2,12 @@
 
 #include <algorithm>
 #include <chrono>
-#include <condition_variable>
 #include <exception>
 #include <limits>
-#include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <system_error>
-#include <thread>
 #include <utility>
 
 #include <openssl/bio.h>
@@ -24,69 +20,23 @@
 #include "platform/SystemLog.h"
 #include "platform/linux/services/DeviceDescription.h"
 #include "platform/linux/services/X509Certificate.h"
+#include "platform/linux/system/DelayedCalls.h"
 
 namespace {
 
 using openssl::Owner;
-using Clock = std::chrono::steady_clock;
 using Status = ComponentAuthService::Status;
 
 constexpr std::chrono::milliseconds longestDelay = std::chrono::hours(1);
 
-// One thread that runs each task when it is due. Tasks that are not due when the process ends are dropped.
-class TaskThread {
-public:
-    using Task = std::function<void()>;
-
+DelayedCalls& serviceThread() {
     // The cryptographic library is set up first, so that it is torn down after the thread has ended. Without an option
     // it would put that off until its first use, on the thread.
-    TaskThread() { OPENSSL_init_crypto(OPENSSL_INIT_LOAD_CRYPTO_STRINGS, nullptr); }
-
-    void runAt(Clock::time_point due, Task task) {
-        const std::lock_guard lock(mutex_);
-        if (!thread_.joinable())
-            thread_ = std::jthread([this](const std::stop_token& stop) { run(stop); });
-        tasks_.emplace(due, std::move(task));
-        changed_.notify_one();
-    }
-
-private:
-    void run(const std::stop_token& stop) {
-        while (const Task task = next(stop)) {
-            try {
-                task();
-            } catch (const std::exception& failure) {
-                consoleLog(std::string("Component authentication was given up: ") + failure.what());
-            }
-        }
-    }
-
-    // Waits for the next task that is due; empty at the end.
-    Task next(const std::stop_token& stop) {
-        std::unique_lock lock(mutex_);
-        while (!stop.stop_requested()) {
-            if (tasks_.empty()) {
-                changed_.wait(lock, stop, [this] { return !tasks_.empty(); });
-                continue;
-            }
-            const auto first = tasks_.begin();
-            const Clock::time_point due = first->first;
-            if (due <= Clock::now())
-                return tasks_.extract(first).mapped();
-            changed_.wait_until(lock, stop, due, [this, due] { return tasks_.begin()->first < due; });
-        }
-        return {};
-    }
-
-    std::mutex mutex_;
-    std::condition_variable_any changed_;
-    std::multimap<Clock::time_point, Task> tasks_;
-    std::jthread thread_; // last, so that it ends before what it uses
-};
-
-TaskThread& serviceThread() {
-    static TaskThread shared;
-    return shared;
+    static const auto shared = [] {
+        OPENSSL_init_crypto(OPENSSL_INIT_LOAD_CRYPTO_STRINGS, nullptr);
+        return std::make_unique<DelayedCalls>();
+    }();
+    return *shared;
 }
 
 using Key = Owner<EVP_PKEY, EVP_PKEY_free>;
@@ -105,7 +55,7 @@ Key readKey(const Value& path) {
     return Key(reader ? PEM_read_bio_PrivateKey(reader.get(), nullptr, noPassphrase, nullptr) : nullptr);
 }
 
-// The chip's signature over the challenge, with the digest that is usual for the kind of its key; nothing when the key
+// The chip's signature over the challenge, with the default digest of the kind of its key; nothing when the key
 // does not sign.
 std::optional<Value::Data> sign(EVP_PKEY* key, const Value::Data& challenge) {
     const DigestContext context(EVP_MD_CTX_new());
@@ -126,30 +76,13 @@ bool verify(EVP_PKEY* key, const Value::Data& challenge, const Value::Data& sign
            EVP_DigestVerify(context.get(), signature.data(), signature.size(), challenge.data(), challenge.size()) == 1;
 }
 
-// A service of the hardware registry, held until the end.
-struct HeldService {
-    explicit HeldService(std::string_view className)
-        : handle(HardwareRegistry::getMatchingService(HardwareRegistry::serviceMatching(className))) {}
-    ~HeldService() { HardwareRegistry::releaseService(handle); }
-    HeldService(const HeldService&) = delete;
-    HeldService& operator=(const HeldService&) = delete;
-
-    const HardwareRegistry::Service handle;
-};
-
 // The bytes of the certificate in the hardware registry, or nothing.
 Value moduleCertificate() {
+    using namespace HardwareRegistry;
     for (const char* className : {"TeskAuthI2CRelayInterface", "TevariAuthCPAID"})
-        if (const HeldService service(className); service.handle != 0)
-            return HardwareRegistry::searchProperty(service.handle, HardwareRegistry::servicePlane,
-                                                    "AccessoryCertificate", HardwareRegistry::searchRecursively);
+        if (const HeldService service(getMatchingService(serviceMatching(className))); service.handle != 0)
+            return searchProperty(service.handle, servicePlane, "AccessoryCertificate", searchRecursively);
     return {};
-}
-
-CertificateService::CertificateRef parseCertificate(const Value::Data& bytes) {
-    const auto list = CertificateService::copyCertificatesFromCertsOnlyMessage(bytes);
-    return list && !list->empty() ? list->front()
-                                  : CertificateService::createCertificateWithBytes(bytes.data(), bytes.size());
 }
 
 struct Outcome {
@@ -171,7 +104,7 @@ Outcome challengeChip(const Value& keyPath, const Value::Data& challenge) {
     Outcome outcome{.signature = *signature, .certificate = moduleCertificate()};
     CertificateService::CertificateRef certificate;
     if (const Value::Data* bytes = outcome.certificate.data())
-        certificate = parseCertificate(*bytes);
+        certificate = CertificateService::copyFirstCertificate(*bytes);
     EVP_PKEY* const publicKey = certificate ? X509_get0_pubkey(certificate->x509.get()) : nullptr;
     if (!publicKey) {
         outcome.status = Status::NoCertificate;
@@ -209,11 +142,15 @@ void ComponentAuthService::authenticateTouchControllerWithChallenge(const Value&
     Value chip = resolveDescribed(deviceDescription()["componentAuth"]);
     if (chip["mode"] == Value("silent"))
         return;
-    const Clock::time_point due = Clock::now() + delayOf(chip);
+    const DelayedCalls::Clock::time_point due = DelayedCalls::Clock::now() + delayOf(chip);
     try {
-        serviceThread().runAt(due, [chip = std::move(chip), challenge, completion = std::move(completion)] {
-            const Outcome outcome = authenticate(chip, challenge);
-            completion(outcome.passed, outcome.signature, outcome.certificate, outcome.isVerified, outcome.status);
+        serviceThread().add(due, [chip = std::move(chip), challenge, completion = std::move(completion)] {
+            try {
+                const Outcome outcome = authenticate(chip, challenge);
+                completion(outcome.passed, outcome.signature, outcome.certificate, outcome.isVerified, outcome.status);
+            } catch (const std::exception& failure) {
+                consoleLog(std::string("Component authentication was given up: ") + failure.what());
+            }
         });
     } catch (const std::system_error& failure) { // no thread: as a chip that never answers
         consoleLog(std::string("Component authentication cannot start: ") + failure.what());

@@ -38,10 +38,10 @@ std::string_view readableName(std::string_view key) {
 }
 
 // The value under `key` in the description's `section`. Only that value is resolved, so a query reads no other's file.
-Value query(std::string_view section, std::string_view key, Error* error) {
+Value query(std::string_view section, std::string_view key, std::optional<Error>* error) {
     Value answer = resolveDescribed(deviceDescription()[section][key]);
     if (answer.isNothing() && error)
-        *error = {"DeviceAnswerErrorDomain", 1, "The device has no answer for " + std::string(key)};
+        *error = Error{"DeviceAnswerErrorDomain", 1, "The device has no answer for " + std::string(key)};
     return answer;
 }
 
@@ -51,10 +51,10 @@ Value KACopyAnswer(std::string_view key, const Value& options) {
     return KACopyAnswerWithError(key, options, nullptr);
 }
 
-Value KACopyAnswerWithError(std::string_view key, const Value&, Error* error) {
+Value KACopyAnswerWithError(std::string_view key, const Value&, std::optional<Error>* error) {
     return query("answers", readableName(key), error);
 }
 
-Value TansuCopyValueWithError(std::string_view key, const Value&, Error* error) {
+Value TansuCopyValueWithError(std::string_view key, const Value&, std::optional<Error>* error) {
     return query("tansu", key, error);
 }

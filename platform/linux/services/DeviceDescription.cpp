@@ -6,9 +6,9 @@
 
 #include "platform/Files.h"
 #include "platform/HostFramework.h"
+#include "platform/Json.h"
 #include "platform/SystemLog.h"
 #include "platform/linux/system/DescriptionCheck.h"
-#include "platform/linux/system/Json.h"
 
 namespace {
 

@@ -16,6 +16,7 @@
 #include <exception>
 #include <memory>
 #include <new>
+#include <system_error>
 #include <utility>
 
 #include <systemd/sd-bus.h>
@@ -23,11 +24,11 @@
 #include <systemd/sd-event.h>
 
 #include "platform/Crypto.h"
+#include "platform/DeviceRoot.h"
 #include "platform/SystemLog.h"
 #include "platform/linux/services/BusValue.h"
 #include "platform/linux/services/DeviceDescription.h"
 #include "platform/linux/services/Http.h"
-#include "platform/linux/system/DeviceRoot.h"
 
 namespace {
 
@@ -60,19 +61,20 @@ void checkKeys(const Value::Dictionary& request) {
 }
 
 HSMessageRequest readRequest(sd_bus_message* message) {
-    const Value request = bus::readDictionary(message);
-    checkKeys(*request.dictionary());
-    return {request["messageStr"], request["messageDict"]};
+    Value::Dictionary request = bus::readDictionary(message);
+    checkKeys(request);
+    return {std::move(request["messageStr"]), std::move(request["messageDict"])};
 }
 
-Value::Dictionary responseDictionary(const HSMessageResponse& response) {
-    Value::Dictionary result{{"name", response.name()}, {"statusCode", response.statusCode()}};
-    if (!response.response().isNothing())
-        result["response"] = response.response();
-    if (const auto& error = response.error())
-        result["error"] =
-            Value::Dictionary{{"domain", error->domain}, {"code", error->code}, {"description", error->text}};
-    return result;
+void appendResponse(sd_bus_message* message, const HSMessageResponse& response) {
+    Value error;
+    if (const auto& given = response.error())
+        error = Value::Dictionary{{"domain", given->domain}, {"code", given->code}, {"description", given->text}};
+    const Value statusCode = response.statusCode();
+    bus::appendEntries(message, {{"error", &error},
+                                 {"name", &response.name()},
+                                 {"response", &response.response()},
+                                 {"statusCode", &statusCode}});
 }
 
 // Raises what bus::fail does when nothing was sent.
@@ -84,7 +86,10 @@ void sendReply(sd_bus_message* request, bool completed, const std::optional<HSMe
     const int completedValue = completed;
     if (const int result = sd_bus_message_append_basic(reply, SD_BUS_TYPE_BOOLEAN, &completedValue); result < 0)
         bus::fail(result);
-    bus::appendDictionary(reply, response ? responseDictionary(*response) : Value::Dictionary{});
+    if (response)
+        appendResponse(reply, *response);
+    else
+        bus::appendEntries(reply, {});
     if (const int result = sd_bus_send(nullptr, reply, nullptr); result < 0)
         bus::fail(result);
 }
@@ -105,8 +110,9 @@ int handleMessageMethod(sd_bus_message* message, void* server, sd_bus_error*) {
         return serve(*static_cast<VeltraPluginServer*>(server), message);
     } catch (const bus::Refusal& refusal) {
         return sd_bus_reply_method_errorf(message, SD_BUS_ERROR_INVALID_ARGS, "%s", refusal.what());
-    } catch (const bus::Failure& failure) {
-        return sd_bus_reply_method_errnof(message, failure.code, "Cannot carry the message: %s", failure.what());
+    } catch (const std::system_error& failure) {
+        return sd_bus_reply_method_errnof(message, failure.code().value(), "Cannot carry the message: %s",
+                                          failure.what());
     } catch (const std::bad_alloc&) {
         return sd_bus_reply_method_errorf(message, SD_BUS_ERROR_NO_MEMORY, "Out of memory.");
     } catch (const std::exception& failure) {
@@ -188,13 +194,13 @@ bool VeltraPluginServer::initWithServiceName(std::string_view serviceName) {
     if (result >= 0)
         result = sd_bus_get_unique_name(connection_->bus, &uniqueName);
     if (result < 0) {
-        consoleLog(name + ": cannot reach the bus \"" + which + "\": " + bus::Failure(result).what());
+        consoleLog(name + ": cannot reach the bus \"" + which + "\": " + bus::reasonOf(result));
         return false;
     }
     result = sd_bus_request_name(connection_->bus, name.c_str(), 0);
     if (result < 0) {
         consoleLog(name + ": cannot own this name on the bus \"" + which +
-                   "\": " + (result == -EEXIST ? "another process owns it already" : bus::Failure(result).what()));
+                   "\": " + (result == -EEXIST ? "another process owns it already" : bus::reasonOf(result)));
         return false;
     }
     return true;
@@ -215,8 +221,7 @@ void VeltraPluginServer::resume() {
     }
     sd_notify(0, "STOPPING=1");
     if (result != 0)
-        consoleLog(result < 0 ? std::string("cannot serve requests: ") + bus::Failure(result).what()
-                              : "the bus closed the connection");
+        consoleLog(result < 0 ? "cannot serve requests: " + bus::reasonOf(result) : "the bus closed the connection");
     sd_bus_flush(connection_->bus);
     std::exit(result == 0 ? EXIT_SUCCESS : EXIT_FAILURE);
 }

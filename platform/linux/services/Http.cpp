@@ -16,8 +16,9 @@
 
 #include "platform/Crypto.h"
 #include "platform/Format.h"
+#include "platform/Hexadecimal.h"
 #include "platform/Utf8.h"
-#include "platform/linux/services/X509Certificate.h"
+#include "platform/linux/system/OpenSSL.h"
 
 namespace http {
 namespace {
@@ -29,7 +30,7 @@ constexpr std::size_t longestTag = 256;
 
 constexpr std::string_view head = "HEAD";
 
-constexpr CURLcode passing[] = {
+constexpr CURLcode transientFailures[] = {
     CURLE_COULDNT_RESOLVE_PROXY,
     CURLE_COULDNT_RESOLVE_HOST,
     CURLE_COULDNT_CONNECT,
@@ -165,13 +166,6 @@ curl_socket_t openSocket(void*, curlsocktype, curl_sockaddr* address) {
     return ::socket(address->family, address->socktype | SOCK_CLOEXEC, address->protocol);
 }
 
-std::string hexadecimal(const std::uint8_t (&digest)[crypto::sha256Size]) {
-    std::string text;
-    for (const std::uint8_t byte : digest)
-        text += format("%02x", byte);
-    return text;
-}
-
 } // namespace
 
 void prepare() {
@@ -183,8 +177,8 @@ void prepare() {
     });
 }
 
-bool Failure::mayPass() const {
-    return std::find(std::begin(passing), std::end(passing), code_) != std::end(passing);
+bool Failure::isTransient() const {
+    return std::find(std::begin(transientFailures), std::end(transientFailures), code_) != std::end(transientFailures);
 }
 
 Url::Url(std::string text) : text_(std::move(text)), url_(curl_url()) {
@@ -289,10 +283,10 @@ void Client::configure(const Request& request) {
     set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
     set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_QUICK_EXIT, 1L); // a name server that is silent does not outlast the time-out
-    set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(request.limits.connecting.count()));
-    set(CURLOPT_TIMEOUT_MS, static_cast<long>(request.limits.whole.count()));
+    set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(request.limits.connectTimeout.count()));
+    set(CURLOPT_TIMEOUT_MS, static_cast<long>(request.limits.timeout.count()));
     set(CURLOPT_LOW_SPEED_LIMIT, 1L);
-    set(CURLOPT_LOW_SPEED_TIME, static_cast<long>(request.limits.silence.count()));
+    set(CURLOPT_LOW_SPEED_TIME, static_cast<long>(request.limits.idleTimeout.count()));
     if (connectTo_)
         set(CURLOPT_CONNECT_TO, connectTo_.get());
     configureTrust();

@@ -36,7 +36,7 @@ public:
 
     // Whether the same request may succeed at another time: the network failed, or the server did, but neither the
     // request nor the server's identity was at fault.
-    bool mayPass() const;
+    bool isTransient() const;
 
 private:
     CURLcode code_;
@@ -72,9 +72,9 @@ std::string proxyFor(const std::string& scheme, const Value& description);
 
 // How long an exchange may take.
 struct Limits {
-    std::chrono::milliseconds whole;
-    std::chrono::milliseconds connecting = whole;
-    std::chrono::seconds silence = {}; // without a byte in either direction; 0 is as long as the whole
+    std::chrono::milliseconds timeout;
+    std::chrono::milliseconds connectTimeout = timeout;
+    std::chrono::seconds idleTimeout = {}; // without a byte in either direction; 0 is as long as the whole
 };
 
 // AWS signature version 4 for an object store (service "s3"). The region has no colon.

@@ -6,7 +6,6 @@
 #include <exception>
 #include <limits>
 #include <memory>
-#include <set>
 #include <utility>
 #include <vector>
 
@@ -16,16 +15,14 @@
 #include "platform/linux/services/OrloStoreBackend.h"
 
 struct __QDOrlo {
-    OrloOptions options;
-    std::set<std::string, std::less<>> grants; // those of the option "Permissions"
-    const char* lack = nullptr;                // what the options lack, if anything
+    OrloOptions options = Value::Dictionary{};
     std::unique_ptr<OrloStoreBackend> backend;
 };
 
 namespace {
 
 constexpr const char* errorDomain = "QDOrloErrorDomain";
-constexpr std::int64_t usualDataVersion = 2;
+constexpr std::int64_t defaultDataVersion = 2;
 constexpr std::int64_t largestDataVersion = std::numeric_limits<std::uint32_t>::max();
 
 std::atomic<QDOrloLogHandler> logHandler = nullptr;
@@ -52,12 +49,13 @@ bool isDataVersion(const Value& value) {
     return number && !value.isBoolean() && *number >= 0 && *number <= largestDataVersion;
 }
 
-// What a session cannot do without and these options do not have, or null; the backend's own needs come on top.
-const char* lackOf(const OrloOptions& options) {
-    const Value::Data* ticket = optionOf(options, "APTicket").data();
+// Raises for options without what no session can do without; the backend's own needs come on top.
+void requireOptions(const OrloOptions& options) {
+    const Value::Data* ticket = options["APTicket"].data();
     if (!ticket || ticket->empty())
-        return "There is no AP ticket";
-    return isDataVersion(optionOf(options, "DataVersion")) ? nullptr : "There is no data version";
+        throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no AP ticket");
+    if (!isDataVersion(options["DataVersion"]))
+        throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no data version");
 }
 
 std::unique_ptr<OrloStoreBackend> openBackend() {
@@ -77,22 +75,24 @@ const std::string* grantable(const Value& name, std::string_view separators) {
     return text && !text->empty() && text->find_first_of(separators) == std::string::npos ? text : nullptr;
 }
 
-std::set<std::string, std::less<>> grantsIn(const Value& permissions) {
-    std::set<std::string, std::less<>> grants;
-    std::string_view rest = permissions.text() ? std::string_view(*permissions.text()) : std::string_view();
+// Whether the option "Permissions" has exactly this grant.
+bool isGranted(const OrloOptions& options, std::string_view grant) {
+    const std::string* permissions = options["Permissions"].text();
+    std::string_view rest = permissions ? *permissions : std::string_view();
     while (!rest.empty()) {
         const std::size_t end = std::min(rest.find(';'), rest.size());
-        grants.emplace(rest.substr(0, end));
+        if (rest.substr(0, end) == grant)
+            return true;
         rest.remove_prefix(std::min(end + 1, rest.size()));
     }
-    return grants;
+    return false;
 }
 
 // Holds the session to its permissions. What is returned are views of the arguments.
 OrloRecordName requireGrant(const __QDOrlo& session, std::int32_t action, const Value& dataClass,
                             const Value& instance) {
     std::string grant;
-    if (!QDOrloAppendPermissionsString(action, dataClass, instance, grant) || !session.grants.contains(grant))
+    if (!QDOrloAppendPermissionsString(action, dataClass, instance, grant) || !isGranted(session.options, grant))
         throw OrloStoreFailure(QDOrloErrorNotPermitted, format("The session has no grant for action %d on %@ of %@",
                                                                action, dataClass, instance));
     return {*dataClass.text(), *instance.text()};
@@ -104,7 +104,7 @@ void requireTrust(const __QDOrlo& session) {
     std::uint8_t digest[crypto::sha256Size];
     if (!crypto::sha256(measure.data(), measure.size(), digest))
         throw OrloStoreFailure(QDOrloErrorStorage, "The trust object cannot be digested");
-    const Value::Data* held = optionOf(session.options, "TrustObjectDigest").data();
+    const Value::Data* held = session.options["TrustObjectDigest"].data();
     if (!held || !std::equal(held->begin(), held->end(), std::begin(digest), std::end(digest)))
         throw OrloStoreFailure(QDOrloErrorTrustObjectMismatch,
                                "The session's trust object digest is not that of the store's trust object");
@@ -116,8 +116,7 @@ bool perform(const char* operation, const __QDOrlo* session, std::optional<Error
     try {
         if (!session)
             throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no session");
-        if (session->lack)
-            throw OrloStoreFailure(QDOrloErrorNotPermitted, session->lack);
+        requireOptions(session->options);
         work();
         return true;
     } catch (const OrloStoreFailure& failure) {
@@ -136,15 +135,12 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler) {
     logHandler = handler;
 }
 
-__QDOrlo* QDOrloCreateWithOptions(const Value& options) try {
+__QDOrlo* QDOrloCreateWithOptions(Value options) try {
     auto session = std::make_unique<__QDOrlo>();
     if (options.dictionary())
-        session->options = *options.dictionary();
-    session->grants = grantsIn(options["Permissions"]);
-    session->lack = lackOf(session->options);
+        session->options = std::move(options);
     try {
-        if (session->lack)
-            throw OrloStoreFailure(QDOrloErrorNotPermitted, session->lack);
+        requireOptions(session->options);
         session->backend = openBackend();
     } catch (const OrloStoreFailure& failure) {
         libraryLog(format("Session: %s", failure.what()));
@@ -156,12 +152,8 @@ __QDOrlo* QDOrloCreateWithOptions(const Value& options) try {
 }
 
 void QDOrloSetOption(__QDOrlo* session, std::string_view key, Value value) {
-    if (!session)
-        return;
-    if (key == "Permissions")
-        session->grants = grantsIn(value);
-    session->options.insert_or_assign(std::string(key), std::move(value));
-    session->lack = lackOf(session->options);
+    if (session)
+        session->options.dictionary()->insert_or_assign(std::string(key), std::move(value));
 }
 
 Value QDOrloDataCreatePermissionsString(__QDOrlo* session, std::int32_t action, const Value& dataClass,
@@ -227,7 +219,7 @@ bool QDOrloDataMultiExport(__QDOrlo* session, const Value::Array& classes, const
 
 std::uint32_t QDOrloSealingMapGetOrloDataVersionForDevice(const Value::Data&) {
     const Value version = resolveDescribed(deviceDescription()["store"]["dataVersion"]);
-    return static_cast<std::uint32_t>(isDataVersion(version) ? *version.integer() : usualDataVersion);
+    return static_cast<std::uint32_t>(isDataVersion(version) ? *version.integer() : defaultDataVersion);
 }
 
 std::int32_t QDSupportDigestSha256(const void* bytes, std::uint32_t length, std::uint8_t* digest) {

@@ -73,16 +73,16 @@ int pathAsItIs(sqlite3_vfs*, const char* path, int size, char* out) {
     return length >= 0 && length < size ? SQLITE_OK : SQLITE_CANTOPEN;
 }
 
-const sqlite3_vfs& usualAccess() {
-    static const sqlite3_vfs& usual = *sqlite3_vfs_find("unix");
-    return usual;
+const sqlite3_vfs& defaultAccess() {
+    static const sqlite3_vfs& access = *sqlite3_vfs_find("unix");
+    return access;
 }
 
 // A rollback journal may name a super-journal, any file of the machine, which SQLite reads and then deletes. No
 // database here has one, so a journal with one was put there by somebody else.
 int openNoSuperJournal(sqlite3_vfs* access, sqlite3_filename path, sqlite3_file* file, int flags, int* outFlags) {
     if ((flags & SQLITE_OPEN_SUPER_JOURNAL) == 0)
-        return usualAccess().xOpen(access, path, file, flags, outFlags);
+        return defaultAccess().xOpen(access, path, file, flags, outFlags);
     file->pMethods = nullptr;
     return SQLITE_CANTOPEN;
 }
@@ -93,7 +93,7 @@ int openNoSuperJournal(sqlite3_vfs* access, sqlite3_filename path, sqlite3_file*
 // a path SQLite opens with O_NOFOLLOW.
 const char* fileAccess() {
     static sqlite3_vfs access = [] {
-        sqlite3_vfs own = usualAccess();
+        sqlite3_vfs own = defaultAccess();
         own.zName = "veltra";
         own.xFullPathname = pathAsItIs;
         own.xOpen = openNoSuperJournal;

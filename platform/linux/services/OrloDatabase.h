@@ -9,8 +9,8 @@
 
 #include <sqlite3.h>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Value.h"
-#include "platform/linux/system/FileDescriptor.h"
 
 // Raises OrloStoreFailure (QDOrloErrorStorage) with SQLite's reason.
 [[noreturn]] void failWithReasonOf(sqlite3* database);

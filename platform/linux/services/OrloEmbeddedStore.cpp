@@ -3,15 +3,15 @@
 #include <cstring>
 #include <utility>
 
+#include "platform/DeviceRoot.h"
 #include "platform/Format.h"
 #include "platform/linux/services/OrloDatabase.h"
 #include "platform/linux/services/OrloStoreBackend.h"
 #include "platform/linux/services/OrloTrustObject.h"
-#include "platform/linux/system/DeviceRoot.h"
 
 namespace {
 
-constexpr const char* usualPath = "/var/lib/orlo/store.db";
+constexpr const char* defaultPath = "/var/lib/orlo/store.db";
 
 constexpr const char* putRecord = R"(
 INSERT INTO records (data_version, class, instance, data, put_at)
@@ -83,7 +83,7 @@ private:
 } // namespace
 
 std::unique_ptr<OrloStoreBackend> openEmbeddedStore(const Value& store) {
-    const Value path = store["path"].isNothing() ? Value(usualPath) : store["path"];
+    const Value path = store["path"].isNothing() ? Value(defaultPath) : store["path"];
     const auto parts = path.text() ? splitDevicePath(*path.text()) : std::nullopt;
     if (!parts)
         throw OrloStoreFailure(QDOrloErrorStorage, "The store's path " + path.description() + " names no file");

@@ -8,14 +8,13 @@
 
 #include <fcntl.h>
 #include <openssl/bio.h>
-#include <openssl/err.h>
 #include <openssl/pem.h>
 #include <sys/stat.h>
 
+#include "platform/DeviceRoot.h"
 #include "platform/Files.h"
 #include "platform/linux/services/OrloStoreBackend.h"
-#include "platform/linux/services/X509Certificate.h"
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/linux/system/OpenSSL.h"
 
 namespace {
 
@@ -85,11 +84,11 @@ bool hasCertificates(const Value::Data& pem) {
 std::string readAuthorities(const Value& path) {
     if (path.isNothing())
         return {};
-    Error error;
+    std::optional<Error> error;
     const auto pem = path.text() ? files::readWhole(*path.text(), largestCaFile, &error) : std::nullopt;
     if (!pem)
         fail("The store's caFile " + path.description() +
-             " cannot be read: " + (path.text() ? error.text : std::string("it is no path")));
+             " cannot be read: " + (error ? error->text : "it is no path"));
     if (!hasCertificates(*pem))
         fail("The store's caFile " + path.description() + " holds no PEM certificate, or one that cannot be read");
     return {pem->begin(), pem->end()};

@@ -11,6 +11,7 @@
 #include <nlohmann/json.hpp>
 
 #include "platform/Format.h"
+#include "platform/Hexadecimal.h"
 #include "platform/ReverseProxy.h"
 #include "platform/Utf8.h"
 #include "platform/linux/services/Http.h"
@@ -31,19 +32,20 @@ constexpr std::size_t longestQuoted = 64;
 constexpr std::size_t longestReason = 64;
 constexpr std::size_t longestGrants = 8000;
 
-constexpr milliseconds firstRest{200};
-constexpr milliseconds longestRest{2000};
+constexpr milliseconds firstBackoff{200};
+constexpr milliseconds longestBackoff{2000};
 
-// A number among the session's options: from 1 to `largest`, to which a larger one is cut; anything else is `usual`.
+// A number among the session's options: from 1 to `largest`, to which a larger one is cut; anything else is the
+// default.
 struct NumberOption {
     const char* key;
-    std::int64_t usual;
+    std::int64_t byDefault;
     std::int64_t largest;
 
     std::int64_t in(const OrloOptions& options) const {
-        const Value& value = optionOf(options, key);
+        const Value& value = options[key];
         const std::int64_t number = value.isBoolean() ? 0 : value.integer().value_or(0);
-        return number < 1 ? usual : std::min(number, largest);
+        return number < 1 ? byDefault : std::min(number, largest);
     }
 };
 constexpr NumberOption timeoutSeconds{"HTTPTimeout", 30, 3600};
@@ -53,9 +55,12 @@ constexpr NumberOption attemptsOfMany{"MultiRequestMaxAttempts", 1, 10};
 // `text` with every octet percent-encoded that `isKept` does not keep.
 template <class Kept>
 std::string percentEncoded(std::string_view text, Kept isKept) {
+    constexpr std::string_view digits = "0123456789ABCDEF";
     std::string encoded;
-    for (const char c : text)
-        encoded += isKept(c) ? std::string(1, c) : format("%%%02X", static_cast<unsigned char>(c));
+    for (const char c : text) {
+        const auto octet = static_cast<std::uint8_t>(c);
+        encoded += isKept(c) ? std::string{c} : std::string{'%', digits[octet >> 4], digits[octet & 0xF]};
+    }
     return encoded;
 }
 
@@ -93,16 +98,12 @@ bool canBeListed(std::string_view name) {
     return true;
 }
 
-std::string hexadecimal(const std::uint8_t* bytes, std::size_t length) {
-    return *QDOrloCreateInstanceString(Value::Data(bytes, bytes + length)).text();
-}
-
 // The headers by which a server can decide. Of the grants nothing breaks the line or is taken for blanks around it;
 // where there are none there is no such header, since one without a value would be signed but not sent.
 std::vector<std::string> headersFor(const OrloOptions& options) {
     std::vector<std::string> headers = {"Orlo-Trust-Object-Digest: " +
-                                        *QDOrloCreateInstanceString(options.at("TrustObjectDigest")).text()};
-    const std::string* grants = optionOf(options, "Permissions").text();
+                                        hexadecimal(*options["TrustObjectDigest"].data())};
+    const std::string* grants = options["Permissions"].text();
     if (!grants || grants->empty())
         return headers;
     std::string encoded;
@@ -126,7 +127,7 @@ std::string randomName() {
     std::uint8_t bytes[8];
     if (!crypto::randomBytes(bytes, sizeof bytes))
         throw OrloStoreFailure(QDOrloErrorStorage, "There is no randomness for the name of an export");
-    return hexadecimal(bytes, sizeof bytes);
+    return hexadecimal(bytes);
 }
 
 std::string exportText(const OrloOptions& options, const std::vector<OrloRecordName>& names) {
@@ -248,14 +249,14 @@ private:
     // the very bytes of before, since tags stand for contents.
     http::Answer sendIfUnchanged(http::Request& request) {
         const http::Request put = request;
-        const auto end = std::chrono::steady_clock::now() + put.limits.whole;
+        const auto end = std::chrono::steady_clock::now() + put.limits.timeout;
         const auto timeLeft = [&] {
             return std::chrono::duration_cast<milliseconds>(end - std::chrono::steady_clock::now());
         };
         const auto send = [&](const char* method, const std::string& condition) {
             request = put;
             request.method = method;
-            request.limits = {.whole = std::max(timeLeft(), milliseconds(1))};
+            request.limits = {.timeout = std::max(timeLeft(), milliseconds(1))};
             if (!condition.empty())
                 request.headers.push_back(condition);
             else
@@ -265,7 +266,7 @@ private:
             return client_.exchange(request);
         };
         http::Answer found = send("HEAD", "");
-        for (milliseconds rest{0};; rest = nextRest(rest)) {
+        for (milliseconds backoff{0};; backoff = nextBackoff(backoff)) {
             if (found.status >= 500)
                 return found;
             if (found.status != 200 && found.status != 404)
@@ -273,9 +274,9 @@ private:
             if (found.status == 200 && found.tag.empty())
                 failToTransport(request, "The answer has no tag, so that no condition can be made of it");
             http::Answer answer = send("PUT", conditionOn(found));
-            if (!isOvertaken(answer) || timeLeft() <= rest)
+            if (!isOvertaken(answer) || timeLeft() <= backoff)
                 return answer;
-            std::this_thread::sleep_for(rest);
+            std::this_thread::sleep_for(backoff);
             http::Answer now = send("HEAD", "");
             if (now.status == found.status && now.tag == found.tag) {
                 // Nobody has changed it, so that the store did not understand the tag, unless it was only busy (409).
@@ -291,7 +292,9 @@ private:
         }
     }
 
-    static milliseconds nextRest(milliseconds rest) { return std::clamp(2 * rest, firstRest, longestRest); }
+    static milliseconds nextBackoff(milliseconds backoff) {
+        return std::clamp(2 * backoff, firstBackoff, longestBackoff);
+    }
 
     Value::Data fetchTrustObject(const OrloOptions& options, const std::string& server, std::string_view path) {
         http::Request request = {.method = "GET", .url = {}, .limits = {}, .maximumAnswer = largestTrustObject};
@@ -350,7 +353,7 @@ private:
 
     // An endpoint of the session's options.
     static std::string endpoint(const OrloOptions& options, const char* key) {
-        const std::string* url = optionOf(options, key).text();
+        const std::string* url = options[key].text();
         if (!url || !url->starts_with("https://"))
             throw OrloStoreFailure(QDOrloErrorTransport, format("The session's %s is no https URL", key));
         return *url;
@@ -358,8 +361,8 @@ private:
 
     // The proxy for `url` as the session's options want it; the description of proxies is asked for once.
     std::string proxyFor(const OrloOptions& options, const http::Url& url) {
-        const bool isWanted = optionOf(options, "EnableProxy").boolean().value_or(false);
-        if (!isWanted || (url.scheme() == "https" && optionOf(options, "EnableProxySsl") != Value("ForHttps")))
+        const bool isWanted = options["EnableProxy"].boolean().value_or(false);
+        if (!isWanted || (url.scheme() == "https" && options["EnableProxySsl"] != Value("ForHttps")))
             return {};
         if (!proxies_)
             proxies_ = RPCopyProxyDictionaryWithOptions(url.text(), Value::Dictionary{{"TestReachability", false}});
@@ -376,13 +379,13 @@ private:
             const http::Url url = http::Url(server).under(path);
             request.url = url.text();
             request.proxy = proxyFor(options, url);
-            request.limits = {.whole = std::chrono::seconds(timeoutSeconds.in(options))};
+            request.limits = {.timeout = std::chrono::seconds(timeoutSeconds.in(options))};
             const http::Request whole = request;
-            milliseconds rest = firstRest;
-            for (std::int64_t left = attempts.in(options); left > 1; --left, rest = nextRest(rest)) {
+            milliseconds backoff = firstBackoff;
+            for (std::int64_t left = attempts.in(options); left > 1; --left, backoff = nextBackoff(backoff)) {
                 if (std::optional<http::Answer> answer = attempt(request, send))
                     return std::move(*answer);
-                std::this_thread::sleep_for(rest);
+                std::this_thread::sleep_for(backoff);
                 request = whole;
             }
             return (this->*send)(request);
@@ -396,7 +399,7 @@ private:
         http::Answer answer = (this->*send)(request);
         return answer.status < 500 ? std::optional(std::move(answer)) : std::nullopt;
     } catch (const http::Failure& failure) {
-        if (!failure.mayPass())
+        if (!failure.isTransient())
             throw;
         return std::nullopt;
     }

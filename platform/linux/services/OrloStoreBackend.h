@@ -31,8 +31,8 @@ struct OrloRecordName {
     std::string_view instance;
 };
 
-// The options of a session as they are when an operation is called.
-using OrloOptions = Value::Dictionary;
+// The options of a session, a dictionary, as they are when an operation is called.
+using OrloOptions = Value;
 
 // Belongs to one session. Every operation raises OrloStoreFailure on failure and then has changed nothing.
 class OrloStoreBackend {
@@ -51,9 +51,6 @@ public:
     virtual Value::Data copy(const OrloOptions& options, const OrloRecordName& name) = 0;
     virtual void multiExport(const OrloOptions& options, const std::vector<OrloRecordName>& names) = 0;
 };
-
-// The option under `key`, or a value of nothing.
-const Value& optionOf(const OrloOptions& options, std::string_view key);
 
 // The data version and the SHA-256 of the AP ticket, in hexadecimal, of a session's options; the library has seen to it
 // that they are there. The second raises OrloStoreFailure.

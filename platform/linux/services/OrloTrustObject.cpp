@@ -8,8 +8,8 @@
 #include <fcntl.h>
 
 #include "platform/Crypto.h"
+#include "platform/DeviceRoot.h"
 #include "platform/linux/services/OrloStoreBackend.h"
-#include "platform/linux/system/DeviceRoot.h"
 #include "platform/linux/system/NewFile.h"
 
 namespace {

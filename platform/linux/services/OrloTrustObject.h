@@ -4,8 +4,8 @@
 
 #include <string>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Value.h"
-#include "platform/linux/system/FileDescriptor.h"
 
 // The contents of the file `name` in `directory`, read now. Makes the file from 64 random bytes when it is missing; of
 // two services that do so at once, one has its way and both see the same. Raises OrloStoreFailure.

@@ -10,8 +10,9 @@
 namespace {
 
 constexpr std::size_t maximumAnswer = std::size_t{16} << 20;
-constexpr http::Limits limits{
-    .whole = std::chrono::minutes(5), .connecting = std::chrono::seconds(30), .silence = std::chrono::seconds(60)};
+constexpr http::Limits limits{.timeout = std::chrono::minutes(5),
+                              .connectTimeout = std::chrono::seconds(30),
+                              .idleTimeout = std::chrono::seconds(60)};
 constexpr std::int64_t patchNotLoaded = -1;
 
 bool refuse(std::optional<Error>* error, std::int64_t code, std::string text) {

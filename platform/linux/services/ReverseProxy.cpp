@@ -2,19 +2,15 @@
 
 #include <algorithm>
 #include <chrono>
-#include <condition_variable>
-#include <mutex>
 #include <system_error>
-#include <thread>
 #include <utility>
 #include <vector>
 
 #include "platform/SystemLog.h"
 #include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/system/DelayedCalls.h"
 
 namespace {
-
-using Clock = std::chrono::steady_clock;
 
 struct Event {
     std::int32_t status;
@@ -43,44 +39,24 @@ class RPRegistration {
 public:
     RPRegistration(RPAvailabilityCallback callback, std::vector<Event> events)
         : callback_(std::move(callback)), events_(std::move(events)) {}
-    RPRegistration(const RPRegistration&) = delete;
-    RPRegistration& operator=(const RPRegistration&) = delete;
-    ~RPRegistration() {
-        invalidate();
-        if (deliverer_.joinable())
-            deliverer_.join();
-    }
 
     void resume() try {
-        if (!deliverer_.joinable())
-            deliverer_ = std::thread([this, start = Clock::now()] { deliver(start); });
+        const auto start = DelayedCalls::Clock::now();
+        auto due = start;
+        for (const Event& event : std::exchange(events_, {})) {
+            due = std::max(due, start + event.after); // none overtakes the one before it
+            calls_.add(due, [this, status = event.status] { callback_(status); });
+        }
     } catch (const std::system_error& failure) {
         consoleLog(std::string("The reverse proxy's events cannot be delivered: ") + failure.what());
     }
 
-    void invalidate() {
-        const std::lock_guard lock(mutex_);
-        invalid_ = true;
-        changed_.notify_all();
-    }
+    void invalidate() { calls_.stop(); }
 
 private:
-    void deliver(Clock::time_point start) {
-        for (const Event& event : events_) {
-            std::unique_lock lock(mutex_);
-            if (changed_.wait_until(lock, start + event.after, [this] { return invalid_; }))
-                return;
-            lock.unlock();
-            callback_(event.status);
-        }
-    }
-
     const RPAvailabilityCallback callback_;
-    const std::vector<Event> events_;
-    std::mutex mutex_;
-    std::condition_variable changed_;
-    bool invalid_ = false;
-    std::thread deliverer_;
+    std::vector<Event> events_; // until the registration is resumed
+    DelayedCalls calls_;        // last, so that it ends before what it uses
 };
 
 RPRegistration* RPRegisterForAvailability(RPAvailabilityCallback callback) {

@@ -5,8 +5,8 @@
 
 #include <fcntl.h>
 
-#include "platform/linux/system/DeviceRoot.h"
-#include "platform/linux/system/PropertyList.h"
+#include "platform/DeviceRoot.h"
+#include "platform/PropertyList.h"
 
 Value bundleInformationList() {
     constexpr std::size_t maximumSize = std::size_t{1} << 20;

@@ -5,17 +5,17 @@
 #include <bit>
 #include <cerrno>
 #include <cstring>
-#include <memory>
 
 #include <openssl/bn.h>
 #include <openssl/core_names.h>
 #include <openssl/crypto.h>
-#include <openssl/err.h>
 #include <openssl/evp.h>
 #include <openssl/objects.h>
 #include <openssl/params.h>
 #include <openssl/rsa.h>
 #include <sys/random.h>
+
+#include "platform/linux/system/OpenSSL.h"
 
 namespace crypto {
 
@@ -152,21 +152,10 @@ bool HMACSHA256::final(std::uint8_t (&out)[sha256Size]) noexcept {
 
 namespace {
 
-template <class Object, void (*Free)(Object*)>
-struct Release {
-    void operator()(Object* object) const { Free(object); }
-};
-using Key = std::unique_ptr<EVP_PKEY, Release<EVP_PKEY, EVP_PKEY_free>>;
-using KeyContext = std::unique_ptr<EVP_PKEY_CTX, Release<EVP_PKEY_CTX, EVP_PKEY_CTX_free>>;
-
-// What the library notes about bad keys and signatures is forgotten; what it noted before stays.
-class QuietErrors {
-public:
-    QuietErrors() noexcept { ERR_set_mark(); }
-    ~QuietErrors() { ERR_pop_to_mark(); }
-    QuietErrors(const QuietErrors&) = delete;
-    QuietErrors& operator=(const QuietErrors&) = delete;
-};
+using openssl::Owner;
+using openssl::QuietErrors;
+using Key = Owner<EVP_PKEY, EVP_PKEY_free>;
+using KeyContext = Owner<EVP_PKEY_CTX, EVP_PKEY_CTX_free>;
 
 // A context for the import of public keys of one type. Making it costs a tenth of a verification, so that one that has
 // served is kept for the next key, whichever thread brings it.
@@ -258,8 +247,8 @@ bool isBeyondLibrary(Bytes modulus, Bytes exponent) noexcept {
     return exponent.length > OPENSSL_RSA_MAX_PUBEXP_BITS / 8 && modulus.length > OPENSSL_RSA_SMALL_MODULUS_BITS / 8;
 }
 
-using Number = std::unique_ptr<BIGNUM, Release<BIGNUM, BN_free>>;
-using NumberContext = std::unique_ptr<BN_CTX, Release<BN_CTX, BN_CTX_free>>;
+using Number = Owner<BIGNUM, BN_free>;
+using NumberContext = Owner<BN_CTX, BN_CTX_free>;
 
 Number number(Bytes octets) noexcept {
     return Number(BN_bin2bn(octets.data, static_cast<int>(octets.length), nullptr));

@@ -1,9 +1,10 @@
 #include "platform/linux/system/DescribedValue.h"
 
-#include <charconv>
 #include <string>
+#include <utility>
 
 #include "platform/Files.h"
+#include "platform/Hexadecimal.h"
 #include "platform/Utf8.h"
 
 namespace {
@@ -14,17 +15,9 @@ std::string_view characters(const Value::Data& bytes) {
     return {reinterpret_cast<const char*>(bytes.data()), bytes.size()};
 }
 
-Value fromHex(const Value& text) {
-    if (!text.text() || text.text()->size() % 2 != 0)
-        return {};
-    Value::Data bytes(text.text()->size() / 2);
-    const char* pair = text.text()->data();
-    for (std::uint8_t& byte : bytes) {
-        if (std::from_chars(pair, pair + 2, byte, 16).ptr != pair + 2)
-            return {};
-        pair += 2;
-    }
-    return bytes;
+Value fromHexadecimal(const Value& digits) {
+    std::optional<Value::Data> bytes = digits.text() ? bytesOfHexadecimal(*digits.text()) : std::nullopt;
+    return bytes ? Value(std::move(*bytes)) : Value();
 }
 
 Value fromFile(const Value& path, const Value& kind) {
@@ -44,7 +37,7 @@ Value fromFile(const Value& path, const Value& kind) {
 Value resolveDictionary(const Value& described) {
     const Value::Dictionary& entries = *described.dictionary();
     if (entries.contains(dataKey))
-        return entries.size() == 1 ? fromHex(described[dataKey]) : Value();
+        return entries.size() == 1 ? fromHexadecimal(described[dataKey]) : Value();
     if (entries.contains(fileKey))
         return entries.size() == 1 + entries.count(kindKey) ? fromFile(described[fileKey], described[kindKey])
                                                             : Value();

@@ -11,9 +11,9 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
+#include "platform/DeviceRoot.h"
 #include "platform/Utf8.h"
 #include "platform/linux/system/DescribedValue.h"
-#include "platform/linux/system/DeviceRoot.h"
 
 namespace {
 

@@ -1,4 +1,4 @@
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/DeviceRoot.h"
 
 #include <algorithm>
 #include <array>
@@ -221,9 +221,8 @@ std::optional<Value::Data> readRegularFile(const FileDescriptor& file, std::size
     while (true) {
         if (filled == contents.size())
             contents.resize(std::min(contents.size() * 2, maximum + 1));
-        const ssize_t count = ::read(file.get(), contents.data() + filled, contents.size() - filled);
-        if (count < 0 && errno == EINTR)
-            continue;
+        const ssize_t count =
+            TEMP_FAILURE_RETRY(::read(file.get(), contents.data() + filled, contents.size() - filled));
         if (count < 0)
             return std::nullopt;
         if (count == 0)

@@ -8,7 +8,7 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/DeviceRoot.h"
 #include "platform/linux/system/NewFile.h"
 
 namespace files {
@@ -18,9 +18,9 @@ namespace {
 constexpr mode_t logMode = 0640;
 
 // Says in *error, when it is given, what errno holds.
-void explain(Error* error) {
+void explain(const char* domain, std::optional<Error>* error) {
     if (error)
-        *error = {"POSIXErrorDomain", errno, std::strerror(errno)};
+        *error = Error{domain, errno, std::strerror(errno)};
 }
 
 // Whether `name` is free or a regular file.
@@ -48,11 +48,11 @@ FileDescriptor makeLog(std::string_view path) {
 
 } // namespace
 
-std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum, Error* error) {
+std::optional<Value::Data> readWhole(std::string_view path, std::size_t maximum, std::optional<Error>* error) {
     const FileDescriptor file = openInRoot(path, O_RDONLY);
     std::optional<Value::Data> contents = file ? readRegularFile(file, maximum) : std::nullopt;
     if (!contents)
-        explain(error);
+        explain("POSIXErrorDomain", error);
     return contents;
 }
 
@@ -72,7 +72,7 @@ bool exists(std::string_view path) {
     return static_cast<bool>(openInRoot(path, O_PATH));
 }
 
-bool replace(std::string_view path, const Value::Data& contents, std::optional<Error>* writeError) {
+bool replace(std::string_view path, std::span<const std::uint8_t> contents, std::optional<Error>* writeError) {
     const std::optional<DevicePath> parts = splitDevicePath(path);
     if (!parts)
         return false;
@@ -83,8 +83,7 @@ bool replace(std::string_view path, const Value::Data& contents, std::optional<E
     if (!file)
         return false;
     if (!file.fill(contents) || !file.replace(parts->name)) {
-        if (writeError)
-            *writeError = Error{"FileErrorDomain", errno, std::strerror(errno)};
+        explain("FileErrorDomain", writeError);
         return false;
     }
     return true;
@@ -103,10 +102,7 @@ bool append(std::string_view path, std::string_view text) {
         file = makeLog(path);
     if (!file)
         return false;
-    ssize_t count;
-    do
-        count = ::write(file.get(), text.data(), text.size());
-    while (count < 0 && errno == EINTR);
+    const ssize_t count = TEMP_FAILURE_RETRY(::write(file.get(), text.data(), text.size()));
     return count >= 0 && static_cast<std::size_t>(count) == text.size();
 }
 

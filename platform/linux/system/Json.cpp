@@ -1,78 +1,38 @@
-#include "platform/linux/system/Json.h"
+#include "platform/Json.h"
 
 #include <algorithm>
 
+#include "platform/Hexadecimal.h"
 #include "platform/linux/system/JsonReader.h"
 
 namespace {
 
-// Keeps one text of the outermost object and skips the rest, in constant memory but for the parser's own stack.
-class TextMemberReader : public nlohmann::json_sax<nlohmann::json> {
-public:
-    explicit TextMemberReader(std::string_view key) : key_(key) {}
-
-    std::optional<std::string> take() { return std::move(found_); }
-
-    bool null() override { return skip(); }
-    bool boolean(bool) override { return skip(); }
-    bool number_integer(number_integer_t) override { return skip(); }
-    bool number_unsigned(number_unsigned_t) override { return skip(); }
-    bool number_float(number_float_t, const string_t&) override { return skip(); }
-    bool binary(binary_t&) override { return skip(); }
-    bool start_object(std::size_t) override { return open(); }
-    bool start_array(std::size_t) override { return open(); }
-    bool end_object() override { return close(); }
-    bool end_array() override { return close(); }
-
-    bool string(string_t& value) override {
-        if (wanted())
-            found_ = std::move(value);
-        return depth_ > 0;
-    }
-
-    bool key(string_t& value) override {
-        if (depth_ == 1)
-            atKey_ = value == key_;
-        return true;
-    }
-
-    bool parse_error(std::size_t, const std::string&, const nlohmann::detail::exception&) override { return false; }
-
-private:
-    bool wanted() const { return depth_ == 1 && atKey_; }
-
-    // A value of another kind. Outside of any collection it ends the reading, since the text is then no object.
-    bool skip() {
-        if (wanted())
-            found_.reset();
-        return depth_ > 0;
-    }
-    bool open() {
-        if (wanted())
-            found_.reset();
-        ++depth_;
-        return true;
-    }
-    bool close() {
-        --depth_;
-        return true;
-    }
-
-    const std::string_view key_;
-    std::optional<std::string> found_;
-    std::size_t depth_ = 0;
-    bool atKey_ = false;
-};
+constexpr char dataKey[] = "$data";
 
 // The parser takes a NUL for the end of the text and would leave unread what follows.
 bool hasNul(std::string_view text) {
     return text.find('\0') != std::string_view::npos;
 }
 
-} // namespace
+// Makes data of each {"$data": "<hexadecimal>"}; false for one that is malformed.
+bool makeData(Value& value) {
+    if (Value::Array* elements = value.array())
+        return std::all_of(elements->begin(), elements->end(), makeData);
+    Value::Dictionary* entries = value.dictionary();
+    if (!entries)
+        return true;
+    if (entries->size() > 1 || !entries->contains(dataKey))
+        return std::all_of(entries->begin(), entries->end(), [](auto& entry) { return makeData(entry.second); });
+    const std::string* digits = value[dataKey].text();
+    std::optional<Value::Data> bytes = digits ? bytesOfHexadecimal(*digits) : std::nullopt;
+    const bool isMade = bytes.has_value();
+    if (isMade)
+        value = std::move(*bytes);
+    return isMade;
+}
 
-std::optional<Value> jsonToValue(std::string_view text, std::string* refusal) {
-    ValueBuilder builder(true);
+std::optional<Value> read(std::string_view text, bool nothingAllowed, std::string* refusal) {
+    ValueBuilder builder(nothingAllowed);
     if (!hasNul(text) && nlohmann::json::sax_parse(text.begin(), text.end(), &builder))
         return builder.take();
     if (!refusal)
@@ -87,9 +47,51 @@ std::optional<Value> jsonToValue(std::string_view text, std::string* refusal) {
     return std::nullopt;
 }
 
+} // namespace
+
+std::optional<Value> jsonToValue(std::string_view text, std::string* refusal) {
+    return read(text, true, refusal);
+}
+
+std::optional<Value> jsonToMessageValue(std::string_view text, std::string* refusal) {
+    std::optional<Value> value = read(text, false, refusal);
+    if (!value || makeData(*value))
+        return value;
+    if (refusal)
+        *refusal = "a \"$data\" that is no text of pairs of hexadecimal digits";
+    return std::nullopt;
+}
+
+nlohmann::ordered_json jsonFromValue(const Value& value) {
+    using nlohmann::ordered_json;
+    if (const std::string* text = value.text())
+        return *text;
+    if (const Value::Data* data = value.data())
+        return {{dataKey, hexadecimal(*data)}};
+    if (const Value::Array* array = value.array()) {
+        ordered_json json = ordered_json::array();
+        for (const Value& element : *array)
+            json.push_back(jsonFromValue(element));
+        return json;
+    }
+    if (const Value::Dictionary* dictionary = value.dictionary()) {
+        ordered_json json = ordered_json::object();
+        for (const auto& [key, element] : *dictionary)
+            json[key] = jsonFromValue(element);
+        return json;
+    }
+    if (value.isBoolean())
+        return *value.boolean();
+    return value.isNothing() ? ordered_json() : ordered_json(*value.integer());
+}
+
 std::optional<std::string> jsonTextMember(std::string_view text, std::string_view key) {
-    TextMemberReader reader(key);
-    if (hasNul(text) || !nlohmann::json::sax_parse(text.begin(), text.end(), &reader))
-        return std::nullopt;
-    return reader.take();
+    using Event = nlohmann::json::parse_event_t;
+    // What is not wanted is dropped as soon as it is read, so that nothing of it is kept.
+    const auto isWanted = [key](int depth, Event event, const nlohmann::json& parsed) {
+        return depth == 0 || (depth == 1 && (event != Event::key || parsed.get_ref<const std::string&>() == key));
+    };
+    const auto read = hasNul(text) ? nlohmann::json() : nlohmann::json::parse(text, isWanted, false);
+    const auto found = read.is_object() ? read.find(std::string(key)) : read.end();
+    return found != read.end() && found->is_string() ? std::optional(found->get<std::string>()) : std::nullopt;
 }

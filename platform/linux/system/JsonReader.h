@@ -1,4 +1,4 @@
-// Reading of JSON and CBOR through the one library that knows both.
+// Values as JSON and CBOR through the one library that knows both.
 #ifndef VELTRA_PLATFORM_LINUX_JSON_READER_H
 #define VELTRA_PLATFORM_LINUX_JSON_READER_H
 
@@ -12,6 +12,9 @@
 
 #include "platform/Utf8.h"
 #include "platform/Value.h"
+
+// A value as JSON, as jsonToMessageValue (platform/Json.h) reads it; nothing is null.
+nlohmann::ordered_json jsonFromValue(const Value& value);
 
 // Builds a Value from the events of the library's parser. Refuses what a Value cannot hold or what no honest writer
 // sends: fractions and integers beyond 64 signed bits (unless they may be nothing), texts that are no UTF-8, a key that

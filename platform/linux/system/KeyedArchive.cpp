@@ -149,7 +149,7 @@ Value::Data archiveEncode(std::string_view rootKey, const Value& root) {
     return bytes;
 }
 
-std::optional<ArchiveDecoder> ArchiveDecoder::create(const Value::Data& bytes, Error* error) {
+std::optional<ArchiveDecoder> ArchiveDecoder::create(const Value::Data& bytes, std::optional<Error>* error) {
     const bool empty = bytes.empty();
     if (!empty && major(bytes.front()) == majorMap)
         return ArchiveDecoder(bytes);

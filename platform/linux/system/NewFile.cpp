@@ -12,7 +12,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/DeviceRoot.h"
+#include "platform/Value.h"
 
 namespace {
 
@@ -22,9 +23,7 @@ constexpr std::string_view prefix = ".new-";
 bool writeAll(const FileDescriptor& file, const std::uint8_t* bytes, std::size_t size) {
     std::size_t written = 0;
     while (written < size) {
-        const ssize_t count = ::write(file.get(), bytes + written, size - written);
-        if (count < 0 && errno == EINTR)
-            continue;
+        const ssize_t count = TEMP_FAILURE_RETRY(::write(file.get(), bytes + written, size - written));
         if (count < 0)
             return false;
         written += static_cast<std::size_t>(count);
@@ -33,19 +32,11 @@ bool writeAll(const FileDescriptor& file, const std::uint8_t* bytes, std::size_t
 }
 
 bool flush(const FileDescriptor& file) {
-    int result;
-    do
-        result = ::fsync(file.get());
-    while (result != 0 && errno == EINTR);
-    return result == 0;
+    return TEMP_FAILURE_RETRY(::fsync(file.get())) == 0;
 }
 
 bool lock(const FileDescriptor& file, int operation) {
-    int result;
-    do
-        result = ::flock(file.get(), operation);
-    while (result != 0 && errno == EINTR);
-    return result == 0;
+    return TEMP_FAILURE_RETRY(::flock(file.get(), operation)) == 0;
 }
 
 bool isOwnFile(const struct stat& status) {
@@ -98,7 +89,7 @@ NewFile::~NewFile() {
 }
 
 // The mode is set once more, since the umask may have taken bits from it.
-bool NewFile::fill(const Value::Data& contents) const {
+bool NewFile::fill(std::span<const std::uint8_t> contents) const {
     return ::fchmod(file_.get(), privateMode) == 0 && writeAll(file_, contents.data(), contents.size()) && flush(file_);
 }
 

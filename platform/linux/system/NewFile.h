@@ -2,10 +2,11 @@
 #ifndef VELTRA_PLATFORM_LINUX_NEW_FILE_H
 #define VELTRA_PLATFORM_LINUX_NEW_FILE_H
 
+#include <cstdint>
+#include <span>
 #include <string>
 
-#include "platform/Value.h"
-#include "platform/linux/system/FileDescriptor.h"
+#include "platform/FileDescriptor.h"
 
 // Every operation returns false, with errno set, on failure. The file is removed again unless it was moved; what a
 // writer that was killed has left is removed by the next one in that directory.
@@ -21,7 +22,7 @@ public:
     explicit operator bool() const { return static_cast<bool>(file_); }
 
     // Writes the contents and flushes them to the disk.
-    bool fill(const Value::Data& contents) const;
+    bool fill(std::span<const std::uint8_t> contents) const;
 
     // The same with the whole of the regular file `source`, piece by piece, and with its time of modification. Holes
     // stay holes, and what is appended meanwhile is left out. Moves the position of `source`.

@@ -13,7 +13,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "platform/linux/system/DeviceRoot.h"
+#include "platform/DeviceRoot.h"
 
 namespace processes {
 
@@ -26,47 +26,36 @@ FileDescriptor aboveStandard(FileDescriptor file) {
     return FileDescriptor(::fcntl(file.get(), F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
 }
 
-class FileActions {
+// How a child is to start.
+class SpawnSettings {
 public:
-    FileActions() { error_ = ::posix_spawn_file_actions_init(&actions_); }
-    ~FileActions() { ::posix_spawn_file_actions_destroy(&actions_); }
-    FileActions(const FileActions&) = delete;
-    FileActions& operator=(const FileActions&) = delete;
-
-    void duplicate(int from, int onto) {
-        if (from >= 0 && error_ == 0)
-            error_ = ::posix_spawn_file_actions_adddup2(&actions_, from, onto);
-    }
-    const posix_spawn_file_actions_t* get() const { return &actions_; }
-    int error() const { return error_; }
-
-private:
-    posix_spawn_file_actions_t actions_;
-    int error_;
-};
-
-class Attributes {
-public:
-    Attributes() {
+    SpawnSettings() {
         // The service blocks the signals that its event loop takes, and a child would inherit that.
         sigset_t none;
         ::sigemptyset(&none);
-        error_ = ::posix_spawnattr_init(&attributes_);
-        if (error_ == 0)
-            error_ = ::posix_spawnattr_setsigmask(&attributes_, &none);
-        if (error_ == 0)
-            error_ = ::posix_spawnattr_setflags(&attributes_, POSIX_SPAWN_SETSIGMASK);
+        note(::posix_spawn_file_actions_init(&actions));
+        note(::posix_spawnattr_init(&attributes));
+        note(::posix_spawnattr_setsigmask(&attributes, &none));
+        note(::posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK));
     }
-    ~Attributes() { ::posix_spawnattr_destroy(&attributes_); }
-    Attributes(const Attributes&) = delete;
-    Attributes& operator=(const Attributes&) = delete;
+    ~SpawnSettings() {
+        ::posix_spawn_file_actions_destroy(&actions);
+        ::posix_spawnattr_destroy(&attributes);
+    }
+    SpawnSettings(const SpawnSettings&) = delete;
+    SpawnSettings& operator=(const SpawnSettings&) = delete;
 
-    const posix_spawnattr_t* get() const { return &attributes_; }
-    int error() const { return error_; }
+    void duplicate(int from, int onto) {
+        if (from >= 0)
+            note(::posix_spawn_file_actions_adddup2(&actions, from, onto));
+    }
+
+    posix_spawn_file_actions_t actions;
+    posix_spawnattr_t attributes;
+    int error = 0; // of the first step that failed
 
 private:
-    posix_spawnattr_t attributes_;
-    int error_;
+    void note(int result) { error = error != 0 ? error : result; }
 };
 
 } // namespace
@@ -75,17 +64,12 @@ int createPipe(Pipe& pipe) {
     int ends[2];
     if (::pipe2(ends, O_CLOEXEC) != 0)
         return errno;
-    FileDescriptor readEnd = aboveStandard(FileDescriptor(ends[0]));
-    FileDescriptor writeEnd = aboveStandard(FileDescriptor(ends[1]));
-    if (!readEnd || !writeEnd)
+    Pipe made{FileDescriptor(ends[0]), FileDescriptor(ends[1])};
+    made = {aboveStandard(std::move(made.readEnd)), aboveStandard(std::move(made.writeEnd))};
+    if (!made.readEnd || !made.writeEnd)
         return errno;
-    pipe = {readEnd.release(), writeEnd.release()};
+    pipe = std::move(made);
     return 0;
-}
-
-void closeDescriptor(int descriptor) {
-    if (descriptor >= 0)
-        ::close(descriptor);
 }
 
 int spawn(const std::vector<std::string>& argv, const StandardDescriptors& standard, pid_t& child) {
@@ -98,13 +82,12 @@ int spawn(const std::vector<std::string>& argv, const StandardDescriptors& stand
     if (length < 0 || length == sizeof path)
         return length < 0 ? errno : ENAMETOOLONG;
     path[length] = '\0';
-    FileActions actions;
-    actions.duplicate(standard.input, STDIN_FILENO);
-    actions.duplicate(standard.output, STDOUT_FILENO);
-    actions.duplicate(standard.error, STDERR_FILENO);
-    const Attributes attributes;
-    if (actions.error() != 0 || attributes.error() != 0)
-        return actions.error() != 0 ? actions.error() : attributes.error();
+    SpawnSettings settings;
+    settings.duplicate(standard.input, STDIN_FILENO);
+    settings.duplicate(standard.output, STDOUT_FILENO);
+    settings.duplicate(standard.error, STDERR_FILENO);
+    if (settings.error != 0)
+        return settings.error;
 
     std::vector<char*> arguments;
     arguments.reserve(argv.size() + 1);
@@ -112,16 +95,12 @@ int spawn(const std::vector<std::string>& argv, const StandardDescriptors& stand
         arguments.push_back(const_cast<char*>(argument.c_str()));
     arguments.push_back(nullptr);
     char* const environment[] = {nullptr};
-    return ::posix_spawn(&child, path, actions.get(), attributes.get(), arguments.data(), environment);
+    return ::posix_spawn(&child, path, &settings.actions, &settings.attributes, arguments.data(), environment);
 }
 
 Ending waitFor(pid_t child) {
     int status = 0;
-    pid_t found;
-    do
-        found = ::waitpid(child, &status, 0);
-    while (found < 0 && errno == EINTR);
-    if (found < 0)
+    if (TEMP_FAILURE_RETRY(::waitpid(child, &status, 0)) < 0)
         return {Ending::Unknown, errno};
     if (WIFEXITED(status))
         return {Ending::Exited, WEXITSTATUS(status)};
@@ -142,8 +121,8 @@ void makeNonBlocking(int descriptor) {
         ::fcntl(descriptor, F_SETFL, flags | O_NONBLOCK);
 }
 
-int openEnding(pid_t child) {
-    return static_cast<int>(::syscall(SYS_pidfd_open, child, 0));
+FileDescriptor openEnding(pid_t child) {
+    return FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, child, 0)));
 }
 
 Ready waitUntilReady(int writeEnd, int readEnd, pid_t child, int ending) {
@@ -171,18 +150,12 @@ std::size_t readableBytes(int readEnd) {
 }
 
 ssize_t readSome(int descriptor, void* bytes, std::size_t size) {
-    ssize_t count;
-    do
-        count = ::read(descriptor, bytes, size);
-    while (count < 0 && errno == EINTR);
+    const ssize_t count = TEMP_FAILURE_RETRY(::read(descriptor, bytes, size));
     return count < 0 ? -errno : count;
 }
 
 ssize_t writeSome(int descriptor, const void* bytes, std::size_t size) {
-    ssize_t count;
-    do
-        count = ::write(descriptor, bytes, size);
-    while (count < 0 && errno == EINTR);
+    const ssize_t count = TEMP_FAILURE_RETRY(::write(descriptor, bytes, size));
     return count < 0 ? -errno : count;
 }
 
@@ -203,7 +176,7 @@ void openStandardDescriptors() {
     do
         number = ::open("/dev/null", O_RDWR | O_CLOEXEC);
     while (number >= 0 && number <= STDERR_FILENO);
-    closeDescriptor(number);
+    const FileDescriptor oneTooMany(number);
 }
 
 BrokenPipeIgnored::BrokenPipeIgnored() {

@@ -1,4 +1,4 @@
-#include "platform/linux/system/PropertyList.h"
+#include "platform/PropertyList.h"
 
 #include <charconv>
 #include <cstring>

@@ -1,6 +1,6 @@
 #include "platform/SystemLog.h"
 
-#include <cerrno>
+#include <cstddef>
 #include <deque>
 #include <exception>
 #include <mutex>
@@ -28,19 +28,7 @@ public:
 
 namespace {
 
-int priority(SystemLogType type) {
-    switch (type) {
-    case SystemLogType::Error:
-        return LOG_ERR;
-    case SystemLogType::Debug:
-        return LOG_DEBUG;
-    case SystemLogType::Info:
-        return LOG_INFO;
-    case SystemLogType::Default:
-        break;
-    }
-    return LOG_NOTICE;
-}
+constexpr int priorities[] = {LOG_NOTICE, LOG_INFO, LOG_DEBUG, LOG_ERR}; // of the types, in their order
 
 iovec field(const std::string& text) {
     return {const_cast<char*>(text.data()), text.size()};
@@ -72,7 +60,7 @@ void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message
     if (message.ends_with('\n'))
         message.remove_suffix(1); // an entry of the journal is a line already
     const std::string text = "MESSAGE=" + std::string(message);
-    const std::string level = "PRIORITY=" + std::to_string(priority(type));
+    const std::string level = "PRIORITY=" + std::to_string(priorities[static_cast<std::size_t>(type)]);
     const iovec fields[] = {field(text), field(level), field(log->identifierField), field(log->categoryField)};
     sd_journal_sendv(fields, static_cast<int>(std::size(fields))); // without a journal this does nothing
 } catch (const std::exception&) {
@@ -83,8 +71,7 @@ void consoleLog(std::string_view line) try {
     std::string text;
     utf8::appendOnOneLine(text, line);
     text += '\n';
-    while (::write(STDERR_FILENO, text.data(), text.size()) < 0 && errno == EINTR) {
-    }
+    static_cast<void>(TEMP_FAILURE_RETRY(::write(STDERR_FILENO, text.data(), text.size())));
 } catch (const std::exception&) {
     return;
 }

@@ -6,8 +6,8 @@
 // symbolic link, nor anything that is renamed or swapped in meanwhile leads out of the root; a link of /proc counts as
 // the path that it shows. This needs nothing of the kernel that an old one, a system-call filter or an emulator lacks.
 // Code that needs more than one operation on a place opens the directory once and goes on with the *at system calls.
-#ifndef VELTRA_PLATFORM_LINUX_DEVICE_ROOT_H
-#define VELTRA_PLATFORM_LINUX_DEVICE_ROOT_H
+#ifndef VELTRA_PLATFORM_DEVICE_ROOT_H
+#define VELTRA_PLATFORM_DEVICE_ROOT_H
 
 #include <optional>
 #include <string>
@@ -16,8 +16,8 @@
 
 #include <sys/types.h>
 
+#include "platform/FileDescriptor.h"
 #include "platform/Value.h"
-#include "platform/linux/system/FileDescriptor.h"
 
 // The device root as the environment names it.
 std::string deviceRootPath();
