@@ -31,6 +31,8 @@
 #include <stdbool.h>
 #include <stdint.h>
 
+#include "der/DERTypes.h"
+
 #if defined(__GNUC__)
 #define SYSCONFIG3_API __attribute__((visibility("default")))
 #define SYSCONFIG3_PRINTF(text, arguments) __attribute__((format(printf, text, arguments)))
@@ -95,6 +97,31 @@ SYSCONFIG3_API SysConfig3ExceptionHandler getSysConfig3ExceptionHandler(void);
 // - HMACs that do not match: they are examined when the object is changed or encoded;
 // - an entry with the deleted flag in any version.
 SYSCONFIG3_API struct __SysConfig3* decodeSysConfig3(const uint8_t* data, uint32_t length);
+
+// What was refused in a blob, in the order in which it is looked at.
+typedef enum SysConfig3Subject {
+    SysConfig3SubjectNone,
+    SysConfig3SubjectBlob,
+    SysConfig3SubjectMagic,
+    SysConfig3SubjectVersion,
+    SysConfig3SubjectPayload,
+    SysConfig3SubjectPayloadEntry,
+    SysConfig3SubjectMetadata,
+    SysConfig3SubjectMetadataEntry,
+    SysConfig3SubjectManifest
+} SysConfig3Subject;
+
+typedef struct SysConfig3Refusal {
+    SysConfig3Subject subject;
+    DERReturn status; // DERSuccess for a value that is not supported, DERBufferOverflow when memory is lacking
+    const uint8_t*
+        place;           // where the item at fault begins, or where a missing one would; without a fault the blob's end
+    DERRefusal encoding; // why an item was refused, unless its fault is DERFaultNone: then `status` says all there is
+} SysConfig3Refusal;
+
+// The same, and says in *refusal, which may be null, why there is no object.
+SYSCONFIG3_API struct __SysConfig3* decodeSysConfig3Explained(const uint8_t* data, uint32_t length,
+                                                              SysConfig3Refusal* refusal);
 
 // Encodes the object into a new buffer: out->data, which the caller releases with free(), and out->length. The object
 // is only read, and its manifest is written as it stands, so an object of version 0x30002 must hold valid HMACs. Fails

@@ -96,26 +96,43 @@ SysConfigData dataOf(const DERItem& item) {
     return {const_cast<std::uint8_t*>(item.data), static_cast<std::uint32_t>(item.length)};
 }
 
+bool refuse(SysConfig3Refusal* refusal, SysConfig3Subject subject, DERReturn status, const std::uint8_t* place) {
+    refusal->subject = subject;
+    refusal->status = status;
+    refusal->place = place;
+    return false;
+}
+
 // The one item that an element of the blob holds, and the formats that report anything else.
 struct Element {
+    SysConfig3Subject subject;
+    SysConfig3Subject entry;
     DERTag tag;
     const char* undecodable;
     const char* otherTag;
 };
 
-constexpr Element payloadElement = {DERTagSet, "Unable to decode payload with error %d",
+constexpr Element payloadElement = {SysConfig3SubjectPayload, SysConfig3SubjectPayloadEntry, DERTagSet,
+                                    "Unable to decode payload with error %d",
                                     "Tag was not the expected Payload tag %llX"};
-constexpr Element metadataElement = {DERTagSet, "Unable to decode metadata with error %d",
+constexpr Element metadataElement = {SysConfig3SubjectMetadata, SysConfig3SubjectMetadataEntry, DERTagSet,
+                                     "Unable to decode metadata with error %d",
                                      "Tag was not the expected metadata tag %llX"};
-constexpr Element manifestElement = {DERTagSequence, "Unable to decode manifest with error %d",
+constexpr Element manifestElement = {SysConfig3SubjectManifest, SysConfig3SubjectNone, DERTagSequence,
+                                     "Unable to decode manifest with error %d",
                                      "Tag was not the expected manifest tag %llX"};
 
-bool openElement(const DERItem& element, const Element& expected, DERItem* content) {
+bool openElement(const DERItem& element, const Element& expected, DERItem* content, SysConfig3Refusal* refusal) {
     DERDecodedInfo item;
-    if (const DERReturn result = DERDecodeItem(&element, &item); result != DERSuccess)
-        return logHook()(messageLevel, expected.undecodable, static_cast<int>(result)), false;
-    if (item.tag != expected.tag)
-        return logHook()(messageLevel, expected.otherTag, static_cast<unsigned long long>(item.tag)), false;
+    if (const DERReturn result = DERDecodeItemExplained(&element, &item, &refusal->encoding); result != DERSuccess) {
+        logHook()(messageLevel, expected.undecodable, static_cast<int>(result));
+        return refuse(refusal, expected.subject, result, element.data);
+    }
+    if (item.tag != expected.tag) {
+        logHook()(messageLevel, expected.otherTag, static_cast<unsigned long long>(item.tag));
+        refusal->encoding = {DERFaultTag, 0, element.data, element.data, item.tag, expected.tag};
+        return refuse(refusal, expected.subject, DERUnexpectedTag, element.data);
+    }
     *content = item.content;
     return true;
 }
@@ -123,32 +140,34 @@ bool openElement(const DERItem& element, const Element& expected, DERItem* conte
 // Fills a list of the object with the entries of an element.
 template <typename List>
 bool decodeList(const DERItem& element, const Element& expected, DERDecodeSequenceCallback addEntry,
-                __SysConfig3* object, List* list) {
+                __SysConfig3* object, List* list, SysConfig3Refusal* refusal) {
     constexpr char operation[] = "struct __SysConfig3 *__singledecodeSysConfig3(const uint8_t *, uint32_t)";
-    DERItem entries;
-    if (!openElement(element, expected, &entries))
+    DERItem rest;
+    if (!openElement(element, expected, &rest, refusal))
         return false;
-    if (const DERReturn result = DERDecodeSequenceContentWithBlock(&entries, addEntry, object); result != DERSuccess)
-        return logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result)), false;
+    const std::uint8_t* const end = rest.data + rest.length;
+    while (rest.data != end) {
+        DERDecodedInfo entry;
+        bool stop = false;
+        DERReturn result = DERDecodeItemExplained(&rest, &entry, &refusal->encoding);
+        if (result == DERSuccess)
+            result = addEntry(&entry, &stop, object);
+        if (result != DERSuccess) {
+            logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result));
+            return refuse(refusal, expected.entry, result, rest.data);
+        }
+        rest.data = entry.content.data + entry.content.length;
+        rest.length = static_cast<std::uint64_t>(end - rest.data);
+    }
     if (list->indexAll(object->secret))
         return true;
     logHook()(messageLevel, "%s malloc failed.", operation);
-    return false;
+    return refuse(refusal, expected.subject, DERBufferOverflow, element.data);
 }
 
-bool decodePayload(const DERItem& element, __SysConfig3* object) {
-    return decodeList(element, payloadElement, _DERDecodeSysConfig3ParseAndPopulatePayloadSequence, object,
-                      &object->payload);
-}
-
-bool decodeMetadata(const DERItem& element, __SysConfig3* object) {
-    return decodeList(element, metadataElement, _DERDecodeSysConfig3ParseAndPopulateMetadataSequence, object,
-                      &object->metadata);
-}
-
-bool decodeManifest(const DERItem& element, __SysConfig3* object) {
+bool decodeManifest(const DERItem& element, __SysConfig3* object, SysConfig3Refusal* refusal) {
     DERItem content;
-    if (!openElement(element, manifestElement, &content))
+    if (!openElement(element, manifestElement, &content, refusal))
         return false;
     ManifestItems items;
     if (const DERReturn result = parse(content, DERDecodeSysConfig3ManifestItemSpecs, &items); result != DERSuccess) {
@@ -158,7 +177,23 @@ bool decodeManifest(const DERItem& element, __SysConfig3* object) {
     }
     const bool empty = items.payloadHMAC.length == 0 && items.metadataHMAC.length == 0 && items.fullHMAC.length == 0;
     return empty ||
-           installManifest(object, dataOf(items.payloadHMAC), dataOf(items.metadataHMAC), dataOf(items.fullHMAC));
+           installManifest(object, dataOf(items.payloadHMAC), dataOf(items.metadataHMAC), dataOf(items.fullHMAC)) ||
+           refuse(refusal, SysConfig3SubjectManifest, DERBufferOverflow, element.data);
+}
+
+// Parses the outer SEQUENCE.
+bool parseBlob(const DERItem& blob, BlobItems* items, SysConfig3Refusal* refusal) {
+    constexpr SysConfig3Subject elements[] = {SysConfig3SubjectMagic, SysConfig3SubjectVersion,
+                                              SysConfig3SubjectPayload, SysConfig3SubjectMetadata,
+                                              SysConfig3SubjectManifest};
+    const DERRefusal& encoding = refusal->encoding;
+    const DERReturn result =
+        DERParseSequenceExplained(&blob, DERDecodeSysConfig3ItemSpecs.size(), DERDecodeSysConfig3ItemSpecs.data(),
+                                  items, sizeof *items, sizeof *items, &refusal->encoding);
+    if (result == DERSuccess)
+        return true;
+    const bool isElement = encoding.fault == DERFaultTag || encoding.fault == DERFaultMissing;
+    return refuse(refusal, isElement ? elements[encoding.row] : SysConfig3SubjectBlob, result, encoding.item);
 }
 
 } // namespace
@@ -198,26 +233,45 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
     return append(makeEntry(content), &object->metadata);
 }
 
-__SysConfig3* decodeSysConfig3(const std::uint8_t* data, std::uint32_t length) {
+__SysConfig3* decodeSysConfig3Explained(const std::uint8_t* data, std::uint32_t length, SysConfig3Refusal* refusal) {
+    SysConfig3Refusal unasked;
+    if (refusal == nullptr)
+        refusal = &unasked;
+    *refusal = {};
     const DERItem blob = {data, data != nullptr ? length : 0};
     BlobItems items;
-    if (DERParseSequenceToObject(&blob, DERDecodeSysConfig3ItemSpecs.size(), DERDecodeSysConfig3ItemSpecs.data(),
-                                 &items, sizeof items, sizeof items) != DERSuccess)
+    if (!parseBlob(blob, &items, refusal))
         return nullptr;
     const SysConfig3Magic magic = valueOf(items.magic);
     const SysConfig3Version version = valueOf(items.version);
-    if (!isSupportedSysConfig3Magic(magic))
-        return logHook()(messageLevel, "Sysconfig magic 0x%X is not valid", magic), nullptr;
+    if (!isSupportedSysConfig3Magic(magic)) {
+        logHook()(messageLevel, "Sysconfig magic 0x%X is not valid", magic);
+        refuse(refusal, SysConfig3SubjectMagic, DERSuccess, items.magic.data);
+        return nullptr;
+    }
     __SysConfig3* const object = allocSysConfig3(magic, version);
     if (object == nullptr) {
         logHook()(messageLevel,
                   "Unable to allocate sysconfig3vX object. Likely due to an unsupported magic: 0x%X or version: 0x%X",
                   magic, version);
+        if (isSupportedSysConfig3Version(version))
+            refuse(refusal, SysConfig3SubjectBlob, DERBufferOverflow, data);
+        else
+            refuse(refusal, SysConfig3SubjectVersion, DERSuccess, items.version.data);
         return nullptr;
     }
-    if (decodePayload(items.payload, object) && decodeMetadata(items.metadata, object) &&
-        decodeManifest(items.manifest, object))
+    if (decodeList(items.payload, payloadElement, _DERDecodeSysConfig3ParseAndPopulatePayloadSequence, object,
+                   &object->payload, refusal) &&
+        decodeList(items.metadata, metadataElement, _DERDecodeSysConfig3ParseAndPopulateMetadataSequence, object,
+                   &object->metadata, refusal) &&
+        decodeManifest(items.manifest, object, refusal)) {
+        refusal->place = items.manifest.data + items.manifest.length;
         return object;
+    }
     deallocSysConfig3(object);
     return nullptr;
+}
+
+__SysConfig3* decodeSysConfig3(const std::uint8_t* data, std::uint32_t length) {
+    return decodeSysConfig3Explained(data, length, nullptr);
 }

@@ -7,7 +7,6 @@
 #include <string>
 #include <vector>
 
-#include "der/DERDecode.h"
 #include "sysconfig/SysConfig3.h"
 #include "sysconfig/SysConfig3Ptr.h"
 #include "tools/orloctl/DerText.h"
@@ -141,53 +140,46 @@ std::string hmacState(__SysConfig3* object, const Value::Data& key) {
     return sysConfig3IsValidHMAC(object) ? "valid" : "do not match";
 }
 
-// Why the outer structure of a blob is refused; the library itself says nothing about that.
-std::string outerProblem(const Value::Data& blob) {
-    const DERItem der{blob.data(), blob.size()};
-    DERTag tag = 0;
-    DERSequence sequence = {};
-    if (blob.empty())
-        return "The file is empty.";
-    if (const DERReturn result = DERDecodeSeqInit(&der, &tag, &sequence); result != DERSuccess || tag != DERTagSequence)
-        return result == DERDecodeError ? "No strict DER item of definite length lies whole at offset 0."
-                                        : "The item at offset 0 is no SEQUENCE.";
-    constexpr struct {
-        const char* name;
-        DERTag tag;
-    } elements[] = {{"magic", DERTagInteger},
-                    {"version", DERTagInteger},
-                    {"payload", DERTagPrivateConstructed(0x53504159)},
-                    {"metadata", DERTagPrivateConstructed(0x4D455441)},
-                    {"manifest", DERTagPrivateConstructed(0x4D414E49)}};
-    for (const auto& element : elements) {
-        const std::string place =
-            std::string(element.name) + " element, at offset " + std::to_string(sequence.next - blob.data());
-        DERDecodedInfo item = {};
-        const DERReturn result = DERDecodeSeqNext(&sequence, &item);
-        if (result == DEREndOfSequence)
-            return "The blob ends before the " + place + ".";
-        if (result != DERSuccess)
-            return "The " + place + ", is not strict DER.";
-        if (item.tag != element.tag)
-            return "The " + place + ", has another tag than its own.";
+// Why there is no object, of which `said` is the library's last message.
+std::string reason(const SysConfig3Refusal& refusal, const std::string& said, const Value::Data& blob) {
+    constexpr const char* names[] = {"",         "blob",           "magic",   "version", "payload", "payload entry",
+                                     "metadata", "metadata entry", "manifest"};
+    const DERRefusal& encoding = refusal.encoding;
+    const std::string name = names[refusal.subject];
+    const std::string place = ", at offset " + std::to_string(refusal.place - blob.data());
+    const std::string subject = "The " + name + place + ", ";
+    switch (encoding.fault) {
+    case DERFaultMissing:
+        return "The blob ends before the " + name + place + ".";
+    case DERFaultExcess:
+        return "Octets follow the manifest" + place + ".";
+    case DERFaultNoSequence:
+        return subject + "is " + derTagName(encoding.tag) + " and should be SEQUENCE.";
+    case DERFaultTag:
+        return subject + "is " + derTagName(encoding.tag) + " and should be " + derTagName(encoding.expected) + ".";
+    case DERFaultNone:
+        break;
+    default:
+        return subject + "is no DER: " + derFaultText(encoding) + ".";
     }
-    return "Octets follow the manifest element, at offset " + std::to_string(sequence.next - blob.data()) + ".";
+    switch (refusal.status) {
+    case DERUnexpectedTag:
+        return subject + "has a field that does not belong there.";
+    case DERIncompleteSequence:
+        return subject + "lacks a field.";
+    case DERDecodeError:
+        return subject + "has a field that is no DER, or more fields than there are.";
+    default:
+        return said;
+    }
 }
 
-Report refused(const Messages& why, const Value::Data& blob) {
+Report refused(const std::string& why, const Messages& said) {
     Report report;
     report.ok = false;
-    report.problem = "No configuration blob. " + (why.last.empty() ? outerProblem(blob) : why.last);
-    addMessages(report.json, why);
+    report.problem = "No configuration blob. " + why;
+    addMessages(report.json, said);
     return report;
-}
-
-// The octets behind the outer SEQUENCE, at which the library does not look.
-std::uint64_t octetsBehind(const Value::Data& blob) {
-    const DERItem whole{blob.data(), blob.size()};
-    DERDecodedInfo outer = {};
-    DERDecodeItem(&whole, &outer);
-    return static_cast<std::uint64_t>(blob.data() + blob.size() - (outer.content.data + outer.content.length));
 }
 
 } // namespace
@@ -195,11 +187,15 @@ std::uint64_t octetsBehind(const Value::Data& blob) {
 Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
     const MessageCollector collector;
     if (blob.size() > std::numeric_limits<std::uint32_t>::max())
-        return refused({{}, 0, "It is larger than 4 GiB."}, blob);
-    const ObjectPtr object(decodeSysConfig3(blob.data(), static_cast<std::uint32_t>(blob.size())),
+        return refused("It is larger than 4 GiB.", {});
+    if (blob.empty())
+        return refused("The file is empty.", {});
+    SysConfig3Refusal refusal;
+    const ObjectPtr object(decodeSysConfig3Explained(blob.data(), static_cast<std::uint32_t>(blob.size()), &refusal),
                            sysconfig::Release());
+    const Messages& said = collector.collected();
     if (!object)
-        return refused(collector.collected(), blob);
+        return refused(reason(refusal, said.last, blob), said);
     Report report;
     report.json = {
         {"magic", codeText(sysConfig3GetMagic(object.get()))},
@@ -208,8 +204,8 @@ Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
         {"metadata", report.lists.add(metadataEntries(object), sysConfig3GetMetadataEntryCount(object.get()))},
         {"hmacState", hmacState(object.get(), hmacKey)},
         {"hmacs", manifestHMACs(object.get())}};
-    addMessages(report.json, collector.collected());
-    if (const std::uint64_t behind = octetsBehind(blob); behind != 0)
+    addMessages(report.json, said);
+    if (const auto behind = blob.data() + blob.size() - refusal.place; behind != 0)
         report.json["octetsBehind"] = behind;
     if (report.json["hmacState"] == "do not match") {
         report.ok = false;
