@@ -82,7 +82,8 @@ std::string contentsOf(const std::string& text) {
     if (!text.starts_with('<'))
         return unescaped(text);
     const Value data = json(R"({"$data": ")" + text.substr(1, text.size() - 2) + R"("})");
-    return {data.data()->begin(), data.data()->end()};
+    return data.data() ? std::string(data.data()->begin(), data.data()->end())
+                       : throw std::runtime_error("no octets: " + text);
 }
 
 // A device, services and files with which every command succeeds, and what a transcript changes of them.
@@ -108,7 +109,7 @@ public:
         else if (verb == "folder")
             root_.makeDirectory(name);
         else if (verb == "replace") // in a file, some octets by others
-            replace(name, contentsOf(takeWord(line)), contentsOf(line));
+            replace(name, contentsOf(takeWord(line)), line);
         else if (verb == "file")
             root_.write(name, contentsOf(line));
         else
@@ -140,7 +141,7 @@ private:
         const std::size_t at = contents.find(from);
         if (at == std::string::npos)
             throw std::runtime_error("nothing to replace in " + name);
-        root_.write(name, contents.replace(at, from.size(), to));
+        root_.write(name, contents.replace(at, from.size(), contentsOf(to)));
     }
 
     static constexpr const char* description = "/etc/veltra/device.json";

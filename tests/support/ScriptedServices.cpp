@@ -1,10 +1,9 @@
 #include "tests/support/ScriptedServices.h"
 
 #include <chrono>
-#include <condition_variable>
-#include <mutex>
 #include <thread>
 #include <utility>
+#include <vector>
 
 #include "platform/Crypto.h"
 #include "platform/Format.h"
@@ -193,22 +192,30 @@ public:
             deliverer_.join();
     }
 
-    void resume(const Value& statuses) {
+    void resume(const Value& output) {
         resumed_ = std::chrono::steady_clock::now();
-        deliverer_ = std::thread([statuses, own = callback] { deliver(statuses, own); });
+        // The thread allocates nothing, since nobody would catch what it raises.
+        deliverer_ = std::thread([statuses = statusesOf(output), own = callback] {
+            for (const std::int32_t status : statuses)
+                own(status);
+        });
     }
 
     // After how many whole seconds.
-    std::string invalidate(const Value& statuses) {
+    std::string invalidate(const Value& output) {
         const auto waited = std::chrono::steady_clock::now() - resumed_;
-        deliver(statuses, callback);
+        for (const std::int32_t status : statusesOf(output))
+            callback(status);
         return format(" after %ld s", std::chrono::duration_cast<std::chrono::seconds>(waited).count());
     }
 
 private:
-    static void deliver(const Value& statuses, const RPAvailabilityCallback& to) {
-        for (const Value& status : statuses.array() ? *statuses.array() : Value::Array())
-            to(static_cast<std::int32_t>(*status.integer()));
+    static std::vector<std::int32_t> statusesOf(const Value& output) {
+        std::vector<std::int32_t> statuses;
+        if (const Value::Array* given = output.array())
+            for (const Value& status : *given)
+                statuses.push_back(static_cast<std::int32_t>(*status.integer()));
+        return statuses;
     }
 
     std::chrono::steady_clock::time_point resumed_;
