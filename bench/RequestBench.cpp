@@ -13,7 +13,7 @@
 #include <systemd/sd-daemon.h>
 #include <systemd/sd-event.h>
 
-#include "platform/linux/services/BusValue.h"
+#include "platform/linux/services/bus/BusValue.h"
 
 namespace {
 

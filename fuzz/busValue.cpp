@@ -1,6 +1,6 @@
 // Bus argument mapping: a message is written as the input says, with any types at any depth, and read as a request. It
 // must be refused or become a dictionary that survives being written and read once more.
-#include "platform/linux/services/BusValue.h"
+#include "platform/linux/services/bus/BusValue.h"
 
 #include <cstdint>
 #include <cstdlib>

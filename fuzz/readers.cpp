@@ -18,9 +18,9 @@
 #include "platform/Json.h"
 #include "platform/PropertyList.h"
 #include "platform/URL.h"
-#include "platform/linux/services/Http.h"
-#include "platform/linux/services/OrloRemoteSettings.h"
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/http/Http.h"
+#include "platform/linux/services/store/OrloRemoteSettings.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 #include "platform/linux/system/DescriptionCheck.h"
 #include "tests/support/TemporaryRoot.h"
 

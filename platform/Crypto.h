@@ -1,4 +1,5 @@
-// Cryptographic primitives, by published algorithm. Backed by a maintained library; nothing here is home-made.
+// Cryptographic primitives, by published algorithm. Digests, signatures and arithmetic are those of a maintained
+// library.
 //
 // Every operation may be called from any thread on objects of its own. Byte arguments are only read during the call. An
 // operation that returns false has run out of memory or has met a broken library; its output is then all zero. What the

@@ -56,7 +56,7 @@ public:
     virtual void handleMessage(const HSMessageRequest& request, const HSCompletion& completion) = 0;
 };
 
-// Base of a plug-in server. On Linux the framework is a D-Bus service, as platform/linux/services/HostFramework.cpp
+// Base of a plug-in server. On Linux the framework is a D-Bus service, as platform/linux/services/bus/HostFramework.cpp
 // says.
 class VeltraPluginServer : public VeltraPluginServerInterface {
 public:

@@ -64,7 +64,7 @@ void QDOrloLogSetHandler(QDOrloLogHandler handler);
 // "/var/lib/orlo/store.db"). Folder and database are made when they are missing.
 //
 // A remote store is a server, or an S3-compatible object store when the description's "store" has "s3". How the servers
-// are reached stands there too: see platform/linux/services/OrloRemoteSettings.h. These options count:
+// are reached stands there too: see platform/linux/services/store/OrloRemoteSettings.h. These options count:
 //   "DSURL"                    https URL of the server of records and exports
 //   "CAURL"                    https URL whose "/orlotrustobject" is the measure of the trust object
 //   "EnableProxy"              true: http URLs are fetched through the device's proxy (ReverseProxy.h), if there is one

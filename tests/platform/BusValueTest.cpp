@@ -1,4 +1,4 @@
-#include "platform/linux/services/BusValue.h"
+#include "platform/linux/services/bus/BusValue.h"
 
 #include <cstdint>
 #include <functional>

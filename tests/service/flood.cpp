@@ -9,7 +9,7 @@
 #include <systemd/sd-bus.h>
 #include <systemd/sd-event.h>
 
-#include "platform/linux/services/BusValue.h"
+#include "platform/linux/services/bus/BusValue.h"
 
 namespace {
 

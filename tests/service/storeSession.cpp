@@ -10,7 +10,7 @@
 #include "platform/Files.h"
 #include "platform/Json.h"
 #include "platform/OrloDataStore.h"
-#include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/device/DeviceDescription.h"
 
 namespace {
 

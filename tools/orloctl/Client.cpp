@@ -16,7 +16,7 @@
 
 #include "platform/DeviceRoot.h"
 #include "platform/ShownText.h"
-#include "platform/linux/services/BusValue.h"
+#include "platform/linux/services/bus/BusValue.h"
 #include "tools/orloctl/Interruption.h"
 
 namespace {

@@ -8,7 +8,7 @@
 #include <openssl/cms.h>
 #include <openssl/objects.h>
 
-#include "platform/linux/services/X509Certificate.h"
+#include "platform/linux/services/device/X509Certificate.h"
 
 namespace CertificateService {
 

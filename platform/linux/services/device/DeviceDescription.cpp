@@ -1,4 +1,4 @@
-#include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/device/DeviceDescription.h"
 
 #include <mutex>
 #include <string>

@@ -26,9 +26,9 @@
 #include "platform/Crypto.h"
 #include "platform/DeviceRoot.h"
 #include "platform/SystemLog.h"
-#include "platform/linux/services/BusValue.h"
-#include "platform/linux/services/DeviceDescription.h"
-#include "platform/linux/services/Http.h"
+#include "platform/linux/services/bus/BusValue.h"
+#include "platform/linux/services/device/DeviceDescription.h"
+#include "platform/linux/services/http/Http.h"
 
 namespace {
 

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/device/DeviceDescription.h"
 
 constexpr std::string_view MiravelSNKey = "JlvBpIcyjzTcAplFQmGACg";
 constexpr std::string_view CoverGlassSNKey = "OhrmT+BS3mZKIKMk7BiWGg";

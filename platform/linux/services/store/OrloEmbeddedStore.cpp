@@ -5,9 +5,9 @@
 
 #include "platform/DeviceRoot.h"
 #include "platform/Format.h"
-#include "platform/linux/services/OrloDatabase.h"
-#include "platform/linux/services/OrloStoreBackend.h"
-#include "platform/linux/services/OrloTrustObject.h"
+#include "platform/linux/services/store/OrloDatabase.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
+#include "platform/linux/services/store/OrloTrustObject.h"
 
 namespace {
 

@@ -5,7 +5,7 @@
 #include <utility>
 
 #include "platform/Format.h"
-#include "platform/linux/services/Http.h"
+#include "platform/linux/services/http/Http.h"
 
 namespace {
 

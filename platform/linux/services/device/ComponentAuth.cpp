@@ -18,8 +18,8 @@
 #include "platform/Files.h"
 #include "platform/HardwareRegistry.h"
 #include "platform/SystemLog.h"
-#include "platform/linux/services/DeviceDescription.h"
-#include "platform/linux/services/X509Certificate.h"
+#include "platform/linux/services/device/DeviceDescription.h"
+#include "platform/linux/services/device/X509Certificate.h"
 #include "platform/linux/system/DelayedCalls.h"
 
 namespace {

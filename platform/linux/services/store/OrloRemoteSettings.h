@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/Value.h"
-#include "platform/linux/services/Http.h"
+#include "platform/linux/services/http/Http.h"
 
 struct OrloRemoteSettings {
     // Where the records lie on an S3-compatible object store, and how its requests are signed.

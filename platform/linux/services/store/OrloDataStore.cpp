@@ -11,8 +11,8 @@
 
 #include "platform/Format.h"
 #include "platform/Utf8.h"
-#include "platform/linux/services/DeviceDescription.h"
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/device/DeviceDescription.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 
 struct __QDOrlo {
     OrloOptions options = Value::Dictionary{};

@@ -1,4 +1,4 @@
-#include "platform/linux/services/Http.h"
+#include "platform/linux/services/http/Http.h"
 
 #include <algorithm>
 #include <charconv>

@@ -1,4 +1,4 @@
-#include "platform/linux/services/OrloTrustObject.h"
+#include "platform/linux/services/store/OrloTrustObject.h"
 
 #include <cerrno>
 #include <cstring>
@@ -9,7 +9,7 @@
 
 #include "platform/Crypto.h"
 #include "platform/DeviceRoot.h"
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 #include "platform/linux/system/NewFile.h"
 
 namespace {

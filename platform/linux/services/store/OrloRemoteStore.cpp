@@ -14,9 +14,9 @@
 #include "platform/Hexadecimal.h"
 #include "platform/ReverseProxy.h"
 #include "platform/Utf8.h"
-#include "platform/linux/services/Http.h"
-#include "platform/linux/services/OrloRemoteSettings.h"
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/http/Http.h"
+#include "platform/linux/services/store/OrloRemoteSettings.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 
 namespace {
 

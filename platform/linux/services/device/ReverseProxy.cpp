@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/SystemLog.h"
-#include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/device/DeviceDescription.h"
 #include "platform/linux/system/DelayedCalls.h"
 
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/linux/services/OrloDatabase.h"
+#include "platform/linux/services/store/OrloDatabase.h"
 
 #include <cerrno>
 #include <chrono>
@@ -9,7 +9,7 @@
 #include <sys/stat.h>
 
 #include "platform/Files.h"
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 #include "platform/linux/system/NewFile.h"
 
 namespace {

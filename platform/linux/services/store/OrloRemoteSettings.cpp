@@ -1,4 +1,4 @@
-#include "platform/linux/services/OrloRemoteSettings.h"
+#include "platform/linux/services/store/OrloRemoteSettings.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -13,7 +13,7 @@
 
 #include "platform/DeviceRoot.h"
 #include "platform/Files.h"
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 #include "platform/linux/system/OpenSSL.h"
 
 namespace {

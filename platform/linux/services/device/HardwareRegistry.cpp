@@ -4,7 +4,7 @@
 #include <mutex>
 #include <utility>
 
-#include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/device/DeviceDescription.h"
 
 namespace HardwareRegistry {
 

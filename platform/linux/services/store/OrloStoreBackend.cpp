@@ -1,4 +1,4 @@
-#include "platform/linux/services/OrloStoreBackend.h"
+#include "platform/linux/services/store/OrloStoreBackend.h"
 
 #include "platform/Hexadecimal.h"
 

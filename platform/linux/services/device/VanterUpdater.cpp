@@ -8,7 +8,7 @@
 #include "platform/Crypto.h"
 #include "platform/Files.h"
 #include "platform/Format.h"
-#include "platform/linux/services/DeviceDescription.h"
+#include "platform/linux/services/device/DeviceDescription.h"
 
 namespace {
 
