@@ -98,13 +98,18 @@ Img4ChainRefusal splitChain(const DERItem& certChain, uint32_t length, Encodings
     }
 }
 
-bool verifySignature(const Certificate& issuer, const Certificate& issued, const Img4TrustProfile& profile) {
+bool verifySignature(const Certificate& issuer, const Certificate& issued, const Img4TrustProfile& profile,
+                     Img4TrustRefusal* why) {
     const uint64_t length = profile.digestInfo->length;
     uint8_t digest[Img4LongestDigest];
     DERItem signature;
-    return parseOctets(issued.fields.signature, &signature) && length <= sizeof digest &&
-           profile.computeDigest(&issued.fields.tbs, digest, length, &profile) == DERSuccess &&
-           profile.verifySignature(&issuer.key, &signature, digest, length, &profile) == DERSuccess;
+    if (parseOctets(issued.fields.signature, &signature))
+        return length <= sizeof digest &&
+               profile.computeDigest(&issued.fields.tbs, digest, length, &profile) == DERSuccess &&
+               verifySignatureOf(profile, issuer.key, signature, digest, why) == DERSuccess;
+    if (why != nullptr)
+        why->signature.fault = Img4SignatureForm;
+    return false;
 }
 
 bool isSignedWith(const Certificate& certificate, KeyKind kind, const DERItem* algorithmOid) {
@@ -115,12 +120,12 @@ bool isSignedWith(const Certificate& certificate, KeyKind kind, const DERItem* a
 }
 
 Img4ChainFault checkIssued(const Certificate& issuer, const Certificate& issued, KeyKind kind,
-                           const Img4TrustProfile& profile) {
+                           const Img4TrustProfile& profile, Img4TrustRefusal* why) {
     if (!areEqual(issued.tbs.issuer, issuer.tbs.subject))
         return Img4ChainIssuer;
     if (!isSignedWith(issued, kind, profile.signatureAlgorithmOid))
         return Img4ChainSignatureAlgorithm;
-    return verifySignature(issuer, issued, profile) ? Img4ChainSound : Img4ChainSignature;
+    return verifySignature(issuer, issued, profile, why) ? Img4ChainSound : Img4ChainSignature;
 }
 
 // Finds the common name among the attributes of one RelativeDistinguishedName, as a whole encoding.
@@ -181,9 +186,10 @@ bool findConstraints(const DERItem& extensions, const DERItem& oid, DERItem* cer
 }
 
 Img4ChainRefusal verifyCertificates(const ChainRules& rules, const Certificate* certificates,
-                                    const DERItem& authorityName, const Img4TrustProfile& profile) {
+                                    const DERItem& authorityName, const Img4TrustProfile& profile,
+                                    Img4TrustRefusal* why) {
     for (uint32_t i = 1; i < rules.length; ++i) {
-        const Img4ChainFault fault = checkIssued(certificates[i - 1], certificates[i], rules.key, profile);
+        const Img4ChainFault fault = checkIssued(certificates[i - 1], certificates[i], rules.key, profile, why);
         if (fault != Img4ChainSound)
             return {fault, i};
     }
@@ -198,27 +204,18 @@ bool arePresent(const ChainArguments& arguments) {
            profile->verifySignature != nullptr && profile->digestInfo != nullptr;
 }
 
-} // namespace
-
-Img4ChainRefusal img4::verifyChain(const ChainRules& rules, const DERItem& root, const Img4TrustDomain& domain,
-                                   const ChainArguments& arguments) {
-    if (arguments.leafKey == nullptr || arguments.certProperties == nullptr)
-        return {Img4ChainParameters, 0};
-    *arguments.leafKey = {};
-    *arguments.certProperties = {};
-    if (!arePresent(arguments))
-        return {Img4ChainParameters, 0};
-    Encodings encodings = {{root}, 1};
-    if (const Img4ChainRefusal refusal = splitChain(*arguments.certChain, rules.length, &encodings);
+Img4ChainRefusal verify(const ChainRules& rules, const Img4TrustDomain& domain, const ChainArguments& arguments,
+                        Encodings* encodings, Img4TrustRefusal* why) {
+    if (const Img4ChainRefusal refusal = splitChain(*arguments.certChain, rules.length, encodings);
         refusal.fault != Img4ChainSound)
         return refusal;
     Certificate certificates[longestChain];
     for (uint32_t i = 0; i < rules.length; ++i) {
-        const Img4ChainFault fault = parseCertificate(encodings.certificates[i], rules.key, &certificates[i]);
+        const Img4ChainFault fault = parseCertificate(encodings->certificates[i], rules.key, &certificates[i]);
         if (fault != Img4ChainSound)
             return {fault, i};
     }
-    Img4ChainRefusal refusal = verifyCertificates(rules, certificates, domain.authorityName, *arguments.profile);
+    Img4ChainRefusal refusal = verifyCertificates(rules, certificates, domain.authorityName, *arguments.profile, why);
     if (refusal.fault != Img4ChainSound)
         return refusal;
     const Certificate& leaf = certificates[rules.length - 1];
@@ -227,5 +224,40 @@ Img4ChainRefusal img4::verifyChain(const ChainRules& rules, const DERItem& root,
         return {Img4ChainExtensions, rules.length - 1};
     }
     *arguments.leafKey = leaf.key;
+    return refusal;
+}
+
+// Says where the certificate that was refused begins, or in which octet it is no DER. The root is not in the input.
+void explain(const DERItem& certChain, const Encodings& encodings, const Img4ChainRefusal& refusal,
+             Img4TrustRefusal* why) {
+    const uint32_t number = refusal.certificate;
+    const DERItem& last = encodings.certificates[encodings.count - 1];
+    const uint8_t* place = encodings.count == 1 ? certChain.data : last.data + last.length;
+    if (number < encodings.count)
+        place = number == 0 ? certChain.data : encodings.certificates[number].data;
+    else if (refusal.fault == Img4ChainEncoding) {
+        const DERItem rest = {place, static_cast<uint64_t>(certChain.data + certChain.length - place)};
+        DERDecodedInfo decoded;
+        DERDecodeItemExplained(&rest, &decoded, &why->refusal.encoding);
+        place = why->refusal.encoding.place;
+    }
+    why->chain = refusal;
+    why->refusal.place = place;
+}
+
+} // namespace
+
+Img4ChainRefusal img4::verifyChain(const ChainRules& rules, const DERItem& root, const Img4TrustDomain& domain,
+                                   const ChainArguments& arguments, Img4TrustRefusal* why) {
+    if (arguments.leafKey == nullptr || arguments.certProperties == nullptr)
+        return {Img4ChainParameters, 0};
+    *arguments.leafKey = {};
+    *arguments.certProperties = {};
+    if (!arePresent(arguments))
+        return {Img4ChainParameters, 0};
+    Encodings encodings = {{root}, 1};
+    const Img4ChainRefusal refusal = verify(rules, domain, arguments, &encodings, why);
+    if (why != nullptr && refusal.fault != Img4ChainSound)
+        explain(*arguments.certChain, encodings, refusal, why);
     return refusal;
 }

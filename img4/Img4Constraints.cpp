@@ -11,82 +11,172 @@ constexpr DERTag measurementTag = Img4PropertyTag(Img4FourCC('m', 'a', 'n', 'x')
 constexpr DERTag mustBePresent = DERTagContextConstructed(0);
 constexpr DERTag mustBeAbsent = DERTagContextConstructed(1);
 
+// Where a check says what it finds: to a callback each constraint, or what is refused first, or nothing. With a
+// callback it goes on behind a failure.
+struct Listener {
+    Img4ConstraintCallback each;
+    void* context;
+    Img4Refusal* first;
+
+    DERReturn hear(DERReturn result, Img4Constraint& constraint) const {
+        constraint.refusal.subject = Img4SubjectConstraints;
+        if (each != nullptr)
+            each(&constraint, context);
+        if (first != nullptr && result != DERSuccess)
+            *first = constraint.refusal;
+        return result;
+    }
+    bool wants() const { return each != nullptr || first != nullptr; }
+};
+
 // Judges the search for the constrained property, whose content is `found` when `search` is a success.
-DERReturn judge(const Img4Property& constraint, const DERItem& required, DERReturn search, const DERItem& found) {
+DERReturn judge(const Img4Property& constraint, const DERItem& required, DERReturn search, const DERItem& found,
+                Img4Refusal* refusal) {
+    const uint8_t* const place = required.data;
     switch (constraint.valueTag) {
     case DERTagBoolean:
     case DERTagInteger:
     case DERTagOctetString:
-        if (search != DERSuccess)
-            return search;
-        return found.length == required.length &&
-                       std::memcmp(found.data, required.data, static_cast<std::size_t>(found.length)) == 0
-                   ? DERSuccess
-                   : Img4Failure;
+        if (search == DERSuccess)
+            return found.length == required.length &&
+                           std::memcmp(found.data, required.data, static_cast<std::size_t>(found.length)) == 0
+                       ? DERSuccess
+                       : refuse(refusal, Img4Failure, Img4FaultValue, place);
+        [[fallthrough]];
     case mustBePresent:
-        return search;
+        return search == DERSuccess ? search : refuse(refusal, search, Img4FaultAbsent, place);
     case mustBeAbsent:
         if (search == DERSuccess)
-            return DERUnexpectedTag;
-        return search == DEREndOfSequence ? DERSuccess : search;
+            return refuse(refusal, DERUnexpectedTag, Img4FaultPresent, place);
+        return search == DEREndOfSequence ? DERSuccess : refuse(refusal, search, Img4FaultAbsent, place);
     default:
-        return DERUnexpectedTag;
+        return refuse(refusal, DERUnexpectedTag, Img4FaultValueType, place);
     }
 }
 
-// Calls `check` for each element of the SET's content `set` until one fails.
+// Calls `check` for each element of the SET's content `set`, with its encoding, until one fails; with a listener to
+// all, for every one. `where` is the row of the SET itself.
 template <typename Check>
-DERReturn checkEach(const DERItem& set, Check check) {
+DERReturn checkEach(const DERItem& set, const Img4Constraint& where, const Listener& listener, Check check) {
     DERSequence rest;
     DERDecodedInfo element;
+    DERReturn first = DERSuccess;
     DERDecodeSeqContentInit(&set, &rest);
-    DERReturn result = DERDecodeSeqNext(&rest, &element);
-    for (; result == DERSuccess; result = DERDecodeSeqNext(&rest, &element))
-        if (const DERReturn checked = check(element); checked != DERSuccess)
-            return checked;
-    return result == DEREndOfSequence ? DERSuccess : result;
+    for (;;) {
+        const uint8_t* const start = rest.next;
+        DERReturn result = DERDecodeSeqNext(&rest, &element);
+        if (result == DEREndOfSequence)
+            return first;
+        const bool isBroken = result != DERSuccess;
+        const uint8_t* const end = isBroken ? rest.end : rest.next;
+        const DERItem encoding = {start, static_cast<uint64_t>(end - start)};
+        if (!isBroken)
+            result = check(element, encoding);
+        else if (listener.wants()) {
+            Img4Constraint broken = {where.dictionary, encoding, 0, {}, where.isChecked, {}};
+            DERDecodeItemExplained(&encoding, &element, &broken.refusal.encoding);
+            refuse(&broken.refusal, result, broken.refusal.encoding);
+            listener.hear(result, broken);
+        }
+        if (first == DERSuccess)
+            first = result;
+        if (isBroken || (result != DERSuccess && listener.each == nullptr))
+            return first;
+    }
 }
 
-DERReturn constrain(const DERItem& dictionary, const DERDecodedInfo& constraints) {
+// Finds the property that is bound, as a whole encoding for a listener.
+DERReturn findBound(const DERItem& dictionary, DERTag tag, DERItem* content, DERItem* encoding) {
+    DERSequence rest;
+    DERDecodedInfo element;
+    const uint8_t* start = dictionary.data;
+    DERReturn result;
+    DERDecodeSeqContentInit(&dictionary, &rest);
+    while ((result = DERDecodeSeqNext(&rest, &element)) == DERSuccess && element.tag != tag)
+        start = rest.next;
+    if (result == DERSuccess) {
+        *content = element.content;
+        *encoding = {start, static_cast<uint64_t>(rest.next - start)};
+    }
+    return result;
+}
+
+// `bound` is null when it is not to be checked.
+DERReturn constrain(const DERItem* bound, const DERDecodedInfo& constraints, const DERItem& whole,
+                    const Listener& listener) {
     Img4Property constraining;
-    if (const DERReturn result = DERImg4DecodeProperty(&constraints.content, constraints.tag, &constraining);
+    Img4Constraint row = {constraints.tag, whole, 0, {}, bound != nullptr, {}};
+    Img4Refusal* const refusal = listener.wants() ? &row.refusal : nullptr;
+    if (const DERReturn result =
+            DERImg4DecodePropertyExplained(&constraints.content, constraints.tag, &constraining, refusal);
         result != DERSuccess)
-        return result;
-    if (constraining.valueTag != DERTagSet)
-        return DERUnexpectedTag;
-    return checkEach(constraining.value, [&](const DERDecodedInfo& element) {
+        return listener.hear(result, row);
+    if (constraining.valueTag != DERTagSet) {
+        row.refusal.encoding.tag = constraining.valueTag;
+        row.refusal.encoding.expected = DERTagSet;
+        return listener.hear(refuse(refusal, DERUnexpectedTag, Img4FaultValueType, whole.data), row);
+    }
+    return checkEach(constraining.value, row, listener, [&](const DERDecodedInfo& element, const DERItem& encoding) {
         Img4Property constraint;
-        if (const DERReturn result = DERImg4DecodeProperty(&element.content, element.tag, &constraint);
-            result != DERSuccess)
-            return result;
-        DERItem found = {};
-        const DERReturn search = findFirst(dictionary, element.tag, &found);
-        return judge(constraint, element.content, search, found);
+        row.encoding = encoding;
+        row.kind = 0;
+        row.found = {};
+        DERReturn result = DERImg4DecodePropertyExplained(&element.content, element.tag, &constraint, refusal);
+        if (result == DERSuccess) {
+            DERItem found = {};
+            row.kind = constraint.valueTag;
+            row.refusal.encoding.tag = constraint.valueTag;
+            if (bound != nullptr)
+                result = judge(constraint, element.content, findBound(*bound, element.tag, &found, &row.found), found,
+                               refusal);
+        }
+        return listener.hear(result, row);
+    });
+}
+
+DERReturn check(const Img4Record& record, const Listener& listener) {
+    DERDecodedInfo properties;
+    Img4Constraint row = {0, record.manifest.certProperties, 0, {}, true, {}};
+    if (!isPresent(record.manifest.certProperties))
+        return listener.hear(refuse(&row.refusal, DERDecodeError, Img4FaultAbsent, record.manifest.certChain.data),
+                             row);
+    if (const DERReturn result = DERDecodeItem(&record.manifest.certProperties, &properties); result != DERSuccess)
+        return listener.hear(refuse(&row.refusal, result, Img4FaultOther, row.encoding.data), row);
+    if (properties.tag != DERTagSet)
+        return listener.hear(refuse(&row.refusal, DERUnexpectedTag, Img4FaultOther, row.encoding.data), row);
+    const bool isListed = listener.each != nullptr;
+    row.isChecked = isPresent(record.manp);
+    return checkEach(properties.content, row, listener, [&](const DERDecodedInfo& element, const DERItem& encoding) {
+        switch (element.tag) {
+        case manifestPropertiesTag:
+            return constrain(isListed && !isPresent(record.manp) ? nullptr : &record.manp, element, encoding, listener);
+        case objectPropertiesTag:
+            if (hasContent(record.objp))
+                return constrain(&record.objp, element, encoding, listener);
+            [[fallthrough]];
+        case measurementTag:
+            if (isListed)
+                constrain(nullptr, element, encoding, listener);
+            return DERSuccess;
+        default:
+            Img4Constraint unknown = {element.tag, encoding, 0, {}, row.isChecked, {}};
+            unknown.refusal.tag = element.tag;
+            return listener.hear(refuse(&unknown.refusal, DERUnexpectedTag, Img4FaultTag, encoding.data), unknown);
+        }
     });
 }
 
 } // namespace
 
+DERReturn img4::checkConstraints(const Img4Record& record, Img4Refusal* refusal) {
+    return check(record, {nullptr, nullptr, refusal});
+}
+
 DERReturn Img4DecodeEvaluateCertificateProperties(const Img4Record* record) {
-    if (record == nullptr)
-        return DERParamError;
-    DERDecodedInfo properties;
-    if (!isPresent(record->manifest.certProperties))
-        return DERDecodeError;
-    if (const DERReturn result = DERDecodeItem(&record->manifest.certProperties, &properties); result != DERSuccess)
-        return result;
-    if (properties.tag != DERTagSet)
-        return DERUnexpectedTag;
-    return checkEach(properties.content, [&](const DERDecodedInfo& element) {
-        switch (element.tag) {
-        case manifestPropertiesTag:
-            return constrain(record->manp, element);
-        case objectPropertiesTag:
-            return hasContent(record->objp) ? constrain(record->objp, element) : DERSuccess;
-        case measurementTag:
-            return DERSuccess;
-        default:
-            return DERUnexpectedTag;
-        }
-    });
+    return record != nullptr ? check(*record, {nullptr, nullptr, nullptr}) : DERParamError;
+}
+
+DERReturn Img4DecodeEvaluateCertificatePropertiesExplained(const Img4Record* record, Img4ConstraintCallback callback,
+                                                           void* context) {
+    return record != nullptr && callback != nullptr ? check(*record, {callback, context, nullptr}) : DERParamError;
 }

@@ -55,10 +55,15 @@ bool isLess(const crypto::Bytes& one, const crypto::Bytes& other) {
 
 // RFC 8017 3.1: the modulus is a product of odd primes, and the exponent lies between 3 and the modulus and is odd.
 // With the exponent 1 anyone could sign.
-bool isSoundKey(const RSAKey& key, std::size_t mostBits) {
-    const std::size_t bits = bitsOf(key.modulus);
-    return bits >= leastModulusBits && bits <= mostBits && isOdd(key.modulus) && isOdd(key.exponent) &&
-           bitsOf(key.exponent) > 1 && isLess(key.exponent, key.modulus);
+bool hasSoundNumbers(const RSAKey& key) {
+    return isOdd(key.modulus) && isOdd(key.exponent) && bitsOf(key.exponent) > 1 && isLess(key.exponent, key.modulus);
+}
+
+DERReturn refuseSignature(Img4SignatureRefusal* refusal, Img4SignatureFault fault, uint64_t found = 0,
+                          uint64_t least = 0, uint64_t most = 0) {
+    if (refusal != nullptr)
+        *refusal = {fault, found, least, most};
+    return Img4Failure;
 }
 
 bool arePresent(const DERItem* key, const DERItem* signature, const uint8_t* digest) {
@@ -66,16 +71,23 @@ bool arePresent(const DERItem* key, const DERItem* signature, const uint8_t* dig
 }
 
 DERReturn verifyRSA(std::size_t mostBits, const DERItem* keyItem, const DERItem* signature, const uint8_t* digest,
-                    uint64_t length, const Img4TrustProfile* profile) {
+                    uint64_t length, const Img4TrustProfile* profile, Img4SignatureRefusal* refusal) {
     const Img4DigestImplementation* implementation = digestOf(profile, length);
     RSAKey key;
-    if (implementation == nullptr || !arePresent(keyItem, signature, digest) || !parseRSAKey(*keyItem, &key) ||
-        !isSoundKey(key, mostBits) || signature->length != key.modulus.length)
-        return Img4Failure;
+    if (implementation == nullptr || !arePresent(keyItem, signature, digest))
+        return refuseSignature(refusal, Img4SignatureArguments);
+    if (!parseRSAKey(*keyItem, &key))
+        return refuseSignature(refusal, Img4SignatureKey);
+    if (const std::size_t bits = bitsOf(key.modulus); bits < leastModulusBits || bits > mostBits)
+        return refuseSignature(refusal, Img4SignatureKeySize, bits, leastModulusBits, mostBits);
+    if (!hasSoundNumbers(key))
+        return refuseSignature(refusal, Img4SignatureKeyNumbers);
+    if (signature->length != key.modulus.length)
+        return refuseSignature(refusal, Img4SignatureLength, signature->length, key.modulus.length, key.modulus.length);
     const crypto::Bytes hash = {digest, static_cast<std::size_t>(length)};
     return crypto::verifyRSASignature(implementation->algorithm, hash, key.modulus, key.exponent, bytesOf(*signature))
                ? DERSuccess
-               : Img4Failure;
+               : refuseSignature(refusal, Img4SignatureMismatch);
 }
 
 // A positive INTEGER in its shortest form (X.690 8.3.2) of at most `mostOctets` octets.
@@ -105,6 +117,22 @@ constexpr NamedCurve curves[] = {
     {&oidAnsip384r1, crypto::Curve::P384, 48, 97},
 };
 
+DERReturn verifyECDSA(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
+                      const Img4TrustProfile* profile, Img4SignatureRefusal* refusal) {
+    if (digestOf(profile, length) == nullptr || profile->keyAlgorithmOid == nullptr ||
+        !arePresent(key, signature, digest))
+        return refuseSignature(refusal, Img4SignatureArguments);
+    const NamedCurve* curve = curveOfPoint(key->length);
+    if (curve == nullptr)
+        return refuseSignature(refusal, Img4SignatureKey);
+    if (!isECDSASignature(*signature, *curve))
+        return refuseSignature(refusal, Img4SignatureForm);
+    const crypto::Bytes hash = {digest, static_cast<std::size_t>(length)};
+    return crypto::verifyECDSASignature(curve->curve, bytesOf(*key), hash, bytesOf(*signature))
+               ? DERSuccess
+               : refuseSignature(refusal, Img4SignatureMismatch);
+}
+
 } // namespace
 
 const NamedCurve* img4::curveOfPoint(uint64_t length) {
@@ -125,23 +153,31 @@ bool img4::isWholeItem(const DERItem& encoding, DERTag tag, DERItem* content) {
 
 DERReturn verify_signature_rsa(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
                                const Img4TrustProfile* profile) {
-    return verifyRSA(mostModulusBits, key, signature, digest, length, profile);
+    return verifyRSA(mostModulusBits, key, signature, digest, length, profile, nullptr);
 }
 
 DERReturn verify_signature_rsa3k(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
                                  const Img4TrustProfile* profile) {
-    return verifyRSA(mostModulusBits3k, key, signature, digest, length, profile);
+    return verifyRSA(mostModulusBits3k, key, signature, digest, length, profile, nullptr);
 }
 
 DERReturn verify_signature_ecdsa(const DERItem* key, const DERItem* signature, const uint8_t* digest, uint64_t length,
                                  const Img4TrustProfile* profile) {
-    if (digestOf(profile, length) == nullptr || profile->keyAlgorithmOid == nullptr ||
-        !arePresent(key, signature, digest))
-        return Img4Failure;
-    const NamedCurve* curve = curveOfPoint(key->length);
-    if (curve == nullptr || !isECDSASignature(*signature, *curve))
-        return Img4Failure;
-    const crypto::Bytes hash = {digest, static_cast<std::size_t>(length)};
-    return crypto::verifyECDSASignature(curve->curve, bytesOf(*key), hash, bytesOf(*signature)) ? DERSuccess
-                                                                                                : Img4Failure;
+    return verifyECDSA(key, signature, digest, length, profile, nullptr);
+}
+
+DERReturn img4::verifySignatureOf(const Img4TrustProfile& profile, const DERItem& key, const DERItem& signature,
+                                  const uint8_t* digest, Img4TrustRefusal* why) {
+    const uint64_t length = profile.digestInfo->length;
+    const auto verify = profile.verifySignature;
+    Img4SignatureRefusal* const refusal = why != nullptr ? &why->signature : nullptr;
+    if (verify == verify_signature_rsa || verify == verify_signature_rsa3k)
+        return verifyRSA(verify == verify_signature_rsa ? mostModulusBits : mostModulusBits3k, &key, &signature, digest,
+                         length, &profile, refusal);
+    if (verify == verify_signature_ecdsa)
+        return verifyECDSA(&key, &signature, digest, length, &profile, refusal);
+    const DERReturn result = verify(&key, &signature, digest, length, &profile);
+    if (result != DERSuccess)
+        refuseSignature(refusal, Img4SignatureOther);
+    return result;
 }

@@ -164,6 +164,23 @@ IMG4_API DERReturn Img4DecodeEvaluateDictionaryProperties(const DERItem* diction
 // for a property that should be there; and Img4Failure for a value that is another.
 IMG4_API DERReturn Img4DecodeEvaluateCertificateProperties(const Img4Record* record);
 
+// One constraint, or what stands in the place of one.
+typedef struct Img4Constraint {
+    DERTag dictionary; // the tag of the element of certProperties that it stands in
+    DERItem encoding;
+    DERTag kind;         // of its value; 0 when it is no constraint
+    DERItem found;       // the whole encoding of the property that it binds; absent when there is none
+    bool isChecked;      // false when what it binds was not evaluated, or binds nothing here
+    Img4Refusal refusal; // Img4FaultNone when it is met
+} Img4Constraint;
+
+typedef void (*Img4ConstraintCallback)(const Img4Constraint* constraint, void* context);
+
+// The same check, which hands every constraint to `callback`, goes on behind one that is not met, and returns the first
+// failure.
+IMG4_API DERReturn Img4DecodeEvaluateCertificatePropertiesExplained(const Img4Record* record,
+                                                                    Img4ConstraintCallback callback, void* context);
+
 // Digests
 
 // What implements a digest.
@@ -362,6 +379,45 @@ typedef struct Img4DomainProfile {
     // Optional: where verifyChain says why it refused a chain, or that it did not.
     Img4ChainRefusal* refusal;
 } Img4DomainProfile;
+
+// Why a signature was refused.
+typedef enum Img4SignatureFault {
+    Img4SignatureSound,
+    Img4SignatureArguments,  // an argument is missing, or the profile has no such digest
+    Img4SignatureKey,        // the key is malformed
+    Img4SignatureKeySize,    // the modulus has `found` bits, and `least` to `most` are allowed
+    Img4SignatureKeyNumbers, // the modulus is even, or the exponent is even, less than 3 or not less than the modulus
+    Img4SignatureForm,       // it is no BIT STRING of whole octets, or no SEQUENCE of two positive INTEGERs that fit
+    Img4SignatureLength,     // it has `found` octets, and the modulus has `most`
+    Img4SignatureMismatch,   // it was made over something else or with another key, or the key is no point of its
+                             // curve, or memory has run out
+    Img4SignatureOther       // a verifier of the caller's says so
+} Img4SignatureFault;
+
+typedef struct Img4SignatureRefusal {
+    Img4SignatureFault fault;
+    uint64_t found;
+    uint64_t least;
+    uint64_t most;
+} Img4SignatureRefusal;
+
+// What an evaluation refused.
+typedef struct Img4TrustRefusal {
+    // The step, its status and the place in the input: for a certificate its start, or the octet of it that is no DER,
+    // as `encoding` says then.
+    Img4Refusal refusal;
+    // Sound unless the chain was refused by a verifier of this library.
+    Img4ChainRefusal chain;
+    // Of the certificate that the chain was refused for, or of the manifest's signature.
+    Img4SignatureRefusal signature;
+} Img4TrustRefusal;
+
+// Img4DecodePerformTrustEvaluationWithCallbacks, or without an `object` the evaluation of the manifest alone, and in
+// *refusal, which may not be null, what was refused: with Img4FaultNone when nothing was.
+IMG4_API DERReturn Img4DecodePerformTrustEvaluationExplained(const uint32_t* object, Img4Record* record,
+                                                             const Img4TrustCallbacks* callbacks,
+                                                             const Img4TrustProfile* profile, void* context,
+                                                             Img4TrustRefusal* refusal);
 
 // Makes *out the profile of `entry` with the root and the domain given. To learn why a chain is refused under a
 // built-in profile, give entry->root and Img4BuiltInTrustDomain, and set out->refusal.

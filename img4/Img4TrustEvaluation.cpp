@@ -32,6 +32,15 @@ struct Evaluation {
     const Img4TrustCallbacks& callbacks;
     const Img4TrustProfile& profile;
     void* context;
+    Img4TrustRefusal* why; // null unless asked for
+
+    Img4Refusal* refusal() const { return why != nullptr ? &why->refusal : nullptr; }
+
+    // Passes the status of a step on that is about what stands at `place`, and has not said more about it by itself.
+    DERReturn step(Img4Subject subject, DERReturn status, const uint8_t* place) const {
+        enter(refusal(), subject);
+        return status == DERSuccess ? status : refuse(refusal(), status, Img4FaultOther, place);
+    }
 
     DERReturn computeDigest(const DERItem& data, uint8_t* out) const {
         return profile.computeDigest(&data, out, profile.digestInfo->length, &profile);
@@ -39,6 +48,7 @@ struct Evaluation {
     bool isTrustedDigest() const;
     DERReturn verifySignature() const;
     DERReturn findObject(uint32_t object) const;
+    DERReturn checkLeaf() const;
     DERReturn run(const uint32_t* object) const;
 };
 
@@ -53,24 +63,35 @@ bool Evaluation::isTrustedDigest() const {
 DERReturn Evaluation::verifySignature() const {
     Img4ManifestRecord& manifest = record.manifest;
     DERItem leafKey = {};
-    if (const DERReturn result = profile.verifyChain(&manifest.certChain, &leafKey, &manifest.certProperties, &profile);
+    if (const DERReturn result =
+            verifyChainOf({&manifest.certChain, &leafKey, &manifest.certProperties, &profile}, why);
         result != DERSuccess)
-        return result;
+        return step(Img4SubjectChain, result,
+                    why != nullptr && why->refusal.place != nullptr ? why->refusal.place : manifest.certChain.data);
     if (const DERReturn result = storeDigest(*this, manifest.body, manifest.bodyDigest, nullptr); result != DERSuccess)
-        return result;
-    return profile.verifySignature(&leafKey, &manifest.signature, manifest.bodyDigest, profile.digestInfo->length,
-                                   &profile);
+        return step(Img4SubjectBodyDigest, result, manifest.body.data);
+    return step(Img4SubjectSignature, verifySignatureOf(profile, leafKey, manifest.signature, manifest.bodyDigest, why),
+                manifest.signature.data);
 }
 
 DERReturn Evaluation::findObject(uint32_t object) const {
     const DERTag tag = Img4PropertyTag(object);
     Img4Property found = {};
-    const DERReturn result = callbacks.findObject != nullptr
-                                 ? callbacks.findObject(&record.manb, tag, DERTagSet, &found, context)
-                                 : DERImg4DecodeFindProperty(&record.manb, tag, DERTagSet, &found);
+    enter(refusal(), Img4SubjectObject);
+    const DERReturn result =
+        callbacks.findObject != nullptr
+            ? step(Img4SubjectObject, callbacks.findObject(&record.manb, tag, DERTagSet, &found, context),
+                   record.manb.data)
+            : findProperty(record.manb, tag, DERTagSet, &found, refusal());
     if (result == DERSuccess)
         record.objp = found.value;
     return result;
+}
+
+DERReturn Evaluation::checkLeaf() const {
+    if (why != nullptr && profile.evaluateCertificateProperties == Img4DecodeEvaluateCertificateProperties)
+        return checkConstraints(record, &why->refusal);
+    return step(Img4SubjectConstraints, profile.evaluateCertificateProperties(&record), record.manifest.certChain.data);
 }
 
 // A record without payload has nothing to digest.
@@ -81,43 +102,42 @@ DERReturn digestPayload(Img4Record& record, const Flow& flow) {
     return storeDigest(flow, record.payloadRaw, record.payload.digest, &record.payloadHashed);
 }
 
+// Has every property in `dictionary` judged.
+DERReturn judgeAll(const DERItem& dictionary, uint32_t selector, Img4PropertyCallback evaluateProperty, void* context,
+                   Img4Refusal* refusal = nullptr);
+
 // Evaluates the manifest alone when `object` is null.
 DERReturn Evaluation::run(const uint32_t* object) const {
     DERReturn result = storeDigest(*this, record.manifestRaw, record.manifest.digest, &record.manifestHashed);
     if (result != DERSuccess)
-        return result;
+        return step(Img4SubjectManifestDigest, result, record.manifestRaw.data);
     const bool verified = !isTrustedDigest();
     if (verified && (result = verifySignature()) != DERSuccess)
         return result;
-    if ((result = findManifestDictionaries(record, &record.manb, &record.manp)) != DERSuccess)
+    if ((result = findManifestDictionaries(record, &record.manb, &record.manp, refusal())) != DERSuccess)
         return result;
     if (object != nullptr && (result = findObject(*object)) != DERSuccess)
         return result;
-    if (verified && (result = profile.evaluateCertificateProperties(&record)) != DERSuccess)
+    if (verified && (result = checkLeaf()) != DERSuccess)
         return result;
     if ((result = digestPayload(record, *this)) != DERSuccess)
-        return result;
-    result = Img4DecodeEvaluateManifestProperties(&record, callbacks.evaluateProperty, context);
+        return step(Img4SubjectPayloadDigest, result, record.payloadRaw.data);
+    enter(refusal(), Img4SubjectManifestProperties);
+    result = judgeAll(record.manp, Img4SelectorManifest, callbacks.evaluateProperty, context, refusal());
     if (object == nullptr || result != DERSuccess)
         return result;
-    return Img4DecodeEvaluateObjectProperties(&record, callbacks.evaluateProperty, context);
+    enter(refusal(), Img4SubjectObjectProperties);
+    return judgeAll(record.objp, Img4SelectorObject, callbacks.evaluateProperty, context, refusal());
 }
 
 DERReturn evaluate(const uint32_t* object, Img4Record* record, const Img4TrustCallbacks* callbacks,
-                   const Img4TrustProfile* profile, void* context) {
+                   const Img4TrustProfile* profile, void* context, Img4TrustRefusal* why = nullptr) {
     if (record == nullptr || callbacks == nullptr || callbacks->evaluateProperty == nullptr || !isComplete(profile) ||
         !isPresent(record->manifestRaw))
         return DERParamError;
     if (profile->digestInfo->length > Img4MaxDigestLength)
         return DERBufferOverflow;
-    return Evaluation{*record, *callbacks, *profile, context}.run(object);
-}
-
-DERReturn walkProperties(const Img4Record* record, DERItem Img4Record::*dictionary, uint32_t selector,
-                         Img4PropertyCallback evaluateProperty, void* context) {
-    if (record == nullptr)
-        return DERParamError;
-    return Img4DecodeEvaluateDictionaryProperties(&(record->*dictionary), selector, evaluateProperty, context);
+    return Evaluation{*record, *callbacks, *profile, context, why}.run(object);
 }
 
 bool isJudgedType(DERTag valueTag) {
@@ -125,16 +145,45 @@ bool isJudgedType(DERTag valueTag) {
            valueTag == DERTagIA5String;
 }
 
-DERReturn judge(const DERDecodedInfo& element, uint32_t selector, Img4PropertyCallback evaluateProperty,
-                void* context) {
+DERReturn judge(const DERDecodedInfo& element, const uint8_t* start, uint32_t selector,
+                Img4PropertyCallback evaluateProperty, void* context, Img4Refusal* refusal) {
     Img4Property property;
+    Img4Refusal why;
     // Tags that are not private and constructed name no property, and are refused here.
-    if (const DERReturn result = DERImg4DecodeProperty(&element.content, element.tag, &property); result != DERSuccess)
+    if (const DERReturn result = DERImg4DecodePropertyExplained(&element.content, element.tag, &property,
+                                                                refusal != nullptr ? &why : nullptr);
+        result != DERSuccess) {
+        if (refusal != nullptr) {
+            why.subject = refusal->subject;
+            *refusal = why;
+        }
         return result;
+    }
+    if (refusal != nullptr) {
+        refusal->tag = element.tag;
+        refusal->encoding.tag = property.valueTag;
+    }
     if (!isJudgedType(property.valueTag))
-        return DERUnexpectedTag;
+        return refuse(refusal, DERUnexpectedTag, Img4FaultValueType, start);
     const Img4PropertyValue value = {property.value, property.valueTag};
-    return evaluateProperty(property.tag, &value, selector, context);
+    const DERReturn judged = evaluateProperty(property.tag, &value, selector, context);
+    return judged == DERSuccess ? judged : refuse(refusal, judged, Img4FaultOther, start);
+}
+
+DERReturn judgeAll(const DERItem& dictionary, uint32_t selector, Img4PropertyCallback evaluateProperty, void* context,
+                   Img4Refusal* refusal) {
+    DERSequence rest;
+    DERDecodedInfo element;
+    const uint8_t* start = dictionary.data;
+    DERDecodeSeqContentInit(&dictionary, &rest);
+    DERReturn result = DERDecodeSeqNext(&rest, &element);
+    for (; result == DERSuccess; result = DERDecodeSeqNext(&rest, &element)) {
+        if (const DERReturn judged = judge(element, start, selector, evaluateProperty, context, refusal);
+            judged != DERSuccess)
+            return judged;
+        start = rest.next;
+    }
+    return result == DEREndOfSequence ? DERSuccess : refuseSearch(result, dictionary, rest.next, refusal);
 }
 
 } // namespace
@@ -167,28 +216,40 @@ DERReturn Img4DecodePerformManifestTrustEvaluationWithCallbacks(Img4Record* reco
     return evaluate(nullptr, record, callbacks, profile, context);
 }
 
+DERReturn Img4DecodePerformTrustEvaluationExplained(const uint32_t* object, Img4Record* record,
+                                                    const Img4TrustCallbacks* callbacks,
+                                                    const Img4TrustProfile* profile, void* context,
+                                                    Img4TrustRefusal* refusal) {
+    if (refusal == nullptr)
+        return DERParamError;
+    *refusal = Img4TrustRefusal{};
+    const DERReturn result = evaluate(object, record, callbacks, profile, context, refusal);
+    if (result == DERSuccess || refusal->refusal.subject == Img4SubjectNone)
+        refusal->refusal.subject = result == DERSuccess ? Img4SubjectNone : Img4SubjectArguments;
+    if (result != DERSuccess && refusal->refusal.fault == Img4FaultNone)
+        refusal->refusal.fault = Img4FaultOther;
+    return refusal->refusal.status = result;
+}
+
 DERReturn Img4DecodeEvaluateManifestProperties(const Img4Record* record, Img4PropertyCallback evaluateProperty,
                                                void* context) {
-    return walkProperties(record, &Img4Record::manp, Img4SelectorManifest, evaluateProperty, context);
+    return record != nullptr
+               ? Img4DecodeEvaluateDictionaryProperties(&record->manp, Img4SelectorManifest, evaluateProperty, context)
+               : DERParamError;
 }
 
 DERReturn Img4DecodeEvaluateObjectProperties(const Img4Record* record, Img4PropertyCallback evaluateProperty,
                                              void* context) {
-    return walkProperties(record, &Img4Record::objp, Img4SelectorObject, evaluateProperty, context);
+    return record != nullptr
+               ? Img4DecodeEvaluateDictionaryProperties(&record->objp, Img4SelectorObject, evaluateProperty, context)
+               : DERParamError;
 }
 
 DERReturn Img4DecodeEvaluateDictionaryProperties(const DERItem* dictionary, uint32_t selector,
                                                  Img4PropertyCallback evaluateProperty, void* context) {
-    if (dictionary == nullptr || evaluateProperty == nullptr)
-        return DERParamError;
-    DERSequence rest;
-    DERDecodedInfo element;
-    DERDecodeSeqContentInit(dictionary, &rest);
-    DERReturn result = DERDecodeSeqNext(&rest, &element);
-    for (; result == DERSuccess; result = DERDecodeSeqNext(&rest, &element))
-        if (const DERReturn judged = judge(element, selector, evaluateProperty, context); judged != DERSuccess)
-            return judged;
-    return result == DEREndOfSequence ? DERSuccess : result;
+    return dictionary != nullptr && evaluateProperty != nullptr
+               ? judgeAll(*dictionary, selector, evaluateProperty, context)
+               : DERParamError;
 }
 
 namespace {

@@ -77,8 +77,17 @@ struct ChainArguments {
     const Img4TrustProfile* profile;
 };
 
+// With `why`, says there too where the chain is refused and what is wrong with a signature or an encoding.
 Img4ChainRefusal verifyChain(const ChainRules& rules, const DERItem& root, const Img4TrustDomain& domain,
-                             const ChainArguments& arguments);
+                             const ChainArguments& arguments, Img4TrustRefusal* why = nullptr);
+
+// The profile's own verifyChain and verifySignature. With `why`, those of this library say what is wrong.
+DERReturn verifyChainOf(const ChainArguments& arguments, Img4TrustRefusal* why);
+DERReturn verifySignatureOf(const Img4TrustProfile& profile, const DERItem& key, const DERItem& signature,
+                            const uint8_t* digest, Img4TrustRefusal* why);
+
+// As Img4DecodeEvaluateCertificateProperties; with `refusal`, what is refused first.
+DERReturn checkConstraints(const Img4Record& record, Img4Refusal* refusal);
 
 } // namespace img4
 

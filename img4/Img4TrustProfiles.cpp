@@ -183,24 +183,41 @@ const uint16_t Img4NumTrustProfiles = std::size(Img4TrustProfiles);
 
 namespace {
 
-// The chain verifier of profiles that Img4DecodeMakeDomainProfile has made.
-DERReturn verifyDomainChain(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                            const Img4TrustProfile* profile) {
-    if (profile == nullptr)
-        return Img4Failure;
-    // The profile is the first member of its domain profile.
-    const auto& domainProfile = *reinterpret_cast<const Img4DomainProfile*>(profile);
-    const bool isRSA = DEROidCompare(profile->keyAlgorithmOid, &oidRsa);
+// Verifies a chain with the rules, the root and the domain of a profile that Img4DecodeMakeDomainProfile has made,
+// whose first member `arguments` has.
+DERReturn verifyInDomain(const ChainArguments& arguments, Img4TrustRefusal* why) {
+    const auto& domainProfile = *reinterpret_cast<const Img4DomainProfile*>(arguments.profile);
+    const bool isRSA = DEROidCompare(arguments.profile->keyAlgorithmOid, &oidRsa);
     const ChainRules& rules =
         domainProfile.chainLength == twoRSA.length ? (isRSA ? twoRSA : twoEC) : (isRSA ? threeRSA : threeEC);
-    const Img4ChainRefusal refusal =
-        verifyChain(rules, domainProfile.root, domainProfile.domain, {certChain, leafKey, certProperties, profile});
+    const Img4ChainRefusal refusal = verifyChain(rules, domainProfile.root, domainProfile.domain, arguments, why);
     if (domainProfile.refusal != nullptr)
         *domainProfile.refusal = refusal;
     return statusOf(refusal);
 }
 
+DERReturn verifyDomainChain(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
+                            const Img4TrustProfile* profile) {
+    return profile != nullptr ? verifyInDomain({certChain, leafKey, certProperties, profile}, nullptr) : Img4Failure;
+}
+
 } // namespace
+
+DERReturn img4::verifyChainOf(const ChainArguments& arguments, Img4TrustRefusal* why) {
+    const auto verify = arguments.profile->verifyChain;
+    if (verify == verifyDomainChain)
+        return verifyInDomain(arguments, why);
+    const Img4TrustProfileEntry* const end = Img4TrustProfiles + Img4NumTrustProfiles;
+    for (const Img4TrustProfileEntry* entry = Img4TrustProfiles; why != nullptr && entry != end; ++entry) {
+        Img4DomainProfile made;
+        if (verify != entry->profile->verifyChain)
+            continue;
+        Img4DecodeMakeDomainProfile(entry, entry->root, &Img4BuiltInTrustDomain, &made);
+        made.profile = *arguments.profile;
+        return verifyInDomain({arguments.certChain, arguments.leafKey, arguments.certProperties, &made.profile}, why);
+    }
+    return verify(arguments.certChain, arguments.leafKey, arguments.certProperties, arguments.profile);
+}
 
 DERReturn Img4DecodeMakeDomainProfile(const Img4TrustProfileEntry* entry, const DERItem* root,
                                       const Img4TrustDomain* domain, Img4DomainProfile* out) {

@@ -267,7 +267,7 @@ std::vector<RefusalCase> refusalCases() {
         {"object", R"(The manifest has no "xyzt")", soundManifest(ec384), nullptr, "xyzt"},
         {"object", R"("sepi" of the manifest is INTEGER instead of SET)", withObject(property("sepi", integer(1))),
          nullptr, "sepi"},
-        {"object", R"(private "sepi" of the manifest is named "boot" inside)",
+        {"object", R"("sepi" of the manifest is named "boot" inside)",
          withObject(item(propertyTag("sepi"), sequence({ia5("boot"), set({})}))), nullptr, "sepi"},
 
         {"constraints", "The leaf certificate carries no constraints", withLeaf(ec384, &Certificate::extensions, {})},

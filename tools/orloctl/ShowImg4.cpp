@@ -5,7 +5,6 @@
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Findings.h"
 #include "tools/orloctl/Img4Properties.h"
-#include "tools/orloctl/Img4Text.h"
 #include "tools/orloctl/Img4Words.h"
 
 namespace {
@@ -190,7 +189,6 @@ void Reader::read() {
     if (kind == Img4KindContainer)
         addRestoreInfo();
     report_.json["notes"] = findings_.notes();
-    report_.text = img4Text(report_);
 }
 
 } // namespace

@@ -5,10 +5,7 @@
 #include <string>
 #include <vector>
 
-#include <nlohmann/json.hpp>
-
 #include "img4/Img4Trust.h"
-#include "tools/orloctl/Img4Findings.h"
 
 // What a leaf certificate demands of one property, and whether it is so.
 struct TrustConstraint {
@@ -26,8 +23,8 @@ struct TrustConstraint {
     const std::uint8_t* place; // of the constraint
 };
 
-// The constraints in the record's certProperties, in their order, against what the evaluation has found. An element
-// that is no constraint is a broken one.
+// The constraints in the record's certProperties, in their order, as the decoder judges them. An element that is no
+// constraint is a broken one.
 std::vector<TrustConstraint> readConstraints(const Img4Record& record);
 
 #endif

@@ -1,22 +1,15 @@
 #include "tools/orloctl/TrustEvaluation.h"
 
-#include <algorithm>
-
 #include "der/DERDecode.h"
 #include "tools/orloctl/CertificateText.h"
 #include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
-#include "tools/orloctl/Img4Findings.h"
-#include "tools/orloctl/Img4Properties.h"
 #include "tools/orloctl/Img4Words.h"
 #include "tools/orloctl/TrustConstraints.h"
 
 namespace {
 
 using img4show::mostCharactersShown;
-
-constexpr std::uint32_t manb = Img4FourCC('M', 'A', 'N', 'B');
-constexpr std::uint32_t manp = Img4FourCC('M', 'A', 'N', 'P');
 
 DERReturn agree(DERTag, const Img4PropertyValue*, std::uint32_t, void*) {
     return DERSuccess;
@@ -26,90 +19,31 @@ bool isRSA(const Img4TrustProfile& profile) {
     return DEROidCompare(profile.keyAlgorithmOid, &oidRsa);
 }
 
-// What a property is refused for, and where.
-struct Cause {
-    std::string reason; // a sentence without its full stop
-    const std::uint8_t* place;
-};
-
 std::string capitalised(std::string text) {
     if (text[0] >= 'a' && text[0] <= 'z')
         text[0] = static_cast<char>(text[0] - 'a' + 'A');
     return text;
 }
 
-Cause headerCause(const std::string& what, const DERItem& rest) {
-    const auto why = derHeaderFault(rest);
-    return {what + " is no strict DER: " + (why ? why->reason : "it cannot be decoded"),
-            rest.data + (why ? why->offset : 0)};
-}
-
-Cause propertyCause(const DERDecodedInfo& element, const std::string& owner) {
-    Img4Property property;
-    Img4Refusal refusal;
-    DERImg4DecodePropertyExplained(&element.content, element.tag, &property, &refusal);
-    return {derTagName(element.tag) + " of " + owner + " " + img4show::propertyReason(refusal), refusal.place};
-}
-
-// Why the decoder does not find the property `code` of the type `type` in `dictionary`, which is `owner`'s.
-Cause lookupCause(const DERItem& dictionary, std::uint32_t code, DERTag type, const std::string& owner) {
-    DerItems elements(dictionary);
-    while (elements.next()) {
-        const DERDecodedInfo& element = elements.item();
-        Img4Property property;
-        if (element.tag != Img4PropertyTag(code))
-            continue;
-        if (DERImg4DecodeProperty(&element.content, element.tag, &property) != DERSuccess)
-            return propertyCause(element, owner);
-        return {quotedCode(code) + " of " + owner + " is " + derTagName(property.valueTag) + " instead of " +
-                    derTagName(type),
-                elements.encoding().data};
-    }
-    if (elements.isBroken())
-        return headerCause("An element of " + owner, elements.encoding());
-    return {capitalised(owner) + " has no " + quotedCode(code), dictionary.data};
-}
-
-// Why the walk of the properties in `dictionary` ends early.
-Cause walkCause(const DERItem& dictionary, const std::string& owner) {
-    constexpr DERTag judged[] = {DERTagBoolean, DERTagInteger, DERTagOctetString, DERTagIA5String};
-    DerItems elements(dictionary);
-    while (elements.next()) {
-        const DERDecodedInfo& element = elements.item();
-        Img4Property property;
-        if (element.tag != Img4PropertyTag(element.tag & DERTagNumberMask))
-            return {derTagName(element.tag) + " of " + owner + " is no property", elements.encoding().data};
-        if (DERImg4DecodeProperty(&element.content, element.tag, &property) != DERSuccess)
-            return propertyCause(element, owner);
-        if (std::find(std::begin(judged), std::end(judged), property.valueTag) == std::end(judged))
-            return {derTagName(element.tag) + " of " + owner + " is " + derTagName(property.valueTag) +
-                        ", and only BOOLEAN, INTEGER, OCTET STRING and IA5String can be judged",
-                    elements.encoding().data};
-    }
-    if (elements.isBroken())
-        return headerCause("A property of " + owner, elements.encoding());
-    return {"The properties of " + owner + " cannot be judged", dictionary.data};
-}
-
 std::string quoted(const std::string& text) {
     return "\"" + text + "\"";
 }
 
-// Why a signature of that form cannot verify under the key, whatever it was made over; `otherwise` when it could.
-std::string signatureRemark(const DERItem& key, const DERItem& signature, const Img4TrustProfile& profile,
-                            const char* otherwise) {
-    const auto bits = rsaBits(key);
-    const std::size_t most = profile.verifySignature == verify_signature_rsa3k ? 3072 : 4096;
-    if (const std::string fault = keyFault(key); !fault.empty())
-        return ": the key " + fault;
-    if (!bits)
-        return otherwise;
-    if (*bits < 1024 || *bits > most)
-        return ", which has " + std::to_string(*bits) + " bits, and the profile takes 1024 to " + std::to_string(most);
-    if (const std::size_t octets = (*bits + 7) / 8; octets != signature.length)
-        return ": it has " + std::to_string(signature.length) + " octets, and those of the key have " +
-               std::to_string(octets);
-    return otherwise;
+// What is wrong with a signature or the key that verifies it; `otherwise` when it is over something else.
+std::string signatureRemark(const Img4SignatureRefusal& refusal, const DERItem& key, const char* otherwise) {
+    switch (refusal.fault) {
+    case Img4SignatureKeySize:
+        return ", which has " + std::to_string(refusal.found) + " bits, and the profile takes " +
+               std::to_string(refusal.least) + " to " + std::to_string(refusal.most);
+    case Img4SignatureForm:
+        return ": it is no SEQUENCE of two positive INTEGERs that fit the curve";
+    case Img4SignatureLength:
+        return ": it has " + std::to_string(refusal.found) + " octets, and those of the key have " +
+               std::to_string(refusal.most);
+    default:
+        const std::string fault = keyFault(key);
+        return fault.empty() ? otherwise : ": the key " + fault;
+    }
 }
 
 // Finds the words for a refused chain.
@@ -117,11 +51,10 @@ class ChainWords {
 public:
     explicit ChainWords(const TrustEvaluation& evaluation);
 
-    TrustRefusal explain() const;
+    std::string reason() const;
 
 private:
     std::string call(std::uint32_t number) const;
-    std::string encodingReason() const;
     std::string lengthReason() const;
     std::string keyReason() const;
     std::string issuerReason() const;
@@ -129,7 +62,7 @@ private:
     std::string signatureReason() const;
     std::string authorityReason() const;
 
-    const TrustEvaluation& evaluation_;
+    const Img4TrustRefusal& refusal_;
     const Img4DomainProfile& made_;
     const std::uint32_t number_;        // of the refused certificate
     std::uint64_t count_ = 0;           // the root included
@@ -139,7 +72,7 @@ private:
 };
 
 ChainWords::ChainWords(const TrustEvaluation& evaluation)
-    : evaluation_(evaluation), made_(evaluation.profile->made), number_(evaluation.refusal.certificate) {
+    : refusal_(evaluation.refusal), made_(evaluation.profile->made), number_(refusal_.chain.certificate) {
     encodings_ = certificatesOf(evaluation.record.manifest.certChain, &count_);
     encodings_.insert(encodings_.begin(), made_.root);
     ++count_;
@@ -153,16 +86,6 @@ std::string ChainWords::call(std::uint32_t number) const {
     const std::string what = number == 0 ? "the root" : "certificate " + std::to_string(number);
     const auto certificate = number < encodings_.size() ? readCertificate(encodings_[number]) : std::nullopt;
     return certificate ? what + " (" + quoted(nameText(certificate->tbs.subject)) + ")" : what;
-}
-
-std::string ChainWords::encodingReason() const {
-    if (number_ < encodings_.size())
-        return capitalised(call(number_)) + " is no certificate";
-    const DERItem& chain = evaluation_.record.manifest.certChain;
-    const DERItem& last = encodings_.back();
-    const std::uint8_t* next = encodings_.size() == 1 ? chain.data : last.data + last.length;
-    return headerCause(capitalised(call(number_)), {next, static_cast<std::uint64_t>(chain.data + chain.length - next)})
-        .reason;
 }
 
 std::string ChainWords::lengthReason() const {
@@ -196,7 +119,7 @@ std::string ChainWords::signatureReason() const {
     if (DERParseBitString(&refused_->fields.signature, &signature, &unusedBits) != DERSuccess || unusedBits != 0)
         return "The signature on " + call(number_) + " is no BIT STRING of whole octets";
     return "The signature on " + call(number_) + " does not verify under the key of " + call(number_ - 1) +
-           signatureRemark(issuer_->tbs.subjectPublicKeyInfo, signature, made_.profile,
+           signatureRemark(refusal_.signature, issuer_->tbs.subjectPublicKeyInfo,
                            ": the certificate was changed, or another key of that name has signed it");
 }
 
@@ -208,70 +131,55 @@ std::string ChainWords::authorityReason() const {
            ", as a PrintableString";
 }
 
-TrustRefusal ChainWords::explain() const {
-    const auto about = [this](const std::string& reason) {
-        const DERItem& chain = evaluation_.record.manifest.certChain;
-        const bool isThere = number_ != 0 && number_ < encodings_.size();
-        return TrustRefusal{"chain", reason, isThere ? encodings_[number_].data : chain.data, number_};
-    };
-    switch (evaluation_.refusal.fault) {
+std::string ChainWords::reason() const {
+    switch (refusal_.chain.fault) {
     case Img4ChainEncoding:
-        return about(encodingReason());
+        return capitalised(call(number_)) + (refusal_.refusal.encoding.fault == DERFaultNone
+                                                 ? " is no certificate"
+                                                 : " is no strict DER: " + derFaultText(refusal_.refusal.encoding));
     case Img4ChainCertificateSize:
-        return about(capitalised(call(number_)) + " is longer than 131071 octets");
+        return capitalised(call(number_)) + " is longer than 131071 octets";
     case Img4ChainLength:
-        return {"chain", lengthReason(), evaluation_.record.manifest.certChain.data, std::nullopt};
+        return lengthReason();
     case Img4ChainKey:
-        return about(keyReason());
+        return keyReason();
     case Img4ChainIssuer:
-        return about(issuerReason());
+        return issuerReason();
     case Img4ChainSignatureAlgorithm:
-        return about(algorithmReason());
+        return algorithmReason();
     case Img4ChainSignature:
-        return about(signatureReason());
+        return signatureReason();
     case Img4ChainAuthority:
-        return about(authorityReason());
+        return authorityReason();
     case Img4ChainExtensions:
-        return about(capitalised(call(number_)) +
-                     " has a malformed or empty list of extensions, or constraints that are no SET");
+        return capitalised(call(number_)) +
+               " has a malformed or empty list of extensions, or constraints that are no SET";
     default:
-        return about("The chain cannot be verified");
+        return "The chain cannot be verified";
     }
 }
 
-TrustRefusal refusalOf(const char* step, Cause cause) {
-    return {step, std::move(cause.reason), cause.place, std::nullopt};
-}
-
-TrustRefusal signatureRefusal(const TrustEvaluation& evaluation) {
+std::string signatureReason(const TrustEvaluation& evaluation) {
     std::uint64_t count = 0;
-    const Img4ManifestRecord& manifest = evaluation.record.manifest;
-    const auto leaf = readCertificate(certificatesOf(manifest.certChain, &count).back());
-    std::string reason = "The manifest's signature does not verify under the key of the leaf";
-    if (leaf)
-        reason += " (" + quoted(nameText(leaf->tbs.subject)) + ")" +
-                  signatureRemark(leaf->tbs.subjectPublicKeyInfo, manifest.signature, evaluation.profile->made.profile,
-                                  ": the manifest's body was changed, or another key has signed it");
-    return {"signature", reason, manifest.signature.data, std::nullopt};
+    const auto leaf = readCertificate(certificatesOf(evaluation.record.manifest.certChain, &count).back());
+    const std::string reason = "The manifest's signature does not verify under the key of the leaf";
+    return leaf ? reason + " (" + quoted(nameText(leaf->tbs.subject)) + ")" +
+                      signatureRemark(evaluation.refusal.signature, leaf->tbs.subjectPublicKeyInfo,
+                                      ": the manifest's body was changed, or another key has signed it")
+                : reason;
 }
 
-TrustRefusal dictionaryRefusal(const Img4Record& record) {
-    DERDecodedInfo body;
-    std::uint32_t version = 0;
-    if (record.manb.data != nullptr)
-        return refusalOf("dictionaries", lookupCause(record.manb, manp, DERTagSet, "\"MANB\""));
-    DERDecodeItem(&record.manifest.body, &body);
-    DERParseInteger(&record.manifest.version, &version);
-    return refusalOf("dictionaries",
-                     lookupCause(body.content, manb, version == 2 ? DERTagSequence : DERTagSet, "the manifest's body"));
+std::string walkReason(const Img4Refusal& refusal, const char* owner) {
+    if (refusal.tag == 0)
+        return std::string("A property of ") + owner + " is no strict DER: " + derFaultText(refusal.encoding);
+    return derTagName(refusal.tag) + " of " + owner + " " + img4show::propertyReason(refusal);
 }
 
-TrustRefusal constraintRefusal(const Img4Record& record) {
+std::string constraintReason(const Img4Record& record) {
     for (const TrustConstraint& constraint : readConstraints(record))
         if (constraint.state == TrustConstraint::Broken)
-            return {"constraints", constraint.reason, constraint.place, std::nullopt};
-    return {"constraints", "The leaf certificate carries no constraints, without which nothing is trusted",
-            record.manifest.certChain.data, std::nullopt};
+            return constraint.reason;
+    return "The leaf certificate carries no constraints, without which nothing is trusted";
 }
 
 } // namespace
@@ -285,50 +193,39 @@ std::vector<DERItem> certificatesOf(const DERItem& certChain, std::uint64_t* cou
     return certificates;
 }
 
-Img4ChainRefusal judgeChain(const Img4Record& record, const DomainProfile& profile) {
-    Img4DomainProfile made = profile.made;
-    Img4ChainRefusal refusal = {Img4ChainParameters, 0};
-    DERItem leafKey;
-    DERItem certProperties;
-    made.refusal = &refusal;
-    made.profile.verifyChain(&record.manifest.certChain, &leafKey, &certProperties, &made.profile);
-    return refusal;
-}
-
 TrustEvaluation evaluateTrust(const Img4Record& record, const DomainProfile& profile,
                               std::optional<std::uint32_t> object) {
-    TrustEvaluation evaluation = {&profile, object, record, {Img4ChainParameters, 0}, DERSuccess};
-    Img4DomainProfile made = profile.made;
+    TrustEvaluation evaluation = {&profile, object, record, {}, DERSuccess};
     const Img4TrustCallbacks callbacks = {agree, nullptr, nullptr};
-    made.refusal = &evaluation.refusal;
-    evaluation.status = object ? Img4DecodePerformTrustEvaluationWithCallbacks(*object, &evaluation.record, &callbacks,
-                                                                               &made.profile, nullptr)
-                               : Img4DecodePerformManifestTrustEvaluationWithCallbacks(&evaluation.record, &callbacks,
-                                                                                       &made.profile, nullptr);
+    evaluation.status =
+        Img4DecodePerformTrustEvaluationExplained(object ? &*object : nullptr, &evaluation.record, &callbacks,
+                                                  &profile.made.profile, nullptr, &evaluation.refusal);
     return evaluation;
 }
 
-// The steps in their order: the first that has not left its result in the record is the one that failed.
 TrustRefusal explainRefusal(const TrustEvaluation& evaluation) {
-    const Img4Record& record = evaluation.record;
-    if (record.manifestHashed == 0)
-        return {"digest", "The manifest's digest could not be computed", record.manifestRaw.data, std::nullopt};
-    if (evaluation.refusal.fault != Img4ChainSound)
-        return ChainWords(evaluation).explain();
-    // The search for the dictionaries has other statuses.
-    if (record.manb.data == nullptr && evaluation.status == Img4Failure)
-        return signatureRefusal(evaluation);
-    if (record.manp.data == nullptr)
-        return dictionaryRefusal(record);
-    if (evaluation.object && record.objp.data == nullptr)
-        return refusalOf("object", lookupCause(record.manb, *evaluation.object, DERTagSet, "the manifest"));
-    if (Img4DecodeEvaluateCertificateProperties(&record) != DERSuccess)
-        return constraintRefusal(record);
-    bool hasPayload = false;
-    Img4DecodePayloadExists(&record, &hasPayload);
-    if (hasPayload && record.payloadHashed == 0)
-        return {"digest", "The payload's digest could not be computed", record.payloadRaw.data, std::nullopt};
-    if (Img4DecodeEvaluateManifestProperties(&record, agree, nullptr) != DERSuccess)
-        return refusalOf("properties", walkCause(record.manp, "the manifest"));
-    return refusalOf("properties", walkCause(record.objp, "the object"));
+    const Img4TrustRefusal& refusal = evaluation.refusal;
+    const std::uint8_t* const place = refusal.refusal.place;
+    switch (refusal.refusal.subject) {
+    case Img4SubjectChain:
+        return {"chain", ChainWords(evaluation).reason(), place,
+                refusal.chain.fault == Img4ChainLength ? std::nullopt : std::optional(refusal.chain.certificate)};
+    case Img4SubjectSignature:
+        return {"signature", signatureReason(evaluation), place, std::nullopt};
+    case Img4SubjectBody:
+    case Img4SubjectManb:
+        return {"dictionaries", img4show::lookupReason(refusal.refusal), place, std::nullopt};
+    case Img4SubjectObject:
+        return {"object", img4show::lookupReason(refusal.refusal), place, std::nullopt};
+    case Img4SubjectConstraints:
+        return {"constraints", constraintReason(evaluation.record), place, std::nullopt};
+    case Img4SubjectManifestProperties:
+        return {"properties", walkReason(refusal.refusal, "the manifest"), place, std::nullopt};
+    case Img4SubjectObjectProperties:
+        return {"properties", walkReason(refusal.refusal, "the object"), place, std::nullopt};
+    case Img4SubjectPayloadDigest:
+        return {"digest", "The payload's digest could not be computed", place, std::nullopt};
+    default:
+        return {"digest", "The manifest's digest could not be computed", place, std::nullopt};
+    }
 }

@@ -1,5 +1,4 @@
-// One evaluation of a manifest under one profile, and the words for its refusal. The verdict is the decoder's; the
-// words are found by looking at what it left in the record.
+// One evaluation of a manifest under one profile, and words for what it refused.
 #ifndef VELTRA_TOOLS_ORLOCTL_TRUSTEVALUATION_H
 #define VELTRA_TOOLS_ORLOCTL_TRUSTEVALUATION_H
 
@@ -15,12 +14,9 @@ struct TrustEvaluation {
     const DomainProfile* profile;
     std::optional<std::uint32_t> object; // evaluated with the manifest
     Img4Record record;
-    Img4ChainRefusal refusal;
+    Img4TrustRefusal refusal;
     DERReturn status;
 };
-
-// Verifies the chain of `record` alone.
-Img4ChainRefusal judgeChain(const Img4Record& record, const DomainProfile& profile);
 
 // `record` as an initialisation left it. Every property is agreed to.
 TrustEvaluation evaluateTrust(const Img4Record& record, const DomainProfile& profile,
@@ -34,7 +30,7 @@ struct TrustRefusal {
     std::optional<std::uint32_t> certificate; // its place in the chain, when it is about one
 };
 
-// The first reason for which the evaluation was refused.
+// Words for what the evaluation refused.
 TrustRefusal explainRefusal(const TrustEvaluation& evaluation);
 
 // The encodings of the certificates in the content of a chain, up to the first that is no strict DER and at most

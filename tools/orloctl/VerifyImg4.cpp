@@ -1,16 +1,15 @@
 #include "tools/orloctl/VerifyImg4.h"
 
 #include <algorithm>
-#include <tuple>
 
 #include "tools/orloctl/CertificateText.h"
 #include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Findings.h"
 #include "tools/orloctl/Img4Properties.h"
+#include "tools/orloctl/Img4Words.h"
 #include "tools/orloctl/LocalFiles.h"
 #include "tools/orloctl/ShowFile.h"
-#include "tools/orloctl/ShowImg4.h"
 #include "tools/orloctl/TrustConstraints.h"
 #include "tools/orloctl/TrustEvaluation.h"
 
@@ -24,27 +23,12 @@ bool areEqual(const DERItem& one, const DERItem& other) {
     return std::equal(one.data, one.data + one.length, other.data, other.data + other.length);
 }
 
-// How far the verification of a chain has come, for comparison: certificates are counted before they are parsed, all of
-// their keys come before names and signatures, and these are checked certificate by certificate.
-std::tuple<int, std::uint32_t, int> progressOf(const Img4ChainRefusal& refusal) {
-    switch (refusal.fault) {
-    case Img4ChainSound:
-        return {5, 0, 0};
-    case Img4ChainAuthority:
-    case Img4ChainExtensions:
-        return {4, 0, refusal.fault};
-    case Img4ChainIssuer:
-    case Img4ChainSignatureAlgorithm:
-    case Img4ChainSignature:
-        return {3, refusal.certificate, refusal.fault};
-    case Img4ChainKey:
-        return {2, refusal.certificate, 0};
-    case Img4ChainEncoding:
-    case Img4ChainCertificateSize:
-        return {1, refusal.certificate, 0};
-    default:
-        return {0, 0, 0};
-    }
+// How far an evaluation has come, for comparison: certificates are counted before they are looked at.
+std::pair<int, std::uint32_t> progressOf(const TrustEvaluation& evaluation) {
+    const Img4ChainRefusal& chain = evaluation.refusal.chain;
+    if (evaluation.refusal.refusal.subject != Img4SubjectChain)
+        return {Img4ChainExtensions + 1, 0};
+    return {chain.fault == Img4ChainLength ? 0 : chain.fault, chain.certificate};
 }
 
 const char* digestName(std::uint64_t length) {
@@ -65,9 +49,8 @@ public:
 
 private:
     bool readFile();
-    bool readBareManifest();
     std::optional<TrustEvaluation> evaluate() const;
-    bool namesRoot(const DomainProfile& profile) const;
+    std::vector<const DomainProfile*> candidates() const;
 
     void refuse(const TrustRefusal& refusal);
     void refuseUnknownRoot();
@@ -102,76 +85,54 @@ void Verification::refuse(const TrustRefusal& refusal) {
     report_.json["problemOffset"] = offset;
 }
 
-bool Verification::readBareManifest() {
-    Img4Record other;
-    report_.json["kind"] = "manifest";
-    if (Img4DecodeInitManifest(file_.data, file_.length, &record_) == DERSuccess)
+bool Verification::readFile() {
+    Img4Kind kind = Img4KindUnknown;
+    Img4Refusal refusal = {};
+    refusal.place = file_.data;
+    const DERReturn result = Img4DecodeInitExplained(file_.data, file_.length, &record_, &kind, &refusal);
+    report_.json["kind"] = img4show::kindName(kind);
+    const std::string pem = pemProblem(file_);
+    std::string reason;
+    if (result != DERSuccess)
+        reason = img4show::fileReason(file_, refusal);
+    else if (kind == Img4KindUnsignedManifest)
+        reason = "The manifest has neither a signature nor a chain";
+    else if (kind == Img4KindPayload)
+        reason = "The file is a bare payload, and only a manifest is signed";
+    else if (record_.manifestRaw.data == nullptr)
+        reason = "The container has no manifest, so that nothing vouches for its payload";
+    else
         return true;
-    if (Img4DecodeInitUnsignedManifest(file_.data, file_.length, &other) == DERSuccess) {
-        report_.json["kind"] = "unsigned manifest";
-        refuse({"file", "The manifest has neither a signature nor a chain", file_.data, std::nullopt});
-    } else if (Img4DecodeInitPayload(file_.data, file_.length, &other) == DERSuccess) {
-        report_.json["kind"] = "payload";
-        refuse({"file", "The file is a bare payload, and only a manifest is signed", file_.data, std::nullopt});
-    } else {
-        const Report shown = showImg4(file_.data, file_.length);
-        report_.json["kind"] = shown.json.value("kind", "file");
-        report_.json["failedStep"] = "file";
-        report_.json["problemOffset"] = shown.json.value("problemOffset", 0);
-        report_.problem = pemProblem(file_);
-        if (report_.problem.empty())
-            report_.problem = shown.problem;
-        report_.ok = false;
-    }
+    refuse({"file", reason, result != DERSuccess ? refusal.place : file_.data, std::nullopt});
+    if (!pem.empty())
+        report_.problem = pem;
     return false;
 }
 
-bool Verification::readFile() {
-    bool hasManifest = false;
-    if (Img4DecodeInit(file_.data, file_.length, &record_) != DERSuccess)
-        return readBareManifest();
-    report_.json["kind"] = "container";
-    Img4DecodeManifestExists(&record_, &hasManifest);
-    if (!hasManifest)
-        refuse({"file", "The container has no manifest, so that nothing vouches for its payload", file_.data,
-                std::nullopt});
-    return hasManifest;
-}
-
-// Whether the first certificate names the profile's root as its issuer.
-bool Verification::namesRoot(const DomainProfile& profile) const {
-    const auto root = readCertificate(profile.made.root);
+// The profiles whose root the first certificate names as its issuer, and all of them when that cannot be told. None
+// when there are several and it names the root of none.
+std::vector<const DomainProfile*> Verification::candidates() const {
     const auto first = certificates_.empty() ? std::nullopt : readCertificate(certificates_.front());
-    return root && first && areEqual(first->tbs.issuer, root->tbs.subject);
+    std::vector<const DomainProfile*> named;
+    for (const DomainProfile& profile : domain_.profiles) {
+        const auto root = readCertificate(profile.made.root);
+        if (domain_.profiles.size() == 1 || !first || (root && areEqual(first->tbs.issuer, root->tbs.subject)))
+            named.push_back(&profile);
+    }
+    return named;
 }
 
-// Verifying a chain is cheap, since most roots are not the one that it names, and the digest of a large manifest is
-// not. So chains come first, and one evaluation is made of the profile whose chain is sound, or comes nearest to it.
-// Nothing when there are several profiles and the chain names the root of none.
+// The first that trusts the manifest, else the one that has come furthest.
 std::optional<TrustEvaluation> Verification::evaluate() const {
-    using Rank = std::pair<bool, std::tuple<int, std::uint32_t, int>>;
-    std::optional<TrustEvaluation> refused;
-    const DomainProfile* best = &domain_.profiles.front();
-    Rank bestRank = {false, {-1, 0, 0}};
-    for (const DomainProfile& profile : domain_.profiles) {
-        const Img4ChainRefusal refusal = judgeChain(record_, profile);
-        const Rank rank = {namesRoot(profile), progressOf(refusal)};
-        if (refusal.fault == Img4ChainSound) {
-            const TrustEvaluation evaluation = evaluateTrust(record_, profile, object_);
-            if (evaluation.status == DERSuccess)
-                return evaluation;
-            refused = refused ? refused : evaluation;
-        } else if (rank > bestRank) {
-            best = &profile;
-            bestRank = rank;
-        }
+    std::optional<TrustEvaluation> best;
+    for (const DomainProfile* profile : candidates()) {
+        const TrustEvaluation evaluation = evaluateTrust(record_, *profile, object_);
+        if (evaluation.status == DERSuccess)
+            return evaluation;
+        if (!best || progressOf(evaluation) > progressOf(*best))
+            best = evaluation;
     }
-    if (refused)
-        return refused;
-    const bool isFirstReadable = !certificates_.empty() && readCertificate(certificates_.front());
-    if (domain_.profiles.size() > 1 && !bestRank.first && isFirstReadable)
-        return std::nullopt;
-    return evaluateTrust(record_, *best, object_);
+    return best;
 }
 
 void Verification::refuseUnknownRoot() {
@@ -224,7 +185,7 @@ void Verification::addDigests(const TrustEvaluation& evaluation) {
     ordered_json digests = {{"algorithm", digestName(length)}};
     if (record.manifestHashed != 0)
         digests["manifest"] = hexText({record.manifest.digest, length}, length);
-    if (evaluation.refusal.fault == Img4ChainSound)
+    if (evaluation.refusal.refusal.fault == Img4FaultNone || evaluation.refusal.refusal.subject > Img4SubjectBodyDigest)
         digests["body"] = hexText({record.manifest.bodyDigest, length}, length);
     if (record.payloadHashed != 0)
         digests["payload"] = hexText({record.payload.digest, length}, length);
