@@ -78,7 +78,7 @@ protected:
 
 private:
     struct Connection;
-    Connection* connection_ = nullptr;
+    [[maybe_unused]] Connection* connection_ = nullptr; // not used in a program that brings its own host
 };
 
 #endif

@@ -394,8 +394,9 @@ TEST(Img4Trust, evaluatesManifestsWithoutPayloadOrObject) {
     EXPECT_EQ(Img4DecodePerformTrustEvaluation(objectCode, &record, judge, fastEntry().profile, &context), DERSuccess);
     const Bytes first = soundManifest();
     Bytes mixed = first;
-    mixed[static_cast<std::size_t>(std::search(mixed.begin(), mixed.end(), "IM4M", "IM4M" + 4) - mixed.begin()) + 6] =
-        2;
+    constexpr char magic[] = {'I', 'M', '4', 'M'};
+    const auto found = std::search(mixed.begin(), mixed.end(), std::begin(magic), std::end(magic));
+    mixed[static_cast<std::size_t>(found - mixed.begin()) + 6] = 2;
     ASSERT_EQ(Img4DecodeInitManifest(mixed.data(), mixed.size(), &record), DERSuccess);
     EXPECT_EQ(Img4DecodePerformTrustEvaluation(objectCode, &record, judge, fastEntry().profile, &context),
               DERUnexpectedTag);

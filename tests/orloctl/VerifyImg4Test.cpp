@@ -17,7 +17,6 @@ using namespace img4maker;
 using nlohmann::ordered_json;
 
 constexpr const char* ec384 = "kImg4DecodeSecureBootEc384Sha384";
-constexpr const char* ec256 = "kImg4DecodeSecureBootEc256Sha256";
 constexpr const char* rsa1k = "kImg4DecodeSecureBootRsa1kSha1";
 constexpr const char* rsa3k = "kImg4DecodeSecureBootRsa3kSha384";
 constexpr const char* rsa4k = "kImg4DecodeSecureBootRsa4kSha384";
