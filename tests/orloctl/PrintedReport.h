@@ -6,14 +6,22 @@
 
 #include "tools/orloctl/Report.h"
 
-// The report with its JSON as a program reads it from what is printed, lists and all, and its text as people do.
-inline Report printed(Report report) {
+// A report and its text as people read it.
+struct PrintedReport : Report {
+    PrintedReport(Report report) : Report(std::move(report)) {
+        std::ostringstream out;
+        writeText(out, *this);
+        text = out.str();
+    }
+
+    std::string text;
+};
+
+// Its JSON too as a program reads it from what is printed, lists and all.
+inline PrintedReport printed(PrintedReport report) {
     std::ostringstream out;
-    std::ostringstream text;
     writeJson(out, report);
-    writeText(text, report);
     report.json = nlohmann::ordered_json::parse(out.str());
-    report.text = text.str();
     return report;
 }
 

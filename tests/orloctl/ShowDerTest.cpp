@@ -13,6 +13,7 @@ namespace {
 
 using namespace img4maker;
 using nlohmann::ordered_json;
+using Report = PrintedReport;
 
 Report show(const Bytes& bytes) {
     return printed(showDer(bytes.data(), bytes.size()));

@@ -9,6 +9,7 @@ namespace {
 
 using namespace img4maker;
 using nlohmann::ordered_json;
+using Report = PrintedReport;
 
 Bytes number(std::uint32_t value) {
     return item(DERTagInteger, {static_cast<std::uint8_t>(value), static_cast<std::uint8_t>(value >> 8),

@@ -11,6 +11,7 @@ namespace {
 
 using namespace img4maker;
 using nlohmann::ordered_json;
+using Report = PrintedReport;
 
 Report show(const Bytes& bytes) {
     return printed(showImg4(bytes.data(), bytes.size()));

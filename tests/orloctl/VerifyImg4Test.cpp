@@ -15,6 +15,7 @@ namespace {
 using namespace signedmanifest;
 using namespace img4maker;
 using nlohmann::ordered_json;
+using Report = PrintedReport;
 
 constexpr const char* ec384 = "kImg4DecodeSecureBootEc384Sha384";
 constexpr const char* rsa1k = "kImg4DecodeSecureBootRsa1kSha1";

@@ -269,10 +269,7 @@ void writeJson(std::ostream& out, const Report& report) {
 }
 
 void writeText(std::ostream& out, const Report& report) {
-    if (report.text.empty())
-        TextWriter(out).members(report.json, report.lists, layouts[0], 0);
-    else
-        printText(out, report.text, utf8::Escaping::Lines);
+    TextWriter(out).members(report.json, report.lists, layouts[0], 0);
 }
 
 void print(std::ostream& out, std::string_view text) {

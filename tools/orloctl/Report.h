@@ -60,7 +60,6 @@ enum class Outcome {
 struct Report { // NOLINT(bugprone-exception-escape): moving JSON asserts, which throws nothing here
     nlohmann::ordered_json json = nlohmann::ordered_json::object();
     Lists lists = {};
-    std::string text = {}; // for people in place of the JSON, unless empty
     bool ok = true;
     std::string problem = {}; // a sentence that says what is wrong and where; empty when ok
     std::string note = {};    // what the JSON does not say and the user should know

@@ -277,7 +277,8 @@ const Verb verbs[] = {
       {"--profile", "The trust profile, such as kImg4DecodeSecureBootEc384Sha384; without it, the one that fits",
        "PROFILE"},
       {"--object", "Evaluate the object with this four-character code too", "CODE"},
-      {"--payload-digest", "Compare the payload's digest with this property of the object, such as DGST", "CODE"},
+      {"--payload-digest", "Compare the payload's digest with this property of --object's object, such as DGST",
+       "CODE"},
       {"--trust-dir",
        "Take roots and names from this folder, which scripts/make-trust-domain has made, instead of those that are "
        "built in",
