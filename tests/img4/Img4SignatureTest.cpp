@@ -246,7 +246,7 @@ TEST(Img4RSASignature, needsASoundKey) {
     block.digestInfo = sequence({sequence({oid(*profile.digestInfo->oid), null}), octets(digest)});
     const Bytes forged = encode(block, n.size());
     Bytes even = n;
-    even.back() ^= 1;
+    even.at(n.size() - 1) ^= 1;
     Bytes trailing = sequence({positiveInteger(n), positiveInteger(e)});
     trailing.push_back(0);
     struct Row {
