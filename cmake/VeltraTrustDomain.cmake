@@ -8,7 +8,7 @@ function(veltra_trust_domain name folder)
     set(script ${PROJECT_SOURCE_DIR}/cmake/WriteTrustDomain.cmake)
     add_custom_command(OUTPUT ${source}
         COMMAND ${CMAKE_COMMAND} -DFOLDER=${folder} -DSOURCE=${source} -P ${script}
-        DEPENDS ${script} ${files}
+        DEPENDS ${script} ${PROJECT_SOURCE_DIR}/img4/Img4TrustProfileList.h ${files}
         COMMENT "Taking the trust domain from ${folder}"
         VERBATIM)
     add_library(${name} OBJECT ${source})

@@ -257,41 +257,30 @@ IMG4_API DERReturn verify_signature_ecdsa(const DERItem* key, const DERItem* sig
 // extension oidTevariImg4ManifestCertSpec, absent when there is none. Both are absent after a failure. Neither dates
 // nor the other extensions are looked at: a manifest outlives the certificates that it was signed with.
 
+typedef DERReturn Img4ChainVerifier(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
+                                    const Img4TrustProfile* profile);
+
 // Three certificates, RSA. The one in the middle must carry the common name of the domain's secure-boot authority.
-IMG4_API DERReturn verify_chain_img4_v1(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                        const Img4TrustProfile* profile);
+IMG4_API Img4ChainVerifier verify_chain_img4_v1;
 
 // Two certificates, RSA.
-IMG4_API DERReturn verify_chain_img4_v2(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                        const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_v2_rsa3k(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                              const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_v2_BRX1(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                             const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_x86(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                         const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_ddi(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                         const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_ddi_global(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                                const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_ddi_fake(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                              const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_ddi_fake_global(const DERItem* certChain, DERItem* leafKey,
-                                                     DERItem* certProperties, const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_marda_local_policy(const DERItem* certChain, DERItem* leafKey,
-                                                        DERItem* certProperties, const Img4TrustProfile* profile);
+IMG4_API Img4ChainVerifier verify_chain_img4_v2;
+IMG4_API Img4ChainVerifier verify_chain_img4_v2_rsa3k;
+IMG4_API Img4ChainVerifier verify_chain_img4_v2_BRX1;
+IMG4_API Img4ChainVerifier verify_chain_img4_x86;
+IMG4_API Img4ChainVerifier verify_chain_img4_ddi;
+IMG4_API Img4ChainVerifier verify_chain_img4_ddi_global;
+IMG4_API Img4ChainVerifier verify_chain_img4_ddi_fake;
+IMG4_API Img4ChainVerifier verify_chain_img4_ddi_fake_global;
+IMG4_API Img4ChainVerifier verify_chain_img4_marda_local_policy;
 
 // Two certificates, EC.
-IMG4_API DERReturn verify_chain_img4_ecdsa256(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                              const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_ecdsa384(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                              const Img4TrustProfile* profile);
+IMG4_API Img4ChainVerifier verify_chain_img4_ecdsa256;
+IMG4_API Img4ChainVerifier verify_chain_img4_ecdsa384;
 
 // Three certificates, EC.
-IMG4_API DERReturn verify_chain_img4_ecdsa384_local_policy(const DERItem* certChain, DERItem* leafKey,
-                                                           DERItem* certProperties, const Img4TrustProfile* profile);
-IMG4_API DERReturn verify_chain_img4_ecdsa384_qa(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                                 const Img4TrustProfile* profile);
+IMG4_API Img4ChainVerifier verify_chain_img4_ecdsa384_local_policy;
+IMG4_API Img4ChainVerifier verify_chain_img4_ecdsa384_qa;
 
 // Profiles
 

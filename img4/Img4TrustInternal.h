@@ -13,20 +13,8 @@ struct Img4DigestImplementation {
 
 // The built-in domain, made from the DER files of its folder when the library is built.
 extern "C" {
-extern const DERItem ROOT_CA_CERTIFICATE;
-extern const DERItem RSA3K_SHA384_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_ROOT_CA_CERTIFICATE_BRX1;
-extern const DERItem RSA4K_SHA384_X86_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_DDI_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_DDI_GLOBAL_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_DDI_FAKE_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_DDI_FAKE_GLOBAL_ROOT_CA_CERTIFICATE;
-extern const DERItem RSA4K_SHA384_LP_ROOT_CA_CERTIFICATE;
-extern const DERItem EC384_SHA384_LP_ROOT_CA_CERTIFICATE;
-extern const DERItem QA_EC384_SHA384_ROOT_CA_CERTIFICATE;
-extern const DERItem LOCAL_EC256_SHA256_ROOT_CA_CERTIFICATE;
-extern const DERItem LOCAL_EC384_SHA384_ROOT_CA_CERTIFICATE;
+#define PROFILE(name, verifier, kind, length, root) extern const DERItem root;
+#include "img4/Img4TrustProfileList.h"
 }
 
 namespace img4 {

@@ -13,27 +13,30 @@ constexpr uint8_t ecPubKeyOctets[] = {0x2A, 0x86, 0x48, 0xCE, 0x3D, 0x02, 0x01};
 constexpr uint8_t prime256v1Octets[] = {0x2A, 0x86, 0x48, 0xCE, 0x3D, 0x03, 0x01, 0x07};
 constexpr uint8_t ansip384r1Octets[] = {0x2B, 0x81, 0x04, 0x00, 0x22};
 
-constexpr ChainRules twoRSA = {2, KeyKind::RSA, false};
-constexpr ChainRules threeRSA = {3, KeyKind::RSA, true};
-constexpr ChainRules twoEC = {2, KeyKind::EC, false};
-constexpr ChainRules threeEC = {3, KeyKind::EC, false};
+// What the profiles of one kind have in common.
+struct Kind {
+    KeyKind key;
+    decltype(Img4TrustProfile::verifySignature) verifySignature;
+    const Img4DigestInfo* digest;
+    const DERItem* signatureAlgorithm;
+    const DERItem* keyAlgorithm;
+};
+
+constexpr Kind Rsa1k = {KeyKind::RSA, verify_signature_rsa, &kQDSupportDigestInfoSha1, &oidSha1Rsa, &oidRsa};
+constexpr Kind Rsa3k = {KeyKind::RSA, verify_signature_rsa3k, &kQDSupportDigestInfoSha384, &oidSha384Rsa, &oidRsa};
+constexpr Kind Rsa4k = {KeyKind::RSA, verify_signature_rsa, &kQDSupportDigestInfoSha384, &oidSha384Rsa, &oidRsa};
+constexpr Kind Ec256 = {KeyKind::EC, verify_signature_ecdsa, &kQDSupportDigestInfoSha256, &oidSha256Ecdsa,
+                        &oidEcPrime256v1};
+constexpr Kind Ec384 = {KeyKind::EC, verify_signature_ecdsa, &kQDSupportDigestInfoSha384, &oidSha384Ecdsa,
+                        &oidAnsip384r1};
+
+// Only long chains of RSA certificates lead through the secure-boot authority.
+constexpr ChainRules rulesOf(KeyKind key, uint32_t length) {
+    return {length, key, key == KeyKind::RSA && length == longestChain};
+}
 
 DERReturn statusOf(const Img4ChainRefusal& refusal) {
     return refusal.fault == Img4ChainSound ? DERSuccess : Img4Failure;
-}
-
-// The routines that the chain verifiers share; each verifier supplies its root.
-
-DERReturn verify_chain_img4_rsa(const DERItem& root, const ChainArguments& arguments) {
-    return statusOf(verifyChain(twoRSA, root, Img4BuiltInTrustDomain, arguments));
-}
-
-DERReturn verify_chain_img4_ec(const DERItem& root, const ChainArguments& arguments) {
-    return statusOf(verifyChain(twoEC, root, Img4BuiltInTrustDomain, arguments));
-}
-
-DERReturn verify_chain_img4_ec_v1(const DERItem& root, const ChainArguments& arguments) {
-    return statusOf(verifyChain(threeEC, root, Img4BuiltInTrustDomain, arguments));
 }
 
 } // namespace
@@ -47,137 +50,24 @@ const DERItem oidEcPrime256v1 = {prime256v1Octets, sizeof prime256v1Octets};
 const DERItem oidAnsip384r1 = {ansip384r1Octets, sizeof ansip384r1Octets};
 const DERItem img4::oidEcPubKey = {ecPubKeyOctets, sizeof ecPubKeyOctets};
 
-DERReturn verify_chain_img4_v1(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                               const Img4TrustProfile* profile) {
-    return statusOf(verifyChain(threeRSA, ROOT_CA_CERTIFICATE, Img4BuiltInTrustDomain,
-                                {certChain, leafKey, certProperties, profile}));
-}
-
-DERReturn verify_chain_img4_v2(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                               const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_v2_rsa3k(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                     const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA3K_SHA384_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_v2_BRX1(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                    const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_ROOT_CA_CERTIFICATE_BRX1, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_x86(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_X86_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ddi(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_DDI_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ddi_global(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                       const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_DDI_GLOBAL_ROOT_CA_CERTIFICATE,
-                                 {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ddi_fake(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                     const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_DDI_FAKE_ROOT_CA_CERTIFICATE,
-                                 {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ddi_fake_global(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                            const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_DDI_FAKE_GLOBAL_ROOT_CA_CERTIFICATE,
-                                 {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_marda_local_policy(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                               const Img4TrustProfile* profile) {
-    return verify_chain_img4_rsa(RSA4K_SHA384_LP_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ecdsa256(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                     const Img4TrustProfile* profile) {
-    return verify_chain_img4_ec(LOCAL_EC256_SHA256_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ecdsa384(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                     const Img4TrustProfile* profile) {
-    return verify_chain_img4_ec(LOCAL_EC384_SHA384_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ecdsa384_local_policy(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                                  const Img4TrustProfile* profile) {
-    return verify_chain_img4_ec_v1(EC384_SHA384_LP_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-DERReturn verify_chain_img4_ecdsa384_qa(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,
-                                        const Img4TrustProfile* profile) {
-    return verify_chain_img4_ec_v1(QA_EC384_SHA384_ROOT_CA_CERTIFICATE, {certChain, leafKey, certProperties, profile});
-}
-
-namespace {
-
-constexpr Img4TrustProfile makeProfile(decltype(Img4TrustProfile::verifyChain) chain,
-                                       decltype(Img4TrustProfile::verifySignature) signature,
-                                       const Img4DigestInfo& digest, const DERItem& signatureAlgorithm,
-                                       const DERItem& keyAlgorithm) {
-    return {Img4DecodeComputeDigest, chain,        signature, Img4DecodeEvaluateCertificateProperties, &digest,
-            &signatureAlgorithm,     &keyAlgorithm};
-}
-
-constexpr Img4TrustProfile makeRSA4kProfile(decltype(Img4TrustProfile::verifyChain) chain) {
-    return makeProfile(chain, verify_signature_rsa, kQDSupportDigestInfoSha384, oidSha384Rsa, oidRsa);
-}
-
-constexpr Img4TrustProfile makeEC384Profile(decltype(Img4TrustProfile::verifyChain) chain) {
-    return makeProfile(chain, verify_signature_ecdsa, kQDSupportDigestInfoSha384, oidSha384Ecdsa, oidAnsip384r1);
-}
-
-} // namespace
-
-const Img4TrustProfile kImg4DecodeSecureBootRsa1kSha1 =
-    makeProfile(verify_chain_img4_v1, verify_signature_rsa, kQDSupportDigestInfoSha1, oidSha1Rsa, oidRsa);
-const Img4TrustProfile kImg4DecodeSecureBootRsa3kSha384 =
-    makeProfile(verify_chain_img4_v2_rsa3k, verify_signature_rsa3k, kQDSupportDigestInfoSha384, oidSha384Rsa, oidRsa);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384 = makeRSA4kProfile(verify_chain_img4_v2);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384BRX1 = makeRSA4kProfile(verify_chain_img4_v2_BRX1);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384X86 = makeRSA4kProfile(verify_chain_img4_x86);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384DDI = makeRSA4kProfile(verify_chain_img4_ddi);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384DDIGlobal = makeRSA4kProfile(verify_chain_img4_ddi_global);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384DDIFake = makeRSA4kProfile(verify_chain_img4_ddi_fake);
-const Img4TrustProfile kImg4DecodeSecureBootRsa4kSha384DDIFakeGlobal =
-    makeRSA4kProfile(verify_chain_img4_ddi_fake_global);
-const Img4TrustProfile kImg4DecodeLocalPolicyRsa4kSha384 = makeRSA4kProfile(verify_chain_img4_marda_local_policy);
-const Img4TrustProfile kImg4DecodeLocalPolicyEc384Sha384 = makeEC384Profile(verify_chain_img4_ecdsa384_local_policy);
-const Img4TrustProfile kImg4DecodeLocalPolicyEc384Sha384QA = makeEC384Profile(verify_chain_img4_ecdsa384_qa);
-const Img4TrustProfile kImg4DecodeSecureBootEc256Sha256 = makeProfile(
-    verify_chain_img4_ecdsa256, verify_signature_ecdsa, kQDSupportDigestInfoSha256, oidSha256Ecdsa, oidEcPrime256v1);
-const Img4TrustProfile kImg4DecodeSecureBootEc384Sha384 = makeEC384Profile(verify_chain_img4_ecdsa384);
-
-#define ENTRY(profile, root, chainLength)                                                                              \
-    { #profile, &(profile), #root, &(root), chainLength }
+#define PROFILE(name, verifier, kind, length, root)                                                                    \
+    DERReturn verify_chain_img4_##verifier(const DERItem* certChain, DERItem* leafKey, DERItem* certProperties,        \
+                                           const Img4TrustProfile* profile) {                                          \
+        return statusOf(verifyChain(rulesOf(kind.key, length), root, Img4BuiltInTrustDomain,                           \
+                                    {certChain, leafKey, certProperties, profile}));                                   \
+    }                                                                                                                  \
+    const Img4TrustProfile kImg4Decode##name = {Img4DecodeComputeDigest,                                               \
+                                                verify_chain_img4_##verifier,                                          \
+                                                kind.verifySignature,                                                  \
+                                                Img4DecodeEvaluateCertificateProperties,                               \
+                                                kind.digest,                                                           \
+                                                kind.signatureAlgorithm,                                               \
+                                                kind.keyAlgorithm};
+#include "img4/Img4TrustProfileList.h"
 
 const Img4TrustProfileEntry Img4TrustProfiles[] = {
-    ENTRY(kImg4DecodeSecureBootRsa1kSha1, ROOT_CA_CERTIFICATE, 3),
-    ENTRY(kImg4DecodeSecureBootRsa3kSha384, RSA3K_SHA384_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384, RSA4K_SHA384_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384BRX1, RSA4K_SHA384_ROOT_CA_CERTIFICATE_BRX1, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384X86, RSA4K_SHA384_X86_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384DDI, RSA4K_SHA384_DDI_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384DDIGlobal, RSA4K_SHA384_DDI_GLOBAL_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384DDIFake, RSA4K_SHA384_DDI_FAKE_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootRsa4kSha384DDIFakeGlobal, RSA4K_SHA384_DDI_FAKE_GLOBAL_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeLocalPolicyRsa4kSha384, RSA4K_SHA384_LP_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeLocalPolicyEc384Sha384, EC384_SHA384_LP_ROOT_CA_CERTIFICATE, 3),
-    ENTRY(kImg4DecodeLocalPolicyEc384Sha384QA, QA_EC384_SHA384_ROOT_CA_CERTIFICATE, 3),
-    ENTRY(kImg4DecodeSecureBootEc256Sha256, LOCAL_EC256_SHA256_ROOT_CA_CERTIFICATE, 2),
-    ENTRY(kImg4DecodeSecureBootEc384Sha384, LOCAL_EC384_SHA384_ROOT_CA_CERTIFICATE, 2),
+#define PROFILE(name, verifier, kind, length, root) {"kImg4Decode" #name, &kImg4Decode##name, #root, &(root), length},
+#include "img4/Img4TrustProfileList.h"
 };
 const uint16_t Img4NumTrustProfiles = std::size(Img4TrustProfiles);
 
@@ -188,8 +78,8 @@ namespace {
 DERReturn verifyInDomain(const ChainArguments& arguments, Img4TrustRefusal* why) {
     const auto& domainProfile = *reinterpret_cast<const Img4DomainProfile*>(arguments.profile);
     const bool isRSA = DEROidCompare(arguments.profile->keyAlgorithmOid, &oidRsa);
-    const ChainRules& rules =
-        domainProfile.chainLength == twoRSA.length ? (isRSA ? twoRSA : twoEC) : (isRSA ? threeRSA : threeEC);
+    const ChainRules rules =
+        rulesOf(isRSA ? KeyKind::RSA : KeyKind::EC, domainProfile.chainLength == 2 ? 2 : longestChain);
     const Img4ChainRefusal refusal = verifyChain(rules, domainProfile.root, domainProfile.domain, arguments, why);
     if (domainProfile.refusal != nullptr)
         *domainProfile.refusal = refusal;
