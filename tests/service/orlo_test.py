@@ -112,30 +112,6 @@ class Psd2(OrloTest):
         self.service.describe({})
         self.assertEqual((self.put(), self.get()), (put, get))
 
-    def test_the_log_tells_each_step(self):
-        handler = r"-\[ZPOrloServices handleMessage:completion:\]:\d+ - Received "
-        self.write("tmp/in", b"record")
-        lines = self.service.messages_of(self.put)
-        self.assertRegex(lines[4], f"^{handler}putPSD2$")
-        self.assertTrue(lines[5].startswith("Calling initWithOptions : "))
-        self.assertEqual(lines[9:11] + lines[-2:], [
-            "psd2- : VAN0001", "psd2 data: <7265636f7264>", "Orlo Put was successful : 1", "psd2 put was successful",
-        ])
-        lines = self.service.messages_of(self.get)
-        self.assertRegex(lines[4], f"^{handler}getPSD2$")
-        self.assertEqual([lines[9]] + lines[-3:], [
-            "psd2 instance : VAN0001", "orloGet  - SUCCESS ", "psd2 get was successful",
-            "psd2 data successfully writen",
-        ])
-        lines = self.service.messages_of(lambda: self.get("/missing/file"))
-        self.assertEqual(lines[-2:], ["psd2 get was successful", "Failed to open psd2 file handler"])
-        os.remove(self.root / STORE)
-        lines = self.service.messages_of(self.get)
-        self.assertTrue(lines[-2].startswith("orloGet  - Failure : "))
-        self.assertEqual(lines[-1], "psd2 get returned an error")
-        self.service.describe({})
-        self.assertEqual(self.service.messages_of(self.put)[-1], "psd2 put returned an error")
-
 
 class Export(OrloTest):
     def exported(self):
@@ -146,51 +122,12 @@ class Export(OrloTest):
             exports.setdefault(number, {}).update({name: instance} if name else {})
         return list(exports.values())
 
-    def refused(self, reason):
-        description = f"Orlo Export Failed due to - {reason}"
-        return -1, None, {"domain": "OrloExport", "code": 2002, "description": description}
-
-    def describe(self, **changes):
-        answers = {
-            "HWModelStr": "M12x", "CoverGlassSerialNumber": "CVG0001", "LoddenUID": "U", "VanterSerialNumber": "VAN0001"
-        }
-        answers.update(changes)
-        self.service.describe({key: value for key, value in answers.items() if value is not None})
-
     def test_each_export_stands_in_the_store_as_a_whole(self):
         self.assertEqual(self.answer("export"), SUCCESS)
         self.assertEqual(self.answer("export", "psd2", "tcrt", "psd2"), SUCCESS)
         self.assertEqual(self.answer("call", "OrloExport", "ExportList:=[]", "HTTPTimeout:=1"), SUCCESS)
         self.assertEqual(self.exported(), [DEFAULT_LIST, {"psd2": "VAN0001", "tcrt": "SCR0001-TMA0001"}, {}])
         self.assertEqual(self.rows("SELECT DISTINCT data_version FROM exports"), ["1"])
-
-    def test_the_model_and_the_request_choose_the_list(self):
-        expected = (-1, None, None)
-        for model, words, answer in (
-            ("M8", [], expected), ("xM9y", [], expected), ("M10M8", [], expected),
-            ("M12x", ["ExportList=CtCl"], expected), ("M12x", ["ExportList:=7"], expected),
-            ("M9", ['ExportList:=["CtCl"]'], SUCCESS), ("M9", ["ExportList:={}"], expected),
-        ):
-            with self.subTest((model, words)):
-                self.describe(HWModelStr=model)
-                lines = self.service.messages_of(
-                    lambda: self.assertEqual(self.answer("call", "OrloExport", *words), answer)
-                )
-                self.assertEqual(lines[4] == "Expected a list", answer is expected, lines)
-        self.describe(HWModelStr=None)
-        lines = self.service.messages_of(lambda: self.answer("export"))
-        self.assertEqual(lines[4], "Adding ExportList for overlays before M8xM9y")
-
-    def test_what_cannot_be_gathered_is_named(self):
-        self.describe()
-        self.assertEqual(self.answer("export", "CtCl", "xxxx"), self.refused("Key doesn't exist - xxxx"))
-        self.assertEqual(self.answer("export", "PxTC"), self.refused("Error Reading Prox SN"))
-        self.assertEqual(self.answer("export"), self.refused("Error Reading Miravel SN"))
-        self.assertEqual(self.answer("call", "OrloExport", "ExportList:=[[]]"), self.refused("Key doesn't exist - []"))
-        self.assertFalse((self.root / STORE).exists())
-        # These classes go on: the message that they leave is not looked at.
-        self.assertEqual(self.answer("export", "ycrt", "AlsH"), SUCCESS)
-        self.assertEqual(self.exported(), [{"ycrt": "(null)-U", "AlsH": "CVG0001-(null)"}])
 
 
 class Store(OrloTest):

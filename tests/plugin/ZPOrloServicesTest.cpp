@@ -1,0 +1,163 @@
+// Where memory or a disk ends, and how much memory a request takes; what commands say and do stands in transcripts.
+#include <csignal>
+#include <limits>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+#include "plugin/ZPOrloServices.h"
+#include "tests/support/FailingAllocation.h"
+#include "tests/support/OwnProcess.h"
+#include "tests/support/RecordedLog.h"
+#include "tests/support/ScriptedServices.h"
+#include "tests/support/TemporaryRoot.h"
+#include "tests/sysconfig/Blob.h"
+
+namespace {
+
+constexpr const char* calibration = "/usr/local/bin/q21isp";
+
+class ZPOrloServicesTest : public testing::Test {
+protected:
+    ZPOrloServicesTest() {
+        const Bytes blob = BlobParts{}.whole();
+        root_.write("/blob", std::string(blob.begin(), blob.end()));
+        root_.write("/ticket", "ticket");
+        root_.write("/psd2", "record");
+        root_.write("/var/mobile/Vanter.BE-Prod.fw", "patch");
+        program("echo loaded");
+        root_.write("/etc/veltra/device.json", R"({
+            "answers": {"HWModelStr": "M12x", "VanterSerialNumber": "VAN", "CoverGlassSerialNumber": "CVG",
+                        "AmbientLightSensorSerialNumber": "ALS", "MiravelSerialNumber": "MIR",
+                        "ScreenSerialNumber": "SCR", "TopModuleAuthChipID": "TMA"},
+            "registry": [{"class": "TeskAuthI2CRelayInterface",
+                          "properties": {"AccessoryCertificate": {"$data": "3000"}}}]})");
+        arrangeServices();
+        recordLog();
+    }
+
+    // The calibration tool.
+    void program(const std::string& script) const {
+        root_.write(calibration, "#!/bin/sh\n" + script);
+        std::filesystem::permissions(root_.host(calibration), std::filesystem::perms::owner_all);
+    }
+
+    static HSMessageResponse request(const char* command, const Value::Dictionary& arguments) {
+        recordLog();
+        std::optional<HSMessageResponse> answer;
+        ZPOrloServices().handleMessage({command, arguments}, [&](bool, const auto& response) { answer = response; });
+        return answer.value();
+    }
+
+    TemporaryRoot root_;
+};
+
+TEST_F(ZPOrloServicesTest, aRequestIsCompletedOnceWhereverMemoryEnds) {
+    const Value nothingElse = Value::Dictionary{{"IsPostSwapEntitled", false}};
+    const struct {
+        const char* command;
+        std::int64_t status;
+        Value response = {};
+    } commands[] = {{"OrloExport", -1},   {"getTCRT", -1},
+                    {"putTCRT", -1},      {"putPSD2", -1},
+                    {"getPSD2", -1},      {"corvoSCProv", -1},
+                    {"corvoSCPair", -1},  {"checkCorvoPostSwapEntitlement", 0, nothingElse},
+                    {"setGlobalbCfg", 0}, {"unknown", 1}};
+    const Value::Dictionary arguments = {
+        {"psd2DataPath", "/psd2"}, {"psd2V4DataPath", "/out"}, {"waftonUrl", "http://host"}, {"bcfgDataPath", "/psd2"}};
+    for (const auto& row : commands) {
+        const HSMessageRequest message{row.command, arguments};
+        bool failed = true, sawFailure = false;
+        for (int count = 1; failed; count += 1 + count / 40) {
+            root_.write("/tmp/new_bCfg", "earlier");
+            recordLog();
+            ZPOrloServices server;
+            int completions = 0;
+            std::optional<HSMessageResponse> answer;
+            const HSCompletion completion = [&](bool completed, const std::optional<HSMessageResponse>& response) {
+                failed = allocationHasFailed();
+                failAllocation(0);
+                completions += completed ? 1 : 10;
+                answer = response;
+            };
+            failAllocation(count);
+            server.handleMessage(message, completion);
+            ASSERT_EQ(completions, 1) << row.command << count;
+            ASSERT_EQ(answer.has_value(), row.status < 1) << row.command << count;
+            EXPECT_EQ(liveSessions(), 0);
+            if (!answer)
+                continue;
+            EXPECT_EQ(answer->name(), Value(row.command));
+            EXPECT_EQ(root_.read("/tmp/new_bCfg") == "earlier", std::string_view(row.command) != "setGlobalbCfg")
+                << count;
+            if (answer->statusCode() == row.status && answer->response() == row.response && !answer->error())
+                sawFailure = true;
+            else
+                EXPECT_TRUE(answer->statusCode() == 0 || answer->error() || !answer->response().isNothing());
+        }
+        EXPECT_EQ(sawFailure, row.status < 1) << row.command;
+    }
+}
+
+TEST_F(ZPOrloServicesTest, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlierBlobIsTakenForTheResult) {
+    inOwnProcess([this] {
+        root_.write("/tmp/new_bCfg", "earlier");
+        root_.write("/out", "before");
+        outcomes()["QDOrloDataCopy"].output = Value::Data(1 << 20);
+        std::signal(SIGXFSZ, SIG_IGN);
+        const rlimit full = {64, 64};
+        ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &full), 0);
+        const HSMessageResponse response = request("getPSD2", {{"psd2V4DataPath", "/out"}});
+        EXPECT_EQ(recordedLog().back(), "2 [ZPOrloServices] Failed to write psd2 to file");
+        EXPECT_EQ(response.statusCode(), -1);
+        EXPECT_EQ(response.response(), Value());
+        EXPECT_TRUE(response.error() && !response.error()->text.empty());
+        EXPECT_EQ(root_.read("/out"), "before");
+        EXPECT_EQ(request("setGlobalbCfg", {{"bcfgDataPath", "/blob"}}).statusCode(), 0);
+        EXPECT_EQ(root_.read("/tmp/new_bCfg"), "(missing)");
+    });
+}
+
+#ifdef VELTRA_MEMORY_CAN_BE_LIMITED
+TEST_F(ZPOrloServicesTest, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
+    constexpr std::size_t size = std::size_t{64} << 20;
+    outcomes()["BWCPairCorvoWithProxy"].output = Value::Array{std::string(size, 't')};
+    outcomes()["VanterUpdaterIsDone"].result = true;
+    const struct {
+        std::size_t memory;
+        bool created;
+    } rows[] = {{size * 5 / 2, true}, {size * 3 / 2, false}}; // the scripted library takes a copy of its own
+    for (const auto& row : rows) {
+        inOwnProcess([&] {
+            limitMemory(row.memory);
+            EXPECT_EQ(request("corvoSCPair", {{"waftonUrl", "http://host"}}).statusCode(), 0);
+            bool created = false, loaded = false;
+            for (const std::string& call : recordedCalls()) {
+                created = created || call.starts_with("VanterUpdaterCreate");
+                loaded = loaded || call == "the patch load returned 0";
+            }
+            EXPECT_EQ(created, row.created);
+            EXPECT_TRUE(loaded);
+        });
+    }
+}
+
+TEST_F(ZPOrloServicesTest, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
+    constexpr long kilobytes = 16 << 10;
+    program("exec head -c 16777216 /dev/zero | tr '\\0' x");
+    inOwnProcess([&] {
+        rusage before = {}, after = {};
+        ASSERT_EQ(::getrusage(RUSAGE_SELF, &before), 0);
+        ZPOrloServices::q21isp_loadDAT();
+        ASSERT_EQ(::getrusage(RUSAGE_SELF, &after), 0);
+        EXPECT_LT(after.ru_maxrss - before.ru_maxrss, 2 * kilobytes + kilobytes / 4);
+        EXPECT_GT(after.ru_maxrss - before.ru_maxrss, kilobytes);
+        EXPECT_TRUE(recordedLog().back().ends_with("x... (16777216 bytes)"));
+    });
+}
+#endif
+
+} // namespace
