@@ -1,9 +1,10 @@
-#include "img4/Img4.h"
+// Digests of a record's parts, digests of a trust profile, and the length of a whole container.
+#include "img4/Img4Trust.h"
 #include "platform/Crypto.h"
+#include "tests/support/MissingArguments.h"
 #include "tools/makers/Img4Maker.h"
 
 #include <algorithm>
-#include <array>
 
 #include <gtest/gtest.h>
 
@@ -11,46 +12,43 @@ namespace {
 
 using namespace img4maker;
 
-using Hash = std::array<std::uint8_t, Img4HashLength>;
-using Digest = std::array<std::uint8_t, Img4MaxDigestLength>;
+DERItem viewOf(const Bytes& bytes) {
+    return {bytes.data(), bytes.size()};
+}
 
-// What a digest operation was called with.
+// What a digest operation was called with last. The operations fill what they are given, and fail.
 struct Call {
-    const std::uint8_t* data = nullptr;
-    std::uint64_t length = 0;
-    std::uint64_t outLength = 0;
-    const Img4TrustProfile* profile = nullptr;
-};
+    DERItem data;
+    std::uint64_t outLength;
+    const Img4TrustProfile* profile;
+} lastCall;
 
 DERReturn noteHash(const std::uint8_t* data, std::uint64_t length, std::uint8_t* out, void* context) {
-    *static_cast<Call*>(context) = {data, length, Img4HashLength, nullptr};
+    lastCall = {{data, length}, Img4HashLength, static_cast<const Img4TrustProfile*>(context)};
     std::fill(out, out + Img4HashLength, std::uint8_t{0x11});
     return DERDecodeError;
 }
 
-Call profileCall;
-
 DERReturn noteDigest(const DERItem* data, std::uint8_t* out, std::uint64_t length, const Img4TrustProfile* profile) {
-    profileCall = {data->data, data->length, length, profile};
+    lastCall = {*data, length, profile};
     std::fill(out, out + length, std::uint8_t{0x22});
     return DERIncompleteSequence;
 }
 
-Img4TrustProfile makeProfile() {
-    Img4TrustProfile profile = {};
-    profile.computeDigest = noteDigest;
-    return profile;
+void expectCall(const DERItem& data, std::uint64_t outLength, const Img4TrustProfile* profile) {
+    EXPECT_EQ(lastCall.data.data, data.data);
+    EXPECT_EQ(lastCall.data.length, data.length);
+    EXPECT_EQ(lastCall.outLength, outLength);
+    EXPECT_EQ(lastCall.profile, profile);
 }
 
-struct Operations {
+const struct {
     const char* name;
     DERReturn (*hash)(const Img4Record*, std::uint8_t*, std::uint64_t);
     DERReturn (*hashWithCallback)(const Img4Record*, std::uint8_t*, std::uint64_t, Img4DigestFunction, void*);
     DERReturn (*digest)(const Img4Record*, std::uint8_t*, std::uint64_t, const Img4TrustProfile*);
     DERItem Img4Record::*raw;
-};
-
-const Operations operations[] = {
+} operations[] = {
     {"payload", Img4DecodeCopyPayloadHash, Img4DecodeCopyPayloadHashWithCallback, Img4DecodeCopyPayloadDigest,
      &Img4Record::payloadRaw},
     {"manifest", Img4DecodeCopyManifestHash, Img4DecodeCopyManifestHashWithCallback, Img4DecodeCopyManifestDigest,
@@ -59,40 +57,37 @@ const Operations operations[] = {
 
 class Img4Digests : public testing::Test {
 protected:
-    void SetUp() override { ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess); }
+    void SetUp() override {
+        profile.computeDigest = noteDigest;
+        ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess);
+    }
 
     const Bytes buffer = exampleContainer();
-    const Img4TrustProfile profile = makeProfile();
+    Img4TrustProfile profile = {};
     Img4Record record;
+    Bytes out = Bytes(Img4MaxDigestLength + 1);
 };
 
 TEST_F(Img4Digests, areTakenOfTheRawEncoding) {
-    for (const Operations& row : operations) {
+    for (const auto& row : operations) {
         SCOPED_TRACE(row.name);
         const DERItem raw = record.*row.raw;
-        Hash expected;
-        Hash hash = {};
+        Bytes expected(Img4HashLength);
         ASSERT_TRUE(crypto::sha1(raw.data, raw.length, expected.data()));
-        EXPECT_EQ(row.hash(&record, hash.data(), hash.size()), DERSuccess);
-        EXPECT_EQ(hash, expected);
+        EXPECT_EQ(row.hash(&record, out.data(), Img4HashLength), DERSuccess);
+        EXPECT_EQ(Bytes(out.begin(), out.begin() + Img4HashLength), expected);
 
-        Call call;
-        EXPECT_EQ(row.hashWithCallback(&record, hash.data(), hash.size(), noteHash, &call), DERDecodeError)
-            << "the callback's own result";
-        EXPECT_EQ(call.data, raw.data);
-        EXPECT_EQ(call.length, raw.length);
-        EXPECT_EQ(hash[19], 0x11);
+        EXPECT_EQ(row.hashWithCallback(&record, out.data(), Img4HashLength, noteHash, &profile), DERDecodeError);
+        EXPECT_EQ(out[Img4HashLength - 1], 0x11);
+        expectCall(raw, Img4HashLength, &profile);
 
-        Digest digest = {};
-        EXPECT_EQ(row.digest(&record, digest.data(), 32, &profile), DERIncompleteSequence)
-            << "the profile's own result";
-        EXPECT_EQ(profileCall.data, raw.data);
-        EXPECT_EQ(profileCall.length, raw.length);
-        EXPECT_EQ(profileCall.outLength, 32U);
-        EXPECT_EQ(profileCall.profile, &profile);
-        EXPECT_EQ(digest[31], 0x22);
-        EXPECT_EQ(digest[32], 0x00);
+        EXPECT_EQ(row.digest(&record, out.data(), 32, &profile), DERIncompleteSequence);
+        EXPECT_EQ(out[31], 0x22);
+        expectCall(raw, 32, &profile);
     }
+    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(&record.manifestRaw, out.data(), 48, &profile),
+              DERIncompleteSequence);
+    expectCall(record.manifestRaw, 48, &profile);
 }
 
 TEST_F(Img4Digests, comeFromTheRecordOnceItHoldsThem) {
@@ -100,56 +95,108 @@ TEST_F(Img4Digests, comeFromTheRecordOnceItHoldsThem) {
     std::fill(std::begin(record.manifest.digest), std::end(record.manifest.digest), std::uint8_t{0x51});
     record.payloadHashed = 1;
     record.manifestHashed = 1;
-    for (const Operations& row : operations) {
-        SCOPED_TRACE(row.name);
-        Hash hash = {};
-        Digest digest = {};
-        EXPECT_EQ(row.hash(&record, hash.data(), hash.size()), DERSuccess);
-        EXPECT_EQ(hash.back(), 0x51);
-        EXPECT_EQ(row.hashWithCallback(&record, hash.data(), hash.size(), noteHash, nullptr), DERSuccess);
-        EXPECT_EQ(row.digest(&record, digest.data(), 32, &profile), DERSuccess);
-        EXPECT_EQ(digest[31], 0x51);
-        EXPECT_EQ(digest[32], 0x00) << "no more than was asked for";
+    for (const auto& row : operations) {
+        const auto expectStored = [&](DERReturn result, std::size_t length) {
+            EXPECT_EQ(result, DERSuccess) << row.name;
+            EXPECT_EQ(std::count(out.begin(), out.end(), 0x51), length) << row.name;
+            out.assign(out.size(), 0);
+        };
+        expectStored(row.hash(&record, out.data(), Img4HashLength), Img4HashLength);
+        expectStored(row.hashWithCallback(&record, out.data(), Img4HashLength, noteHash, nullptr), Img4HashLength);
+        expectStored(row.digest(&record, out.data(), 32, &profile), 32);
     }
 }
 
 TEST_F(Img4Digests, refuseLengthsThatDoNotFitAndMissingArguments) {
-    Img4TrustProfile withoutOperation = {};
+    const Img4TrustProfile withoutOperation = {};
     const Img4Record none = {};
-    for (const Operations& row : operations) {
+    const DERItem absent = {};
+    for (const auto& row : operations) {
         SCOPED_TRACE(row.name);
-        Digest out = {};
-        Call call;
+        expectNeedsAll(DERParamError, row.hash, &record, out.data(), 20);
+        expectNeedsAll(DERParamError, row.hashWithCallback, &record, out.data(), 20, noteHash, nullptr);
+        expectNeedsAll(DERParamError, row.digest, &record, out.data(), 32, &profile);
         EXPECT_EQ(row.hash(&record, out.data(), 32), DERParamError);
         EXPECT_EQ(row.hash(&record, out.data(), 19), DERParamError);
-        EXPECT_EQ(row.hash(&record, nullptr, 20), DERParamError);
-        EXPECT_EQ(row.hash(nullptr, out.data(), 20), DERParamError);
         EXPECT_EQ(row.hash(&none, out.data(), 20), DEREndOfSequence);
-        EXPECT_EQ(row.hashWithCallback(&record, out.data(), 32, noteHash, &call), DERParamError);
-        EXPECT_EQ(row.hashWithCallback(&record, out.data(), 20, nullptr, &call), DERParamError);
+        EXPECT_EQ(row.hashWithCallback(&record, out.data(), 32, noteHash, nullptr), DERParamError);
         EXPECT_EQ(row.digest(&record, out.data(), 49, &profile), DERBufferOverflow);
-        EXPECT_EQ(row.digest(&record, nullptr, 32, &profile), DERParamError);
-        EXPECT_EQ(row.digest(&record, out.data(), 32, nullptr), DERParamError);
         EXPECT_EQ(row.digest(&record, out.data(), 32, &withoutOperation), DERParamError);
-        EXPECT_EQ(row.digest(nullptr, out.data(), 32, &profile), DERParamError);
         EXPECT_EQ(row.digest(&none, out.data(), 32, &profile), DEREndOfSequence);
-        EXPECT_EQ(out, Digest{});
+    }
+    const auto ofProperties = Img4DecodeCopyPayloadPropertiesDigest;
+    expectNeedsAll(DERParamError, ofProperties, &record.payloadRaw, out.data(), 48, &profile);
+    EXPECT_EQ(ofProperties(&record.payloadRaw, out.data(), 48, &withoutOperation), DERParamError);
+    EXPECT_EQ(ofProperties(&record.payloadRaw, out.data(), 49, &profile), DERBufferOverflow);
+    EXPECT_EQ(ofProperties(&absent, out.data(), 48, &profile), DERParamError);
+    EXPECT_EQ(out, Bytes(out.size()));
+}
+
+TEST(Img4TrustDigests, areThoseOfFIPS180) {
+    // FIPS 180-4's own example: "abc".
+    const Bytes abc = {'a', 'b', 'c'};
+    const DERItem view = viewOf(abc);
+    const std::pair<const Img4DigestInfo*, Bytes> rows[] = {
+        {&kQDSupportDigestInfoSha1, {0xa9, 0x99, 0x3e, 0x36}},
+        {&kQDSupportDigestInfoSha256, {0xba, 0x78, 0x16, 0xbf}},
+        {&kQDSupportDigestInfoSha384, {0xcb, 0x00, 0x75, 0x3f}},
+        {&kQDSupportDigestInfoSha512, {0xdd, 0xaf, 0x35, 0xa1}},
+    };
+    for (const auto& [info, start] : rows) {
+        Img4TrustProfile profile = {};
+        profile.digestInfo = info;
+        const std::uint64_t length = info->length;
+        Bytes once(length), inPieces(length + 1);
+        EXPECT_EQ(Img4DecodeComputeDigest(&view, once.data(), length, &profile), DERSuccess);
+        EXPECT_EQ(Bytes(once.begin(), once.begin() + 4), start);
+        for (const std::uint64_t other : {length - 1, length + 1})
+            EXPECT_EQ(Img4DecodeComputeDigest(&view, inPieces.data(), other, &profile), DERBufferOverflow);
+        EXPECT_EQ(inPieces, Bytes(length + 1));
+
+        Img4DigestState state;
+        EXPECT_EQ(Img4DecodeDigestInit(&state, &profile), DERSuccess);
+        for (const std::uint8_t& octet : abc) {
+            const DERItem piece = {&octet, 1};
+            EXPECT_EQ(Img4DecodeDigestUpdate(&state, &piece, &profile), DERSuccess);
+        }
+        EXPECT_EQ(Img4DecodeDigestReturnHash(&state, inPieces.data(), length, &profile), DERParamError)
+            << "before its end";
+        EXPECT_EQ(Img4DecodeDigestFinal(&state, &profile), DERSuccess);
+        EXPECT_EQ(Img4DecodeDigestReturnHash(&state, inPieces.data(), length - 1, &profile), DERBufferOverflow);
+        EXPECT_EQ(Img4DecodeDigestReturnHash(&state, inPieces.data(), length + 1, &profile), DERSuccess);
+        inPieces.pop_back();
+        EXPECT_EQ(inPieces, once);
+        EXPECT_EQ(Img4DecodeDigestFinal(&state, &profile), DERParamError) << "twice";
     }
 }
 
-TEST_F(Img4Digests, ofPayloadPropertiesAreThoseOfTheItem) {
-    DERItem properties;
-    const DERItem absent = {};
-    Digest digest = {};
-    ASSERT_EQ(Img4DecodeGetPayloadProperties(&record, &properties), DERSuccess);
-    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(&properties, digest.data(), 48, &profile), DERIncompleteSequence);
-    EXPECT_EQ(profileCall.data, properties.data);
-    EXPECT_EQ(profileCall.length, properties.length);
-    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(&properties, digest.data(), 49, &profile), DERBufferOverflow);
-    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(&absent, digest.data(), 48, &profile), DERParamError);
-    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(nullptr, digest.data(), 48, &profile), DERParamError);
-    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(&properties, nullptr, 48, &profile), DERParamError);
-    EXPECT_EQ(Img4DecodeCopyPayloadPropertiesDigest(&properties, digest.data(), 48, nullptr), DERParamError);
+TEST(Img4TrustDigests, areThoseOfOneDescriptionFromInitToReturnHash) {
+    Img4TrustProfile profile = {}, other = {}, wrong = {};
+    profile.digestInfo = &kQDSupportDigestInfoSha256;
+    other.digestInfo = &kQDSupportDigestInfoSha384;
+    // One that claims fewer octets than its implementation writes.
+    const Img4DigestInfo tooShort = {20, nullptr, other.digestInfo->implementation};
+    wrong.digestInfo = &tooShort;
+    const DERItem piece = *profile.digestInfo->oid, absent = {};
+    std::uint8_t out[Img4LongestDigest];
+    Img4DigestState state;
+    ASSERT_EQ(Img4DecodeDigestInit(&state, &profile), DERSuccess);
+    EXPECT_EQ(Img4DecodeDigestUpdate(&state, &piece, &other), DERParamError);
+    expectNeedsAll(DERParamError, Img4DecodeDigestUpdate, &state, &piece, &profile);
+    EXPECT_EQ(Img4DecodeDigestFinal(&state, &other), DERParamError);
+    EXPECT_EQ(Img4DecodeDigestReturnHash(&state, out, sizeof out, &profile), DERParamError);
+
+    ASSERT_EQ(Img4DecodeDigestInit(&state, &profile), DERSuccess);
+    EXPECT_EQ(Img4DecodeDigestUpdate(&state, &absent, &profile), DERSuccess);
+    ASSERT_EQ(Img4DecodeDigestFinal(&state, &profile), DERSuccess);
+    EXPECT_EQ(Img4DecodeDigestReturnHash(&state, out, sizeof out, &other), DERParamError);
+    expectNeedsAll(DERParamError, Img4DecodeDigestReturnHash, &state, out, sizeof out, &profile);
+    expectNeedsAll(DERParamError, Img4DecodeDigestInit, &state, &profile);
+    expectNeedsAll(DERParamError, Img4DecodeComputeDigest, &piece, out, 32, &profile);
+    EXPECT_EQ(Img4DecodeComputeDigest(&absent, out, 32, &profile), DERParamError);
+    EXPECT_EQ(Img4DecodeComputeDigest(&piece, out, tooShort.length, &wrong), DERParamError);
+    EXPECT_EQ(Img4DecodeDigestInit(&state, &wrong), DERParamError);
+    expectNeedsAll(DERParamError, sha1_digest, out, 1, out);
 }
 
 struct LengthCase {
@@ -159,23 +206,20 @@ struct LengthCase {
     std::uint64_t total = 0;
 };
 
+const Bytes magic = ia5("IMG4");
+
 const LengthCase lengthCases[] = {
-    {"short length", {0x30, 0x10, 0x16, 0x04, 'I', 'M', 'G', '4'}, DERSuccess, 18},
-    {"long length", {0x30, 0x83, 0x01, 0x00, 0x00, 0x16, 0x04, 'I', 'M', 'G', '4'}, DERSuccess, 0x10005},
-    {"longest length that fits",
-     {0x30, 0x88, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xF5, 0x16, 0x04, 'I', 'M', 'G', '4'},
-     DERSuccess,
-     UINT64_MAX},
-    {"length that wraps",
-     {0x30, 0x88, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xF6, 0x16, 0x04, 'I', 'M', 'G', '4'},
-     DERBufferOverflow},
-    {"other magic", {0x30, 0x10, 0x16, 0x04, 'I', 'M', '4', 'P'}, DERUnexpectedTag},
-    {"magic of five characters", {0x30, 0x10, 0x16, 0x05, 'I', 'M', 'G', '4', '4'}, DERUnexpectedTag},
+    {"short length", join({{0x30, 0x10}, magic}), DERSuccess, 18},
+    {"long length", join({{0x30, 0x83, 0x01, 0x00, 0x00}, magic}), DERSuccess, 0x10005},
+    {"longest length that fits", join({{0x30, 0x88}, Bytes(7, 0xFF), {0xF5}, magic}), DERSuccess, UINT64_MAX},
+    {"length that wraps", join({{0x30, 0x88}, Bytes(7, 0xFF), {0xF6}, magic}), DERBufferOverflow},
+    {"other magic", join({{0x30, 0x10}, ia5("IM4P")}), DERUnexpectedTag},
+    {"magic of five characters", join({{0x30, 0x10}, ia5("IMG44")}), DERUnexpectedTag},
     {"magic cut short", {0x30, 0x10, 0x16, 0x04, 'I', 'M', 'G'}, DERUnexpectedTag},
     {"empty magic", {0x30, 0x10, 0x16, 0x00, 0x00, 0x00}, DERDecodeError},
-    {"SET", {0x31, 0x10, 0x16, 0x04, 'I', 'M', 'G', '4'}, DERUnexpectedTag},
-    {"empty SEQUENCE", {0x30, 0x00, 0x16, 0x04, 'I', 'M', 'G', '4'}, DERDecodeError},
-    {"indefinite length", {0x30, 0x80, 0x16, 0x04, 'I', 'M', 'G', '4'}, DERDecodeError},
+    {"SET", join({{0x31, 0x10}, magic}), DERUnexpectedTag},
+    {"empty SEQUENCE", join({{0x30, 0x00}, magic}), DERDecodeError},
+    {"indefinite length", join({{0x30, 0x80}, magic}), DERDecodeError},
     {"nothing behind the header", {0x30, 0x10}, DERDecodeError},
     {"one octet", {0x30}, DERDecodeError},
 };
@@ -187,16 +231,13 @@ TEST(Img4Length, isKnownFromTheFirstOctets) {
             << row.name;
         EXPECT_EQ(total, row.total) << row.name;
     }
-}
-
-TEST(Img4Length, ofOtherItemsGoesByTheirMagic) {
     const Bytes ticket = exampleTicket();
+    const std::uint32_t magicOfTicket = fourCC("IM4M");
     std::uint64_t total = 77;
-    EXPECT_EQ(Img4DecodeParseLengthFromBufferWithTag(ticket.data(), 12, fourCC("IM4M"), &total), DERSuccess);
+    expectNeedsAll(Img4Failure, Img4DecodeParseLengthFromBufferWithTag, ticket.data(), 12, magicOfTicket, &total);
+    EXPECT_EQ(total, 0U);
+    EXPECT_EQ(Img4DecodeParseLengthFromBufferWithTag(ticket.data(), 12, magicOfTicket, &total), DERSuccess);
     EXPECT_EQ(total, ticket.size());
-    EXPECT_EQ(Img4DecodeParseLengthFromBuffer(ticket.data(), 12, &total), DERUnexpectedTag);
-    EXPECT_EQ(Img4DecodeParseLengthFromBufferWithTag(nullptr, 12, fourCC("IM4M"), &total), Img4Failure);
-    EXPECT_EQ(Img4DecodeParseLengthFromBufferWithTag(ticket.data(), 12, fourCC("IM4M"), nullptr), Img4Failure);
 }
 
 } // namespace

@@ -1,8 +1,10 @@
-// The properties of one dictionary, read through every family of getters. The families look up alike and differ in what
-// a failure does to the out-value.
+// The properties of one dictionary, read through every family of getters for every type of value. The families look up
+// alike and differ in what a failure does to the out-value.
 #include "img4/Img4.h"
+#include "tests/support/MissingArguments.h"
 #include "tools/makers/Img4Maker.h"
 
+#include <cctype>
 #include <functional>
 #include <string>
 
@@ -13,159 +15,121 @@ namespace {
 using namespace img4maker;
 
 constexpr std::uint64_t big = 0x123456789A;
+constexpr std::uint32_t sepi = Img4FourCC('s', 'e', 'p', 'i');
 const Bytes data = {1, 2, 3};
+const Bytes null = {0x05, 0x00};
 
-Bytes namedAs(std::string_view tag, const List& content) {
-    return item(propertyTag(tag), join(content));
+// An element and what is answered when it is asked for as a boolean, a number of 32 and of 64 bits, data and a string:
+// the first letter of success, the end, an unexpected tag, broken encoding, an incomplete sequence or an overflow. The
+// letter is large when the value was found and cannot be read.
+struct Row {
+    const char* name;
+    Bytes content;
+    std::string answers;
+    char single = 0; // for all types, where the property is read by itself; 0: the same
+    std::uint64_t number = 0;
+    Bytes octets = {};
+};
+
+Bytes named(std::string_view name, const Bytes& value) {
+    return sequence({ia5(name), value});
 }
 
-const List dictionary = {
-    integer(99), // no property; a lookup passes over it
-    property("bTru", boolean(true)),
-    property("bFal", boolean(false)),
-    property("bOdd", item(DERTagBoolean, {0x01})),
-    property("iSml", integer(12)),
-    property("iBig", integer(big)),
-    property("iNeg", item(DERTagInteger, {0x80})),
-    property("iEmp", item(DERTagInteger, {})),
-    property("data", octets(data)),
-    property("strg", ia5("abc")),
-    property("twic", integer(1)),
-    property("twic", integer(2)),
-    namedAs("name", {sequence({ia5("eman"), boolean(true)})}),
-    namedAs("shrt", {sequence({ia5("shr"), boolean(true)})}),
-    namedAs("utf8", {sequence({item(0x0C, {'u', 't', 'f', '8'}), boolean(true)})}),
-    namedAs("thrd", {sequence({ia5("thrd"), boolean(true), integer(1)})}),
-    namedAs("miss", {sequence({ia5("miss")})}),
-    namedAs("void", {sequence({})}),
-    namedAs("nSeq", {set({ia5("nSeq"), boolean(true)})}),
-    namedAs("none", {}),
-    // The element's content goes on behind the SEQUENCE.
-    namedAs("tail", {sequence({ia5("tail"), boolean(true)}), {0x05, 0x00}}),
+const Row rows[] = {
+    {"bTru", named("bTru", boolean(true)), "suuuu", 0, 1},
+    {"bFal", named("bFal", boolean(false)), "suuuu"},
+    {"bOdd", named("bOdd", item(DERTagBoolean, {0x01})), "Buuuu"},
+    {"iSml", named("iSml", integer(12)), "ussuu", 0, 12},
+    {"iBig", named("iBig", integer(big)), "uOsuu", 0, big},
+    {"iNeg", named("iNeg", item(DERTagInteger, {0x80})), "uBBuu"},
+    {"iEmp", named("iEmp", item(DERTagInteger, {})), "uBBuu"},
+    {"data", named("data", octets(data)), "uuusu", 0, 0, data},
+    {"dEmp", named("dEmp", octets({})), "uuusu"},
+    {"strg", named("strg", ia5("abc")), "uuuus", 0, 0, {'a', 'b', 'c'}},
+    {"list", named("list", set({})), "uuuuu"},
+    {"twic", named("twic", integer(1)), "ussuu", 0, 1},
+    {"absn", {}, "eeeee", 'b'},
+    {"name", named("eman", boolean(true)), "uuuuu"},
+    {"shrt", named("shr", boolean(true)), "uuuuu"},
+    {"utf8", sequence({item(0x0C, {'u', 't', 'f', '8'}), boolean(true)}), "uuuuu"},
+    {"thrd", sequence({ia5("thrd"), boolean(true), integer(1)}), "buuuu", 'u'},
+    {"miss", sequence({ia5("miss")}), "iiiii"},
+    {"void", sequence({}), "iiiii", 'u'},
+    {"nSeq", set({ia5("nSeq"), boolean(true)}), "uuuuu"},
+    {"elem", property("elem", boolean(true)), "uuuuu"},
+    {"none", {}, "bbbbb"},
+    {"cutS", {0x30, 0x06, 0x16}, "bbbbb"},
+    {"tail", join({named("tail", boolean(true)), null}), "suuuu", 'o', 1},
+    {"both", join({sequence({ia5("both"), boolean(true), null}), null}), "buuuu", 'u'},
 };
 
-enum class Asked {
-    Boolean,
-    Integer,
-    Integer64,
-    Data,
-    String
-};
+List dictionary() {
+    List elements = {integer(99)}; // no property; a lookup passes over it
+    for (const Row& row : rows)
+        if (row.answers[0] != 'e')
+            elements.push_back(item(propertyTag(row.name), row.content));
+    elements.push_back(property("twic", integer(2)));
+    return elements;
+}
 
-struct Case {
-    const char* name;
-    Asked asked;
-    DERReturn expected;
-    std::uint64_t value = 0;
-};
-
-const Case cases[] = {
-    {"bTru", Asked::Boolean, DERSuccess, 1},
-    {"bFal", Asked::Boolean, DERSuccess, 0},
-    {"bOdd", Asked::Boolean, DERDecodeError},
-    {"iSml", Asked::Boolean, DERUnexpectedTag},
-    {"absn", Asked::Boolean, DEREndOfSequence},
-    {"name", Asked::Boolean, DERUnexpectedTag},
-    {"shrt", Asked::Boolean, DERUnexpectedTag},
-    {"utf8", Asked::Boolean, DERUnexpectedTag},
-    {"thrd", Asked::Boolean, DERDecodeError},
-    {"miss", Asked::Boolean, DERIncompleteSequence},
-    {"void", Asked::Boolean, DERIncompleteSequence},
-    {"nSeq", Asked::Boolean, DERUnexpectedTag},
-    {"none", Asked::Boolean, DERDecodeError},
-    {"tail", Asked::Boolean, DERSuccess, 1},
-    {"iSml", Asked::Integer, DERSuccess, 12},
-    {"twic", Asked::Integer, DERSuccess, 1},
-    {"iBig", Asked::Integer, DERBufferOverflow},
-    {"iNeg", Asked::Integer, DERDecodeError},
-    {"iEmp", Asked::Integer, DERDecodeError},
-    {"data", Asked::Integer, DERUnexpectedTag},
-    {"absn", Asked::Integer, DEREndOfSequence},
-    {"iBig", Asked::Integer64, DERSuccess, big},
-    {"iNeg", Asked::Integer64, DERDecodeError},
-    {"bTru", Asked::Integer64, DERUnexpectedTag},
-    {"absn", Asked::Integer64, DEREndOfSequence},
-    {"data", Asked::Data, DERSuccess},
-    {"strg", Asked::Data, DERUnexpectedTag},
-    {"absn", Asked::Data, DEREndOfSequence},
-    {"strg", Asked::String, DERSuccess},
-    {"data", Asked::String, DERUnexpectedTag},
-};
+DERReturn statusOf(char answer) {
+    switch (std::tolower(answer)) {
+    case 's':
+        return DERSuccess;
+    case 'e':
+        return DEREndOfSequence;
+    case 'u':
+        return DERUnexpectedTag;
+    case 'i':
+        return DERIncompleteSequence;
+    case 'o':
+        return DERBufferOverflow;
+    default:
+        return DERDecodeError;
+    }
+}
 
 enum class OnFailure {
     Keeps,
+    KeepsNumbersNotFound,
     Clears
 };
 
-struct Family {
-    const char* name;
-    std::function<DERReturn(std::string_view, bool*)> boolean;
-    std::function<DERReturn(std::string_view, std::uint32_t*)> integer;
-    std::function<DERReturn(std::string_view, std::uint64_t*)> integer64;
-    std::function<DERReturn(std::string_view, DERItem*)> data;
-    std::function<DERReturn(std::string_view, DERItem*)> string; // empty when the family has none
-    OnFailure numberNotFound;
-    OnFailure numberNotParsed;
-    OnFailure item;
-};
-
-bool foundButNotParsed(DERReturn result, const std::string& name) {
-    return result != DERSuccess && (name == "iBig" || name == "iNeg" || name == "iEmp");
+Bytes shown(const DERItem& value) {
+    return {value.data, value.data + value.length};
 }
 
-template <typename Number>
-void checkNumber(const Family& family, const Case& row,
-                 const std::function<DERReturn(std::string_view, Number*)>& get) {
-    Number value = 77;
-    EXPECT_EQ(get(row.name, &value), row.expected);
-    const OnFailure rule = foundButNotParsed(row.expected, row.name) ? family.numberNotParsed : family.numberNotFound;
-    const std::uint64_t afterFailure = rule == OnFailure::Keeps ? 77 : 0;
-    EXPECT_EQ(value, row.expected == DERSuccess ? row.value : afterFailure);
-    EXPECT_EQ(get(row.name, nullptr), DERParamError);
+Bytes shown(std::uint64_t value) {
+    return integer(value);
 }
 
-void checkItem(const Family& family, const Case& row, const std::function<DERReturn(std::string_view, DERItem*)>& get,
-               const Bytes& expected) {
-    const std::uint8_t other = 0;
-    DERItem value = {&other, 77};
-    EXPECT_EQ(get(row.name, &value), row.expected);
-    if (row.expected == DERSuccess)
-        EXPECT_EQ(Bytes(value.data, value.data + value.length), expected);
-    else
-        EXPECT_EQ(value.length, family.item == OnFailure::Keeps ? 77U : 0U);
-    EXPECT_EQ(get(row.name, nullptr), DERParamError);
+// Checks a query whose out-value holds `before`.
+template <typename Value, typename Query>
+void check(char answer, bool isKept, const Bytes& expected, Value before, Query query) {
+    Value value = before;
+    EXPECT_EQ(query(&value), statusOf(answer));
+    EXPECT_EQ(shown(value), answer == 's' ? expected : shown(isKept ? before : Value{}));
 }
 
-void checkBoolean(const Family& family, const Case& row) {
-    for (const bool before : {false, true}) {
-        bool value = before;
-        EXPECT_EQ(family.boolean(row.name, &value), row.expected);
-        EXPECT_EQ(value, row.expected == DERSuccess ? row.value != 0 : before);
-    }
-    EXPECT_EQ(family.boolean(row.name, nullptr), DERParamError);
-}
-
-void checkFamily(const Family& family) {
-    for (const Case& row : cases) {
-        SCOPED_TRACE(std::string(family.name) + " " + row.name);
-        switch (row.asked) {
-        case Asked::Boolean:
-            checkBoolean(family, row);
-            break;
-        case Asked::Integer:
-            checkNumber(family, row, family.integer);
-            break;
-        case Asked::Integer64:
-            checkNumber(family, row, family.integer64);
-            break;
-        case Asked::Data:
-            checkItem(family, row, family.data, data);
-            break;
-        case Asked::String:
-            if (family.string)
-                checkItem(family, row, family.string, {'a', 'b', 'c'});
-            break;
-        }
+template <typename Call, typename... String>
+void checkFamily(const char* family, OnFailure onFailure, bool isSingle, Call call, auto getBoolean, auto getInteger,
+                 auto getInteger64, auto getData, String... getString) {
+    for (const Row& row : rows) {
+        SCOPED_TRACE(std::string(family) + " " + row.name);
+        const std::string answers = isSingle && row.single != 0 ? std::string(5, row.single) : row.answers;
+        const bool keeps = onFailure == OnFailure::Keeps;
+        const auto keepsNumber = [&](char answer) {
+            return keeps || (onFailure == OnFailure::KeepsNumbersNotFound && std::islower(answer) != 0);
+        };
+        const DERItem before = {row.content.data(), row.content.size()};
+        check(answers[0], true, shown(row.number), row.number == 0,
+              [&](bool* out) { return call(getBoolean, row, out); });
+        check(answers[1], keepsNumber(answers[1]), shown(row.number), std::uint32_t{77},
+              [&](std::uint32_t* out) { return call(getInteger, row, out); });
+        check(answers[2], keepsNumber(answers[2]), shown(row.number), std::uint64_t{77},
+              [&](std::uint64_t* out) { return call(getInteger64, row, out); });
+        check(answers[3], keeps, row.octets, before, [&](DERItem* out) { return call(getData, row, out); });
+        (check(answers[4], keeps, row.octets, before, [&](DERItem* out) { return call(getString, row, out); }), ...);
     }
 }
 
@@ -173,214 +137,136 @@ class Img4Properties : public testing::Test {
 protected:
     void SetUp() override {
         Manifest fields;
-        fields.properties = dictionary;
-        fields.objects = {object("kern", {}), object("sepi", dictionary)};
         Payload image;
-        image.properties = payloadProperties(dictionary);
-        buffer = container(payload(image), manifest(fields), restoreInfo(dictionary));
+        fields.properties = dictionary();
+        fields.objects = {object("kern", {}), object("sepi", dictionary())};
+        image.properties = payloadProperties(dictionary());
+        buffer = container(payload(image), manifest(fields), restoreInfo(dictionary()));
         ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess);
-    }
-
-    Family section(std::uint32_t number) const {
-        return {number == 0 ? "manifest" : "restore information",
-                [=, this](auto name, auto* out) {
-                    return Img4DecodeGetBooleanFromSection(&record, number, fourCC(name), out);
-                },
-                [=, this](auto name, auto* out) {
-                    return Img4DecodeGetIntegerFromSection(&record, number, fourCC(name), out);
-                },
-                [=, this](auto name, auto* out) {
-                    return Img4DecodeGetInteger64FromSection(&record, number, fourCC(name), out);
-                },
-                [=, this](auto name, auto* out) {
-                    return Img4DecodeGetDataFromSection(&record, number, fourCC(name), out);
-                },
-                {},
-                OnFailure::Keeps,
-                OnFailure::Clears,
-                OnFailure::Clears};
     }
 
     Bytes buffer;
     Img4Record record;
 };
 
-TEST_F(Img4Properties, ofASection) {
-    checkFamily(section(Img4SectionManifest));
-    checkFamily(section(Img4SectionRestoreInfo));
-}
-
-TEST_F(Img4Properties, ofTheRestoreInformation) {
-    checkFamily({"restore information",
-                 [this](auto name, auto* out) { return Img4DecodeGetRestoreInfoBoolean(&record, fourCC(name), out); },
-                 [this](auto name, auto* out) { return Img4DecodeGetRestoreInfoInteger(&record, fourCC(name), out); },
-                 [this](auto name, auto* out) { return Img4DecodeGetRestoreInfoInteger64(&record, fourCC(name), out); },
-                 [this](auto name, auto* out) { return Img4DecodeGetRestoreInfoData(&record, fourCC(name), out); },
-                 {},
-                 OnFailure::Keeps,
-                 OnFailure::Clears,
-                 OnFailure::Clears});
-}
-
-TEST_F(Img4Properties, ofAnObject) {
-    constexpr std::uint32_t sepi = Img4FourCC('s', 'e', 'p', 'i');
+TEST_F(Img4Properties, areFoundByEveryFamilyAlike) {
+    for (const std::uint32_t section : {Img4SectionManifest, Img4SectionRestoreInfo})
+        checkFamily(
+            section == Img4SectionManifest ? "manifest" : "section 1", OnFailure::KeepsNumbersNotFound, false,
+            [&](auto get, const Row& row, auto* out) { return get(&record, section, fourCC(row.name), out); },
+            Img4DecodeGetBooleanFromSection, Img4DecodeGetIntegerFromSection, Img4DecodeGetInteger64FromSection,
+            Img4DecodeGetDataFromSection);
     checkFamily(
-        {"object",
-         [=, this](auto name, auto* out) {
-             return Img4DecodeGetObjectPropertyBoolean(&record, sepi, fourCC(name), out);
-         },
-         [=, this](auto name, auto* out) {
-             return Img4DecodeGetObjectPropertyInteger(&record, sepi, fourCC(name), out);
-         },
-         [=, this](auto name, auto* out) {
-             return Img4DecodeGetObjectPropertyInteger64(&record, sepi, fourCC(name), out);
-         },
-         [=, this](auto name, auto* out) { return Img4DecodeGetObjectPropertyData(&record, sepi, fourCC(name), out); },
-         [=, this](auto name, auto* out) {
-             return Img4DecodeGetObjectPropertyString(&record, sepi, fourCC(name), out);
-         },
-         OnFailure::Clears, OnFailure::Clears, OnFailure::Clears});
-}
-
-TEST_F(Img4Properties, ofThePayload) {
+        "restore information", OnFailure::KeepsNumbersNotFound, false,
+        [&](auto get, const Row& row, auto* out) { return get(&record, fourCC(row.name), out); },
+        Img4DecodeGetRestoreInfoBoolean, Img4DecodeGetRestoreInfoInteger, Img4DecodeGetRestoreInfoInteger64,
+        Img4DecodeGetRestoreInfoData);
     checkFamily(
-        {"payload",
-         [this](auto name, auto* out) {
-             return Img4DecodeGetPayloadPropertiesBoolean(&record, propertyTag(name), out);
-         },
-         [this](auto name, auto* out) {
-             return Img4DecodeGetPayloadPropertiesInteger(&record, propertyTag(name), out);
-         },
-         [this](auto name, auto* out) {
-             return Img4DecodeGetPayloadPropertiesInteger64(&record, propertyTag(name), out);
-         },
-         [this](auto name, auto* out) { return Img4DecodeGetPayloadPropertiesData(&record, propertyTag(name), out); },
-         {},
-         OnFailure::Keeps,
-         OnFailure::Keeps,
-         OnFailure::Keeps});
+        "object", OnFailure::Clears, false,
+        [&](auto get, const Row& row, auto* out) { return get(&record, sepi, fourCC(row.name), out); },
+        Img4DecodeGetObjectPropertyBoolean, Img4DecodeGetObjectPropertyInteger, Img4DecodeGetObjectPropertyInteger64,
+        Img4DecodeGetObjectPropertyData, Img4DecodeGetObjectPropertyString);
+    checkFamily(
+        "payload", OnFailure::Keeps, false,
+        [&](auto get, const Row& row, auto* out) { return get(&record, propertyTag(row.name), out); },
+        Img4DecodeGetPayloadPropertiesBoolean, Img4DecodeGetPayloadPropertiesInteger,
+        Img4DecodeGetPayloadPropertiesInteger64, Img4DecodeGetPayloadPropertiesData);
+    checkFamily(
+        "single", OnFailure::Clears, true,
+        [&](auto get, const Row& row, auto* out) {
+            const DERItem content = {row.content.data(), row.content.size()};
+            return get(&content, fourCC(row.name), out);
+        },
+        Img4DecodeGetPropertyBoolean, Img4DecodeGetPropertyInteger, Img4DecodeGetPropertyInteger64,
+        Img4DecodeGetPropertyData);
 }
 
 // Properties as records: the name, the tags and the value; what failure leaves behind.
-TEST_F(Img4Properties, asRecords) {
-    constexpr std::uint32_t sepi = Img4FourCC('s', 'e', 'p', 'i');
-    using Get = std::function<DERReturn(DERTag, DERTag, Img4Property*)>;
-    struct Row {
+TEST_F(Img4Properties, areRecordsWithNameTagsAndValue) {
+    struct Family {
         const char* name;
-        Get get;
-        OnFailure onFailure;
+        bool keeps;
+        std::function<DERReturn(DERTag, DERTag, Img4Property*)> get;
     };
-    const Row rows[] = {
-        {"section", [&](auto... a) { return Img4DecodeGetPropertyFromSection(&record, Img4SectionManifest, a...); },
-         OnFailure::Clears},
-        {"restore information",
-         [&](auto... a) { return Img4DecodeGetPropertyFromSection(&record, Img4SectionRestoreInfo, a...); },
-         OnFailure::Clears},
-        {"object", [&](auto... a) { return Img4DecodeGetObjectProperty(&record, sepi, a...); }, OnFailure::Clears},
-        {"payload", [&](auto... a) { return Img4DecodePayloadProperty(&record, a...); }, OnFailure::Keeps},
-        {"dictionary", [&](auto... a) { return DERImg4DecodeFindProperty(&record.restoreInfo.properties, a...); },
-         OnFailure::Keeps},
+    const Family families[] = {
+        {"manifest", false, [&](auto... a) { return Img4DecodeGetPropertyFromSection(&record, 0, a...); }},
+        {"section 1", false, [&](auto... a) { return Img4DecodeGetPropertyFromSection(&record, 1, a...); }},
+        {"object", false, [&](auto... a) { return Img4DecodeGetObjectProperty(&record, sepi, a...); }},
+        {"payload", true, [&](auto... a) { return Img4DecodePayloadProperty(&record, a...); }},
+        {"dictionary", true,
+         [&](auto... a) { return DERImg4DecodeFindProperty(&record.restoreInfo.properties, a...); }},
     };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.name);
+    const DERTag tag = propertyTag("data");
+    for (const Family& family : families) {
+        SCOPED_TRACE(family.name);
         Img4Property found = {};
-        ASSERT_EQ(row.get(propertyTag("data"), DERTagOctetString, &found), DERSuccess);
-        EXPECT_EQ(std::string(found.name.data, found.name.data + found.name.length), "data");
-        EXPECT_EQ(Bytes(found.value.data, found.value.data + found.value.length), data);
-        EXPECT_EQ(found.tag, propertyTag("data"));
+        ASSERT_EQ(family.get(tag, DERTagOctetString, &found), DERSuccess);
+        EXPECT_EQ(shown(found.name), Bytes({'d', 'a', 't', 'a'}));
+        EXPECT_EQ(shown(found.value), data);
+        EXPECT_EQ(found.tag, tag);
         EXPECT_EQ(found.valueTag, DERTagOctetString);
-        EXPECT_EQ(row.get(propertyTag("data"), DERTagSet, &found), DERUnexpectedTag);
-        EXPECT_EQ(found.name.length, row.onFailure == OnFailure::Clears ? 0U : 4U);
-        EXPECT_EQ(found.tag, row.onFailure == OnFailure::Clears ? 0U : propertyTag("data"));
+        EXPECT_EQ(family.get(tag, DERTagSet, &found), DERUnexpectedTag);
+        EXPECT_EQ(found.name.length, family.keeps ? 4U : 0U);
+        EXPECT_EQ(found.tag, family.keeps ? tag : 0U);
         // The whole tag counts, not only its number.
-        EXPECT_EQ(row.get(fourCC("data"), DERTagOctetString, &found), DEREndOfSequence);
-        EXPECT_EQ(row.get(propertyTag("data"), DERTagOctetString, nullptr), DERParamError);
+        EXPECT_EQ(family.get(fourCC("data"), DERTagOctetString, &found), DEREndOfSequence);
     }
+    const Bytes content = named("data", octets(data));
+    const DERItem view = {content.data(), content.size()};
+    Img4Property single;
+    EXPECT_EQ(DERImg4DecodeProperty(&view, fourCC("data"), &single), DERUnexpectedTag) << "no property tag";
+    EXPECT_EQ(DERImg4DecodeProperty(&view, tag, &single), DERSuccess);
+    EXPECT_EQ(single.tag, tag);
+    EXPECT_EQ(single.valueTag, DERTagOctetString);
 }
 
 // An element with a tag that no four-character code makes is never a property, whatever its name.
-TEST_F(Img4Properties, needAPrivateTag) {
-    const Bytes content =
-        item(DERTagContextConstructed(1), sequence({ia5(std::string_view("\0\0\0\1", 4)), integer(1)}));
+TEST(Img4Property, needsAPrivateTag) {
+    const DERTag tag = DERTagContextConstructed(1);
+    const Bytes content = item(tag, named(std::string_view("\0\0\0\1", 4), integer(1)));
     const DERItem elements = {content.data(), content.size()};
     Img4Property found;
-    EXPECT_EQ(DERImg4DecodeFindProperty(&elements, DERTagContextConstructed(1), DERTagInteger, &found),
-              DERUnexpectedTag);
+    EXPECT_EQ(DERImg4DecodeFindProperty(&elements, tag, DERTagInteger, &found), DERUnexpectedTag);
 }
 
-struct SingleCase {
-    const char* name;
-    Bytes content;
-    DERReturn expected;
-    Bytes value = {};
-};
-
-const SingleCase singles[] = {
-    {"sound", sequence({ia5("prop"), octets(data)}), DERSuccess, data},
-    {"empty value", sequence({ia5("prop"), octets({})}), DERSuccess},
-    {"other type", sequence({ia5("prop"), ia5("abc")}), DERUnexpectedTag},
-    {"other name", sequence({ia5("porp"), octets(data)}), DERUnexpectedTag},
-    {"name of another type", sequence({octets({'p', 'r', 'o', 'p'}), octets(data)}), DERUnexpectedTag},
-    {"no name", sequence({}), DERUnexpectedTag},
-    {"no value", sequence({ia5("prop")}), DERIncompleteSequence},
-    {"third element", sequence({ia5("prop"), octets(data), boolean(true)}), DERUnexpectedTag},
-    {"octets behind", join({sequence({ia5("prop"), octets(data)}), {0}}), DERBufferOverflow},
-    {"third element and octets behind", join({sequence({ia5("prop"), octets(data), boolean(true)}), {0}}),
-     DERUnexpectedTag},
-    {"SET", set({ia5("prop"), octets(data)}), DERUnexpectedTag},
-    {"whole element", property("prop", octets(data)), DERUnexpectedTag},
-    {"cut short", {0x30, 0x06, 0x16}, DERDecodeError},
-};
-
-TEST(Img4SingleProperty, isCheckedToItsLastOctet) {
-    constexpr std::uint32_t prop = Img4FourCC('p', 'r', 'o', 'p');
-    for (const SingleCase& row : singles) {
-        SCOPED_TRACE(row.name);
-        const DERItem content = {row.content.data(), row.content.size()};
-        DERItem value = {row.content.data(), 77};
-        std::uint32_t number = 77;
-        std::uint64_t number64 = 77;
-        bool flag = true;
-        EXPECT_EQ(Img4DecodeGetPropertyData(&content, prop, &value), row.expected);
-        EXPECT_EQ(Bytes(value.data, value.data + value.length), row.value) << "cleared on failure";
-        EXPECT_NE(Img4DecodeGetPropertyInteger(&content, prop, &number), DERSuccess);
-        EXPECT_NE(Img4DecodeGetPropertyInteger64(&content, prop, &number64), DERSuccess);
-        EXPECT_NE(Img4DecodeGetPropertyBoolean(&content, prop, &flag), DERSuccess);
-        EXPECT_EQ(number, 0U);
-        EXPECT_EQ(number64, 0U);
-        EXPECT_TRUE(flag);
-    }
-}
-
-TEST(Img4SingleProperty, givesTypedValues) {
-    constexpr std::uint32_t prop = Img4FourCC('p', 'r', 'o', 'p');
-    const Bytes number = sequence({ia5("prop"), integer(big)});
-    const Bytes small = sequence({ia5("prop"), integer(5)});
-    const Bytes truth = sequence({ia5("prop"), boolean(true)});
-    const DERItem numberItem = {number.data(), number.size()};
-    const DERItem smallItem = {small.data(), small.size()};
-    const DERItem truthItem = {truth.data(), truth.size()};
-    std::uint32_t value = 77;
-    std::uint64_t value64 = 77;
-    bool flag = false;
-    Img4Property found;
-    EXPECT_EQ(Img4DecodeGetPropertyInteger64(&numberItem, prop, &value64), DERSuccess);
-    EXPECT_EQ(value64, big);
-    EXPECT_EQ(Img4DecodeGetPropertyInteger(&smallItem, prop, &value), DERSuccess);
-    EXPECT_EQ(value, 5U);
-    EXPECT_EQ(Img4DecodeGetPropertyInteger(&numberItem, prop, &value), DERBufferOverflow);
-    EXPECT_EQ(value, 0U);
-    EXPECT_EQ(Img4DecodeGetPropertyBoolean(&truthItem, prop, &flag), DERSuccess);
+// Without a record or an item an operation does to its out-value what it does at any failure.
+TEST_F(Img4Properties, cannotBeReadWithoutArguments) {
+    const DERItem content = record.restoreInfo.properties;
+    const DERTag tag = propertyTag("data");
+    Img4Property found = {content, tag, content, tag};
+    bool flag = true;
+    std::uint32_t kept = 77, cleared = 77;
+    std::uint64_t kept64 = 77, cleared64 = 77;
+    DERItem keptItem = content, items[] = {content, content, content, content, content};
+    expectNeedsAll(DERParamError, Img4DecodeGetBooleanFromSection, &record, 0, sepi, &flag);
+    expectNeedsAll(DERParamError, Img4DecodeGetIntegerFromSection, &record, 0, sepi, &kept);
+    expectNeedsAll(DERParamError, Img4DecodeGetInteger64FromSection, &record, 0, sepi, &kept64);
+    expectNeedsAll(DERParamError, Img4DecodeGetDataFromSection, &record, 0, sepi, &items[0]);
+    expectNeedsAll(DERParamError, Img4DecodeGetRestoreInfoBoolean, &record, sepi, &flag);
+    expectNeedsAll(DERParamError, Img4DecodeGetRestoreInfoData, &record, sepi, &items[1]);
+    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyBoolean, &record, sepi, sepi, &flag);
+    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyInteger, &record, sepi, sepi, &cleared);
+    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyInteger64, &record, sepi, sepi, &cleared64);
+    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyData, &record, sepi, sepi, &items[2]);
+    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyString, &record, sepi, sepi, &items[3]);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadPropertiesBoolean, &record, tag, &flag);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadPropertiesInteger, &record, tag, &kept);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadPropertiesInteger64, &record, tag, &kept64);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadPropertiesData, &record, tag, &keptItem);
+    expectNeedsAll(DERParamError, Img4DecodeGetPropertyBoolean, &content, sepi, &flag);
+    expectNeedsAll(DERParamError, Img4DecodeGetPropertyData, &content, sepi, &items[4]);
+    expectNeedsAll(DERParamError, DERImg4DecodeFindProperty, &content, tag, tag, &found);
+    expectNeedsAll(DERParamError, DERImg4DecodeProperty, &content, tag, &found);
+    expectNeedsAll(DERParamError, Img4DecodePayloadProperty, &record, tag, tag, &found);
     EXPECT_TRUE(flag);
-    EXPECT_EQ(DERImg4DecodeProperty(&truthItem, Img4PropertyTag(prop), &found), DERSuccess);
-    EXPECT_EQ(found.valueTag, DERTagBoolean);
-    EXPECT_EQ(found.tag, propertyTag("prop"));
-    EXPECT_EQ(DERImg4DecodeProperty(&truthItem, prop, &found), DERUnexpectedTag) << "a bare code is no property tag";
-    EXPECT_EQ(DERImg4DecodeProperty(nullptr, Img4PropertyTag(prop), &found), DERParamError);
-    EXPECT_EQ(DERImg4DecodeProperty(&truthItem, Img4PropertyTag(prop), nullptr), DERParamError);
-    value64 = 77;
-    EXPECT_EQ(Img4DecodeGetPropertyInteger64(nullptr, prop, &value64), DERParamError);
-    EXPECT_EQ(value64, 0U);
+    EXPECT_EQ(kept + kept64 + cleared + cleared64, 2 * 77U);
+    EXPECT_EQ(keptItem.length, content.length);
+    EXPECT_EQ(found.tag, tag);
+    for (const DERItem& item : items)
+        EXPECT_EQ(item.length, 0U);
+    expectNeedsAll(DERParamError, Img4DecodeGetPropertyFromSection, &record, 0, tag, tag, &found);
+    EXPECT_EQ(found.tag, 0U);
+    expectNeedsAll(DERParamError, Img4DecodeGetObjectProperty, &record, sepi, tag, tag, &found);
 }
 
 } // namespace

@@ -1,4 +1,5 @@
 #include "tests/img4/TrustDomain.h"
+#include "tests/support/MissingArguments.h"
 
 #include <utility>
 #include <vector>
@@ -129,30 +130,19 @@ std::vector<BlockCase> blockCases(const Bytes& digest, const Bytes& oid) {
         {"sound", with(sound), true},
         {"no NULL", with(sequence({sequence({oid}), octets(digest)}))},
         {"other parameters", with(sequence({sequence({oid, octets({})}), octets(digest)}))},
-        {"octets in the NULL", with(sequence({sequence({oid, Bytes{0x05, 0x01, 0x00}}), octets(digest)}))},
-        {"long length outside", with(longSequence(join({algorithm, octets(digest)})))},
-        {"long length of the algorithm", with(sequence({longSequence(join({oid, null})), octets(digest)}))},
         {"long length of the digest", with(sequence({algorithm, longDigest}))},
-        {"indefinite length", with(join({Bytes{0x30, 0x80}, algorithm, octets(digest), Bytes{0x00, 0x00}}))},
         {"octets behind the digest", with(sequence({algorithm, octets(digest), null}))},
-        {"octets behind the algorithm's NULL", with(sequence({sequence({oid, null, null}), octets(digest)}))},
         {"other digest algorithm", with(sequence({sequence({lastChanged(oid, 0x03), null}), octets(digest)}))},
-        {"digest in a BIT STRING", with(sequence({algorithm, item(DERTagBitString, digest)}))},
-        {"DigestInfo in a SET", with(set({algorithm, octets(digest)}))},
         {"digest that lacks an octet", with(sequence({algorithm, octets(Bytes(digest.begin(), digest.end() - 1))}))},
         {"digest alone", with(digest)},
         {"other digest", with(sequence({algorithm, octets(lastChanged(digest))}))},
-        {"nothing", with({})},
         {"octets behind the DigestInfo", {.digestInfo = sound, .rest = {0x00}}},
         {"short padding and octets behind", {.paddingLength = 8, .digestInfo = sound}},
         {"padding of seven octets", {.paddingLength = 7, .digestInfo = sound}},
         {"other octets in the padding", {.digestInfo = sound, .padding = 0xFE}},
         {"zeros as padding", {.digestInfo = sound, .padding = 0x00}},
-        {"padding that ends in another octet", {.separator = {0x01}, .digestInfo = sound}},
         {"no end of the padding", {.separator = {}, .digestInfo = sound}},
-        {"two ends of the padding", {.separator = {0x00, 0x00}, .digestInfo = sound}},
         {"padding of encryption", {.start = {0x00, 0x02}, .digestInfo = sound}},
-        {"padding of type 0", {.start = {0x00, 0x00}, .digestInfo = sound}},
         {"first octet left out", {.start = {0x01}, .digestInfo = sound}},
     };
 }
@@ -273,7 +263,6 @@ TEST(Img4RSASignature, needsASoundKey) {
         {"third number", sequence({positiveInteger(n), positiveInteger(e), integer(1)}), sound},
         {"octet behind", trailing, sound},
         {"SET", set({positiveInteger(n), positiveInteger(e)}), sound},
-        {"whole SubjectPublicKeyInfo", publicKeyInfo(rsaKey()), sound},
         {"none", {}, sound},
     };
     for (const Row& row : rows)
@@ -312,12 +301,11 @@ struct CurveUnderTest {
 const CurveUnderTest curves[] = {{"P-256", &kImg4DecodeSecureBootEc256Sha256},
                                  {"P-384", &kImg4DecodeSecureBootEc384Sha384}};
 
-// The magnitudes of the numbers of a sound signature, and the order and the field of its curve.
+// The magnitudes of the numbers of a sound signature, and the order of its curve.
 struct Sound {
     Bytes r;
     Bytes s;
     Number order;
-    Number field;
 };
 
 Sound soundSignature(const Key& key, const Img4TrustProfile& profile) {
@@ -325,7 +313,7 @@ Sound soundSignature(const Key& key, const Img4TrustProfile& profile) {
     const std::size_t lengthOfR = signature[3];
     Sound sound = {Bytes(signature.begin() + 4, signature.begin() + 4 + static_cast<long>(lengthOfR)),
                    Bytes(signature.begin() + 6 + static_cast<long>(lengthOfR), signature.end()),
-                   parameter(key, OSSL_PKEY_PARAM_EC_ORDER), parameter(key, OSSL_PKEY_PARAM_EC_P)};
+                   parameter(key, OSSL_PKEY_PARAM_EC_ORDER)};
     sound.r = octetsOf(number(sound.r).get());
     sound.s = octetsOf(number(sound.s).get());
     return sound;
@@ -361,9 +349,8 @@ std::vector<PairCase> pairCases(const Sound& sound) {
     const Bytes &r = sound.r, &s = sound.s;
     const Bytes R = positiveInteger(r), S = positiveInteger(s);
     const BIGNUM* const n = sound.order.get();
-    const Bytes order = octetsOf(n), field = octetsOf(sound.field.get());
+    const Bytes order = octetsOf(n);
     const Bytes whole = pair(r, s);
-    const Bytes enumerated = item(0x0A, Bytes(R.begin() + 2, R.end()));
     const Bytes longR = join({Bytes{0x02, 0x81}, Bytes(R.begin() + 1, R.end())});
     return {
         {"sound", whole, true},
@@ -371,20 +358,13 @@ std::vector<PairCase> pairCases(const Sound& sound) {
         {"r and s swapped", pair(s, r)},
         {"r = 0", pair({}, s)},
         {"s = 0", pair(r, {})},
-        {"r = s = 0", pair({}, {})},
-        {"r = s = 1", pair({1}, {1})},
         {"r = 0, s = 1", pair({}, {1})},
         {"r = order", pair(order, s)},
         {"s = order", pair(r, order)},
-        {"r = field", pair(field, s)},
-        {"r = s = order", pair(order, order)},
-        {"r = order - 1", pair(difference(n, {1}), s)},
         {"r plus order", pair(sum(r, n), s)},
         {"s plus order", pair(r, sum(s, n))},
-        {"r much too long", pair(join({Bytes{1}, Bytes(100), r}), s)},
         {"r negative", sequence({rawInteger(negative(r)), S})},
         {"s negative", sequence({R, rawInteger(negative(s))})},
-        {"r minus order", sequence({rawInteger(negative(difference(n, r))), S})},
         {"zeros before r", sequence({rawInteger(join({Bytes{0, 0}, r})), S})},
         {"zeros before s", sequence({R, rawInteger(join({Bytes{0, 0}, s}))})},
         {"r empty", sequence({rawInteger({}), S})},
@@ -393,22 +373,13 @@ std::vector<PairCase> pairCases(const Sound& sound) {
         {"s missing", sequence({R})},
         {"both missing", sequence({})},
         {"third number", sequence({R, S, positiveInteger({1})})},
-        {"NULL inside", sequence({R, S, null})},
-        {"tagged element in front", sequence({context(0, {}), R, S})},
         {"octets behind", join({whole, null})},
-        {"zero octet behind", join({whole, Bytes{0}})},
         {"cut short", Bytes(whole.begin(), whole.end() - 1)},
         {"r an OCTET STRING", sequence({octets(r), S})},
-        {"r an ENUMERATED", sequence({enumerated, S})},
-        {"s a REAL", sequence({R, Bytes{0x09, 0x01, 0x42}})},
-        {"NULLs", sequence({null, null})},
         {"SET", set({R, S})},
-        {"SEQUENCE in a SEQUENCE", sequence({whole})},
         {"long length", longSequence(join({R, S}))},
         {"long length of r", sequence({longR, S})},
         {"indefinite length", join({Bytes{0x30, 0x80}, R, S, Bytes{0x00, 0x00}})},
-        {"plain r and s", join({r, s})},
-        {"one octet", {0x30}},
         {"none", {}},
     };
 }
@@ -436,7 +407,6 @@ std::vector<std::pair<const char*, Bytes>> refusedPoints(const Key& key) {
     const Bytes y(point.end() - static_cast<long>(half), point.end());
     const Number p = parameter(key, OSSL_PKEY_PARAM_EC_P);
     const Bytes field = octetsOf(p.get(), half);
-    const Bytes negatedY = octetsOf(number(difference(p.get(), y)).get(), half);
     const std::uint8_t parity = y.back() & 1;
     const bool isP256 = half == 32;
     return {
@@ -445,19 +415,12 @@ std::vector<std::pair<const char*, Bytes>> refusedPoints(const Key& key) {
         {"compressed", join({Bytes{static_cast<std::uint8_t>(0x02 | parity)}, x})},
         {"form of a compressed point", withForm(point, 0x02)},
         {"infinity", {0x00}},
-        {"infinity of full length", Bytes(point.size())},
-        {"origin", withForm(Bytes(point.size()), 0x04)},
         {"coordinates of the field's size", join({Bytes{0x04}, field, field})},
-        {"coordinates swapped", join({Bytes{0x04}, y, x})},
-        {"bare coordinates", join({x, y})},
         {"octet behind", join({point, Bytes{0}})},
         {"octet missing", Bytes(point.begin(), point.end() - 1)},
-        {"in an OCTET STRING", octets(point)},
         {"whole SubjectPublicKeyInfo", publicKeyInfo(key)},
         {"of the other curve", publicKeyBits(makeECKey(isP256 ? "P-384" : "P-256"))},
-        {"of P-521", publicKeyBits(makeECKey("P-521"))},
         {"of another key", publicKeyBits(makeECKey(isP256 ? "P-256" : "P-384"))},
-        {"of the key's negation", join({Bytes{0x04}, x, negatedY})},
         {"none", {}},
     };
 }
@@ -488,35 +451,29 @@ TEST(Img4ECDSASignature, takesTheCurveFromThePointAndTheDigestFromTheProfile) {
 
 TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
     const Key ecKey = makeECKey("P-384");
-    struct Row {
+    const struct {
         Verifier verify;
-        const Img4TrustProfile* profile;
+        const Img4TrustProfile& profile;
         const Key& key;
-    };
-    const Row rows[] = {{verify_signature_rsa, &kImg4DecodeSecureBootRsa4kSha384, rsaKey()},
-                        {verify_signature_rsa3k, &kImg4DecodeSecureBootRsa3kSha384, rsaKey()},
-                        {verify_signature_ecdsa, &kImg4DecodeSecureBootEc384Sha384, ecKey}};
-    for (const Row& row : rows) {
-        const Bytes bits = publicKeyBits(row.key);
-        const Bytes octetsOfSignature = sign(row.key, 48, message);
-        const Bytes digest = digestOfMessage(*row.profile);
-        const DERItem key = viewOf(bits);
-        const DERItem signature = viewOf(octetsOfSignature);
-        const DERItem none = {};
-        Img4TrustProfile withoutDigest = *row.profile;
+    } rows[] = {{verify_signature_rsa, kImg4DecodeSecureBootRsa4kSha384, rsaKey()},
+                {verify_signature_rsa3k, kImg4DecodeSecureBootRsa3kSha384, rsaKey()},
+                {verify_signature_ecdsa, kImg4DecodeSecureBootEc384Sha384, ecKey}};
+    const Img4DigestInfo bare = {48, nullptr, nullptr};
+    for (const auto& [verify, profile, signer] : rows) {
+        const Bytes digest = digestOfMessage(profile);
+        const Bytes keyBits = publicKeyBits(signer);
+        const Bytes signatureOctets = sign(signer, 48, message);
+        const DERItem key = viewOf(keyBits), signature = viewOf(signatureOctets), none = {};
+        Img4TrustProfile withoutDigest = profile;
         withoutDigest.digestInfo = nullptr;
-        const Img4DigestInfo bare = {48, nullptr, nullptr};
-        const Img4TrustProfile withoutImplementation = profileWith(*row.profile, bare);
-        ASSERT_EQ(row.verify(&key, &signature, digest.data(), 48, row.profile), DERSuccess);
-        EXPECT_EQ(row.verify(nullptr, &signature, digest.data(), 48, row.profile), Img4Failure);
-        EXPECT_EQ(row.verify(&none, &signature, digest.data(), 48, row.profile), Img4Failure);
-        EXPECT_EQ(row.verify(&key, nullptr, digest.data(), 48, row.profile), Img4Failure);
-        EXPECT_EQ(row.verify(&key, &none, digest.data(), 48, row.profile), Img4Failure);
-        EXPECT_EQ(row.verify(&key, &signature, nullptr, 48, row.profile), Img4Failure);
-        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 32, row.profile), Img4Failure);
-        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 48, nullptr), Img4Failure);
-        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 48, &withoutDigest), Img4Failure);
-        EXPECT_EQ(row.verify(&key, &signature, digest.data(), 48, &withoutImplementation), Img4Failure);
+        const Img4TrustProfile withoutImplementation = profileWith(profile, bare);
+        ASSERT_EQ(verify(&key, &signature, digest.data(), 48, &profile), DERSuccess);
+        expectNeedsAll(Img4Failure, verify, &key, &signature, digest.data(), 48, &profile);
+        EXPECT_EQ(verify(&none, &signature, digest.data(), 48, &profile), Img4Failure);
+        EXPECT_EQ(verify(&key, &none, digest.data(), 48, &profile), Img4Failure);
+        EXPECT_EQ(verify(&key, &signature, digest.data(), 32, &profile), Img4Failure);
+        EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutDigest), Img4Failure);
+        EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutImplementation), Img4Failure);
     }
     Img4TrustProfile withoutKeyAlgorithm = kImg4DecodeSecureBootEc384Sha384;
     withoutKeyAlgorithm.keyAlgorithmOid = nullptr;

@@ -8,6 +8,7 @@
 #include <map>
 #include <span>
 #include <string>
+#include <vector>
 
 inline std::span<const Img4TrustProfileEntry> allProfiles() {
     return {Img4TrustProfiles, Img4NumTrustProfiles};
@@ -23,6 +24,12 @@ inline const Img4TrustProfileEntry& entryOf(const Img4TrustProfile& profile) {
         if (entry.profile == &profile)
             return entry;
     std::abort();
+}
+
+// One of each kind: RSA and EC, in chains of two and of three certificates.
+inline std::vector<const Img4TrustProfileEntry*> kindsOfProfile() {
+    return {&entryOf(kImg4DecodeSecureBootRsa1kSha1), &entryOf(kImg4DecodeSecureBootRsa4kSha384),
+            &entryOf(kImg4DecodeSecureBootEc256Sha256), &entryOf(kImg4DecodeLocalPolicyEc384Sha384)};
 }
 
 inline bool isEC(const Img4TrustProfileEntry& entry) {

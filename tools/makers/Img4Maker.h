@@ -41,9 +41,9 @@ struct Payload {
     std::string_view type = "sepi";
     std::string_view version = "sepi-1.0";
     Bytes data = filler(64);
-    Bytes keybag;      // none when empty
-    Bytes compression; // an encoding; none when empty
-    Bytes properties;  // the content of [0]; none when empty
+    Bytes keybag = {};      // none when empty
+    Bytes compression = {}; // an encoding; none when empty
+    Bytes properties = {};  // the content of [0]; none when empty
 };
 Bytes payload(const Payload& fields);
 Bytes compression(std::uint64_t algorithm, std::uint64_t uncompressedSize);
@@ -51,10 +51,10 @@ Bytes payloadProperties(const List& properties);
 
 struct Manifest {
     std::uint64_t version = 0;
-    List properties; // of "MANP"
-    List objects;
+    List properties = {}; // of "MANP"
+    List objects = {};
     Bytes signature = filler(48);
-    Bytes certChain; // the content of the SEQUENCE
+    Bytes certChain = {}; // the content of the SEQUENCE
 };
 Bytes manifestBody(const Manifest& fields);
 Bytes manifest(const Manifest& fields);

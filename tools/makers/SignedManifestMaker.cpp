@@ -159,7 +159,8 @@ Certificate Signer::leaf(const List& constraints) const {
 }
 
 Bytes Signer::issue(const Certificate& fields, const Key& issuer) const {
-    const Bytes tbs = sequence({context(0, integer(2)), integer(4711), fields.signatureAlgorithm, fields.issuer,
+    const Bytes& inner = fields.innerAlgorithm.empty() ? fields.signatureAlgorithm : fields.innerAlgorithm;
+    const Bytes tbs = sequence({context(0, integer(2)), integer(4711), inner, fields.issuer,
                                 sequence({time("260101000000Z"), time("460101000000Z")}), fields.subject,
                                 fields.publicKeyInfo, fields.extensions});
     const std::uint64_t digestLength =

@@ -52,6 +52,7 @@ Bytes extensions(const List& list);
 // The fields of a certificate, each a whole encoding; `extensions` is left out when empty.
 struct Certificate {
     Bytes signatureAlgorithm;
+    Bytes innerAlgorithm; // that of the to-be-signed part, when it is another
     Bytes issuer;
     Bytes subject;
     Bytes publicKeyInfo;

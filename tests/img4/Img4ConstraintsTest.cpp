@@ -1,0 +1,154 @@
+// The walk over a dictionary's properties, and the constraints that a leaf certificate carries.
+#include "tests/img4/TrustDomain.h"
+#include "tests/support/MissingArguments.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace img4maker;
+using namespace signedmanifest;
+
+const Bytes good = property("GOOD", integer(1));
+
+DERReturn count(DERTag tag, const Img4PropertyValue* value, std::uint32_t selector, void* context) {
+    EXPECT_EQ(tag, propertyTag("GOOD"));
+    EXPECT_EQ(Bytes(value->content.data, value->content.data + value->content.length), Bytes{1});
+    EXPECT_EQ(selector, 9U);
+    ++*static_cast<unsigned*>(context);
+    return DERSuccess;
+}
+
+TEST(Img4PropertyWalk, judgesEveryPropertyOrSaysWhichIsNone) {
+    const Bytes content = sequence({ia5("ABCD"), integer(1)});
+    const struct {
+        const char* name;
+        Bytes dictionary;
+        DERReturn expected;
+        unsigned seen = 0;
+    } rows[] = {
+        {"nothing", {}, DERSuccess},
+        {"the same property twice", join({good, good}), DERSuccess, 2},
+        {"value that is a SET", join({good, property("ABCD", set({}))}), DERUnexpectedTag, 1},
+        {"value that is NULL", property("ABCD", {0x05, 0x00}), DERUnexpectedTag},
+        {"name that is another", item(propertyTag("ABCE"), content), DERUnexpectedTag},
+        {"property in a universal tag", item(DERTagSet, content), DERUnexpectedTag},
+        {"property in an application tag", item(0x6000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag},
+        {"property in a primitive tag", item(0xC000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag},
+        {"octets behind the property", item(propertyTag("ABCD"), join({content, content})), DERBufferOverflow},
+        {"element cut short", join({good, Bytes{0xFF}}), DERDecodeError, 1},
+    };
+    for (const auto& row : rows) {
+        const DERItem view = viewOf(row.dictionary);
+        unsigned seen = 0;
+        EXPECT_EQ(Img4DecodeEvaluateDictionaryProperties(&view, 9, count, &seen), row.expected) << row.name;
+        EXPECT_EQ(seen, row.seen) << row.name;
+    }
+    const DERItem view = viewOf(good);
+    const Img4Record record = {};
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateDictionaryProperties, &view, 9, count, nullptr);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateManifestProperties, &record, count, nullptr);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateObjectProperties, &record, count, nullptr);
+}
+
+// The constraints of manifest or object alone.
+Bytes onManifest(const List& constraints) {
+    return set({object("MANP", constraints)});
+}
+
+Bytes onObject(const List& constraints) {
+    return set({object("OBJP", constraints)});
+}
+
+struct ConstraintCase {
+    const char* name;
+    Bytes certProperties;
+    DERReturn expected;
+};
+
+const Bytes data = filler(20);
+
+const ConstraintCase constraintCases[] = {
+    {"none", set({}), DERSuccess},
+    {"empty ones", set({object("MANP", {}), object("OBJP", {})}), DERSuccess},
+    {"BOOLEAN met", onManifest({property("FLAG", boolean(true))}), DERSuccess},
+    {"BOOLEAN broken", onManifest({property("FLAG", boolean(false))}), Img4Failure},
+    {"INTEGER met", onManifest({property("NUMB", integer(0x1234))}), DERSuccess},
+    {"INTEGER broken by an octet", onManifest({property("NUMB", integer(0x1235))}), Img4Failure},
+    {"INTEGER of another length", onManifest({property("NUMB", integer(0x12))}), Img4Failure},
+    {"OCTET STRING met", onManifest({property("DATA", octets(data))}), DERSuccess},
+    {"OCTET STRING broken", onManifest({property("DATA", octets(filler(20, 1)))}), Img4Failure},
+    {"value of another type", onManifest({property("FLAG", integer(0xFF))}), Img4Failure},
+    {"value of a missing property", onManifest({property("NONE", integer(1))}), DEREndOfSequence},
+    {"presence met", onManifest({mustBePresent("TEXT")}), DERSuccess},
+    {"presence broken", onManifest({mustBePresent("NONE")}), DEREndOfSequence},
+    {"absence met", onManifest({mustBeAbsent("NONE")}), DERSuccess},
+    {"absence broken", onManifest({mustBeAbsent("TEXT")}), DERUnexpectedTag},
+    {"text, which constrains nothing", onManifest({property("TEXT", ia5("text"))}), DERUnexpectedTag},
+    {"primitive [0]", onManifest({property("TEXT", item(DERTagContextPrimitive(0), {}))}), DERUnexpectedTag},
+    {"[2]", onManifest({property("TEXT", context(2, {}))}), DERUnexpectedTag},
+    {"constraint with another name", onManifest({item(propertyTag("FLAG"), sequence({ia5("NUMB"), boolean(true)}))}),
+     DERUnexpectedTag},
+    {"constraint that is no property", onManifest({integer(1)}), DERDecodeError},
+    {"the second broken", onManifest({property("FLAG", boolean(true)), mustBePresent("NONE")}), DEREndOfSequence},
+    {"the first broken", onManifest({mustBePresent("NONE"), property("FLAG", boolean(false))}), DEREndOfSequence},
+    {"object's met", onObject({property("SIZE", integer(5)), mustBeAbsent("FLAG")}), DERSuccess},
+    {"object's broken", onObject({property("SIZE", integer(6))}), Img4Failure},
+    {"both, the object's broken",
+     set({object("MANP", {mustBePresent("TEXT")}), object("OBJP", {mustBeAbsent("SIZE")})}), DERUnexpectedTag},
+    {"measurement's", set({property("manx", integer(1)), object("MANP", {mustBePresent("TEXT")})}), DERSuccess},
+    {"measurement's that is nothing at all", set({item(propertyTag("manx"), {})}), DERSuccess},
+    {"another kind", set({object("KIND", {})}), DERUnexpectedTag},
+    {"manifest's in a SEQUENCE", set({property("MANP", sequence({}))}), DERUnexpectedTag},
+    {"manifest's with another name", set({item(propertyTag("MANP"), sequence({ia5("OBJP"), set({})}))}),
+     DERUnexpectedTag},
+    {"cut short", {0x31, 0x02, 0xFF, 0x80}, DERDecodeError},
+    {"SEQUENCE", sequence({}), DERUnexpectedTag},
+    {"no DER", {0x31}, DERDecodeError},
+};
+
+// Keeps the first refusal of a constraint.
+void keepRefusal(const Img4Constraint* constraint, void* context) {
+    Img4Refusal& first = *static_cast<Img4Refusal*>(context);
+    if (first.fault == Img4FaultNone && constraint->isChecked)
+        first = constraint->refusal;
+}
+
+TEST(Img4Constraints, bindManifestAndObject) {
+    const Bytes manp = join({property("FLAG", boolean(true)), property("NUMB", integer(0x1234)),
+                             property("DATA", octets(data)), property("TEXT", ia5("text"))});
+    const Bytes objp = property("SIZE", integer(5));
+    for (const ConstraintCase& row : constraintCases) {
+        SCOPED_TRACE(row.name);
+        Img4Record record = {};
+        Img4Refusal refusal = {};
+        record.manp = viewOf(manp);
+        record.objp = viewOf(objp);
+        record.manifest.certProperties = viewOf(row.certProperties);
+        EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), row.expected);
+        EXPECT_EQ(Img4DecodeEvaluateCertificatePropertiesExplained(&record, keepRefusal, &refusal), row.expected);
+        EXPECT_EQ(refusal.status, row.expected);
+        EXPECT_EQ(refusal.fault == Img4FaultNone, row.expected == DERSuccess);
+    }
+}
+
+TEST(Img4Constraints, needPropertiesToBind) {
+    const Bytes ofObject = onObject({mustBePresent("SIZE")});
+    const Bytes ofManifest = onManifest({mustBeAbsent("FLAG")});
+    const Bytes broken = {0xFF};
+    Img4Record record = {};
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERDecodeError);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateCertificateProperties, &record);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateCertificatePropertiesExplained, &record, keepRefusal, nullptr);
+
+    record.manifest.certProperties = viewOf(ofObject);
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "no object was evaluated";
+    record.objp = {broken.data(), 0};
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "an object without properties";
+
+    record.manifest.certProperties = viewOf(ofManifest);
+    record.manp = viewOf(broken);
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERDecodeError) << "a search that fails finds nothing";
+}
+
+} // namespace

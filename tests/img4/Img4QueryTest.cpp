@@ -1,0 +1,333 @@
+// What a record says of its parts: of the payload and its properties, of the manifest and its sections.
+#include "img4/Img4.h"
+#include "tests/support/MissingArguments.h"
+#include "tools/makers/Img4Maker.h"
+
+#include <span>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace img4maker;
+
+constexpr std::uint32_t sepi = Img4FourCC('s', 'e', 'p', 'i');
+constexpr std::uint32_t eksp = Img4FourCC('e', 'k', 's', 'p');
+constexpr std::uint32_t brdI = Img4FourCC('b', 'r', 'd', 'I');
+const std::uint8_t octet = 0;
+
+Bytes bytesOf(const DERItem& item) {
+    return {item.data, item.data + item.length};
+}
+
+DERItem viewOf(const Bytes& bytes) {
+    return {bytes.data(), bytes.size()};
+}
+
+using Initialise = DERReturn (*)(const std::uint8_t*, std::uint64_t, Img4Record*);
+
+Img4Record recordOf(Initialise initialise, const Bytes& buffer) {
+    Img4Record record;
+    EXPECT_EQ(initialise(buffer.data(), buffer.size(), &record), DERSuccess);
+    return record;
+}
+
+// Answers as text: for each query its status and what it leaves in an out-value that something stands in: the number,
+// or how long the item is.
+class Answers {
+public:
+    template <typename Out, typename Query, typename... Keys>
+    Answers& ask(Query query, Keys... keys) {
+        Out value;
+        if constexpr (std::is_same_v<Out, DERItem>)
+            value = {&octet, 1};
+        else
+            value = true;
+        text_ << query(keys..., &value) << ':' << shown(value) << ' ';
+        return *this;
+    }
+    std::string text() const { return text_.str(); }
+
+private:
+    static std::uint64_t shown(const DERItem& item) { return item.length; }
+    static std::uint64_t shown(std::uint64_t number) { return number; }
+
+    std::ostringstream text_;
+};
+
+// Whether there is a payload, its data, version and type, whether there are a keybag and compression information, and
+// these.
+std::string askPayload(const Img4Record* record) {
+    std::uint32_t algorithm = 77;
+    std::uint32_t size = 77;
+    std::ostringstream text;
+    text << Answers()
+                .ask<bool>(Img4DecodePayloadExists, record)
+                .ask<DERItem>(Img4DecodeGetPayload, record)
+                .ask<DERItem>(Img4DecodeGetPayloadVersion, record)
+                .ask<std::uint32_t>(Img4DecodeGetPayloadType, record)
+                .ask<bool>(Img4DecodePayloadKeybagExists, record)
+                .ask<DERItem>(Img4DecodeGetPayloadKeybag, record)
+                .ask<bool>(Img4DecodePayloadCompressionInfoExists, record)
+                .text();
+    text << Img4DecodeGetPayloadCompressionInfo(record, &algorithm, &size) << ':' << algorithm << ',' << size;
+    return text.str();
+}
+
+TEST(Img4Payload, givesItsFieldsOrClearsWhatItIsAskedFor) {
+    const std::string nothing = "4294967295,4294967295";
+    const Bytes emptyKeybag = sequence({ia5("IM4P"), ia5("sepi"), ia5("1"), octets({1}), octets({})});
+    const struct {
+        Bytes payload;
+        std::string answers;
+    } rows[] = {
+        {payload({.type = "ABCD", .keybag = {9, 8, 7}, .compression = compression(1, 0xFFFFFFFE)}),
+         "0:1 0:64 0:8 0:1094861636 0:1 0:3 0:1 0:1,4294967294"},
+        {payload({}), "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:0 1:" + nothing},
+        {emptyKeybag, "0:1 0:1 0:1 0:1936027753 0:0 0:0 0:0 1:" + nothing},
+        // A size that does not fit is refused when it is asked for; both numbers say that there is no answer.
+        {payload({.compression = compression(0, 0x100000000)}), "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:1 7:" + nothing},
+        {payload({.data = {}}), "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing},
+    };
+    for (const auto& row : rows) {
+        const Img4Record record = recordOf(Img4DecodeInitPayload, row.payload);
+        EXPECT_EQ(askPayload(&record), row.answers);
+    }
+    const Img4Record none = {};
+    EXPECT_EQ(askPayload(&none), "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing);
+    EXPECT_EQ(askPayload(nullptr), "6:0 6:0 6:0 6:0 6:0 6:0 6:0 6:" + nothing);
+    std::uint32_t number = 77;
+    EXPECT_EQ(Img4DecodeGetPayloadCompressionInfo(&none, nullptr, &number), DERParamError);
+    EXPECT_EQ(number, 0xFFFFFFFF);
+}
+
+// Whether there are payload properties, these, whether "entP" is among them, and its value. Failure leaves things
+// alone.
+std::string askProperties(const Img4Record* record) {
+    const DERTag tag = propertyTag("entP");
+    return Answers()
+        .ask<bool>(Img4DecodePayloadPropertiesExists, record)
+        .ask<DERItem>(Img4DecodeGetPayloadProperties, record)
+        .ask<bool>(Img4DecodePayloadPropertyExistsByTag, record, tag)
+        .ask<std::uint32_t>(Img4DecodeGetPayloadPropertiesInteger, record, tag)
+        .text();
+}
+
+TEST(Img4PayloadProperties, areAbsentOrThere) {
+    const Bytes some = payload({.properties = payloadProperties({property("entP", integer(5))})});
+    const Bytes others = payload({.properties = payloadProperties({property("entL", integer(5))})});
+    const Bytes empty = payload({});
+    const Img4Record none = {}, withSome = recordOf(Img4DecodeInitPayload, some),
+                     withOthers = recordOf(Img4DecodeInitPayload, others),
+                     withNone = recordOf(Img4DecodeInitPayload, empty);
+    EXPECT_EQ(askProperties(&withSome), "0:1 0:28 0:1 0:5 ");
+    EXPECT_EQ(askProperties(&withOthers), "0:1 0:28 1:0 1:1 ");
+    EXPECT_EQ(askProperties(&withNone), "0:0 6:1 6:1 6:1 ");
+    EXPECT_EQ(askProperties(&none), "3:1 3:1 3:1 3:1 ");
+    EXPECT_EQ(askProperties(nullptr), "6:1 6:1 6:1 6:1 ");
+}
+
+struct FindCase {
+    const char* name;
+    Bytes properties;
+    DERReturn expected;
+    Bytes value = {};
+};
+
+// Failure leaves the value alone.
+template <typename Key>
+void checkFinds(DERReturn (*find)(const DERItem*, Key, DERItem*), Key key, std::span<const FindCase> rows) {
+    for (const FindCase& row : rows) {
+        const DERItem properties = viewOf(row.properties);
+        DERItem value = {&octet, 1};
+        EXPECT_EQ(find(&properties, key, &value), row.expected) << row.name;
+        EXPECT_EQ(bytesOf(value), row.expected == DERSuccess ? row.value : Bytes{octet}) << row.name;
+    }
+}
+
+Bytes inSet(const List& elements) {
+    return sequence({ia5("PAYP"), set(elements)});
+}
+
+// Before a sound property of that name, an element with the content `content`.
+Bytes behind(const Bytes& content) {
+    return inSet({item(propertyTag("want"), content), property("want", integer(5))});
+}
+
+TEST(Img4PayloadProperties, canBeFoundByName) {
+    const Bytes wanted = property("want", integer(5));
+    const FindCase rows[] = {
+        {"sound", inSet({property("othr", integer(1)), wanted}), DERSuccess, {5}},
+        {"first SEQUENCE behind another item", join({integer(1), inSet({wanted})}), DERSuccess, {5}},
+        {"name counts, not the tag",
+         inSet({item(propertyTag("othr"), sequence({ia5("want"), integer(6)}))}),
+         DERSuccess,
+         {6}},
+        {"value of any type", inSet({property("want", set({boolean(true)}))}), DERSuccess, {1, 1, 0xFF}},
+        {"element that holds no item", inSet({octets({0x30}), wanted}), DERSuccess, {5}},
+        {"name without a value", behind(sequence({ia5("want")})), DERSuccess, {5}},
+        {"value before the name", behind(sequence({integer(1), ia5("want")})), DERSuccess, {5}},
+        {"SET for a SEQUENCE", behind(set({ia5("want"), integer(1)})), DERSuccess, {5}},
+        {"third element", behind(sequence({ia5("want"), integer(1), integer(2)})), DERSuccess, {5}},
+        {"element without any IA5String", behind(sequence({integer(1)})), DEREndOfSequence},
+        {"broken item before the name", behind(item(DERTagSequence, {5, 9})), DERDecodeError},
+        {"empty value", inSet({property("want", octets({}))}), DERUnexpectedTag},
+        {"absent", inSet({property("othr", integer(1))}), DEREndOfSequence},
+        {"broken element", sequence({ia5("PAYP"), item(DERTagSet, {0x05})}), DERDecodeError},
+        {"wrong magic", sequence({ia5("PAYQ"), set({wanted})}), DERParamError},
+        {"no magic", sequence({set({wanted})}), DERParamError},
+        {"no SET", sequence({ia5("PAYP"), sequence({wanted})}), DEREndOfSequence},
+        {"empty SEQUENCE", sequence({}), DERUnexpectedTag},
+        {"no SEQUENCE", set({}), DEREndOfSequence},
+        {"broken", {0x30, 0x05}, DERDecodeError},
+        {"nothing", {}, DERParamError},
+    };
+    checkFinds(Img4DecodePayloadPropertiesFindItemWithTag, fourCC("want"), rows);
+}
+
+TEST(Img4PayloadProperties, canHoldPropertiesThemselves) {
+    const Bytes inner = property("verS", ia5("1.0"));
+    const Bytes misnamed = item(propertyTag("verS"), sequence({ia5("verT"), ia5("1")}));
+    const FindCase rows[] = {
+        {"in a SET", sequence({ia5("vers"), set({property("bldn", integer(1)), inner})}), DERSuccess, {'1', '.', '0'}},
+        {"in a SEQUENCE", sequence({ia5("vers"), sequence({inner})}), DERSuccess, {'1', '.', '0'}},
+        {"absent", sequence({ia5("vers"), set({})}), DEREndOfSequence},
+        {"value that holds no properties", sequence({ia5("vers"), octets(inner)}), DERUnexpectedTag},
+        {"inner one with another name", sequence({ia5("vers"), set({misnamed})}), DERUnexpectedTag},
+        {"octets behind", join({sequence({ia5("vers"), set({inner})}), {0}}), DERBufferOverflow},
+        {"no SEQUENCE", set({ia5("vers"), set({inner})}), DERUnexpectedTag},
+    };
+    checkFinds(Img4DecodeGetPayloadVersionPropertyString, propertyTag("verS"), rows);
+}
+
+Bytes manifestWith(std::uint64_t version, const List& manb, const char* name = "MANB") {
+    return sequence({ia5("IM4M"), integer(version),
+                     set({integer(1), property(name, version == 2 ? sequence(manb) : set(manb))}), octets({1}),
+                     sequence({})});
+}
+
+TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
+    const Bytes manp = object("MANP", {property("brdI", integer(12))});
+    const Bytes sep = object("sepi", {property("eksp", boolean(true))});
+    const Bytes misnamed = item(propertyTag("sepi"), sequence({ia5("ipes"), set({})}));
+    Bytes mixed = manifestWith(2, {manp, sep});
+    mixed[10] = 1; // the version
+    const struct {
+        const char* name;
+        Bytes manifest;
+        DERReturn object;  // of the lookup of "eksp" in "sepi"
+        DERReturn section; // of the lookup of "brdI" in the manifest's own properties
+    } rows[] = {
+        {"sound", manifestWith(0, {manp, sep}), DERSuccess, DERSuccess},
+        {"MANP behind the object", manifestWith(1, {sep, manp}), DERSuccess, DERSuccess},
+        {"version 2 with a SEQUENCE", manifestWith(2, {manp, sep}), DERSuccess, DERSuccess},
+        {"version 1 with a SEQUENCE", mixed, DERUnexpectedTag, DERUnexpectedTag},
+        {"no MANB", manifestWith(0, {manp, sep}, "MANA"), DEREndOfSequence, DEREndOfSequence},
+        {"no MANP", manifestWith(0, {sep}), DEREndOfSequence, DEREndOfSequence},
+        {"MANP in a SEQUENCE", manifestWith(0, {property("MANP", sequence({})), sep}), DERUnexpectedTag,
+         DERUnexpectedTag},
+        {"no object", manifestWith(0, {manp}), DEREndOfSequence, DERSuccess},
+        {"object in a SEQUENCE", manifestWith(2, {manp, property("sepi", sequence({}))}), DERUnexpectedTag, DERSuccess},
+        {"object under another name", manifestWith(0, {manp, misnamed}), DERUnexpectedTag, DERSuccess},
+        {"broken element before the object", manifestWith(0, {manp, {0x05, 0x01}}), DERDecodeError, DERSuccess},
+    };
+    for (const auto& row : rows) {
+        const Img4Record record = recordOf(Img4DecodeInitManifest, row.manifest);
+        bool entitled = false;
+        std::uint32_t board = 0;
+        EXPECT_EQ(Img4DecodeGetObjectPropertyBoolean(&record, sepi, eksp, &entitled), row.object) << row.name;
+        EXPECT_EQ(entitled, row.object == DERSuccess) << row.name;
+        EXPECT_EQ(Img4DecodeGetIntegerFromSection(&record, Img4SectionManifest, brdI, &board), row.section) << row.name;
+        EXPECT_EQ(board, row.section == DERSuccess ? 12U : 0U) << row.name;
+    }
+    const Bytes bare = unsignedManifest({.objects = {sep}});
+    const Img4Record record = recordOf(Img4DecodeInitUnsignedManifest, bare);
+    bool entitled = false;
+    EXPECT_EQ(Img4DecodeGetObjectPropertyBoolean(&record, sepi, eksp, &entitled), DERSuccess);
+    EXPECT_TRUE(entitled);
+}
+
+// Whether there are a manifest and restore information, each asked in two ways, and what a third section is.
+std::string askSections(const Img4Record* record) {
+    return Answers()
+        .ask<bool>(Img4DecodeManifestExists, record)
+        .ask<bool>(Img4DecodeSectionExists, record, Img4SectionManifest)
+        .ask<bool>(Img4DecodeRestoreInfoExists, record)
+        .ask<bool>(Img4DecodeSectionExists, record, Img4SectionRestoreInfo)
+        .ask<bool>(Img4DecodeSectionExists, record, 2)
+        .text();
+}
+
+// Of a section: a boolean, a number, one of 64 bits, data.
+std::string askSection(const Img4Record* record, std::uint32_t section) {
+    return Answers()
+        .ask<bool>(Img4DecodeGetBooleanFromSection, record, section, eksp)
+        .ask<std::uint32_t>(Img4DecodeGetIntegerFromSection, record, section, eksp)
+        .ask<std::uint64_t>(Img4DecodeGetInteger64FromSection, record, section, eksp)
+        .ask<DERItem>(Img4DecodeGetDataFromSection, record, section, eksp)
+        .text();
+}
+
+TEST(Img4Manifest, hasSectionsOrNot) {
+    const Bytes plain = container(payload({}), {}, {});
+    const Bytes emptyRestoreInfo = container(payload({}), {}, restoreInfo({}));
+    const Bytes full = exampleContainer();
+    const Bytes ticket = exampleTicket();
+    const Img4Record none = {}, withNone = recordOf(Img4DecodeInit, plain),
+                     withRestoreInfo = recordOf(Img4DecodeInit, emptyRestoreInfo),
+                     withBoth = recordOf(Img4DecodeInit, full), ofTicket = recordOf(Img4DecodeInitManifest, ticket);
+    EXPECT_EQ(askSections(&withNone), "0:0 0:0 0:0 0:0 6:0 ");
+    EXPECT_EQ(askSections(&withRestoreInfo), "0:0 0:0 0:1 0:1 6:0 ");
+    EXPECT_EQ(askSections(&withBoth), "0:1 0:1 0:1 0:1 6:0 ");
+    EXPECT_EQ(askSections(&ofTicket), "0:1 0:1 0:0 0:0 6:0 ");
+    EXPECT_EQ(askSections(nullptr), "6:0 6:0 6:0 6:0 6:0 ");
+    // Data is cleared, numbers are not.
+    EXPECT_EQ(askSection(&none, Img4SectionManifest), "1:1 1:1 1:1 1:0 ");
+    EXPECT_EQ(askSection(&none, Img4SectionRestoreInfo), "1:1 1:1 1:1 1:0 ");
+    EXPECT_EQ(askSection(&none, 2), "6:1 6:1 6:1 6:0 ");
+    std::uint32_t number = 77;
+    EXPECT_EQ(Img4DecodeGetObjectPropertyInteger(&none, sepi, eksp, &number), DERDecodeError);
+    EXPECT_EQ(number, 0U);
+}
+
+TEST(Img4Manifest, hasAStartAndALength) {
+    const Bytes ticket = exampleTicket();
+    const Img4Record none = {};
+    const std::uint8_t* start = nullptr;
+    std::uint32_t length = 0;
+    Img4Record record = recordOf(Img4DecodeInitManifest, ticket);
+    expectNeedsAll(DERParamError, Img4DecodeGetManifest, &record, &start, &length);
+    EXPECT_EQ(Img4DecodeGetManifest(&record, &start, &length), DERSuccess);
+    EXPECT_EQ(start, ticket.data());
+    EXPECT_EQ(length, ticket.size());
+    record.manifestRaw.length = 0x100000001;
+    EXPECT_EQ(Img4DecodeGetManifest(&record, &start, &length), DERBufferOverflow);
+    EXPECT_EQ(length, 0U);
+    start = ticket.data();
+    EXPECT_EQ(Img4DecodeGetManifest(&none, &start, &length), Img4Failure);
+    EXPECT_EQ(start, nullptr);
+}
+
+TEST(Img4Queries, needTheirArguments) {
+    const Bytes buffer = exampleContainer();
+    const Img4Record record = recordOf(Img4DecodeInit, buffer);
+    bool flag;
+    std::uint32_t number;
+    DERItem item;
+    for (const auto query :
+         {Img4DecodePayloadExists, Img4DecodePayloadKeybagExists, Img4DecodeManifestExists,
+          Img4DecodePayloadCompressionInfoExists, Img4DecodePayloadPropertiesExists, Img4DecodeRestoreInfoExists})
+        expectNeedsAll(DERParamError, query, &record, &flag);
+    for (const auto query : {Img4DecodeGetPayload, Img4DecodeGetPayloadVersion, Img4DecodeGetPayloadKeybag,
+                             Img4DecodeGetPayloadProperties})
+        expectNeedsAll(DERParamError, query, &record, &item);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadType, &record, &number);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadCompressionInfo, &record, &number, &number);
+    expectNeedsAll(DERParamError, Img4DecodePayloadPropertyExistsByTag, &record, 0, &flag);
+    expectNeedsAll(DERParamError, Img4DecodeSectionExists, &record, 0, &flag);
+    expectNeedsAll(DERParamError, Img4DecodePayloadPropertiesFindItemWithTag, &record.payloadRaw, 0, &item);
+    expectNeedsAll(DERParamError, Img4DecodeGetPayloadVersionPropertyString, &record.payloadRaw, 0, &item);
+}
+
+} // namespace
