@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <memory>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -13,55 +14,33 @@ namespace {
 
 using namespace img4answers;
 
-struct Exact {
-    explicit Exact(const img4maker::Bytes& bytes, std::size_t count)
-        : octets(std::make_unique<std::uint8_t[]>(count)), length(count) {
-        std::copy_n(bytes.begin(), count, octets.get());
-    }
+// The answers to the first `length` octets, from memory of that very size.
+Answers askExactly(int initialisation, const img4maker::Bytes& bytes, std::size_t length) {
+    const auto octets = std::make_unique<std::uint8_t[]>(length);
+    std::copy_n(bytes.begin(), length, octets.get());
+    return ask(initialisation, octets.get(), length);
+}
 
-    std::unique_ptr<std::uint8_t[]> octets;
-    std::size_t length;
-};
+const std::pair<int, img4maker::Bytes> files[] = {{0, img4maker::exampleContainer()}, {2, img4maker::exampleTicket()}};
 
 TEST(Img4Hostile, noPrefixOfASoundFileIsTakenForOne) {
-    const img4maker::Bytes container = img4maker::exampleContainer();
-    const img4maker::Bytes ticket = img4maker::exampleTicket();
-    for (std::size_t length = 0; length < container.size(); ++length) {
-        const Exact cut(container, length);
-        EXPECT_NE(ask(0, cut.octets.get(), length).front(), DERSuccess) << length;
-        askAll(cut.octets.get(), length);
-    }
-    for (std::size_t length = 0; length < ticket.size(); ++length) {
-        const Exact cut(ticket, length);
-        EXPECT_NE(ask(2, cut.octets.get(), length).front(), DERSuccess) << length;
-        askAll(cut.octets.get(), length);
-    }
+    for (const auto& [initialisation, file] : files)
+        for (std::size_t length = 0; length < file.size(); ++length)
+            EXPECT_NE(askExactly(initialisation, file, length).front(), DERSuccess) << length;
 }
 
-// None goes unnoticed: each changes a status, the place of a view or a digest.
+// None goes unnoticed in a container: each changes a status, the place of a view or a digest.
 TEST(Img4Hostile, everyFlippedBitChangesAnAnswer) {
-    const img4maker::Bytes container = img4maker::exampleContainer();
-    Exact buffer(container, container.size());
-    const Answers sound = ask(0, buffer.octets.get(), buffer.length);
-    ASSERT_EQ(sound.front(), DERSuccess);
-    for (std::size_t bit = 0; bit < buffer.length * 8; ++bit) {
-        const auto mask = static_cast<std::uint8_t>(1U << (bit % 8));
-        buffer.octets[bit / 8] ^= mask;
-        EXPECT_NE(ask(0, buffer.octets.get(), buffer.length), sound) << "bit " << bit % 8 << " of octet " << bit / 8;
-        for (int other = 1; other < initialisations; ++other)
-            ask(other, buffer.octets.get(), buffer.length);
-        buffer.octets[bit / 8] ^= mask;
-    }
-}
-
-TEST(Img4Hostile, everyFlippedBitOfATicketIsSurvived) {
-    const img4maker::Bytes ticket = img4maker::exampleTicket();
-    Exact buffer(ticket, ticket.size());
-    for (std::size_t bit = 0; bit < buffer.length * 8; ++bit) {
-        const auto mask = static_cast<std::uint8_t>(1U << (bit % 8));
-        buffer.octets[bit / 8] ^= mask;
-        askAll(buffer.octets.get(), buffer.length);
-        buffer.octets[bit / 8] ^= mask;
+    for (auto [initialisation, file] : files) {
+        const Answers sound = askExactly(initialisation, file, file.size());
+        ASSERT_EQ(sound.front(), DERSuccess);
+        for (std::size_t bit = 0; bit < file.size() * 8; ++bit) {
+            const auto mask = static_cast<std::uint8_t>(1U << (bit % 8));
+            file[bit / 8] ^= mask;
+            EXPECT_NE(askExactly(initialisation, file, file.size()), sound)
+                << "bit " << bit % 8 << " of octet " << bit / 8;
+            file[bit / 8] ^= mask;
+        }
     }
 }
 

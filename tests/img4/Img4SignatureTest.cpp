@@ -182,54 +182,11 @@ TEST(Img4RSASignature, isOverTheExactBlock) {
             checkBlocks(key, *info);
 }
 
-TEST(Img4RSASignature, isANumberBelowTheModulusOfItsLength) {
+TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
     const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
     const Bytes digest = digestOfMessage(profile);
-    const Bytes key = publicKeyBits(rsaKey());
-    const Bytes sound = sign(rsaKey(), digest.size(), message);
     const Number modulus = parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_N);
-    const Number below(BN_dup(modulus.get()), BN_free);
-    ASSERT_EQ(BN_sub_word(below.get(), 1), 1);
-    Bytes one(256);
-    one.back() = 1;
-    const std::pair<const char*, Bytes> refused[] = {
-        {"none", {}},
-        {"zero in front", join({Bytes{0x00}, sound})},
-        {"octet behind", join({sound, Bytes{0x00}})},
-        {"octet missing", Bytes(sound.begin(), sound.end() - 1)},
-        {"plus modulus", sum(sound, modulus.get())},
-        {"zero", Bytes(256)},
-        {"zero of one octet", {0x00}},
-        {"one", one},
-        {"modulus", octetsOf(modulus.get())},
-        {"one below the modulus", octetsOf(below.get())},
-        {"all ones", Bytes(256, 0xFF)},
-    };
-    for (const auto& [name, signature] : refused)
-        EXPECT_FALSE(accepts(verify_signature_rsa, profile, key, signature, digest)) << name;
-}
-
-TEST(Img4RSASignature, keepsItsLeadingZeros) {
-    const Key key = readKey(TEST_TRUST_DOMAIN "/keys/kImg4DecodeSecureBootRsa1kSha1-leaf.pem");
-    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa1kSha1;
-    Bytes text = message;
-    Bytes signature;
-    do {
-        ++text[text.front() == 0xFF ? 1 : 0];
-        signature = sign(key, Img4HashLength, text);
-    } while (signature.front() != 0);
-    const DERItem view = viewOf(text);
-    Bytes digest(Img4HashLength);
-    ASSERT_EQ(Img4DecodeComputeDigest(&view, digest.data(), digest.size(), &profile), DERSuccess);
-    EXPECT_TRUE(accepts(verify_signature_rsa, profile, publicKeyBits(key), signature, digest));
-    signature.erase(signature.begin());
-    EXPECT_FALSE(accepts(verify_signature_rsa, profile, publicKeyBits(key), signature, digest));
-}
-
-TEST(Img4RSASignature, needsASoundKey) {
-    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
-    const Bytes digest = digestOfMessage(profile);
-    const Bytes n = octetsOf(parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_N).get());
+    const Bytes n = octetsOf(modulus.get());
     const Bytes e = octetsOf(parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_E).get());
     const Bytes sound = sign(rsaKey(), digest.size(), message);
     Block block;
@@ -237,8 +194,7 @@ TEST(Img4RSASignature, needsASoundKey) {
     const Bytes forged = encode(block, n.size());
     Bytes even = n;
     even.at(n.size() - 1) ^= 1;
-    Bytes trailing = sequence({positiveInteger(n), positiveInteger(e)});
-    trailing.push_back(0);
+    const Bytes whole = sequence({positiveInteger(n), positiveInteger(e)});
     struct Row {
         const char* name;
         Bytes key;
@@ -246,7 +202,7 @@ TEST(Img4RSASignature, needsASoundKey) {
         bool accepted = false;
     };
     const Row rows[] = {
-        {"sound", sequence({positiveInteger(n), positiveInteger(e)}), sound, true},
+        {"sound", whole, sound, true},
         {"zeros before the modulus", sequence({rawInteger(join({Bytes{0, 0}, n})), positiveInteger(e)}), sound, true},
         {"negative modulus", sequence({rawInteger(n), positiveInteger(e)}), sound},
         {"even modulus", sequence({positiveInteger(even), positiveInteger(e)}), sound},
@@ -261,9 +217,15 @@ TEST(Img4RSASignature, needsASoundKey) {
          sound},
         {"no exponent", sequence({positiveInteger(n)}), sound},
         {"third number", sequence({positiveInteger(n), positiveInteger(e), integer(1)}), sound},
-        {"octet behind", trailing, sound},
+        {"octet behind", join({whole, Bytes{0}}), sound},
         {"SET", set({positiveInteger(n), positiveInteger(e)}), sound},
         {"none", {}, sound},
+        {"signature with a zero in front", whole, join({Bytes{0}, sound})},
+        {"signature that lacks an octet", whole, Bytes(sound.begin(), sound.end() - 1)},
+        {"signature plus modulus", whole, sum(sound, modulus.get())},
+        {"signature of zero", whole, Bytes(n.size())},
+        {"modulus as signature", whole, n},
+        {"no signature", whole, {}},
     };
     for (const Row& row : rows)
         EXPECT_EQ(accepts(verify_signature_rsa, profile, row.key, row.signature, digest), row.accepted) << row.name;

@@ -129,8 +129,7 @@ const Img4TrustProfile scripted = {
     checkConstraints,
     &kQDSupportDigestInfoSha256,
     nullptr,
-    nullptr,
-};
+    nullptr};
 
 const Img4SignatureWithChainVerifier verifyBoth = [](const DERItem* chain, const DERItem* signature,
                                                      const std::uint8_t* digest, DERItem* properties, void*) {
@@ -185,66 +184,46 @@ Img4TrustRefusal refusal;
 // out.
 struct Flow {
     const char* name;
-    std::span<const Step> steps;
     std::string_view has;
-    Bytes trusted;
     DERReturn (*evaluate)(Img4Record*);
+    Bytes trusted = {};
+    std::span<const Step> steps = newerSteps;
 };
 
 const Flow flows[] = {
-    {"plain",
-     newerSteps,
-     "nos",
-     {},
+    {"plain", "nos",
      [](auto record) { return Img4DecodePerformTrustEvaluation(sepi, record, judge, &scripted, &script); }},
-    {"plain by its other name",
-     newerSteps,
-     "nos",
-     {},
+    {"plain by its other name", "nos",
      [](auto record) { return Img4DecodePerformTrustEvaluatation(sepi, record, judge, &scripted, &script); }},
-    {"with callbacks",
-     newerSteps,
-     "cos",
-     {},
+    {"with callbacks", "cos",
      [](auto record) {
          return Img4DecodePerformTrustEvaluationWithCallbacks(none, record, &allCallbacks, &scripted, &script);
      }},
-    {"with callbacks by its other name", newerSteps, "cos", lastChanged(Bytes(32, 'm')),
+    {"trusted", "co",
      [](auto record) {
          return Img4DecodePerformTrustEvaluatationWithCallbacks(none, record, &allCallbacks, &scripted, &script);
-     }},
-    {"trusted", newerSteps, "co", Bytes(32, 'm'),
-     [](auto record) {
-         return Img4DecodePerformTrustEvaluationWithCallbacks(none, record, &allCallbacks, &scripted, &script);
-     }},
-    {"manifest alone",
-     newerSteps,
-     "cs",
-     {},
+     },
+     Bytes(32, 'm')},
+    {"manifest alone", "cs",
      [](auto record) {
          return Img4DecodePerformManifestTrustEvaluationWithCallbacks(record, &allCallbacks, &scripted, &script);
-     }},
-    {"explained",
-     newerSteps,
-     "cose",
-     {},
+     },
+     lastChanged(Bytes(32, 'm'))},
+    {"explained", "cose",
      [](auto record) {
          return Img4DecodePerformTrustEvaluationExplained(&none, record, &allCallbacks, &scripted, &script, &refusal);
      }},
-    {"explained, manifest alone",
-     newerSteps,
-     "cse",
-     {},
+    {"explained, manifest alone", "cse",
      [](auto record) {
          return Img4DecodePerformTrustEvaluationExplained(nullptr, record, &allCallbacks, &scripted, &script, &refusal);
      }},
     {"by parts",
-     olderSteps,
      "",
-     {},
      [](auto record) {
          return Img4DecodeEvaluateTrustWithCallbacks(sepi, record, judge, verifyBoth, checkConstraints, hash, &script);
-     }},
+     },
+     {},
+     olderSteps},
 };
 
 std::set<std::string> leftIn(const Img4Record& record) {
