@@ -12,10 +12,9 @@ namespace img4answers {
 
 namespace {
 
-// Names that the example files use, wanted both as names of objects and of properties, and one that none uses.
-constexpr std::string_view names[] = {"MANP", "sepi", "kern", "eksp", "dgsO", "brdI", "devI",
-                                      "proC", "osvr", "nonV", "rcnt", "rbig", "rdbg", "entP",
-                                      "lodA", "uuiD", "revD", "vers", "verS", "o001", "none"};
+// Names that the example files use, one for each kind of place and value, and one that none uses.
+constexpr std::string_view names[] = {"sepi", "eksp", "dgsO", "brdI", "osvr", "nonV",
+                                      "rcnt", "rbig", "rdbg", "entP", "vers", "none"};
 
 DERReturn foldDigest(const DERItem* data, std::uint8_t* out, std::uint64_t length, const Img4TrustProfile*) {
     for (std::uint64_t i = 0; i < data->length && length != 0; ++i)
@@ -51,7 +50,7 @@ private:
     void askSections(std::uint32_t name);
     void askObject(std::uint32_t object, std::uint32_t name);
     void askSingle(const DERItem& single, std::uint32_t name);
-    void askSingles(std::uint32_t name);
+    void askSingles();
     void askDigests(const DERItem& properties);
 
     const std::uint8_t* data_;
@@ -119,7 +118,7 @@ void Inquiry::askPayloadProperties(std::uint32_t name, const DERItem& properties
 
 void Inquiry::askSections(std::uint32_t name) {
     const Img4Record* record = &record_;
-    for (std::uint32_t section = 0; section < 3; ++section) {
+    for (std::uint32_t section = 0; section < 2; ++section) {
         ask<Img4Property>(Img4DecodeGetPropertyFromSection, record, section, Img4PropertyTag(name), DERTagIA5String);
         ask<bool>(Img4DecodeGetBooleanFromSection, record, section, name);
         ask<std::uint32_t>(Img4DecodeGetIntegerFromSection, record, section, name);
@@ -151,13 +150,13 @@ void Inquiry::askSingle(const DERItem& single, std::uint32_t name) {
     ask<DERItem>(Img4DecodeGetPayloadVersionPropertyString, &single, Img4PropertyTag(name));
 }
 
-// The elements of a dictionary are what a caller of these holds.
-void Inquiry::askSingles(std::uint32_t name) {
+// The elements of a dictionary are what a caller of these holds; each is asked for by its own name.
+void Inquiry::askSingles() {
     DERSequence elements;
     DERDecodedInfo element;
     DERDecodeSeqContentInit(&record_.restoreInfo.properties, &elements);
     while (DERDecodeSeqNext(&elements, &element) == DERSuccess)
-        askSingle(element.content, name);
+        askSingle(element.content, static_cast<std::uint32_t>(element.tag));
 }
 
 void Inquiry::askDigests(const DERItem& properties) {
@@ -205,10 +204,10 @@ Answers Inquiry::run(int initialisation) {
         const std::uint32_t name = img4maker::fourCC(text);
         askPayloadProperties(name, properties);
         askSections(name);
-        for (const std::string_view object : {"sepi", "kern", "o001"})
+        for (const std::string_view object : {"sepi", "o001"})
             askObject(img4maker::fourCC(object), name);
-        askSingles(name);
     }
+    askSingles();
     return answers_;
 }
 
