@@ -8,6 +8,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/DataClasses.h"
 #include "platform/Error.h"
 #include "platform/Value.h"
 
@@ -23,23 +24,26 @@ public:
     ZPDevice(const ZPDevice&) = delete;
     ZPDevice& operator=(const ZPDevice&) = delete;
 
+    // The identity of a component; nothing for ComponentIdentity::None.
+    Value get(ComponentIdentity identity) const;
+
     // Identities that are handed back as the service answers them.
-    Value getMiravelSerialNumber() const;
-    Value getCoverGlassSerialNumber() const;
-    Value getAmbientLightSensorSerialNumber() const;
-    Value getFCAMModuleSerialNumber() const;
-    Value getProxSerialNumber() const;
-    Value getBackglassCompassSerialNumber() const;
-    Value getScreenSerialNumber() const;
+    Value getMiravelSerialNumber() const { return get(ComponentIdentity::MiravelSerialNumber); }
+    Value getCoverGlassSerialNumber() const { return get(ComponentIdentity::CoverGlassSerialNumber); }
+    Value getAmbientLightSensorSerialNumber() const { return get(ComponentIdentity::AmbientLightSensorSerialNumber); }
+    Value getFCAMModuleSerialNumber() const { return get(ComponentIdentity::FrontCameraModuleSerialNumber); }
+    Value getProxSerialNumber() const { return get(ComponentIdentity::ProximitySensorSerialNumber); }
+    Value getBackglassCompassSerialNumber() const { return get(ComponentIdentity::BackglassCompassSerialNumber); }
+    Value getScreenSerialNumber() const { return get(ComponentIdentity::ScreenSerialNumber); }
     Value getHardwareModel() const;
 
     // Identities in the data store's text form (QDOrloCreateInstanceString).
-    Value getVanterSerialNumber() const;
-    Value getVanterChipId() const;
-    Value getVanterUID() const;
-    Value getLoddenChipID() const;
-    Value getLoddenUID() const;
-    Value getTopModuleChipID() const;
+    Value getVanterSerialNumber() const { return get(ComponentIdentity::VanterSerialNumber); }
+    Value getVanterChipId() const { return get(ComponentIdentity::VanterChipID); }
+    Value getVanterUID() const { return get(ComponentIdentity::VanterUID); }
+    Value getLoddenChipID() const { return get(ComponentIdentity::LoddenChipID); }
+    Value getLoddenUID() const { return get(ComponentIdentity::LoddenUID); }
+    Value getTopModuleChipID() const { return get(ComponentIdentity::TopModuleChipID); }
 
     // The device's own identity, "<chip id>:<unique chip id>" in their text forms; nothing when either is missing.
     static Value getUniqueChipId();

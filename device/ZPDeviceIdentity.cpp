@@ -28,6 +28,7 @@ enum class Result {
 };
 
 struct Identity {
+    ComponentIdentity identity;
     Value (*service)(std::string_view key);
     const std::string_view& key; // the opaque keys are constants of another file, so they are read when they are used
     Result result;
@@ -41,22 +42,25 @@ constexpr std::string_view vanterKey = "VanterSerialNumber";
 constexpr std::string_view topModuleKey = "TopModuleAuthChipID";
 constexpr std::string_view hardwareModelKey = "HWModelStr";
 
-constexpr Identity miravel{answer, MiravelSNKey, Result::Answer, "Miravel SN"};
-constexpr Identity coverGlass{answer, CoverGlassSNKey, Result::Answer, "CoverGlass SN"};
-constexpr Identity ambientLightSensor{answer, ALSSNKey, Result::Answer, "ALS SN"};
-constexpr Identity frontCamera{answer, FCAMModuleSNKey, Result::Answer, "FCAMModule SN"};
-constexpr Identity proximity{tansuValue, proxKey, Result::Answer, "Prox Serial Number"};
-constexpr Identity backglassCompass{tansuValue, backglassCompassKey, Result::Answer, "BG Serial Number"};
-constexpr Identity screen{answer, screenKey, Result::Answer, "Screen Serial Number"};
-constexpr Identity vanter{answer, vanterKey, Result::InstanceString, "Vanter Serial Number"};
-constexpr Identity vanterChip{answer, VanterChipIDKey, Result::InstanceString, "Vanter Chip id"};
-constexpr Identity vanterUID{answer, VanterUIDKey, Result::InstanceString, "Vanter UID"};
-constexpr Identity loddenChip{answer, LoddenChipIDKey, Result::InstanceString, "Lodden Chip id"};
-constexpr Identity loddenUID{answer, LoddenUIDKey, Result::InstanceString, "Lodden UID"};
-constexpr Identity topModule{answer, topModuleKey, Result::InstanceStringIfAnswered, "topModuleChipID"};
-constexpr Identity hardwareModel{answerWithError, hardwareModelKey, Result::Answer, "HWModelStr"};
+using enum ComponentIdentity;
+constexpr Identity identities[] = {
+    {MiravelSerialNumber, answer, MiravelSNKey, Result::Answer, "Miravel SN"},
+    {CoverGlassSerialNumber, answer, CoverGlassSNKey, Result::Answer, "CoverGlass SN"},
+    {AmbientLightSensorSerialNumber, answer, ALSSNKey, Result::Answer, "ALS SN"},
+    {FrontCameraModuleSerialNumber, answer, FCAMModuleSNKey, Result::Answer, "FCAMModule SN"},
+    {ProximitySensorSerialNumber, tansuValue, proxKey, Result::Answer, "Prox Serial Number"},
+    {BackglassCompassSerialNumber, tansuValue, backglassCompassKey, Result::Answer, "BG Serial Number"},
+    {ScreenSerialNumber, answer, screenKey, Result::Answer, "Screen Serial Number"},
+    {VanterSerialNumber, answer, vanterKey, Result::InstanceString, "Vanter Serial Number"},
+    {VanterChipID, answer, VanterChipIDKey, Result::InstanceString, "Vanter Chip id"},
+    {VanterUID, answer, VanterUIDKey, Result::InstanceString, "Vanter UID"},
+    {LoddenChipID, answer, LoddenChipIDKey, Result::InstanceString, "Lodden Chip id"},
+    {LoddenUID, answer, LoddenUIDKey, Result::InstanceString, "Lodden UID"},
+    {TopModuleChipID, answer, topModuleKey, Result::InstanceStringIfAnswered, "topModuleChipID"},
+};
+constexpr Identity hardwareModel{None, answerWithError, hardwareModelKey, Result::Answer, "HWModelStr"};
 
-Value get(const Identity& identity) {
+Value read(const Identity& identity) {
     Value value = identity.service(identity.key);
     const bool answered = !value.isNothing();
     if (identity.result != Result::Answer)
@@ -86,47 +90,15 @@ ZPDevice& ZPDevice::sharedSingleton() {
     return shared;
 }
 
-Value ZPDevice::getMiravelSerialNumber() const {
-    return get(miravel);
+Value ZPDevice::get(ComponentIdentity identity) const {
+    for (const Identity& row : identities)
+        if (row.identity == identity)
+            return read(row);
+    return {};
 }
-Value ZPDevice::getCoverGlassSerialNumber() const {
-    return get(coverGlass);
-}
-Value ZPDevice::getAmbientLightSensorSerialNumber() const {
-    return get(ambientLightSensor);
-}
-Value ZPDevice::getFCAMModuleSerialNumber() const {
-    return get(frontCamera);
-}
-Value ZPDevice::getProxSerialNumber() const {
-    return get(proximity);
-}
-Value ZPDevice::getBackglassCompassSerialNumber() const {
-    return get(backglassCompass);
-}
-Value ZPDevice::getScreenSerialNumber() const {
-    return get(screen);
-}
+
 Value ZPDevice::getHardwareModel() const {
-    return get(hardwareModel);
-}
-Value ZPDevice::getVanterSerialNumber() const {
-    return get(vanter);
-}
-Value ZPDevice::getVanterChipId() const {
-    return get(vanterChip);
-}
-Value ZPDevice::getVanterUID() const {
-    return get(vanterUID);
-}
-Value ZPDevice::getLoddenChipID() const {
-    return get(loddenChip);
-}
-Value ZPDevice::getLoddenUID() const {
-    return get(loddenUID);
-}
-Value ZPDevice::getTopModuleChipID() const {
-    return get(topModule);
+    return read(hardwareModel);
 }
 
 Value ZPDevice::getUniqueChipId() {

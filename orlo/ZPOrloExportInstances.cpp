@@ -11,32 +11,28 @@ namespace {
 
 constexpr LogSource zplog{"ZPOrloExport"};
 
-// How an identity is read.
+// What the log says about an identity.
 struct IdentityRow {
     ComponentIdentity identity;
-    Value (ZPDevice::*get)() const;
     const char* missing;               // the message for a device that has none; null: nobody checks
     const char* readingLine = nullptr; // logged with the class once the identity has been asked for
 };
 
+using enum ComponentIdentity;
 constexpr IdentityRow identities[] = {
-    {ComponentIdentity::MiravelSerialNumber, &ZPDevice::getMiravelSerialNumber, "Error Reading Miravel SN"},
-    {ComponentIdentity::CoverGlassSerialNumber, &ZPDevice::getCoverGlassSerialNumber, "Error Reading Cover Glass SN"},
-    {ComponentIdentity::AmbientLightSensorSerialNumber, &ZPDevice::getAmbientLightSensorSerialNumber,
-     "Error Reading Ambient Light SN"},
-    {ComponentIdentity::BackglassCompassSerialNumber, &ZPDevice::getBackglassCompassSerialNumber,
-     "Error Reading Back Glass SN"},
-    {ComponentIdentity::VanterSerialNumber, &ZPDevice::getVanterSerialNumber, "Error Reading Vanter SN",
-     "Reading Vanter SN for %@"},
-    {ComponentIdentity::VanterChipID, &ZPDevice::getVanterChipId, "Error Reading Vanter Chip ID"},
-    {ComponentIdentity::VanterUID, &ZPDevice::getVanterUID, "Error Reading Vanter UID"},
-    {ComponentIdentity::LoddenChipID, &ZPDevice::getLoddenChipID, "Error Reading Lodden Chip ID"},
-    {ComponentIdentity::LoddenUID, &ZPDevice::getLoddenUID, "Error Reading Lodden UID"},
-    {ComponentIdentity::ProximitySensorSerialNumber, &ZPDevice::getProxSerialNumber, "Error Reading Prox SN"},
-    {ComponentIdentity::FrontCameraModuleSerialNumber, &ZPDevice::getFCAMModuleSerialNumber,
-     "Error Reading FCAMModule SN", "Reading FCAMModule SN for %@"},
-    {ComponentIdentity::TopModuleChipID, &ZPDevice::getTopModuleChipID, nullptr},
-    {ComponentIdentity::ScreenSerialNumber, &ZPDevice::getScreenSerialNumber, nullptr},
+    {MiravelSerialNumber, "Error Reading Miravel SN"},
+    {CoverGlassSerialNumber, "Error Reading Cover Glass SN"},
+    {AmbientLightSensorSerialNumber, "Error Reading Ambient Light SN"},
+    {BackglassCompassSerialNumber, "Error Reading Back Glass SN"},
+    {VanterSerialNumber, "Error Reading Vanter SN", "Reading Vanter SN for %@"},
+    {VanterChipID, "Error Reading Vanter Chip ID"},
+    {VanterUID, "Error Reading Vanter UID"},
+    {LoddenChipID, "Error Reading Lodden Chip ID"},
+    {LoddenUID, "Error Reading Lodden UID"},
+    {ProximitySensorSerialNumber, "Error Reading Prox SN"},
+    {FrontCameraModuleSerialNumber, "Error Reading FCAMModule SN", "Reading FCAMModule SN for %@"},
+    {TopModuleChipID, nullptr},
+    {ScreenSerialNumber, nullptr},
 };
 
 // The message when memory does not suffice to join two identities of which the second is not checked.
@@ -64,10 +60,6 @@ void report(const char* message, Value* error) {
         *error = message;
 }
 
-Value read(const IdentityRow* row) {
-    return row ? (ZPDevice::sharedSingleton().*row->get)() : Value();
-}
-
 // Whether the gathering ends here because the identity is missing, which is reported also when it goes on.
 bool stops(const DataClass& dataClass, const IdentityRow& row, const Value& identity, Value* error) {
     if (!row.missing || !identity.isNothing())
@@ -78,12 +70,13 @@ bool stops(const DataClass& dataClass, const IdentityRow& row, const Value& iden
 
 // The instance of one class, or nothing when the gathering stops here.
 Value readInstance(const DataClass& dataClass, Value* error) {
+    const ZPDevice& device = ZPDevice::sharedSingleton();
     const IdentityRow& first = *rowOf(dataClass.first);
     const IdentityRow* const second = rowOf(dataClass.second);
-    Value trailing = dataClass.secondIsReadFirst ? read(second) : Value();
-    Value leading = read(&first);
+    Value trailing = dataClass.secondIsReadFirst ? device.get(dataClass.second) : Value();
+    Value leading = device.get(dataClass.first);
     if (!dataClass.secondIsReadFirst)
-        trailing = read(second);
+        trailing = device.get(dataClass.second);
     if (first.readingLine)
         zplog.info(first.readingLine, dataClass.name);
 
