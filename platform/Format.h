@@ -11,6 +11,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <type_traits>
 #include <variant>
 
 #include "platform/Error.h"
@@ -41,7 +42,8 @@ public:
     FormatArgument(const std::string& text) : content_(std::string_view(text)) {}
     FormatArgument(ProgramOutput output) : content_(output) {}
     template <std::integral Integer>
-    FormatArgument(Integer number) : content_(static_cast<std::uint64_t>(number)), negative_(number < Integer{}) {}
+    FormatArgument(Integer number)
+        : content_(static_cast<std::conditional_t<std::is_signed_v<Integer>, std::int64_t, std::uint64_t>>(number)) {}
     FormatArgument(const void* pointer) : content_(pointer) {}
 
 private:
@@ -51,9 +53,8 @@ private:
     };
 
     std::variant<std::monostate, const Value*, std::span<const std::uint8_t>, const Error*, Literal, std::string_view,
-                 ProgramOutput, std::uint64_t, const void*>
+                 ProgramOutput, std::int64_t, std::uint64_t, const void*>
         content_;
-    bool negative_ = false;
 };
 
 // Replaces each conversion of `text` by its argument, in order:

@@ -7,6 +7,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "platform/Error.h"
 #include "platform/SystemLog.h"
@@ -18,14 +19,18 @@ struct HSMessageRequest {
     Value messageDict; // the command's arguments, a dictionary; nothing when the host sent none
 
     // Command and dictionary on one line, for the log.
-    std::string description() const;
+    std::string description() const {
+        return Value::descriptionOf({{"messageDict", &messageDict}, {"messageStr", &messageStr}});
+    }
 };
 
 // A response. Its name is that of the request; statusCode is 0 or -1; response is a dictionary or nothing.
 class HSMessageResponse {
 public:
     static HSMessageResponse initWithName(Value name, std::int64_t statusCode, Value response = {},
-                                          std::optional<Error> error = {});
+                                          std::optional<Error> error = {}) {
+        return {std::move(name), statusCode, std::move(response), std::move(error)};
+    }
 
     const Value& name() const { return name_; }
     std::int64_t statusCode() const { return statusCode_; }
@@ -33,8 +38,11 @@ public:
     const std::optional<Error>& error() const { return error_; }
 
 private:
+    HSMessageResponse(Value name, std::int64_t statusCode, Value response, std::optional<Error> error)
+        : name_(std::move(name)), statusCode_(statusCode), response_(std::move(response)), error_(std::move(error)) {}
+
     Value name_;
-    std::int64_t statusCode_ = 0;
+    std::int64_t statusCode_;
     Value response_;
     std::optional<Error> error_;
 };

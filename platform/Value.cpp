@@ -29,26 +29,9 @@ void appendText(std::string& out, std::string_view text) {
 
 void append(std::string& out, const Value& value, unsigned nesting);
 
-void appendElement(std::string& out, const Value& element, unsigned nesting) {
-    append(out, element, nesting);
-}
-
-void appendEntry(std::string& out, std::string_view key, const Value& value, unsigned nesting) {
-    appendText(out, key);
-    out += ": ";
-    append(out, value, nesting);
-}
-
-void appendElement(std::string& out, const Value::Dictionary::value_type& element, unsigned nesting) {
-    appendEntry(out, element.first, element.second, nesting);
-}
-
-void appendElement(std::string& out, const Value::BorrowedEntries::value_type& element, unsigned nesting) {
-    appendEntry(out, element.first, *element.second, nesting);
-}
-
-template <class Collection>
-void appendCollection(std::string& out, const Collection& collection, const char (&brackets)[3], unsigned nesting) {
+template <class Collection, class Append>
+void appendCollection(std::string& out, const Collection& collection, const char (&brackets)[3], unsigned nesting,
+                      Append appendElement) {
     out += brackets[0];
     std::size_t left = collection.size();
     for (const auto& element : collection) {
@@ -58,17 +41,24 @@ void appendCollection(std::string& out, const Collection& collection, const char
             out += "... (" + std::to_string(left) + " more)";
             break;
         }
-        appendElement(out, element, nesting + 1);
+        appendElement(element);
         --left;
     }
     out += brackets[1];
 }
 
+void appendEntry(std::string& out, std::string_view key, const Value& value, unsigned nesting) {
+    appendText(out, key);
+    out += ": ";
+    append(out, value, nesting);
+}
+
 void append(std::string& out, const Value& value, unsigned nesting) {
     if (const Value::Dictionary* dictionary = value.dictionary())
-        appendCollection(out, *dictionary, "{}", nesting);
+        appendCollection(out, *dictionary, "{}", nesting,
+                         [&](const auto& entry) { appendEntry(out, entry.first, entry.second, nesting + 1); });
     else if (const Value::Array* array = value.array())
-        appendCollection(out, *array, "[]", nesting);
+        appendCollection(out, *array, "[]", nesting, [&](const Value& element) { append(out, element, nesting + 1); });
     else if (const Value::Data* data = value.data())
         appendData(out, *data);
     else if (const std::string* text = value.text())
@@ -124,6 +114,7 @@ std::string Value::descriptionOf(std::span<const std::uint8_t> data) {
 
 std::string Value::descriptionOf(BorrowedEntries entries) {
     std::string out;
-    appendCollection(out, entries, "{}", 0);
+    appendCollection(out, entries, "{}", 0,
+                     [&](const auto& entry) { appendEntry(out, entry.first, *entry.second, 1); });
     return out;
 }
