@@ -64,25 +64,9 @@ std::optional<Value> jsonToMessageValue(std::string_view text, std::string* refu
 
 nlohmann::ordered_json jsonFromValue(const Value& value) {
     using nlohmann::ordered_json;
-    if (const std::string* text = value.text())
-        return *text;
-    if (const Value::Data* data = value.data())
-        return {{dataKey, hexadecimal(*data)}};
-    if (const Value::Array* array = value.array()) {
-        ordered_json json = ordered_json::array();
-        for (const Value& element : *array)
-            json.push_back(jsonFromValue(element));
-        return json;
-    }
-    if (const Value::Dictionary* dictionary = value.dictionary()) {
-        ordered_json json = ordered_json::object();
-        for (const auto& [key, element] : *dictionary)
-            json[key] = jsonFromValue(element);
-        return json;
-    }
-    if (value.isBoolean())
-        return *value.boolean();
-    return value.isNothing() ? ordered_json() : ordered_json(*value.integer());
+    return jsonOf<ordered_json>(value, [](const Value::Data& data) {
+        return ordered_json{{dataKey, hexadecimal(data)}};
+    });
 }
 
 std::optional<std::string> jsonTextMember(std::string_view text, std::string_view key) {

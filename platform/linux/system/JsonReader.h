@@ -13,9 +13,6 @@
 #include "platform/Utf8.h"
 #include "platform/Value.h"
 
-// A value as JSON, as jsonToMessageValue (platform/Json.h) reads it; nothing is null.
-nlohmann::ordered_json jsonFromValue(const Value& value);
-
 // Builds a Value from the events of the library's parser. Refuses what a Value cannot hold or what no honest writer
 // sends: fractions and integers beyond 64 signed bits (unless they may be nothing), texts that are no UTF-8, a key that
 // stands twice in one dictionary, collections nested deeper than `maximumNesting`, and more than `maximumValues`
@@ -123,5 +120,35 @@ private:
     std::string refusal_;
     std::size_t malformedAt_ = 0;
 };
+
+// A value as JSON, with what `fromData` makes of data. Null is nothing, and what stands in more than `nestingLeft`
+// collections, which no reader here takes.
+template <class Json, class FromData>
+Json jsonOf(const Value& value, FromData fromData, std::size_t nestingLeft = 2 * ValueBuilder::maximumNesting) {
+    if (const std::string* text = value.text())
+        return *text;
+    if (const Value::Data* data = value.data())
+        return fromData(*data);
+    if (value.isBoolean())
+        return *value.boolean();
+    if (value.isNumber())
+        return *value.integer();
+    Json json;
+    if (nestingLeft-- == 0)
+        return json;
+    if (const Value::Array* array = value.array()) {
+        json = Json::array();
+        for (const Value& element : *array)
+            json.push_back(jsonOf<Json>(element, fromData, nestingLeft));
+    } else if (const Value::Dictionary* dictionary = value.dictionary()) {
+        json = Json::object();
+        for (const auto& [key, element] : *dictionary)
+            json[key] = jsonOf<Json>(element, fromData, nestingLeft);
+    }
+    return json;
+}
+
+// The same as jsonToMessageValue (platform/Json.h) reads it.
+nlohmann::ordered_json jsonFromValue(const Value& value);
 
 #endif

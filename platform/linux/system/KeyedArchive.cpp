@@ -30,12 +30,6 @@ unsigned major(std::uint8_t first) {
     return first >> 5;
 }
 
-// Refuses a collection inside of `nesting` others.
-void requireNesting(std::size_t nesting) {
-    if (nesting >= ValueBuilder::maximumNesting)
-        throw ArchiveFailure("a nesting of more than " + std::to_string(ValueBuilder::maximumNesting));
-}
-
 // Walks over the heads of all items and lets pass only what an archive may hold, before the library sees the bytes: the
 // library descends once for every nested head, also for texts of indefinite length, and wraps around at negative
 // integers beyond 64 bits.
@@ -77,7 +71,8 @@ private:
     }
 
     void elements(std::uint64_t count, std::size_t nesting) {
-        requireNesting(nesting);
+        if (nesting >= ValueBuilder::maximumNesting)
+            throw ArchiveFailure("a nesting of more than " + std::to_string(ValueBuilder::maximumNesting));
         require(count); // an element has one byte at least
         for (; count > 0; --count)
             item(nesting + 1);
@@ -108,44 +103,12 @@ private:
     std::size_t items_ = 0;
 };
 
-std::string archiveText(const std::string& text) {
-    if (!utf8::isValid(text))
-        throw ArchiveFailure("a text that is no UTF-8");
-    return text;
-}
-
-nlohmann::json archiveItem(const Value& value, std::size_t nesting) {
-    if (value.isBoolean())
-        return *value.boolean();
-    if (value.isNumber())
-        return *value.integer();
-    if (const std::string* text = value.text())
-        return archiveText(*text);
-    if (const Value::Data* data = value.data())
-        return nlohmann::json::binary(*data);
-    if (value.isNothing())
-        throw ArchiveFailure("a value of nothing");
-
-    requireNesting(nesting);
-    if (const Value::Array* array = value.array()) {
-        nlohmann::json items = nlohmann::json::array();
-        for (const Value& element : *array)
-            items.push_back(archiveItem(element, nesting + 1));
-        return items;
-    }
-    nlohmann::json entries = nlohmann::json::object();
-    for (const auto& [key, element] : *value.dictionary())
-        entries[archiveText(key)] = archiveItem(element, nesting + 1);
-    return entries;
-}
-
 } // namespace
 
 Value::Data archiveEncode(std::string_view rootKey, const Value& root) {
-    nlohmann::json archive = nlohmann::json::object();
-    archive[archiveText(std::string(rootKey))] = archiveItem(root, 1);
-    Value::Data bytes = nlohmann::json::to_cbor(archive);
-    HeadCheck(bytes).run(); // what could not be decoded again is no archive
+    const auto item = [](const Value::Data& data) { return nlohmann::json::binary(data); };
+    Value::Data bytes = nlohmann::json::to_cbor({{rootKey, jsonOf<nlohmann::json>(root, item)}});
+    ArchiveDecoder::create(bytes, nullptr)->decode(rootKey); // what could not be decoded again is no archive
     return bytes;
 }
 
