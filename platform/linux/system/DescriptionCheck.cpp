@@ -4,7 +4,6 @@
 #include <cerrno>
 #include <cstring>
 #include <numeric>
-#include <span>
 #include <string_view>
 #include <utility>
 
@@ -20,125 +19,101 @@ namespace {
 constexpr std::size_t mostFaults = 20;
 constexpr std::size_t longestName = 64;
 
-enum Kinds : unsigned {
-    none = 0,
-    text = 1,
-    integer = 2,
-    boolean = 4,
-    data = 8,
-    array = 16,
-    object = 32,
-    identity = text | integer | data, // what is made a text: an instance of a data class, or a part of one
-    file = text | 64,                 // the path of a file that has to be there
-};
+// Lists are texts: "one, two or three".
+constexpr std::string_view identity = "text or integer or data"; // what is made an instance of a data class
+constexpr std::string_view number = "integer or boolean";
+constexpr std::string_view nothing = "null or a number that is no integer of 64 bits";
+constexpr std::string_view aFile = "path of a file that has to be there";
 
-constexpr std::pair<unsigned, std::string_view> kindNames[] = {
-    {text, "text"}, {integer, "integer"}, {boolean, "boolean"}, {data, "data"}, {array, "array"}, {object, "object"}};
-
-struct Section;
-
+// A key that somebody reads.
 struct Key {
-    std::string_view name; // empty for any name
-    unsigned kinds;
-    const Section* section = nullptr;             // of the object, or of each object of the array
-    std::span<const std::string_view> words = {}; // the texts that it may be; none for any
+    std::string_view section;    // the object that has it
+    std::string_view name;       // empty for any name
+    std::string_view kinds;      // a list
+    std::string_view inner = {}; // the section of the object, or of each object of the array; or aFile
+    std::string_view words = {}; // a list of the texts that it may be; empty for any
 };
 
-struct Section {
-    std::span<const Key> keys;
+constexpr Key keys[] = {
+    {"", "answers", "object", "answers"},
+    {"answers", "HWModelStr", "text"},
+    {"answers", "ScreenSerialNumber", "text"},
+    {"answers", "VanterSerialNumber", identity},
+    {"answers", "MiravelSerialNumber", "text"},
+    {"answers", "CoverGlassSerialNumber", "text"},
+    {"answers", "AmbientLightSensorSerialNumber", "text"},
+    {"answers", "FrontCameraModuleSerialNumber", "text"},
+    {"answers", "VanterChipID", identity},
+    {"answers", "VanterUID", identity},
+    {"answers", "LoddenChipID", identity},
+    {"answers", "LoddenUID", identity},
+    {"answers", "TopModuleAuthChipID", identity},
+    {"answers", "UniqueChipID", identity},
+    {"answers", "ChipID", identity},
+
+    {"", "tansu", "object", "tansu"},
+    {"tansu", "ProxSerialNumber", "text"},
+    {"tansu", "BackglassCompassSerialNumber", "text"},
+
+    {"", "registry", "array", "service"},
+    {"service", "class", "text"},
+    {"service", "properties", "object", "properties"},
+    {"service", "children", "array", "service"},
+    {"properties", "AccessoryCertificate", "data"},
+
+    {"", "componentAuth", "object", "componentAuth"},
+    {"componentAuth", "mode", "text", "", "key, pass, fail or silent"},
+    {"componentAuth", "key", "text", aFile},
+    {"componentAuth", "delayMs", "integer"},
+
+    {"", "reverseProxy", "object", "reverseProxy"},
+    {"reverseProxy", "events", "array", "event"},
+    {"event", "status", "integer"},
+    {"event", "afterMs", "integer"},
+    {"reverseProxy", "proxy", "object", "proxy"},
+    {"proxy", "HTTPEnable", number},
+    {"proxy", "HTTPProxy", "text"},
+    {"proxy", "HTTPPort", "integer"},
+    {"proxy", "HTTPSEnable", number},
+    {"proxy", "HTTPSProxy", "text"},
+    {"proxy", "HTTPSPort", "integer"},
+
+    {"", "vanter", "object", "vanter"},
+    {"vanter", "done", number},
+    {"vanter", "firmware", "text"},
+    {"vanter", "fail", "text", "", "create, isDone, queryInfo or performNextStage"},
+
+    {"", "store", "object", "store"},
+    {"store", "backend", "text", "", "embedded or remote"},
+    {"store", "path", "text"},
+    {"store", "dataVersion", "integer"},
+    {"store", "caFile", "text", aFile},
+    {"store", "connectTo", "object", "connectTo"},
+    {"connectTo", "", "text"},
+    {"store", "s3", "object", "s3"},
+    {"s3", "region", "text"},
+    {"s3", "bucket", "text"},
+    {"s3", "accessKeyFile", "text", aFile},
+    {"s3", "conditional", "boolean"},
 };
 
-// What the readers of each section look up.
-constexpr Key answerKeys[] = {
-    {"HWModelStr", text},
-    {"ScreenSerialNumber", text},
-    {"VanterSerialNumber", identity},
-    {"MiravelSerialNumber", text},
-    {"CoverGlassSerialNumber", text},
-    {"AmbientLightSensorSerialNumber", text},
-    {"FrontCameraModuleSerialNumber", text},
-    {"VanterChipID", identity},
-    {"VanterUID", identity},
-    {"LoddenChipID", identity},
-    {"LoddenUID", identity},
-    {"TopModuleAuthChipID", identity},
-    {"UniqueChipID", identity},
-    {"ChipID", identity},
-};
-constexpr Section answers{answerKeys};
-
-constexpr Key tansuKeys[] = {{"ProxSerialNumber", text}, {"BackglassCompassSerialNumber", text}};
-constexpr Section tansu{tansuKeys};
-
-constexpr Key propertyKeys[] = {{"AccessoryCertificate", data}};
-constexpr Section properties{propertyKeys};
-
-extern const Section service;
-constexpr Key serviceKeys[] = {{"class", text}, {"properties", object, &properties}, {"children", array, &service}};
-constexpr Section service{serviceKeys};
-
-constexpr std::string_view authenticationModes[] = {"key", "pass", "fail", "silent"};
-constexpr Key authenticationKeys[] = {
-    {"mode", text, nullptr, authenticationModes}, {"key", file}, {"delayMs", integer}};
-constexpr Section authentication{authenticationKeys};
-
-constexpr Key eventKeys[] = {{"status", integer}, {"afterMs", integer}};
-constexpr Section event{eventKeys};
-constexpr Key proxyKeys[] = {
-    {"HTTPEnable", integer | boolean},  {"HTTPProxy", text},  {"HTTPPort", integer},
-    {"HTTPSEnable", integer | boolean}, {"HTTPSProxy", text}, {"HTTPSPort", integer},
-};
-constexpr Section proxy{proxyKeys};
-constexpr Key reverseProxyKeys[] = {{"events", array, &event}, {"proxy", object, &proxy}};
-constexpr Section reverseProxy{reverseProxyKeys};
-
-constexpr std::string_view updaterSteps[] = {"create", "isDone", "queryInfo", "performNextStage"};
-constexpr Key vanterKeys[] = {{"done", integer | boolean}, {"firmware", text}, {"fail", text, nullptr, updaterSteps}};
-constexpr Section vanter{vanterKeys};
-
-constexpr Key connectToKeys[] = {{"", text}};
-constexpr Section connectTo{connectToKeys};
-constexpr Key objectStoreKeys[] = {
-    {"region", text}, {"bucket", text}, {"accessKeyFile", file}, {"conditional", boolean}};
-constexpr Section objectStore{objectStoreKeys};
-constexpr std::string_view backends[] = {"embedded", "remote"};
-constexpr Key storeKeys[] = {
-    {"backend", text, nullptr, backends},
-    {"path", text},
-    {"dataVersion", integer},
-    {"caFile", file},
-    {"connectTo", object, &connectTo},
-    {"s3", object, &objectStore},
-};
-constexpr Section store{storeKeys};
-
-constexpr Key rootKeys[] = {
-    {"answers", object, &answers},
-    {"tansu", object, &tansu},
-    {"registry", array, &service},
-    {"componentAuth", object, &authentication},
-    {"reverseProxy", object, &reverseProxy},
-    {"vanter", object, &vanter},
-    {"store", object, &store},
-};
-constexpr Section root{rootKeys};
-
-unsigned kindOf(const Value& value) {
-    return value.text()         ? text
-           : value.isBoolean()  ? boolean
-           : value.isNumber()   ? integer
-           : value.data()       ? data
-           : value.array()      ? array
-           : value.dictionary() ? object
-                                : none;
+bool isListed(std::string_view word, std::string_view list) {
+    for (std::size_t start = 0, end = 0; end < list.size(); start = list.find_first_not_of(", ", end)) {
+        end = std::min(list.find_first_of(", ", start), list.size());
+        if (list.substr(start, end - start) == word)
+            return word != "or";
+    }
+    return false;
 }
 
-std::string nameOf(unsigned kinds) {
-    std::string names;
-    for (const auto& [kind, name] : kindNames)
-        if ((kinds & kind) != 0)
-            (names += names.empty() ? "" : " or ") += name;
-    return names.empty() ? "null or a number that is no integer of 64 bits" : names;
+std::string_view kindOf(const Value& value) {
+    return value.text()         ? "text"
+           : value.isBoolean()  ? "boolean"
+           : value.isNumber()   ? "integer"
+           : value.data()       ? "data"
+           : value.array()      ? "array"
+           : value.dictionary() ? "object"
+                                : nothing;
 }
 
 // How many characters have to be put in, taken out or changed to make one name of the other (Levenshtein distance).
@@ -158,13 +133,13 @@ std::size_t distance(std::string_view from, std::string_view to) {
 
 class Check {
 public:
-    void checkObject(const Value& value, const Section& section, const std::string& place) {
+    void checkObject(const Value& value, std::string_view section, const std::string& place) {
         for (const auto& [name, entry] : *value.dictionary()) {
             const std::string inner = (place.empty() ? place : place + ".") + shown(name);
-            const auto key = std::find_if(section.keys.begin(), section.keys.end(), [&name = name](const Key& known) {
-                return known.name.empty() || known.name == name;
+            const Key* const key = std::ranges::find_if(keys, [&name = name, section](const Key& known) {
+                return known.section == section && (known.name.empty() || known.name == name);
             });
-            if (key != section.keys.end())
+            if (key != std::end(keys))
                 checkValue(entry, *key, inner);
             else
                 add("nobody reads " + inner + nearest(name, section));
@@ -179,46 +154,42 @@ public:
 
 private:
     void checkValue(const Value& value, const Key& key, const std::string& place) {
-        const unsigned kind =
+        const std::string_view kind =
             value["$data"].isNothing() && value["$file"].isNothing() ? kindOf(value) : checkDescribed(value, place);
-        if (kind == malformed)
+        if (kind.empty())
             return;
-        if ((kind & key.kinds) == 0)
-            return add(place + " is " + nameOf(kind) + " and has to be " + nameOf(key.kinds));
-        if (key.section && kind == array)
-            checkElements(*value.array(), *key.section, place);
-        else if (key.section)
-            checkObject(value, *key.section, place);
+        if (!isListed(kind, key.kinds))
+            return add(place + " is " + std::string(kind) + " and has to be " + std::string(key.kinds));
+        if (kind == "array")
+            for (std::size_t i = 0; i < value.array()->size(); ++i)
+                checkValue((*value.array())[i], {"", "", "object", key.inner}, place + "[" + std::to_string(i) + "]");
+        else if (kind == "object")
+            checkObject(value, key.inner, place);
         if (!value.text())
             return;
-        if (key.kinds == file)
+        if (key.inner == aFile)
             checkFile(*value.text(), place);
-        if (!key.words.empty() && std::find(key.words.begin(), key.words.end(), *value.text()) == key.words.end())
-            add(place + " is " + shown(*value.text()) + " and has to be " + listed(key.words));
+        if (!key.words.empty() && !isListed(*value.text(), key.words))
+            add(place + " is " + shown(*value.text()) + " and has to be " + std::string(key.words));
     }
 
-    void checkElements(const Value::Array& elements, const Section& section, const std::string& place) {
-        for (std::size_t i = 0; i < elements.size(); ++i)
-            checkValue(elements[i], {"", object, &section}, place + "[" + std::to_string(i) + "]");
-    }
-
-    // The kind of the value that a described value stands for; `malformed`, once that is said, when it is none.
-    unsigned checkDescribed(const Value& value, const std::string& place) {
+    // The kind of the value that a described value stands for; none, once that is said, when it is malformed.
+    std::string_view checkDescribed(const Value& value, const std::string& place) {
         if (!value["$data"].isNothing()) {
             if (!resolveDescribed(value).isNothing())
-                return data;
+                return "data";
             add(place + " has a $data that is not pairs of hexadecimal digits alone");
-            return malformed;
+            return {};
         }
         const Value &path = value["$file"], &as = value["as"];
         const bool asText = as == Value("text");
         if (!path.text() || !(asText || as.isNothing() || as == Value("data")) ||
             value.dictionary()->size() != 1 + value.dictionary()->count("as")) {
             add(place + R"( has a $file that is no path with nothing beside it but "as": "data" or "as": "text")");
-            return malformed;
+            return {};
         }
         checkFile(*path.text(), place);
-        return asText ? text : data;
+        return asText ? "text" : "data";
     }
 
     void checkFile(const std::string& path, const std::string& place) {
@@ -231,12 +202,17 @@ private:
             add("the file " + shown(path) + " of " + place + " is no regular file");
     }
 
-    static std::string nearest(std::string_view name, const Section& section) {
+    static std::string nearest(std::string_view name, std::string_view section) {
         if (name.size() > longestName)
             return {};
-        const auto by = [name](const Key& a, const Key& b) { return distance(name, a.name) < distance(name, b.name); };
-        const std::string_view best = std::min_element(section.keys.begin(), section.keys.end(), by)->name;
-        return distance(name, best) > best.size() / 3 ? "" : "; is " + std::string(best) + " meant?";
+        std::string_view best;
+        std::size_t least = name.npos;
+        for (const Key& key : keys)
+            if (key.section == section && distance(name, key.name) < least) {
+                best = key.name;
+                least = distance(name, best);
+            }
+        return least > best.size() / 3 ? "" : "; is " + std::string(best) + " meant?";
     }
 
     static std::string shown(std::string_view name) {
@@ -245,20 +221,11 @@ private:
         return name.size() > longestName ? text + "..." : text;
     }
 
-    static std::string listed(std::span<const std::string_view> words) {
-        std::string text;
-        for (const std::string_view word : words)
-            (text += text.empty() ? "" : word == words.back() ? " or " : ", ") += word;
-        return text;
-    }
-
     // Beyond the most that are said they are only counted.
     void add(std::string fault) {
         if (++found_ <= mostFaults)
             faults_.push_back(std::move(fault));
     }
-
-    static constexpr unsigned malformed = ~0U;
 
     std::vector<std::string> faults_;
     std::size_t found_ = 0;
@@ -269,6 +236,6 @@ private:
 std::vector<std::string> descriptionFaults(const Value& description) {
     Check check;
     if (description.dictionary())
-        check.checkObject(description, root, "");
+        check.checkObject(description, "", "");
     return check.take();
 }
