@@ -23,24 +23,20 @@ bool refuse(std::optional<Error>* error, std::int64_t code, std::string text) {
 
 // Posts to an endpoint of the server; the body of a 2xx answer goes to *answer.
 bool post(const std::string& server, std::string_view endpoint, const Value& proxyDescription, std::string_view body,
-          Value::Data* answer, std::optional<Error>* error) try {
-    const http::Url url = http::Url(server).under(endpoint);
-    http::Answer answered = http::Client().exchange({
-        .method = "POST",
-        .url = url.text(),
-        .limits = limits,
-        .maximumAnswer = maximumAnswer,
-        .proxy = http::proxyFor(url.scheme(), proxyDescription),
-        .body = std::span(reinterpret_cast<const std::uint8_t*>(body.data()), body.size()),
-    });
+          Value::Data* answer, std::optional<Error>* error) {
+    http::Request request{.method = "POST", .limits = limits, .maximumAnswer = maximumAnswer};
+    request.body = std::span(reinterpret_cast<const std::uint8_t*>(body.data()), body.size());
+    http::Answer answered{.failure = http::aim(request, server, endpoint, proxyDescription)};
+    if (!answered.failure)
+        answered = http::Client().exchange(request);
+    if (answered.failure)
+        return refuse(error, static_cast<std::int64_t>(answered.failure->code), std::move(answered.failure->reason));
     if (!answered.isSuccess())
         return refuse(error, std::int64_t{answered.status},
-                      format("POST %s was answered with HTTP status %d", url.path(), answered.status));
+                      format("POST %s was answered with HTTP status %d", http::pathOf(request.url), answered.status));
     if (answer)
         *answer = std::move(answered.body);
     return true;
-} catch (const http::Failure& failure) {
-    return refuse(error, static_cast<std::int64_t>(failure.code()), failure.what());
 }
 
 } // namespace

@@ -1,12 +1,10 @@
 #include "platform/linux/services/http/Http.h"
 
 #include <algorithm>
-#include <charconv>
 #include <mutex>
 #include <new>
 #include <optional>
 #include <string_view>
-#include <system_error>
 #include <utility>
 
 #include <openssl/ssl.h>
@@ -17,6 +15,7 @@
 #include "platform/Crypto.h"
 #include "platform/Format.h"
 #include "platform/Hexadecimal.h"
+#include "platform/ShownText.h"
 #include "platform/Utf8.h"
 #include "platform/linux/system/OpenSSL.h"
 
@@ -44,9 +43,8 @@ constexpr CURLcode transientFailures[] = {
     CURLE_HTTP2_STREAM,
 };
 
-void check(CURLcode result) {
-    if (result != CURLE_OK)
-        throw Failure(result, curl_easy_strerror(result));
+Failure failure(CURLcode code, const std::string& reason) {
+    return {code, withoutUserInfo(reason)};
 }
 
 // An answer while it comes in.
@@ -56,13 +54,10 @@ struct Incoming {
     Answer answer{};
     std::size_t headers = 0;
     bool isTooLarge = false;
-    bool hasTooManyHeaders = false;
-    bool hasMarkedEnd = false; // a length, or chunks of which the last one says so
-    bool isEncoded = false;
     bool isCut = false; // the rest of a refusal is of no interest
 };
 
-// libcurl calls these two through C, which no exception may cross.
+// libcurl calls this through C, which no exception may cross.
 std::size_t receive(char* bytes, std::size_t, std::size_t count, void* context) try {
     auto& incoming = *static_cast<Incoming*>(context);
     Answer& answer = incoming.answer;
@@ -86,55 +81,37 @@ std::size_t receive(char* bytes, std::size_t, std::size_t count, void* context) 
     return 0;
 }
 
-bool beginsWith(std::string_view text, std::string_view prefix) {
-    return text.size() >= prefix.size() && curl_strnequal(text.data(), prefix.data(), prefix.size()) != 0;
+std::size_t countHeader(char*, std::size_t, std::size_t count, void* context) {
+    std::size_t& headers = static_cast<Incoming*>(context)->headers;
+    headers += count;
+    return headers > maximumHeaders ? 0 : count;
 }
 
-std::string_view trimmed(std::string_view text) {
-    const std::size_t first = text.find_first_not_of(" \t\r\n");
-    return first == text.npos ? "" : text.substr(first, text.find_last_not_of(" \t\r\n") - first + 1);
+// The last header with this name of the answer that counts, without blanks around it.
+std::optional<std::string_view> headerOf(CURL* handle, const char* name) {
+    curl_header* header = nullptr;
+    if (curl_easy_header(handle, name, 0, CURLH_HEADER, -1, &header) != CURLHE_OK ||
+        curl_easy_header(handle, name, header->amount - 1, CURLH_HEADER, -1, &header) != CURLHE_OK)
+        return std::nullopt;
+    return header->value;
 }
 
-// The value of a header when it is the one with this name, which ends in a colon.
-std::optional<std::string_view> valueOf(std::string_view header, std::string_view name) {
-    return beginsWith(header, name) ? std::optional(trimmed(header.substr(name.size()))) : std::nullopt;
-}
-
-// Whether the header says where the body ends, to libcurl too: with a length that it can represent, or with chunked as
-// the last transfer coding (RFC 9112 6.3).
-bool marksEnd(std::string_view header) {
+// Whether the answer says where its body ends, to libcurl too: with a length that it can represent, with chunked as the
+// last transfer coding (RFC 9112 6.3), or by HTTP/2.
+bool hasMarkedEnd(CURL* handle) {
     constexpr std::string_view chunked = "chunked";
-    if (const auto length = valueOf(header, "content-length:")) {
-        curl_off_t octets = 0;
-        return std::from_chars(length->data(), length->data() + length->size(), octets).ec == std::errc();
-    }
-    const auto coding = valueOf(header, "transfer-encoding:");
-    return coding && coding->size() >= chunked.size() &&
-           beginsWith(coding->substr(coding->size() - chunked.size()), chunked);
+    long version = 0;
+    curl_off_t length = -1;
+    curl_easy_getinfo(handle, CURLINFO_HTTP_VERSION, &version);
+    curl_easy_getinfo(handle, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
+    const std::string_view coding = headerOf(handle, "Transfer-Encoding").value_or("");
+    return version >= CURL_HTTP_VERSION_2 || length >= 0 ||
+           (coding.size() >= chunked.size() &&
+            curl_strequal(coding.substr(coding.size() - chunked.size()).data(), chunked.data()) != 0);
 }
 
 bool isTag(std::string_view text) {
-    return text.size() <= longestTag &&
-           std::all_of(text.begin(), text.end(), [](char c) { return c > ' ' && c < '\x7F'; });
-}
-
-std::size_t receiveHeader(char* bytes, std::size_t, std::size_t count, void* context) try {
-    auto& incoming = *static_cast<Incoming*>(context);
-    const std::string_view header(bytes, count);
-    // The headers of a proxy's answer to CONNECT and of an interim answer come in here before those that count.
-    if (beginsWith(header, "HTTP/")) {
-        incoming.hasMarkedEnd = incoming.isEncoded = false;
-        incoming.answer.tag.clear();
-    }
-    incoming.hasMarkedEnd |= marksEnd(header);
-    incoming.isEncoded |= valueOf(header, "content-encoding:").has_value();
-    if (const auto tag = valueOf(header, "etag:"); tag && isTag(*tag))
-        incoming.answer.tag = *tag;
-    incoming.headers += count;
-    incoming.hasTooManyHeaders = incoming.headers > maximumHeaders;
-    return incoming.hasTooManyHeaders ? 0 : count;
-} catch (const std::bad_alloc&) {
-    return 0;
+    return text.size() <= longestTag && std::ranges::all_of(text, [](char c) { return c > ' ' && c < '\x7F'; });
 }
 
 bool namesHosts(const X509* certificate) {
@@ -161,6 +138,24 @@ CURLcode prepareTls(CURL*, void* context, void*) {
     return CURLE_OK;
 }
 
+using Url = std::unique_ptr<CURLU, decltype(&curl_url_cleanup)>;
+
+// Null for what is no well-formed absolute URL.
+Url parse(const std::string& text) {
+    Url url(curl_url(), curl_url_cleanup);
+    if (text.find('\0') != std::string::npos ||
+        curl_url_set(url.get(), CURLUPART_URL, text.c_str(), CURLU_NON_SUPPORT_SCHEME) != CURLUE_OK)
+        url.reset();
+    return url;
+}
+
+std::string partOf(const std::string& url, CURLUPart which) {
+    char* part = nullptr;
+    curl_url_get(parse(url).get(), which, &part, 0);
+    const std::unique_ptr<char, decltype(&curl_free)> owner(part, curl_free);
+    return part ? part : "";
+}
+
 // A connection is not for programs that are started meanwhile.
 curl_socket_t openSocket(void*, curlsocktype, curl_sockaddr* address) {
     return ::socket(address->family, address->socktype | SOCK_CLOEXEC, address->protocol);
@@ -178,48 +173,39 @@ void prepare() {
 }
 
 bool Failure::isTransient() const {
-    return std::find(std::begin(transientFailures), std::end(transientFailures), code_) != std::end(transientFailures);
+    return std::ranges::find(transientFailures, code) != std::end(transientFailures);
 }
 
-Url::Url(std::string text) : text_(std::move(text)), url_(curl_url()) {
-    if (!url_ || text_.find('\0') != std::string::npos ||
-        curl_url_set(url_.get(), CURLUPART_URL, text_.c_str(), CURLU_NON_SUPPORT_SCHEME) != CURLUE_OK)
-        check(CURLE_URL_MALFORMAT);
-}
-
-Url Url::under(std::string_view path) const {
-    const std::size_t end = std::min(text_.find_first_of("?#"), text_.size());
-    std::string longer = text_.substr(0, end);
-    while (!path.empty() && longer.ends_with('/'))
-        longer.pop_back();
-    return Url(longer.append(path).append(text_, end));
-}
-
-std::string Url::part(CURLUPart which) const {
-    char* text = nullptr;
-    if (curl_url_get(url_.get(), which, &text, 0) != CURLUE_OK)
-        return {};
-    const std::unique_ptr<char, decltype(&curl_free)> owner(text, curl_free);
-    return text;
-}
-
-std::string proxyFor(const std::string& scheme, const Value& description) {
-    const std::string prefix = scheme == "https" ? "HTTPS" : "HTTP";
-    if (!description[prefix + "Enable"].boolean().value_or(false))
-        return "";
-    const std::string* host = description[prefix + "Proxy"].text();
-    const auto port = description[prefix + "Port"].integer();
+std::optional<Failure> aim(Request& request, const std::string& server, std::string_view path, const Value& proxies) {
+    const std::size_t end = std::min(server.find_first_of("?#"), server.size());
+    // As given: libcurl would change the case of what is percent-encoded, which a signature covers.
+    std::string url = server.substr(0, end);
+    while (!path.empty() && url.ends_with('/'))
+        url.pop_back();
+    url.append(path).append(server, end);
+    if (!parse(server) || !parse(url))
+        return failure(CURLE_URL_MALFORMAT, curl_easy_strerror(CURLE_URL_MALFORMAT));
+    request.url = std::move(url);
+    const std::string prefix = partOf(request.url, CURLUPART_SCHEME) == "https" ? "HTTPS" : "HTTP";
+    request.proxy.clear();
+    if (!proxies[prefix + "Enable"].boolean().value_or(false))
+        return std::nullopt;
+    const std::string* host = proxies[prefix + "Proxy"].text();
+    const auto port = proxies[prefix + "Port"].integer();
     if (!host || host->empty() || host->find('@') != std::string::npos || !port || *port < 1 || *port > 65535)
-        throw Failure(CURLE_COULDNT_RESOLVE_PROXY, "The proxy description names no host and port");
+        return failure(CURLE_COULDNT_RESOLVE_PROXY, "The proxy description names no host and port");
     const bool bare = host->find(':') != std::string::npos && !host->starts_with('['); // an IPv6 address
-    return "http://" + (bare ? "[" + *host + "]" : *host) + ":" + std::to_string(*port);
+    request.proxy = "http://" + (bare ? "[" + *host + "]" : *host) + ":" + std::to_string(*port);
+    return std::nullopt;
+}
+
+std::string pathOf(const std::string& url) {
+    return partOf(url, CURLUPART_PATH);
 }
 
 Client::Client() {
     prepare();
     handle_.reset(curl_easy_init());
-    if (!handle_)
-        check(CURLE_FAILED_INIT);
 }
 
 void Client::connectTo(const std::vector<std::string>& entries) {
@@ -229,46 +215,52 @@ void Client::connectTo(const std::vector<std::string>& entries) {
 }
 
 Answer Client::exchange(const Request& request) {
+    if (!handle_)
+        throw std::bad_alloc();
     // What was set for the exchange before is forgotten; connections, host names and TLS sessions are not.
     curl_easy_reset(handle_.get());
     headers_.reset();
     problem_[0] = '\0';
+    result_ = CURLE_OK;
     configure(request);
     Incoming incoming{.handle = handle_.get(), .maximum = request.maximumAnswer};
     set(CURLOPT_WRITEFUNCTION, receive);
     set(CURLOPT_WRITEDATA, &incoming);
-    set(CURLOPT_HEADERFUNCTION, receiveHeader);
+    set(CURLOPT_HEADERFUNCTION, countHeader);
     set(CURLOPT_HEADERDATA, &incoming);
-    const CURLcode result = curl_easy_perform(handle_.get());
+    if (result_ == CURLE_OK)
+        result_ = curl_easy_perform(handle_.get());
     if (incoming.isTooLarge)
-        throw Failure(result, format("The answer is larger than %lu bytes", request.maximumAnswer));
-    if (incoming.hasTooManyHeaders)
-        throw Failure(result, "The answer has too many headers");
-    if (result != CURLE_OK && !incoming.isCut)
-        throw Failure(result, utf8::repaired(*problem_ ? problem_ : curl_easy_strerror(result)));
-    check(curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &incoming.answer.status));
-    long version = 0;
-    check(curl_easy_getinfo(handle_.get(), CURLINFO_HTTP_VERSION, &version));
-    if (!incoming.answer.isSuccess() || request.method == head)
-        return std::move(incoming.answer);
-    if (request.endMustBeMarked && version < CURL_HTTP_VERSION_2 && !incoming.hasMarkedEnd)
-        throw Failure(CURLE_WEIRD_SERVER_REPLY, "The answer does not say where it ends");
-    if (incoming.isEncoded)
-        throw Failure(CURLE_BAD_CONTENT_ENCODING, "The answer has a Content-Encoding");
-    return std::move(incoming.answer);
+        return {failure(result_, format("The answer is larger than %lu bytes", request.maximumAnswer))};
+    if (incoming.headers > maximumHeaders)
+        return {failure(result_, "The answer has too many headers")};
+    if (result_ != CURLE_OK && !incoming.isCut)
+        return {failure(result_, utf8::repaired(*problem_ ? problem_ : curl_easy_strerror(result_)))};
+    Answer answer = std::move(incoming.answer);
+    curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &answer.status);
+    if (const auto tag = headerOf(handle_.get(), "ETag"); tag && isTag(*tag))
+        answer.tag = *tag;
+    if (!answer.isSuccess() || request.method == head)
+        return answer;
+    if (request.endMustBeMarked && !hasMarkedEnd(handle_.get()))
+        return {failure(CURLE_WEIRD_SERVER_REPLY, "The answer does not say where it ends")};
+    if (headerOf(handle_.get(), "Content-Encoding"))
+        return {failure(CURLE_BAD_CONTENT_ENCODING, "The answer has a Content-Encoding")};
+    return answer;
 }
 
 void Client::append(List& list, const std::string& text) {
     curl_slist* longer = curl_slist_append(list.get(), text.c_str());
     if (!longer)
-        check(CURLE_OUT_OF_MEMORY);
+        throw std::bad_alloc();
     static_cast<void>(list.release()); // it is the head of the longer one
     list.reset(longer);
 }
 
 template <class Setting>
 void Client::set(CURLoption option, Setting setting) {
-    check(curl_easy_setopt(handle_.get(), option, setting));
+    if (result_ == CURLE_OK)
+        result_ = curl_easy_setopt(handle_.get(), option, setting);
 }
 
 void Client::configure(const Request& request) {
@@ -325,7 +317,7 @@ void Client::sign(const Request& request) {
     std::uint8_t digest[crypto::sha256Size];
     const std::span<const std::uint8_t> body = request.body.value_or(std::span<const std::uint8_t>());
     if (!crypto::sha256(body.data(), body.size(), digest))
-        check(CURLE_OUT_OF_MEMORY);
+        throw std::bad_alloc();
     append(headers_, "x-amz-content-sha256: " + hexadecimal(digest));
     set(CURLOPT_AWS_SIGV4, ("aws:amz:" + signature.region + ":s3").c_str());
     set(CURLOPT_USERNAME, signature.accessKey.c_str());

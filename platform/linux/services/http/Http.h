@@ -11,14 +11,12 @@
 #include <memory>
 #include <optional>
 #include <span>
-#include <stdexcept>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include <curl/curl.h>
 
-#include "platform/ShownText.h"
 #include "platform/Value.h"
 
 namespace http {
@@ -27,52 +25,20 @@ namespace http {
 // start what those do when memory ends in their first use.
 void prepare();
 
-// An exchange that had no answer. The code is libcurl's, the text says what went wrong, without user and password of a
+// Why an exchange had no answer. The code is libcurl's, the reason says what went wrong, without user and password of a
 // URL.
-class Failure : public std::runtime_error {
-public:
-    Failure(CURLcode code, const std::string& reason) : std::runtime_error(withoutUserInfo(reason)), code_(code) {}
-    CURLcode code() const { return code_; }
+struct Failure {
+    CURLcode code;
+    std::string reason;
 
     // Whether the same request may succeed at another time: the network failed, or the server did, but neither the
     // request nor the server's identity was at fault.
     bool isTransient() const;
-
-private:
-    CURLcode code_;
 };
-
-// A well-formed absolute URL.
-class Url {
-public:
-    // Raises Failure for any other text.
-    explicit Url(std::string text);
-
-    // The URL with `path`, which begins with a slash and is percent-encoded where it has to be, at the end of its own.
-    Url under(std::string_view path) const;
-
-    const std::string& text() const { return text_; }
-    std::string scheme() const { return part(CURLUPART_SCHEME); }
-    std::string user() const { return part(CURLUPART_USER); }
-    std::string path() const { return part(CURLUPART_PATH); }
-
-private:
-    struct Release {
-        void operator()(CURLU* url) const { curl_url_cleanup(url); }
-    };
-    std::string part(CURLUPart which) const;
-
-    std::string text_; // as given: libcurl would change the case of what is percent-encoded, which a signature covers
-    std::unique_ptr<CURLU, Release> url_;
-};
-
-// The URL of the proxy that a proxy description (RPCopyProxyDictionaryWithOptions) has for `scheme`, empty for none.
-// Raises Failure when it enables one that it does not name.
-std::string proxyFor(const std::string& scheme, const Value& description);
 
 // How long an exchange may take.
 struct Limits {
-    std::chrono::milliseconds timeout;
+    std::chrono::milliseconds timeout{};
     std::chrono::milliseconds connectTimeout = timeout;
     std::chrono::seconds idleTimeout = {}; // without a byte in either direction; 0 is as long as the whole
 };
@@ -86,10 +52,10 @@ struct Signature {
 
 struct Request {
     std::string method;
-    std::string url;
-    Limits limits;
-    std::size_t maximumAnswer; // octets in the body of an answer with status 2xx
-    std::string proxy = {};    // a URL, empty for none
+    std::string url = {};
+    Limits limits = {};
+    std::size_t maximumAnswer = 0; // octets in the body of an answer with status 2xx
+    std::string proxy = {};        // a URL, empty for none
     // "Name: value", without line break; one without a value would be signed but not sent
     std::vector<std::string> headers = {};
     // What is sent as application/octet-stream; the octets have to outlive the exchange.
@@ -99,10 +65,20 @@ struct Request {
     bool endMustBeMarked = false;
 };
 
+// Aims `request` at the well-formed absolute URL `server` with `path` at the end of the URL's own, which begins with a
+// slash and is percent-encoded where it has to be, through the proxy that the description `proxies`
+// (RPCopyProxyDictionaryWithOptions) has for it. Fails for any other URL, and for a proxy that is enabled but not
+// named.
+std::optional<Failure> aim(Request& request, const std::string& server, std::string_view path, const Value& proxies);
+
+// The path of a well-formed URL.
+std::string pathOf(const std::string& url);
+
 struct Answer {
-    long status;
-    Value::Data body; // of a status other than 2xx its beginning at most
-    std::string tag;  // the header ETag; empty for none, or one with blanks or of more than 256 octets
+    std::optional<Failure> failure = {}; // instead of all the rest
+    long status = 0;
+    Value::Data body = {}; // of a status other than 2xx its beginning at most
+    std::string tag = {};  // the header ETag; empty for none, or one with blanks or of more than 256 octets
 
     bool isSuccess() const { return status >= 200 && status <= 299; }
 };
@@ -110,7 +86,6 @@ struct Answer {
 // Keeps the connections that it made for the exchanges after. Serves one thread at a time.
 class Client {
 public:
-    // Raises Failure, as exchange does.
     Client();
 
     // Trusts the authorities of these PEM certificates beside those of the system.
@@ -119,6 +94,7 @@ public:
     // Connects elsewhere: each entry is "HOST:PORT:CONNECT-TO-HOST:CONNECT-TO-PORT".
     void connectTo(const std::vector<std::string>& entries);
 
+    // Raises only std::bad_alloc.
     Answer exchange(const Request& request);
 
 private:
@@ -139,6 +115,7 @@ private:
     std::string authorities_;
     List connectTo_; // before the handle, which refers to it
     List headers_;
+    CURLcode result_ = CURLE_OK;
     char problem_[CURL_ERROR_SIZE] = "";
     std::unique_ptr<CURL, Release> handle_;
 };

@@ -267,7 +267,7 @@ private:
         };
         http::Answer found = send("HEAD", "");
         for (milliseconds backoff{0};; backoff = nextBackoff(backoff)) {
-            if (found.status >= 500)
+            if (found.failure || found.status >= 500)
                 return found;
             if (found.status != 200 && found.status != 404)
                 failWith(request, found);
@@ -278,6 +278,8 @@ private:
                 return answer;
             std::this_thread::sleep_for(backoff);
             http::Answer now = send("HEAD", "");
+            if (now.failure)
+                return now;
             if (now.status == found.status && now.tag == found.tag) {
                 // Nobody has changed it, so that the store did not understand the tag, unless it was only busy (409).
                 if (answer.status == 412 && now.status == 200)
@@ -297,7 +299,7 @@ private:
     }
 
     Value::Data fetchTrustObject(const OrloOptions& options, const std::string& server, std::string_view path) {
-        http::Request request = {.method = "GET", .url = {}, .limits = {}, .maximumAnswer = largestTrustObject};
+        http::Request request = {.method = "GET", .maximumAnswer = largestTrustObject};
         request.endMustBeMarked = true;
         http::Answer answer = exchange(options, server, path, request, attemptsOfOne);
         if (answer.status != 200)
@@ -320,8 +322,6 @@ private:
     http::Request dataStoreRequest(const char* method, const OrloOptions& options) const {
         return {
             .method = method,
-            .url = {},
-            .limits = {},
             .maximumAnswer = largestReply,
             .headers = headersFor(options),
             .signature = settings_.objectStore ? &settings_.objectStore->signature : nullptr,
@@ -359,14 +359,16 @@ private:
         return *url;
     }
 
-    // The proxy for `url` as the session's options want it; the description of proxies is asked for once.
-    std::string proxyFor(const OrloOptions& options, const http::Url& url) {
-        const bool isWanted = options["EnableProxy"].boolean().value_or(false);
-        if (!isWanted || (url.scheme() == "https" && options["EnableProxySsl"] != Value("ForHttps")))
+    // The description of the proxies that the session's options want; it is asked for once.
+    Value proxiesFor(const OrloOptions& options, const std::string& server) {
+        if (!options["EnableProxy"].boolean().value_or(false))
             return {};
         if (!proxies_)
-            proxies_ = RPCopyProxyDictionaryWithOptions(url.text(), Value::Dictionary{{"TestReachability", false}});
-        return http::proxyFor(url.scheme(), *proxies_);
+            proxies_ = RPCopyProxyDictionaryWithOptions(server, Value::Dictionary{{"TestReachability", false}});
+        Value wanted = *proxies_;
+        if (wanted.dictionary() && options["EnableProxySsl"] != Value("ForHttps"))
+            wanted.dictionary()->erase("HTTPSEnable");
+        return wanted;
     }
 
     // Sends the request, whose URL becomes that of `path` on `server`, as often as it may be and as is of use.
@@ -375,33 +377,26 @@ private:
         if (server.find('@') != server.npos)
             throw OrloStoreFailure(QDOrloErrorTransport, "A server's URL has to do without user and password");
         request.url = server + std::string(path);
-        try {
-            const http::Url url = http::Url(server).under(path);
-            request.url = url.text();
-            request.proxy = proxyFor(options, url);
-            request.limits = {.timeout = std::chrono::seconds(timeoutSeconds.in(options))};
-            const http::Request whole = request;
-            milliseconds backoff = firstBackoff;
-            for (std::int64_t left = attempts.in(options); left > 1; --left, backoff = nextBackoff(backoff)) {
-                if (std::optional<http::Answer> answer = attempt(request, send))
-                    return std::move(*answer);
-                std::this_thread::sleep_for(backoff);
-                request = whole;
-            }
-            return (this->*send)(request);
-        } catch (const http::Failure& failure) {
-            failToTransport(request, failure.what());
+        if (const auto failure = http::aim(request, server, path, proxiesFor(options, server)))
+            failToTransport(request, failure->reason);
+        request.limits = {.timeout = std::chrono::seconds(timeoutSeconds.in(options))};
+        const http::Request whole = request;
+        http::Answer answer = (this->*send)(request);
+        milliseconds backoff = firstBackoff;
+        for (std::int64_t left = attempts.in(options); left > 1 && mayPass(answer); --left) {
+            std::this_thread::sleep_for(backoff);
+            backoff = nextBackoff(backoff);
+            request = whole;
+            answer = (this->*send)(request);
         }
+        if (answer.failure)
+            failToTransport(request, answer.failure->reason);
+        return answer;
     }
 
-    // The answer, or none when another attempt may bring a better one.
-    std::optional<http::Answer> attempt(http::Request& request, Send send) try {
-        http::Answer answer = (this->*send)(request);
-        return answer.status < 500 ? std::optional(std::move(answer)) : std::nullopt;
-    } catch (const http::Failure& failure) {
-        if (!failure.isTransient())
-            throw;
-        return std::nullopt;
+    // Whether another attempt may bring a better answer.
+    static bool mayPass(const http::Answer& answer) {
+        return answer.failure ? answer.failure->isTransient() : answer.status >= 500;
     }
 
     OrloRemoteSettings settings_;
@@ -412,8 +407,6 @@ private:
 
 } // namespace
 
-std::unique_ptr<OrloStoreBackend> openRemoteStore(const Value& store) try {
+std::unique_ptr<OrloStoreBackend> openRemoteStore(const Value& store) {
     return std::make_unique<RemoteStore>(readRemoteSettings(store));
-} catch (const http::Failure& failure) {
-    throw OrloStoreFailure(QDOrloErrorTransport, failure.what());
 }
