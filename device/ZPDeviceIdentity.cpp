@@ -30,17 +30,10 @@ enum class Result {
 struct Identity {
     ComponentIdentity identity;
     Value (*service)(std::string_view key);
-    const std::string_view& key; // the opaque keys are constants of another file, so they are read when they are used
+    std::string_view key;
     Result result;
     const char* identifier; // as the line about a missing identity names it
 };
-
-constexpr std::string_view proxKey = "ProxSerialNumber";
-constexpr std::string_view backglassCompassKey = "BackglassCompassSerialNumber";
-constexpr std::string_view screenKey = "ScreenSerialNumber";
-constexpr std::string_view vanterKey = "VanterSerialNumber";
-constexpr std::string_view topModuleKey = "TopModuleAuthChipID";
-constexpr std::string_view hardwareModelKey = "HWModelStr";
 
 using enum ComponentIdentity;
 constexpr Identity identities[] = {
@@ -48,17 +41,17 @@ constexpr Identity identities[] = {
     {CoverGlassSerialNumber, answer, CoverGlassSNKey, Result::Answer, "CoverGlass SN"},
     {AmbientLightSensorSerialNumber, answer, ALSSNKey, Result::Answer, "ALS SN"},
     {FrontCameraModuleSerialNumber, answer, FCAMModuleSNKey, Result::Answer, "FCAMModule SN"},
-    {ProximitySensorSerialNumber, tansuValue, proxKey, Result::Answer, "Prox Serial Number"},
-    {BackglassCompassSerialNumber, tansuValue, backglassCompassKey, Result::Answer, "BG Serial Number"},
-    {ScreenSerialNumber, answer, screenKey, Result::Answer, "Screen Serial Number"},
-    {VanterSerialNumber, answer, vanterKey, Result::InstanceString, "Vanter Serial Number"},
+    {ProximitySensorSerialNumber, tansuValue, "ProxSerialNumber", Result::Answer, "Prox Serial Number"},
+    {BackglassCompassSerialNumber, tansuValue, "BackglassCompassSerialNumber", Result::Answer, "BG Serial Number"},
+    {ScreenSerialNumber, answer, "ScreenSerialNumber", Result::Answer, "Screen Serial Number"},
+    {VanterSerialNumber, answer, "VanterSerialNumber", Result::InstanceString, "Vanter Serial Number"},
     {VanterChipID, answer, VanterChipIDKey, Result::InstanceString, "Vanter Chip id"},
     {VanterUID, answer, VanterUIDKey, Result::InstanceString, "Vanter UID"},
     {LoddenChipID, answer, LoddenChipIDKey, Result::InstanceString, "Lodden Chip id"},
     {LoddenUID, answer, LoddenUIDKey, Result::InstanceString, "Lodden UID"},
-    {TopModuleChipID, answer, topModuleKey, Result::InstanceStringIfAnswered, "topModuleChipID"},
+    {TopModuleChipID, answer, "TopModuleAuthChipID", Result::InstanceStringIfAnswered, "topModuleChipID"},
 };
-constexpr Identity hardwareModel{None, answerWithError, hardwareModelKey, Result::Answer, "HWModelStr"};
+constexpr Identity hardwareModel{None, answerWithError, "HWModelStr", Result::Answer, "HWModelStr"};
 
 Value read(const Identity& identity) {
     Value value = identity.service(identity.key);

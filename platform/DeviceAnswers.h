@@ -14,14 +14,14 @@
 
 // Opaque names of properties, as the device-answer service knows them: 22 characters of the base64 alphabet each. The
 // plug-in passes them on without reading them.
-extern const std::string_view MiravelSNKey;
-extern const std::string_view CoverGlassSNKey;
-extern const std::string_view ALSSNKey;
-extern const std::string_view FCAMModuleSNKey;
-extern const std::string_view VanterChipIDKey;
-extern const std::string_view VanterUIDKey;
-extern const std::string_view LoddenChipIDKey;
-extern const std::string_view LoddenUIDKey;
+inline constexpr std::string_view MiravelSNKey = "JlvBpIcyjzTcAplFQmGACg";
+inline constexpr std::string_view CoverGlassSNKey = "OhrmT+BS3mZKIKMk7BiWGg";
+inline constexpr std::string_view ALSSNKey = "xoNDTxUzjD2nhkaZSU365A";
+inline constexpr std::string_view FCAMModuleSNKey = "DWg23KH4RuU3qPfUd3q3qQ";
+inline constexpr std::string_view VanterChipIDKey = "4IRKeFl4kQazKfrPLqk3lw";
+inline constexpr std::string_view VanterUIDKey = "6sG7woifsZ4/lwoin2RMOQ";
+inline constexpr std::string_view LoddenChipIDKey = "/UmQZN9m7xv9ltmu0KoELA";
+inline constexpr std::string_view LoddenUIDKey = "wIE+IdqFckii+RoMBTR2Hw";
 
 // The device-answer service's answer for `key`: text, number or data, depending on the key, or nothing when the device
 // has no such property. `options` is always nothing.

@@ -4,15 +4,6 @@
 
 #include "platform/linux/services/device/DeviceDescription.h"
 
-constexpr std::string_view MiravelSNKey = "JlvBpIcyjzTcAplFQmGACg";
-constexpr std::string_view CoverGlassSNKey = "OhrmT+BS3mZKIKMk7BiWGg";
-constexpr std::string_view ALSSNKey = "xoNDTxUzjD2nhkaZSU365A";
-constexpr std::string_view FCAMModuleSNKey = "DWg23KH4RuU3qPfUd3q3qQ";
-constexpr std::string_view VanterChipIDKey = "4IRKeFl4kQazKfrPLqk3lw";
-constexpr std::string_view VanterUIDKey = "6sG7woifsZ4/lwoin2RMOQ";
-constexpr std::string_view LoddenChipIDKey = "/UmQZN9m7xv9ltmu0KoELA";
-constexpr std::string_view LoddenUIDKey = "wIE+IdqFckii+RoMBTR2Hw";
-
 namespace {
 
 // The opaque names and the readable ones under which the device description has their answers.
