@@ -11,4 +11,8 @@
 // document names is fetched.
 std::optional<Value> propertyListToValue(const Value::Data& xml);
 
+// The plug-in bundle's information list: the property list Info.plist beside the executable, read at every call.
+// Nothing when it is missing or malformed.
+Value bundleInformationList();
+
 #endif

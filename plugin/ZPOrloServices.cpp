@@ -7,9 +7,9 @@
 #include <utility>
 
 #include "Daemon/Common/HSPipeUtil.h"
-#include "platform/BundleInfo.h"
 #include "platform/DeviceAnswers.h"
 #include "platform/Format.h"
+#include "platform/PropertyList.h"
 #include "plugin/Commands.h"
 
 namespace {

@@ -4,8 +4,6 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/BundleInfo.h"
-
 namespace {
 
 using Data = Value::Data;

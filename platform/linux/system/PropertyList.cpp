@@ -2,12 +2,15 @@
 
 #include <charconv>
 #include <cstring>
-#include <string>
+#include <filesystem>
 #include <string_view>
+#include <system_error>
 
+#include <fcntl.h>
 #include <pugixml.hpp>
 
 #include "platform/Base64.h"
+#include "platform/DeviceRoot.h"
 #include "platform/Utf8.h"
 
 namespace {
@@ -43,10 +46,6 @@ Result array(const pugi::xml_node& node, unsigned nesting) {
     return elements;
 }
 
-Result text(const pugi::xml_node& node, unsigned) {
-    return Value(node.child_value());
-}
-
 Result integer(const pugi::xml_node& node, unsigned) {
     const std::string_view digits = node.child_value();
     std::int64_t number = 0;
@@ -61,24 +60,19 @@ Result data(const pugi::xml_node& node, unsigned) {
     return bytes ? Result(std::move(*bytes)) : std::nullopt;
 }
 
-Result yes(const pugi::xml_node&, unsigned) {
-    return true;
-}
-
-Result no(const pugi::xml_node&, unsigned) {
-    return false;
-}
-
-Result nothing(const pugi::xml_node&, unsigned) {
-    return Value();
-}
-
 constexpr struct {
     const char* name;
     Result (*read)(const pugi::xml_node&, unsigned nesting);
 } kinds[] = {
-    {"dict", dictionary}, {"array", array}, {"string", text},  {"integer", integer}, {"data", data},
-    {"true", yes},        {"false", no},    {"real", nothing}, {"date", nothing},
+    {"dict", dictionary},
+    {"array", array},
+    {"string", [](const pugi::xml_node& node, unsigned) { return Result(node.child_value()); }},
+    {"integer", integer},
+    {"data", data},
+    {"true", [](const pugi::xml_node&, unsigned) { return Result(true); }},
+    {"false", [](const pugi::xml_node&, unsigned) { return Result(false); }},
+    {"real", [](const pugi::xml_node&, unsigned) { return Result(Value()); }},
+    {"date", [](const pugi::xml_node&, unsigned) { return Result(Value()); }},
 };
 
 Result element(const pugi::xml_node& node, unsigned nesting) {
@@ -102,4 +96,17 @@ std::optional<Value> propertyListToValue(const Value::Data& xml) {
         return std::nullopt;
     const pugi::xml_node root = document.child("plist").first_child();
     return root && !root.next_sibling() ? element(root, 0) : std::nullopt;
+}
+
+Value bundleInformationList() {
+    constexpr std::size_t maximumSize = std::size_t{1} << 20;
+    std::error_code error;
+    const std::filesystem::path executable = std::filesystem::read_symlink("/proc/self/exe", error);
+    if (error)
+        return {};
+    // The list comes with the program and not with the device, so it does not lie below the device root.
+    const std::filesystem::path list = executable.parent_path() / "Info.plist";
+    const FileDescriptor file(::open(list.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    const std::optional<Value::Data> contents = file ? readRegularFile(file, maximumSize) : std::nullopt;
+    return contents ? propertyListToValue(*contents).value_or(Value()) : Value();
 }

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "platform/Format.h"
+#include "platform/Hexadecimal.h"
 #include "platform/Utf8.h"
 #include "platform/linux/services/device/DeviceDescription.h"
 #include "platform/linux/services/store/OrloStoreBackend.h"
@@ -130,6 +131,14 @@ bool perform(const char* operation, const __QDOrlo* session, std::optional<Error
 }
 
 } // namespace
+
+std::string ticketDigestOf(const OrloOptions& options) {
+    const Value::Data& ticket = *options["APTicket"].data();
+    std::uint8_t digest[crypto::sha256Size];
+    if (!crypto::sha256(ticket.data(), ticket.size(), digest))
+        throw OrloStoreFailure(QDOrloErrorStorage, "The AP ticket cannot be digested");
+    return hexadecimal(digest);
+}
 
 void QDOrloLogSetHandler(QDOrloLogHandler handler) {
     logHandler = handler;

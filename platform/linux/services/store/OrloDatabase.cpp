@@ -103,26 +103,30 @@ const char* fileAccess() {
     return registered == SQLITE_OK ? access.zName : nullptr;
 }
 
-[[noreturn]] void failWithErrno(const char* what) {
-    throw OrloStoreFailure(QDOrloErrorStorage, std::string(what) + ": " + std::strerror(errno));
-}
-
 // SQLite would give a new file the mode that the umask leaves of 0644.
 void makeFile(const FileDescriptor& directory, const std::string& name) {
     struct stat status;
-    if (::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0) {
-        if (!S_ISREG(status.st_mode))
-            throw OrloStoreFailure(QDOrloErrorStorage, "The store is no regular file");
-        return;
+    if (::fstatat(directory.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+        if (errno != ENOENT)
+            failWithErrno("The store cannot be opened");
+        makeStoreFile(directory, name, {}, "The store cannot be made");
+    } else if (!S_ISREG(status.st_mode)) {
+        throw OrloStoreFailure(QDOrloErrorStorage, "The store is no regular file");
     }
-    if (errno != ENOENT)
-        failWithErrno("The store cannot be opened");
-    NewFile file(directory);
-    if (!file || !file.fill({}) || (!file.placeAt(name) && errno != EEXIST))
-        failWithErrno("The store cannot be made");
 }
 
 } // namespace
+
+void failWithErrno(const std::string& what) {
+    throw OrloStoreFailure(QDOrloErrorStorage, what + ": " + std::strerror(errno));
+}
+
+void makeStoreFile(const FileDescriptor& directory, const std::string& name, std::span<const std::uint8_t> contents,
+                   const char* problem) {
+    NewFile file(directory);
+    if (!file || !file.fill(contents) || (!file.placeAt(name) && errno != EEXIST))
+        failWithErrno(problem);
+}
 
 void failWithReasonOf(sqlite3* database) {
     throw OrloStoreFailure(QDOrloErrorStorage, std::string("The store cannot be used: ") + sqlite3_errmsg(database) +

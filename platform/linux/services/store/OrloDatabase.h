@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -12,8 +13,14 @@
 #include "platform/FileDescriptor.h"
 #include "platform/Value.h"
 
-// Raises OrloStoreFailure (QDOrloErrorStorage) with SQLite's reason.
+// Raise OrloStoreFailure (QDOrloErrorStorage) with the reason in errno, and with SQLite's.
+[[noreturn]] void failWithErrno(const std::string& what);
 [[noreturn]] void failWithReasonOf(sqlite3* database);
+
+// Makes the file `name` in `directory`, with mode 0600, unless somebody else is faster. Raises OrloStoreFailure with
+// `problem` and the reason.
+void makeStoreFile(const FileDescriptor& directory, const std::string& name, std::span<const std::uint8_t> contents,
+                   const char* problem);
 
 // A prepared statement. Every operation raises OrloStoreFailure on failure.
 class OrloStatement {

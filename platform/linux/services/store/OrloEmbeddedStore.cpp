@@ -1,13 +1,14 @@
 // The embedded backend: records in an SQLite database below the device root.
 #include <cerrno>
-#include <cstring>
 #include <utility>
 
+#include <fcntl.h>
+
+#include "platform/Crypto.h"
 #include "platform/DeviceRoot.h"
 #include "platform/Format.h"
 #include "platform/linux/services/store/OrloDatabase.h"
 #include "platform/linux/services/store/OrloStoreBackend.h"
-#include "platform/linux/services/store/OrloTrustObject.h"
 
 namespace {
 
@@ -25,6 +26,34 @@ INSERT INTO exports (data_version, ticket, exported_at) VALUES (?1, ?2, strftime
 
 constexpr const char* addExportPair =
     "INSERT INTO export_pairs (export_id, position, class, instance) VALUES (?1, ?2, ?3, ?4)";
+
+[[noreturn]] void failOfTrustObject(const char* problem) {
+    throw OrloStoreFailure(QDOrloErrorStorage, std::string("The trust object ") + problem);
+}
+
+void makeTrustObject(const FileDescriptor& directory, const std::string& name) {
+    std::uint8_t contents[64];
+    if (!crypto::randomBytes(contents, sizeof contents))
+        failOfTrustObject("cannot be made: there is no randomness");
+    makeStoreFile(directory, name, contents, "The trust object cannot be made");
+}
+
+// The trust object, a file beside the database, read now. It is made when it is missing; of two services that do so at
+// once, one has its way and both see the same.
+Value::Data readTrustObject(const FileDescriptor& directory, const std::string& name) {
+    constexpr std::size_t maximumSize = std::size_t{1} << 20;
+    FileDescriptor file = openIn(directory, name, O_RDONLY);
+    if (!file && errno == ENOENT) {
+        makeTrustObject(directory, name);
+        file = openIn(directory, name, O_RDONLY);
+    }
+    if (!file && errno != ENXIO) // what is neither a file nor a link is not opened
+        failWithErrno("The trust object cannot be opened");
+    std::optional<Value::Data> contents = file ? readRegularFile(file, maximumSize) : std::nullopt;
+    if (!contents || contents->empty())
+        failOfTrustObject("is damaged: it is empty, no regular file, or larger than 1 MiB");
+    return std::move(*contents);
+}
 
 class EmbeddedStore : public OrloStoreBackend {
 public:
@@ -89,7 +118,6 @@ std::unique_ptr<OrloStoreBackend> openEmbeddedStore(const Value& store) {
         throw OrloStoreFailure(QDOrloErrorStorage, "The store's path " + path.description() + " names no file");
     FileDescriptor directory = makeDirectoryInRoot(parts->parent, 0700);
     if (!directory)
-        throw OrloStoreFailure(QDOrloErrorStorage,
-                               "The store's folder cannot be opened: " + std::string(std::strerror(errno)));
+        failWithErrno("The store's folder cannot be opened");
     return std::make_unique<EmbeddedStore>(std::move(directory), parts->name);
 }

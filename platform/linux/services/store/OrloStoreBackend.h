@@ -54,7 +54,9 @@ public:
 
 // The data version and the SHA-256 of the AP ticket, in hexadecimal, of a session's options; the library has seen to it
 // that they are there. The second raises OrloStoreFailure.
-std::int64_t dataVersionOf(const OrloOptions& options);
+inline std::int64_t dataVersionOf(const OrloOptions& options) {
+    return *options["DataVersion"].integer();
+}
 std::string ticketDigestOf(const OrloOptions& options);
 
 // A backend on the database that "path" of the description's "store" names.
