@@ -13,6 +13,7 @@
 #include <openssl/objects.h>
 #include <openssl/params.h>
 #include <openssl/rsa.h>
+#include <openssl/x509.h>
 #include <sys/random.h>
 
 #include "platform/linux/system/OpenSSL.h"
@@ -256,27 +257,24 @@ Number number(Bytes octets) noexcept {
 
 // Writes the encoded message of RFC 8017 9.2 for a digest into the `size` octets at `out`.
 bool encodeMessage(const EVP_MD* md, Bytes hash, unsigned char* out, std::size_t size) noexcept {
-    const ASN1_OBJECT* const id = OBJ_nid2obj(EVP_MD_get_type(md));
-    const std::size_t idLength = OBJ_length(id);
-    // Short-form lengths serve: no digest here, and none of their identifiers, is longer.
-    const auto octet = [](std::size_t length) { return static_cast<unsigned char>(length); };
-    const unsigned char beforeId[] = {
-        0x30, octet(8 + idLength + hash.length), 0x30, octet(4 + idLength), 0x06, octet(idLength)};
-    const unsigned char beforeHash[] = {0x05, 0x00, 0x04, octet(hash.length)};
-    const std::size_t infoLength = sizeof beforeId + idLength + sizeof beforeHash + hash.length;
-    constexpr std::size_t leastPadding = 8 + 3;
-    if (size < infoLength + leastPadding)
+    const Owner<X509_SIG, X509_SIG_free> info(X509_SIG_new());
+    X509_ALGOR* algorithm = nullptr;
+    ASN1_OCTET_STRING* octets = nullptr;
+    if (info)
+        X509_SIG_getm(info.get(), &algorithm, &octets);
+    if (!info || X509_ALGOR_set0(algorithm, OBJ_nid2obj(EVP_MD_get_type(md)), V_ASN1_NULL, nullptr) != 1 ||
+        ASN1_OCTET_STRING_set(octets, hash.data, static_cast<int>(hash.length)) != 1)
         return false;
-    unsigned char* const info = out + size - infoLength;
-    std::fill(out, info, std::uint8_t{0xFF});
+    const int length = i2d_X509_SIG(info.get(), nullptr);
+    constexpr std::size_t leastPadding = 8 + 3;
+    if (length < 0 || size < static_cast<std::size_t>(length) + leastPadding)
+        return false;
+    unsigned char* next = out + size - length;
+    std::fill(out, next, std::uint8_t{0xFF});
     out[0] = 0x00;
     out[1] = 0x01;
-    info[-1] = 0x00;
-    unsigned char* next = std::copy(std::begin(beforeId), std::end(beforeId), info);
-    next = std::copy_n(OBJ_get0_data(id), idLength, next);
-    next = std::copy(std::begin(beforeHash), std::end(beforeHash), next);
-    std::copy_n(hash.data, hash.length, next);
-    return true;
+    next[-1] = 0x00;
+    return i2d_X509_SIG(info.get(), &next) == length;
 }
 
 // RFC 8017 5.2.2 and 8.2.2 by the library's arithmetic, for keys of at most NativeNumber::capacity octets.
