@@ -159,6 +159,13 @@ TEST_F(ZPDeviceTest, aChallengeHas32BytesAndIsNeverTheSame) {
     EXPECT_NE(device_.createChallenge(), first);
 }
 
+TEST_F(ZPDeviceTest, anAnswerOfTheDisplayThatComesTooLateIsTakenForNoOther) {
+    for (const char* chip : {R"({"mode": "pass", "delayMs": 11000})", R"({"mode": "fail", "delayMs": 2000})"}) {
+        describe(R"({"answers": {"HWModelStr": "M3"}, "componentAuth": )" + std::string(chip) + "}");
+        EXPECT_FALSE(device_.authenticateDisplay()) << chip;
+    }
+}
+
 TEST_F(ZPDeviceTest, availabilityThatComesAfterTheCallIsHarmless) {
     EXPECT_FALSE(device_.setupReverseProxy(url).isNothing());
     std::vector<std::thread> late;

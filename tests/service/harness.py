@@ -1,4 +1,5 @@
 """The real service on a bus and a device root of its own, driven by orloctl and busctl."""
+import concurrent.futures
 import ctypes
 import json
 import os
@@ -8,6 +9,8 @@ import shutil
 import signal
 import subprocess
 import tempfile
+import time
+import unittest
 
 SOURCE = pathlib.Path(__file__).resolve().parents[2]
 BIN = pathlib.Path(os.environ["VELTRA_BIN"])
@@ -15,10 +18,25 @@ NAME = "com.tevari.VeltraOrloServices"
 # The sanitizer keeps freed memory aside, which would hide what a test of memory looks for.
 HONEST_MEMORY = {"ASAN_OPTIONS": "detect_leaks=1:quarantine_size_mb=1:thread_local_quarantine_size_kb=64"}
 LOG = f"private/var/log/{NAME}.log"
+DESCRIPTION = "etc/veltra/device.json"
+SUCCESS = (0, None, None)  # of answer()
 
 # A service that start-service leaves behind becomes a child of the tests, which can then tell how it ended.
 PR_SET_CHILD_SUBREAPER = 36
 assert ctypes.CDLL(None).prctl(PR_SET_CHILD_SUBREAPER, 1, 0, 0, 0) == 0
+
+
+def kilobytes(figure, pid):
+    """What the kernel tells of the memory of a process, "VmRSS" now or "VmHWM" at most."""
+    status = pathlib.Path(f"/proc/{pid}/status").read_text()
+    return int(status.split(figure + ":")[1].split()[0])
+
+
+def at_once(*works):
+    """Does all of `works` at the same time, until they are done."""
+    with concurrent.futures.ThreadPoolExecutor(len(works)) as pool:
+        for work in [pool.submit(work) for work in works]:
+            work.result()
 
 
 class PrivateBus:
@@ -36,15 +54,12 @@ class PrivateBus:
 
 
 class Service:
-    """A running service on a bus of its own. `answers` replaces the example device's answers; None leaves its whole
-    description as it is. With the `root` of another service it shares that one's device. At the end it must end cleanly,
-    with nothing that the sanitizer finds leaked."""
+    """A running service on a bus and an example device of its own. With the `root` of another service it shares that
+    one's device. At the end it must end cleanly, with nothing that the sanitizer finds leaked."""
 
-    def __init__(self, answers=None, root=None):
+    def __init__(self, root=None):
         self.owns_root = root is None
         self.root = root or self.make_root()
-        if answers is not None:
-            self.describe(answers)
         self.bus = PrivateBus()
         self.environment = {
             **os.environ,
@@ -90,8 +105,24 @@ class Service:
             if self.owns_root:
                 shutil.rmtree(self.root)
 
-    def describe(self, answers):
-        (self.root / "etc/veltra/device.json").write_text(json.dumps({"answers": answers}))
+    def describe(self, **sections):
+        """Replaces sections of the device's description, but for "answers", of which the named ones are replaced; None
+        takes out what it stands for."""
+        description = json.loads((self.root / DESCRIPTION).read_text())
+        description |= sections | {"answers": description["answers"] | sections.get("answers", {})}
+        for part in (description, description["answers"]):
+            for key in [key for key, value in part.items() if value is None]:
+                del part[key]
+        (self.root / DESCRIPTION).write_text(json.dumps(description))
+
+    def write(self, path, contents, mode=0o644):
+        path = self.root / path
+        path.parent.mkdir(parents=True, exist_ok=True)
+        path.write_bytes(contents)
+        path.chmod(mode)
+
+    def read(self, path):
+        return (self.root / path).read_bytes()
 
     def run(self, *command, **options):
         return subprocess.run(
@@ -103,6 +134,18 @@ class Service:
         done = self.run(BIN / "orloctl", "--json", *words)
         return done.returncode, json.loads(done.stdout)
 
+    def answer(self, *words):
+        """What the plug-in answered, without the name: (status code, dictionary, error)."""
+        response = self.orloctl(*words)[1]["response"]
+        return response["statusCode"], response.get("response"), response.get("error")
+
+    def put(self, record):
+        self.write("tmp/in", record)
+        return self.answer("put-psd2", "/tmp/in")
+
+    def get(self, path="/tmp/out"):
+        return self.answer("get-psd2", path)
+
     def busctl(self, *body):
         return self.run(
             "busctl", "--user", "call", NAME, "/" + NAME.replace(".", "/"), "com.tevari.VeltraPluginServer",
@@ -113,21 +156,20 @@ class Service:
         path = self.root / LOG
         return path.read_text().splitlines() if path.exists() else []
 
+    def log_size(self):
+        return (self.root / LOG).stat().st_size
+
+    def await_request(self, logged):
+        """Waits until the log is longer than `logged` octets, as it is once a request is in hand."""
+        while self.log_size() == logged:
+            time.sleep(0)
+
     def messages_of(self, act):
         """The messages, without time and line number, that the log gains while `act` runs. A message may end in a line
         break; the empty line that follows is left out."""
         before = len(self.log())
         act()
         return [line.split("] ", 1)[1] for line in self.log()[before:] if line]
-
-    def resident_kilobytes(self, figure="VmRSS:"):
-        for line in pathlib.Path(f"/proc/{self.pid}/status").read_text().splitlines():
-            if line.startswith(figure):
-                return int(line.split()[1])
-        raise AssertionError("the service has no memory figure")
-
-    def peak_kilobytes(self):
-        return self.resident_kilobytes("VmHWM:")
 
     def wait_end(self, seconds=None):
         """The exit status, or the number of the signal that ended the service as a negative number; None when it still
@@ -136,3 +178,18 @@ class Service:
             return None
         ending = os.waitid(os.P_PIDFD, self.ended, os.WEXITED | os.WNOWAIT)
         return ending.si_status if ending.si_code == os.CLD_EXITED else -ending.si_status
+
+
+class Case(unittest.TestCase):
+    def closing(self, opened):
+        """`opened`, which is closed when the case has ended."""
+        self.addCleanup(opened.close)
+        return opened
+
+
+class ServiceTest(Case):
+    """A case with a running service."""
+
+    def setUp(self):
+        self.service = self.closing(Service())
+        self.root = self.service.root

@@ -1,4 +1,4 @@
-"""An HTTPS server that misbehaves in the way that the last segment of a request's path names."""
+"""An HTTPS server that misbehaves in the way that the last segment of a request's path names, the first one of a POST."""
 import hashlib
 import http.client
 import http.server
@@ -18,7 +18,8 @@ class Handler(http.server.BaseHTTPRequestHandler):
 
     def handle_request(self):
         measure = self.server.context and self.path == "/orlotrustobject"
-        behaviour, *argument = (not measure and self.server.instead or self.path.rsplit("/", 1)[1]).split("-")
+        segment = self.path.split("/")[1 if self.command == "POST" else -1]
+        behaviour, *argument = (not measure and self.server.instead or segment).split("-")
         with self.server.lock:
             self.server.seen.append((self.command, self.path))
             count = self.server.counts[self.path] = self.server.counts.get(self.path, 0) + 1
@@ -27,10 +28,13 @@ class Handler(http.server.BaseHTTPRequestHandler):
         except (OSError, ssl.SSLError):
             self.close_connection = True
 
-    do_GET = do_HEAD = do_PUT = handle_request
+    do_GET = do_HEAD = do_PUT = do_POST = handle_request
 
     def body(self):
-        return self.rfile.read(int(self.headers.get("Content-Length", 0)))
+        body = self.rfile.read(int(self.headers.get("Content-Length", 0)))
+        if self.command == "POST":
+            self.server.posts.append((self.path, body, "tinyproxy" in self.headers.get("Via", "")))
+        return body
 
     def answer(self, status, body=b"", **headers):
         self.send_response(status)
@@ -61,6 +65,11 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.body()
         body = f"<Error><Code>{reason}</Code></Error>".encode() if reason else b""
         self.answer(int(status), body, Location="/v1/records/psd2/plain")
+
+    def deaf(self, count):
+        """A pairing server that fails when it is told of the result."""
+        self.body()
+        self.answer(500 if self.path.endswith("/result") else 200, self.server.trust_object)
 
     def busy(self, count, failures, *_):
         self.body()
@@ -204,14 +213,15 @@ class Handler(http.server.BaseHTTPRequestHandler):
 
 
 class HostileServer(http.server.ThreadingHTTPServer):
-    """Speaks plain HTTP without a certificate. `instead`, when set, is the behaviour for every path."""
+    """Speaks plain HTTP without a certificate. `instead`, when set, is the behaviour for every path. `seen` has method and
+    path of each request, `posts` path and body of each POST and whether a proxy passed it on."""
 
     daemon_threads = True
 
     def __init__(self, certificate, key, trust_object):
         super().__init__(("127.0.0.1", 0), Handler)
         self.instead = None
-        self.trust_object, self.seen, self.counts, self.failing = trust_object, [], {}, 0
+        self.trust_object, self.seen, self.posts, self.counts, self.failing = trust_object, [], [], {}, 0
         self.objects, self.racing, self.refusal = {}, 0, 412
         self.lock, self.closing, self.answered, self.finished = threading.Lock(), *(threading.Event() for _ in range(3))
         self.context = None
