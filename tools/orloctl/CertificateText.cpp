@@ -1,6 +1,5 @@
 #include "tools/orloctl/CertificateText.h"
 
-#include <algorithm>
 #include <memory>
 
 #include <openssl/ec.h>
@@ -9,85 +8,31 @@
 #include <openssl/x509.h>
 
 #include "der/DERDecode.h"
+#include "platform/Crypto.h"
 #include "tools/orloctl/DerText.h"
-#include "tools/orloctl/Img4Findings.h"
+#include "tools/orloctl/Findings.h"
 
 namespace {
 
-using nlohmann::ordered_json;
-
 constexpr std::uint64_t mostOctets = 256;
-constexpr const char* rsaKey = "rsaEncryption";
-constexpr const char* ecKey = "id-ecPublicKey";
 
-struct Key {
-    std::string algorithm;
-    DERItem parameters;
-    DERItem bits;
-    std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)> parsed; // null when OpenSSL cannot read it
+using KeyPtr = std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)>;
 
-    bool isUncompressedPoint() const {
-        return parsed && bits.length != 0 && bits.data[0] == POINT_CONVERSION_UNCOMPRESSED;
-    }
-};
-
-std::optional<Key> readKey(const DERItem& subjectPublicKeyInfo) {
-    DERSubjPubKeyInfo info;
-    DERAlgorithmId algorithm;
-    DERItem bits;
-    std::uint8_t unusedBits = 0;
-    if (DERParseSequenceContent(&subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info,
-                                sizeof info) != DERSuccess ||
-        DERParseSequenceContent(&info.algorithm, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, &algorithm,
-                                sizeof algorithm) != DERSuccess ||
-        DERParseBitString(&info.publicKey, &bits, &unusedBits) != DERSuccess || unusedBits != 0)
-        return std::nullopt;
+// Null when OpenSSL cannot read it.
+KeyPtr parsedKey(const DERItem& subjectPublicKeyInfo) {
     const auto encoding = derEncoding(DERTagSequence, subjectPublicKeyInfo);
     const std::uint8_t* place = encoding.data();
-    return Key{algorithmName(algorithm.algorithm),
-               algorithm.parameters,
-               bits,
-               {d2i_PUBKEY(nullptr, &place, static_cast<long>(encoding.size())), EVP_PKEY_free}};
+    return {d2i_PUBKEY(nullptr, &place, static_cast<long>(encoding.size())), EVP_PKEY_free};
 }
 
-bool isPositive(const DERItem& number) {
-    return number.length != 0 && (number.data[0] & 0x80) == 0;
-}
-
-bool isOdd(const DERItem& number) {
-    return (number.data[number.length - 1] & 1) != 0;
-}
-
-// RFC 8017 3.1.
-std::string rsaFault(const DERItem& bits) {
-    DERRSAPubKeyPKCS1 numbers;
-    if (DERParseSequence(&bits, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs, &numbers, sizeof numbers) !=
-        DERSuccess)
-        return "is no RSAPublicKey";
-    const DERItem &modulus = numbers.modulus, &exponent = numbers.publicExponent;
-    if (!isPositive(modulus) || !isPositive(exponent))
-        return "has a number that is not positive";
-    if (!isOdd(modulus))
-        return "has an even modulus";
-    const bool isOne = exponent.length == 1 && exponent.data[0] == 1;
-    return !isOdd(exponent) || isOne || exponent.length > modulus.length ? "has an unsound exponent" : "";
-}
-
-std::string rsaText(const Key& key) {
-    constexpr std::uint8_t null[] = {0x05, 0x00};
-    const bool isPlain =
-        key.parameters.data == nullptr ||
-        std::equal(std::begin(null), std::end(null), key.parameters.data, key.parameters.data + key.parameters.length);
-    return "RSA " + std::to_string(EVP_PKEY_get_bits(key.parsed.get())) + " bits" + (isPlain ? "" : " with parameters");
-}
-
-std::string ecText(const Key& key) {
+std::string ecText(const EVP_PKEY* key, const DERItem& point) {
     char name[80] = "";
-    if (EVP_PKEY_get_group_name(key.parsed.get(), name, sizeof name, nullptr) != 1)
+    if (EVP_PKEY_get_group_name(key, name, sizeof name, nullptr) != 1)
         return "EC without a named curve";
     const char* const standard = EC_curve_nid2nist(OBJ_txt2nid(name));
+    const bool isUncompressed = point.length > 1 && point.data[1] == POINT_CONVERSION_UNCOMPRESSED;
     return std::string("EC ") + (standard ? standard : name) +
-           (key.isUncompressedPoint() ? "" : ", with a point that is not in uncompressed form");
+           (isUncompressed ? "" : ", with a point that is not in uncompressed form");
 }
 
 // The number's digits, without the octet that keeps it positive.
@@ -123,27 +68,27 @@ std::string nameText(const DERItem& name, std::size_t longest) {
 }
 
 std::string keyText(const DERItem& subjectPublicKeyInfo, std::uint64_t most) {
-    const auto key = readKey(subjectPublicKeyInfo);
-    if (!key)
+    DERSubjPubKeyInfo info;
+    DERAlgorithmId algorithm;
+    if (DERParseSequenceContent(&subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info,
+                                sizeof info) != DERSuccess ||
+        DERParseSequenceContent(&info.algorithm, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, &algorithm,
+                                sizeof algorithm) != DERSuccess)
         return "malformed #" + hexText(subjectPublicKeyInfo, most);
-    if (!key->parsed)
-        return key->algorithm + " #" + hexText(key->bits, most);
-    return key->algorithm == rsaKey ? rsaText(*key) : key->algorithm == ecKey ? ecText(*key) : key->algorithm;
-}
-
-std::optional<std::size_t> rsaBits(const DERItem& subjectPublicKeyInfo) {
-    const auto key = readKey(subjectPublicKeyInfo);
-    return key && key->parsed && key->algorithm == rsaKey ? std::optional(EVP_PKEY_get_bits(key->parsed.get()))
-                                                          : std::nullopt;
-}
-
-std::string keyFault(const DERItem& subjectPublicKeyInfo) {
-    const auto key = readKey(subjectPublicKeyInfo);
+    const std::string name = algorithmName(algorithm.algorithm);
+    const KeyPtr key = parsedKey(subjectPublicKeyInfo);
     if (!key)
-        return "is malformed";
-    if (key->algorithm == rsaKey)
-        return rsaFault(key->bits);
-    return key->algorithm == ecKey && !key->isUncompressedPoint() ? "is no uncompressed point of its curve" : "";
+        return name + " #" + hexText(info.publicKey, most);
+    if (EVP_PKEY_is_a(key.get(), "EC"))
+        return ecText(key.get(), info.publicKey);
+    if (!EVP_PKEY_is_a(key.get(), "RSA"))
+        return name;
+    const bool isPlain = algorithm.parameters.length == 0 || hexText(algorithm.parameters) == "0500"; // NULL
+    return "RSA " + std::to_string(EVP_PKEY_get_bits(key.get())) + " bits" + (isPlain ? "" : " with parameters");
+}
+
+bool isKey(const DERItem& subjectPublicKeyInfo) {
+    return parsedKey(subjectPublicKeyInfo) != nullptr;
 }
 
 std::string algorithmName(const DERItem& oid) {
@@ -159,7 +104,7 @@ std::string algorithmText(const DERItem& identifier) {
                : "malformed " + hexText(identifier, mostOctets);
 }
 
-ordered_json certificateJson(const DERItem& encoding) {
+nlohmann::ordered_json certificateJson(const DERItem& encoding) {
     const auto certificate = readCertificate(encoding);
     if (!certificate)
         return {{"fault", "is no certificate"}};
@@ -168,5 +113,5 @@ ordered_json certificateJson(const DERItem& encoding) {
             {"key", keyText(certificate->tbs.subjectPublicKeyInfo, UINT64_MAX)},
             {"signatureAlgorithm", algorithmText(certificate->fields.signatureAlgorithm)},
             {"serialNumber", serialText(certificate->tbs.serialNumber)},
-            {"sha256", img4show::sha256Text(encoding)}};
+            {"sha256", digestText(encoding, crypto::sha256Size)}};
 }

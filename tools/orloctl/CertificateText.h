@@ -28,11 +28,8 @@ std::string nameText(const DERItem& name, std::size_t longest = 512);
 // octets are shown.
 std::string keyText(const DERItem& subjectPublicKeyInfo, std::uint64_t most = 256);
 
-// The size of an RSA key's modulus; nothing for other keys.
-std::optional<std::size_t> rsaBits(const DERItem& subjectPublicKeyInfo);
-
-// Why no signature verifies under the key, as in "the key <fault>"; empty for a sound RSA or EC key and for any other.
-std::string keyFault(const DERItem& subjectPublicKeyInfo);
+// Whether OpenSSL can read the key in that content: an EC key that it cannot is no point of its curve.
+bool isKey(const DERItem& subjectPublicKeyInfo);
 
 // An algorithm's object identifier: "sha384WithRSAEncryption" where the name is known, else numbers with dots. The
 // second form takes the content of an AlgorithmIdentifier.

@@ -17,6 +17,7 @@
 #include "platform/DeviceRoot.h"
 #include "platform/ShownText.h"
 #include "platform/linux/services/bus/BusValue.h"
+#include "platform/linux/system/JsonReader.h"
 #include "tools/orloctl/Interruption.h"
 
 namespace {
@@ -92,12 +93,20 @@ std::string whereReasonsAre(const std::string& bus, std::int64_t logSizeBefore) 
 // The error of a bad URL has it as it was sent; what is printed goes without user and password.
 void hideUserInfo(Value::Dictionary& response) {
     const auto error = response.find("error");
-    Value::Dictionary* const entries = error == response.end() ? nullptr : error->second.dictionary();
-    if (!entries)
-        return;
-    for (auto& [key, value] : *entries)
-        if (const std::string* text = value.text())
-            value = withoutUserInfo(*text);
+    if (error != response.end() && error->second.dictionary())
+        for (auto& [key, value] : *error->second.dictionary())
+            if (const std::string* text = value.text())
+                value = withoutUserInfo(*text);
+}
+
+Answer failed(Outcome outcome, std::string why) {
+    Answer answer;
+    answer.report.fail(std::move(why), outcome);
+    return answer;
+}
+
+Answer unreachable(std::string why) {
+    return failed(Outcome::Unreachable, std::move(why));
 }
 
 // Reads a reply into an answer. A reply without response object is one to an unknown command.
@@ -106,11 +115,14 @@ Answer answerFrom(sd_bus_message* reply, const std::string& command) {
     check(sd_bus_message_read_basic(reply, SD_BUS_TYPE_BOOLEAN, &completed));
     Value::Dictionary response = bus::readDictionary(reply);
     if (response.empty())
-        return {Outcome::UnknownCommand, {}, "The plug-in does not know the command \"" + command + "\"."};
+        return failed(Outcome::UnknownCommand, "The plug-in does not know the command \"" + command + "\".");
     hideUserInfo(response);
-    if (Value(response)["statusCode"].integer() == 0)
-        return {Outcome::Success, std::move(response)};
-    return {Outcome::Failure, std::move(response), "The plug-in answered \"" + command + "\" with a failure."};
+    Answer answer;
+    answer.response = std::move(response);
+    answer.report.json["response"] = jsonFromValue(answer.response);
+    if (answer.response["statusCode"].integer() != 0)
+        answer.report.fail("The plug-in answered \"" + command + "\" with a failure.", Outcome::Failure);
+    return answer;
 }
 
 Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address) {
@@ -118,14 +130,14 @@ Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address)
     const std::string text = error.message ? error.message : error.name;
     const std::string where = " on the bus \"" + address.bus + "\"";
     if (name == SD_BUS_ERROR_INVALID_ARGS)
-        return {Outcome::Usage, {}, "The service refused the request: " + text};
+        return failed(Outcome::Usage, "The service refused the request: " + text);
     if (name == SD_BUS_ERROR_ACCESS_DENIED && geteuid() != 0)
-        return {Outcome::Unreachable, {}, "Only root may call the service" + where + "."};
+        return unreachable("Only root may call the service" + where + ".");
     if (name == SD_BUS_ERROR_NO_REPLY)
-        return {Outcome::Unreachable, {}, "The service" + where + " did not answer: " + text};
+        return unreachable("The service" + where + " did not answer: " + text);
     if (name == SD_BUS_ERROR_SERVICE_UNKNOWN)
-        return {Outcome::Unreachable, {}, "The service " + std::string(serviceName) + " is not running" + where + "."};
-    return {Outcome::Unreachable, {}, "The service" + where + " cannot be used: " + text};
+        return unreachable("The service " + std::string(serviceName) + " is not running" + where + ".");
+    return unreachable("The service" + where + " cannot be used: " + text);
 }
 
 std::chrono::microseconds timeLeft(const ServiceAddress& address) {
@@ -163,7 +175,7 @@ int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
         if (const char* sender = sd_bus_message_get_sender(reply); sender && !error)
             pending.sender = sender;
     } catch (const std::exception& failure) {
-        pending.answer = {Outcome::Unreachable, {}, std::string("The answer cannot be read: ") + failure.what()};
+        pending.answer = unreachable(std::string("The answer cannot be read: ") + failure.what());
     }
     return 0;
 }
@@ -185,10 +197,8 @@ Answer converse(sd_bus* connection, const ServiceAddress& address, const std::st
             continue;
         const auto left = timeLeft(address);
         if (left.count() == 0 || Interruption::isRaised())
-            return {Outcome::Unreachable,
-                    {},
-                    noAnswerReason(address) + " while the service on the bus \"" + address.bus + "\" was to answer. " +
-                        fateOf(connection)};
+            return unreachable(noAnswerReason(address) + " while the service on the bus \"" + address.bus +
+                               "\" was to answer. " + fateOf(connection));
         const int waited = sd_bus_wait(connection, static_cast<std::uint64_t>(std::min(left, tick).count()));
         if (waited != -EINTR)
             check(waited);
@@ -198,9 +208,9 @@ Answer converse(sd_bus* connection, const ServiceAddress& address, const std::st
     if (!pending.sender.empty())
         pending.answer->serviceUser = userOf(connection, pending.sender.c_str());
     pending.answer->reasons = whereReasonsAre(address.bus, logSizeBefore);
-    if (pending.answer->outcome == Outcome::Failure)
-        pending.answer->problem += ' ' + pending.answer->reasons;
-    return *pending.answer;
+    if (pending.answer->report.outcome == Outcome::Failure)
+        pending.answer->report.problem += ' ' + pending.answer->reasons;
+    return std::move(*pending.answer);
 }
 
 } // namespace
@@ -214,15 +224,15 @@ Answer sendRequest(const ServiceAddress& address, const std::string& command, co
     const Interruption interruption;
     sd_bus* opened = nullptr;
     if (const int result = bus::open(address.bus, &opened); result < 0)
-        return {Outcome::Unreachable, {}, "Cannot reach the bus \"" + address.bus + "\": " + bus::reasonOf(result), {}};
+        return unreachable("Cannot reach the bus \"" + address.bus + "\": " + bus::reasonOf(result));
     const BusPtr connection(opened, sd_bus_close_unref);
     try {
         return converse(connection.get(), address, command, arguments);
     } catch (const bus::Refusal& refusal) {
-        return {Outcome::Usage, {}, refusal.what(), {}};
+        return failed(Outcome::Usage, refusal.what());
     } catch (const std::system_error& failure) {
         if (const int code = failure.code().value(); code == E2BIG || code == EMSGSIZE || code == ENOBUFS)
-            return {Outcome::Usage, {}, std::string("The request is too large for a message: ") + failure.what(), {}};
-        return {Outcome::Unreachable, {}, "Lost the bus \"" + address.bus + "\": " + failure.what(), {}};
+            return failed(Outcome::Usage, std::string("The request is too large for a message: ") + failure.what());
+        return unreachable("Lost the bus \"" + address.bus + "\": " + failure.what());
     }
 }

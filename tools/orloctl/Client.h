@@ -12,9 +12,8 @@
 #include "tools/orloctl/Report.h"
 
 struct Answer {
-    Outcome outcome = Outcome::Unreachable;
-    Value::Dictionary response = {}; // as the plug-in sent it; empty unless it answered
-    std::string problem = {};        // sentences for a person; empty on success
+    Report report = {};  // with what the plug-in sent under "response"; that is empty unless it answered
+    Value response = {}; // the same
     // The user whom the bus names as the one who runs the service that answered; none when it has left meanwhile.
     std::optional<uid_t> serviceUser = {};
     std::string reasons = {}; // a sentence that says where the service has said why it answered so

@@ -108,12 +108,10 @@ Report collectCrashLogs(const std::string& copyDirectory) {
     for (auto& [time, entry] : found)
         logs.push_back(std::move(entry));
     Report report;
-    report.failure = Outcome::Usage;
     if (!missed.empty())
-        report.problem = "Not everything could be looked at";
+        report.fail("Not everything could be looked at", Outcome::Usage);
     if (copies && !std::ranges::all_of(logs, [](const ordered_json& log) { return log.contains("copy"); }))
-        report.problem = "Not all logs were copied to " + copyDirectory;
-    report.ok = report.problem.empty();
+        report.fail("Not all logs were copied to " + copyDirectory, Outcome::Usage);
     report.json = {{"status", logs.empty() ? 45 : 0}, {"logs", std::move(logs)}};
     if (!missed.empty())
         report.json["missed"] = std::move(missed);

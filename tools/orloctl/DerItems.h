@@ -10,29 +10,32 @@
 //   DerItems items(content);
 //   while (items.next())
 //       ... items.item(), items.encoding() ...
-//   if (items.isBroken())
-//       ... no item could be decoded at the start of items.encoding() ...
+//   if (items.refusal())
+//       ... it says why no item could be decoded at the start of items.encoding() ...
 class DerItems {
 public:
-    explicit DerItems(const DERItem& content) { DERDecodeSeqContentInit(&content, &rest_); }
+    explicit DerItems(const DERItem& content) : rest_(content) {}
 
     // False at the end, and when what follows is no strict DER.
     bool next() {
-        encoding_ = {rest_.next, static_cast<std::uint64_t>(rest_.end - rest_.next)};
-        if (DERDecodeSeqNext(&rest_, &item_) != DERSuccess)
+        encoding_ = rest_;
+        if (rest_.length == 0 || DERDecodeItemExplained(&rest_, &item_, &refusal_) != DERSuccess)
             return false;
-        encoding_.length = static_cast<std::uint64_t>(rest_.next - encoding_.data);
+        rest_.data = item_.content.data + item_.content.length;
+        encoding_.length = static_cast<std::uint64_t>(rest_.data - encoding_.data);
+        rest_.length -= encoding_.length;
         return true;
     }
 
     const DERDecodedInfo& item() const { return item_; }
     const DERItem& encoding() const { return encoding_; }
-    bool isBroken() const { return rest_.next != rest_.end; }
+    const DERRefusal* refusal() const { return rest_.length != 0 ? &refusal_ : nullptr; }
 
 private:
-    DERSequence rest_ = {};
+    DERItem rest_;
     DERDecodedInfo item_ = {};
     DERItem encoding_ = {};
+    DERRefusal refusal_ = {};
 };
 
 #endif

@@ -2,115 +2,90 @@
 
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
+#include "platform/Hexadecimal.h"
 
 #include <algorithm>
-#include <array>
+#include <iterator>
 #include <memory>
 
 #include <openssl/objects.h>
 
 namespace {
 
+using Octets = std::vector<std::uint8_t>;
+
 constexpr std::uint64_t classShift = 62;
 constexpr DERTag constructedFlag = UINT64_C(1) << 61;
-constexpr std::uint8_t moreBit = 0x80;
 
-enum Form {
-    Primitive,
-    Constructed,
-    Undefined // no such type
-};
-
-struct UniversalType {
-    const char* name;
-    Form form;
-};
-
-// By tag number (X.680 8.6). Strings are primitive in DER (X.690 10.2).
-constexpr std::array<UniversalType, 31> universalTypes = {{
-    {"end of contents", Undefined},
-    {"BOOLEAN", Primitive},
-    {"INTEGER", Primitive},
-    {"BIT STRING", Primitive},
-    {"OCTET STRING", Primitive},
-    {"NULL", Primitive},
-    {"OBJECT IDENTIFIER", Primitive},
-    {"ObjectDescriptor", Primitive},
-    {"EXTERNAL", Constructed},
-    {"REAL", Primitive},
-    {"ENUMERATED", Primitive},
-    {"EMBEDDED PDV", Constructed},
-    {"UTF8String", Primitive},
-    {"RELATIVE-OID", Primitive},
-    {"TIME", Primitive},
-    {"universal [15]", Undefined},
-    {"SEQUENCE", Constructed},
-    {"SET", Constructed},
-    {"NumericString", Primitive},
-    {"PrintableString", Primitive},
-    {"TeletexString", Primitive},
-    {"VideotexString", Primitive},
-    {"IA5String", Primitive},
-    {"UTCTime", Primitive},
-    {"GeneralizedTime", Primitive},
-    {"GraphicString", Primitive},
-    {"VisibleString", Primitive},
-    {"GeneralString", Primitive},
-    {"UniversalString", Primitive},
-    {"CHARACTER STRING", Constructed},
-    {"BMPString", Primitive},
-}};
-
-std::uint64_t numberOf(DERTag tag) {
-    return tag & DERTagNumberMask;
-}
+// The universal types by tag number (X.680 8.6), and those that are none or constructed; strings are primitive in DER
+// (X.690 10.2).
+constexpr const char* typeNames[] = {
+    "end of contents",   "BOOLEAN",          "INTEGER",       "BIT STRING",     "OCTET STRING",    "NULL",
+    "OBJECT IDENTIFIER", "ObjectDescriptor", "EXTERNAL",      "REAL",           "ENUMERATED",      "EMBEDDED PDV",
+    "UTF8String",        "RELATIVE-OID",     "TIME",          "universal [15]", "SEQUENCE",        "SET",
+    "NumericString",     "PrintableString",  "TeletexString", "VideotexString", "IA5String",       "UTCTime",
+    "GeneralizedTime",   "GraphicString",    "VisibleString", "GeneralString",  "UniversalString", "CHARACTER STRING",
+    "BMPString"};
+constexpr std::uint32_t undefinedTypes = 1U << 0 | 1U << 15;
+constexpr std::uint32_t constructedTypes = 1U << 8 | 1U << 11 | 1U << 16 | 1U << 17 | 1U << 29;
+constexpr std::uint32_t textTypes =
+    1U << 12 | 1U << 18 | 1U << 19 | 1U << 20 | 1U << 22 | 1U << 23 | 1U << 24 | 1U << 26;
+constexpr DERTag null = 5, enumerated = 10, relativeOid = 13;
 
 bool isUniversal(DERTag tag) {
-    return tag >> classShift == 0;
+    return (tag & ~constructedFlag) < std::size(typeNames);
 }
 
-std::optional<DerFault> integerFault(const DERItem& content) {
-    if (content.length == 0)
-        return DerFault{0, "the number has no octets"};
-    if (content.length == 1)
-        return std::nullopt;
-    const bool negative = (content.data[1] & 0x80) != 0;
-    if (content.data[0] == (negative ? 0xFF : 0x00))
-        return DerFault{0, "the number is not in its shortest form"};
-    return std::nullopt;
+bool isOneOf(std::uint32_t types, DERTag tag) {
+    return isUniversal(tag) && (types >> (tag & DERTagNumberMask) & 1) != 0;
 }
 
-std::optional<DerFault> booleanFault(const DERItem& content) {
-    if (content.length != 1)
-        return DerFault{0, "a BOOLEAN has one octet, and this one has " + std::to_string(content.length)};
-    if (content.data[0] != 0x00 && content.data[0] != 0xFF)
-        return DerFault{0, "a BOOLEAN is 00 or FF, and this one is " + hexText(content, 1)};
-    return std::nullopt;
-}
-
-std::optional<DerFault> bitStringFault(const DERItem& content) {
+// Why the octets are none of that primitive type.
+std::optional<DerFault> octetsFault(DERTag type, const DERItem& content) {
+    const std::uint64_t length = content.length;
+    const std::uint8_t* const octets = content.data;
+    const std::uint8_t* const last = octets + length - 1;
     DERItem bits;
     std::uint8_t unused = 0;
-    if (DERParseBitString(&content, &bits, &unused) == DERSuccess)
-        return std::nullopt;
-    if (content.length == 0)
-        return DerFault{0, "a BIT STRING has at least one octet"};
-    if (unused > 7 || content.length == 1)
-        return DerFault{0, "the count of unused bits is " + std::to_string(unused)};
-    return DerFault{content.length - 1, "the unused bits are not zero"};
-}
-
-std::optional<DerFault> oidFault(const DERItem& content) {
-    if (content.length == 0)
-        return DerFault{0, "an identifier has at least one octet"};
-    bool first = true;
-    for (std::uint64_t i = 0; i < content.length; ++i) {
-        if (first && content.data[i] == moreBit)
-            return DerFault{i, "a component is not in its shortest form"};
-        first = (content.data[i] & moreBit) == 0;
+    switch (type) {
+    case DERTagBoolean:
+        if (length != 1)
+            return DerFault{octets, "a BOOLEAN has one octet, and this one has " + std::to_string(length)};
+        if (octets[0] != 0x00 && octets[0] != 0xFF)
+            return DerFault{octets, "a BOOLEAN is 00 or FF, and this one is " + hexText(content)};
+        break;
+    case DERTagInteger:
+    case enumerated:
+        if (length == 0)
+            return DerFault{octets, "the number has no octets"};
+        if (length > 1 && octets[0] == ((octets[1] & 0x80) != 0 ? 0xFF : 0x00))
+            return DerFault{octets, "the number is not in its shortest form"};
+        break;
+    case DERTagBitString:
+        if (DERParseBitString(&content, &bits, &unused) == DERSuccess)
+            break;
+        if (length == 0)
+            return DerFault{octets, "a BIT STRING has at least one octet"};
+        if (unused > 7 || length == 1)
+            return DerFault{octets, "the count of unused bits is " + std::to_string(unused)};
+        return DerFault{last, "the unused bits are not zero"};
+    case null:
+        if (length != 0)
+            return DerFault{octets, "a NULL has no content"};
+        break;
+    case DERTagObjectIdentifier:
+    case relativeOid:
+        if (length == 0)
+            return DerFault{octets, "an identifier has at least one octet"};
+        for (std::uint64_t i = 0; i < length; ++i)
+            if (octets[i] == 0x80 && (i == 0 || octets[i - 1] < 0x80))
+                return DerFault{octets + i, "a component is not in its shortest form"};
+        if (*last >= 0x80)
+            return DerFault{last, "the last component is cut short"};
+        break;
+    default:
+        break;
     }
-    if (!first)
-        return DerFault{content.length - 1, "the last component is cut short"};
     return std::nullopt;
 }
 
@@ -118,21 +93,24 @@ bool isPrintable(std::uint8_t octet) {
     return octet >= 0x20 && octet <= 0x7E;
 }
 
-// Quotes and backslashes would be mistaken for those around a code.
-bool isSpellable(std::uint64_t number) {
-    if (number > UINT32_MAX)
-        return false;
-    for (unsigned shift = 0; shift < 32; shift += 8) {
-        const auto octet = static_cast<std::uint8_t>(number >> shift);
-        if (!isPrintable(octet) || octet == '"' || octet == '\\')
-            return false;
-    }
-    return true;
+// The octets of a number, without zeros before them.
+Octets octetsOf(std::uint64_t number) {
+    Octets octets(1, static_cast<std::uint8_t>(number));
+    while ((number >>= 8) != 0)
+        octets.insert(octets.begin(), static_cast<std::uint8_t>(number));
+    return octets;
 }
 
-std::string hexOctet(std::uint8_t octet) {
-    constexpr char digits[] = "0123456789abcdef";
-    return {digits[octet >> 4], digits[octet & 0xF]};
+// Quotes and backslashes would be mistaken for those around a code.
+bool isSpelling(const Octets& octets) {
+    return octets.size() == 4 && std::ranges::all_of(octets, [](std::uint8_t octet) {
+               return isPrintable(octet) && octet != '"' && octet != '\\';
+           });
+}
+
+std::string codeOf(std::uint64_t number, const std::string& quote) {
+    const Octets octets = octetsOf(number);
+    return isSpelling(octets) ? quote + std::string(octets.begin(), octets.end()) + quote : "0x" + hexadecimal(octets);
 }
 
 } // namespace
@@ -163,40 +141,37 @@ std::string derFaultText(const DERRefusal& refusal) {
     }
 }
 
-std::optional<DerFault> derHeaderFault(const DERItem& der) {
-    DERDecodedInfo decoded;
-    DERRefusal refusal;
-    if (DERDecodeItemExplained(&der, &decoded, &refusal) == DERSuccess)
+std::optional<DerFault> derContentFault(DERTag tag, const DERItem& content) {
+    if (!isUniversal(tag))
         return std::nullopt;
-    return DerFault{static_cast<std::uint64_t>(refusal.place - der.data), derFaultText(refusal)};
+    const DERTag number = tag & DERTagNumberMask;
+    if (isOneOf(undefinedTypes, tag))
+        return DerFault{content.data, "there is no universal type with the number " + std::to_string(number)};
+    if (isOneOf(constructedTypes, tag) != isConstructed(tag))
+        return DerFault{content.data, std::string("DER has ") + typeNames[number] + " in " +
+                                          (isConstructed(tag) ? "primitive" : "constructed") + " form only"};
+    return octetsFault(tag, content);
 }
 
-std::optional<DerFault> derContentFault(DERTag tag, const DERItem& content) {
-    const std::uint64_t number = numberOf(tag);
-    if (!isUniversal(tag) || number >= universalTypes.size())
-        return std::nullopt;
-    const UniversalType& type = universalTypes[number];
-    if (type.form == Undefined)
-        return DerFault{0, "there is no universal type with the number " + std::to_string(number)};
-    if ((type.form == Constructed) != isConstructed(tag))
-        return DerFault{0, std::string("DER has ") + type.name + " in " +
-                               (type.form == Constructed ? "constructed" : "primitive") + " form only"};
-    switch (number) {
-    case DERTagBoolean:
-        return booleanFault(content);
-    case DERTagInteger:
-    case 10: // ENUMERATED
-        return integerFault(content);
-    case DERTagBitString:
-        return bitStringFault(content);
-    case 5: // NULL
-        return content.length == 0 ? std::nullopt : std::optional(DerFault{0, "a NULL has no content"});
-    case DERTagObjectIdentifier:
-    case 13: // RELATIVE-OID
-        return oidFault(content);
-    default:
-        return std::nullopt;
-    }
+nlohmann::ordered_json derValue(DERTag tag, const DERItem& content) {
+    std::uint64_t number = 0;
+    if (isOneOf(textTypes, tag) && !isConstructed(tag))
+        return escapedText(content);
+    if (tag == DERTagBoolean && content.length == 1)
+        return content.data[0] != 0;
+    if (tag == DERTagObjectIdentifier)
+        if (std::string numbers = oidText(content); !numbers.empty())
+            return numbers;
+    if (tag != DERTagInteger && tag != enumerated)
+        return content.length != 0 ? nlohmann::ordered_json(hexText(content)) : nlohmann::ordered_json();
+    if (DERParseInteger64(&content, &number) == DERSuccess)
+        return number;
+    if (content.length == 0 || content.length > sizeof number)
+        return "0x" + hexText(content);
+    number = (content.data[0] & 0x80) != 0 ? UINT64_MAX : 0;
+    for (std::uint64_t i = 0; i < content.length; ++i)
+        number = number << 8 | content.data[i];
+    return static_cast<std::int64_t>(number);
 }
 
 bool isConstructed(DERTag tag) {
@@ -205,44 +180,32 @@ bool isConstructed(DERTag tag) {
 
 std::string derTagName(DERTag tag) {
     constexpr const char* classes[] = {"universal", "application", "context", "private"};
-    const std::uint64_t number = numberOf(tag);
-    if (isUniversal(tag) && number < universalTypes.size()) {
-        const UniversalType& type = universalTypes[number];
-        const bool isUsual = (type.form == Constructed) == isConstructed(tag);
-        return (isUsual ? "" : isConstructed(tag) ? "constructed " : "primitive ") + std::string(type.name);
+    const std::uint64_t number = tag & DERTagNumberMask;
+    if (isUniversal(tag)) {
+        const bool isUsual = isOneOf(constructedTypes, tag) == isConstructed(tag);
+        return (isUsual ? "" : isConstructed(tag) ? "constructed " : "primitive ") + std::string(typeNames[number]);
     }
-    std::string name = classes[tag >> classShift];
-    if (tag >> classShift == 3 && isSpellable(number))
-        name += " " + quotedCode(number);
-    else
-        name += " [" + std::to_string(number) + "]";
-    return isConstructed(tag) ? name : name + " primitive";
+    const std::uint64_t tagClass = tag >> classShift;
+    return std::string(classes[tagClass]) + " " +
+           (tagClass == 3 && isSpelling(octetsOf(number)) ? quotedCode(number) : "[" + std::to_string(number) + "]") +
+           (isConstructed(tag) ? "" : " primitive");
 }
 
 std::string codeText(std::uint64_t number) {
-    const std::uint8_t octets[] = {static_cast<std::uint8_t>(number >> 24), static_cast<std::uint8_t>(number >> 16),
-                                   static_cast<std::uint8_t>(number >> 8), static_cast<std::uint8_t>(number)};
-    if (isSpellable(number))
-        return {std::begin(octets), std::end(octets)};
-    std::string digits;
-    for (; number != 0; number >>= 8)
-        digits.insert(0, hexOctet(static_cast<std::uint8_t>(number)));
-    return "0x" + (digits.empty() ? "00" : digits);
+    return codeOf(number, "");
 }
 
 std::string quotedCode(std::uint64_t number) {
-    return isSpellable(number) ? "\"" + codeText(number) + "\"" : codeText(number);
+    return codeOf(number, "\"");
 }
 
 std::string escapedText(const DERItem& text, std::uint64_t most) {
     std::string escaped;
-    for (std::uint64_t i = 0; i < std::min(text.length, most); ++i) {
-        const std::uint8_t octet = text.data[i];
-        if (isPrintable(octet) && octet != '\\')
-            escaped += static_cast<char>(octet);
+    for (std::uint64_t i = 0; i < std::min(text.length, most); ++i)
+        if (isPrintable(text.data[i]) && text.data[i] != '\\')
+            escaped += static_cast<char>(text.data[i]);
         else
-            escaped += "\\x" + hexOctet(octet);
-    }
+            escaped += "\\x" + hexText({text.data + i, 1});
     return escaped + (text.length > most ? "..." : "");
 }
 
@@ -251,14 +214,11 @@ std::string quotedText(const DERItem& text, std::uint64_t most) {
 }
 
 std::string hexText(const DERItem& data, std::uint64_t most) {
-    std::string digits;
-    for (std::uint64_t i = 0; i < std::min(data.length, most); ++i)
-        digits += hexOctet(data.data[i]);
-    return digits + (data.length > most ? "..." : "");
+    return hexadecimal({data.data, std::min(data.length, most)}) + (data.length > most ? "..." : "");
 }
 
-std::vector<std::uint8_t> derEncoding(DERTag tag, const DERItem& content) {
-    std::vector<std::uint8_t> encoding(DERLengthOfItem(tag, content.length));
+Octets derEncoding(DERTag tag, const DERItem& content) {
+    Octets encoding(DERLengthOfItem(tag, content.length));
     std::uint64_t written = 0;
     DEREncodeItemSized(tag, content.length, content.data, encoding.data(), encoding.size(), &written);
     return encoding;
@@ -268,7 +228,7 @@ std::string oidText(const DERItem& content, bool isNamed) {
     char text[128];
     if (content.length >= sizeof text) // each octet takes a character and more
         return "";
-    const auto encoding = derEncoding(DERTagObjectIdentifier, content);
+    const Octets encoding = derEncoding(DERTagObjectIdentifier, content);
     const std::uint8_t* place = encoding.data();
     const std::unique_ptr<ASN1_OBJECT, decltype(&ASN1_OBJECT_free)> object(
         d2i_ASN1_OBJECT(nullptr, &place, static_cast<long>(encoding.size())), ASN1_OBJECT_free);

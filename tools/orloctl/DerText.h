@@ -1,5 +1,5 @@
 // Words for DER: what an item is called, what its content says, and in which octet and by which rule an encoding is
-// refused. Offsets here are relative to the item at hand.
+// refused.
 #ifndef VELTRA_TOOLS_ORLOCTL_DERTEXT_H
 #define VELTRA_TOOLS_ORLOCTL_DERTEXT_H
 
@@ -10,20 +10,23 @@
 #include <string>
 #include <vector>
 
+#include <nlohmann/json.hpp>
+
 struct DerFault {
-    std::uint64_t offset;
+    const std::uint8_t* place;
     std::string reason; // a clause without a full stop
 };
 
 // A clause for an item that cannot be decoded.
 std::string derFaultText(const DERRefusal& refusal);
 
-// Why DERDecodeItem refuses the item at the start of `der`; nothing when it does not.
-std::optional<DerFault> derHeaderFault(const DERItem& der);
-
 // Why the content of an item with the given tag is not DER, as far as its universal type tells; nothing when it is, and
 // for types without rules of their own. The items inside a constructed content are not looked at.
 std::optional<DerFault> derContentFault(DERTag tag, const DERItem& content);
+
+// What the content of a primitive item says: a truth, a number, numbers with dots, a text, or else its octets in
+// hexadecimal; null when there are none.
+nlohmann::ordered_json derValue(DERTag tag, const DERItem& content);
 
 bool isConstructed(DERTag tag);
 

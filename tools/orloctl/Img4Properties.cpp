@@ -2,15 +2,14 @@
 
 #include <set>
 
+#include "platform/Crypto.h"
 #include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
 #include "tools/orloctl/Img4Words.h"
 
-namespace img4show {
+namespace {
 
 using nlohmann::ordered_json;
-
-namespace {
 
 constexpr unsigned deepestDictionary = 8;
 
@@ -20,125 +19,81 @@ bool looksLikeDictionary(const DERItem& content) {
            (DERDecodeItem(&content, &first) == DERSuccess && first.tag == Img4PropertyTag(first.tag));
 }
 
-class Reader {
-public:
-    // Without `findings` the properties are only shown.
-    Reader(const DERItem& file, Findings* findings) : file_(file), findings_(findings) {}
-
-    Elements dictionary(const DERItem& content, const std::string& where, unsigned depth) const {
-        return [reader = *this, content, where, depth](const auto& take) { reader.walk(content, where, depth, take); };
-    }
-
-private:
-    void walk(const DERItem& content, const std::string& where, unsigned depth,
-              const std::function<bool(const Element&)>& take) const;
-    Element describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
-                     unsigned depth) const;
-    void describeValue(const Img4Property& property, const std::string& what, unsigned depth, Element& shown) const;
-    void valueFault(const Img4Property& property, const std::string& what, const std::string& reason,
-                    ordered_json& json) const;
-    void fault(const std::uint8_t* place, const std::string& reason) const {
-        if (findings_)
-            findings_->fault(place, reason);
-    }
-
-    DERItem file_;
-    Findings* findings_;
-};
-
-void Reader::walk(const DERItem& content, const std::string& where, unsigned depth,
-                  const std::function<bool(const Element&)>& take) const {
-    std::set<DERTag> seen;
-    DerItems elements(content);
-    while (elements.next()) {
-        Element property = describe(elements.item(), elements.encoding(), where, depth);
-        if (!seen.insert(elements.item().tag).second)
-            property.json["hidden"] = "behind an earlier one of that tag, which a lookup takes";
-        if (!take(property))
-            return;
-    }
-    if (elements.isBroken() && findings_)
-        findings_->headerFault(elements.encoding(), "A property of " + where);
+void setFault(ordered_json& json, const std::string& reason, std::ptrdiff_t offset) {
+    json["fault"] = reason;
+    json["faultOffset"] = offset;
 }
 
+// Why the value is none of its type that can be asked for, in a clause whose subject is the property.
+std::string valueReason(const Img4Property& property) {
+    std::uint64_t number = 0;
+    if (property.valueTag == DERTagInteger)
+        return DERParseInteger64(&property.value, &number) == DERSuccess ? "" : numberReason(property.value, 64);
+    const auto fault = derContentFault(property.valueTag, property.value);
+    return fault ? "has a value that is not DER: " + fault->reason : "";
+}
+
+Elements propertiesIn(const DERItem& content, const std::uint8_t* file, unsigned depth);
+
 // One element of a dictionary, which should be a property.
-Element Reader::describe(const DERDecodedInfo& element, const DERItem& encoding, const std::string& where,
-                         unsigned depth) const {
-    const std::uint64_t number = element.tag & DERTagNumberMask;
-    const std::string place = std::to_string(encoding.data - file_.data);
+Element describe(const DERDecodedInfo& element, const DERItem& encoding, const std::uint8_t* file, unsigned depth) {
     Img4Property property;
     Img4Refusal refusal;
     const DERReturn result = DERImg4DecodePropertyExplained(&element.content, element.tag, &property, &refusal);
     const bool isProperty = refusal.fault != Img4FaultTag;
-    Element shown{
-        {{"name", isProperty ? codeText(number) : derTagName(element.tag)}, {"offset", encoding.data - file_.data}},
-        {}};
-    const std::string what = (isProperty ? quotedCode(number) : derTagName(element.tag)) + " of " + where;
-    if (result == DERSuccess) {
-        describeValue(property, what, depth, shown);
+    const std::string name = isProperty ? codeText(element.tag & DERTagNumberMask) : derTagName(element.tag);
+    Element shown{{{"name", name}, {"offset", encoding.data - file}}, {}};
+    ordered_json& json = shown.json;
+    if (result != DERSuccess) {
+        setFault(json, propertyReason(refusal), (isProperty ? refusal.place : encoding.data) - file);
+        return shown;
+    }
+    const DERItem& value = property.value;
+    const bool isDictionary = property.valueTag == DERTagSet || property.valueTag == DERTagSequence;
+    json["type"] = derTagName(property.valueTag);
+    if (const std::string reason = valueReason(property); !reason.empty()) {
+        setFault(json, reason, value.data - file);
+        json["hex"] = hexText(value);
+    } else if (isDictionary && depth < deepestDictionary && looksLikeDictionary(value)) {
+        json["properties"] = shown.lists.add(propertiesIn(value, file, depth + 1));
+    } else if (property.valueTag == DERTagBoolean || property.valueTag == DERTagInteger ||
+               property.valueTag == DERTagIA5String) {
+        json["value"] = derValue(property.valueTag, value);
+        if (value.length > mostCharactersShown)
+            json["sha256"] = digestText(value, crypto::sha256Size);
     } else {
-        shown.json["fault"] = propertyReason(refusal);
-        if (isProperty)
-            fault(refusal.place, what + ", which begins at offset " + place + ", " + propertyReason(refusal));
-        else
-            fault(encoding.data, what + " is no property");
+        json.update(dataJson(value));
     }
     return shown;
 }
 
-void Reader::valueFault(const Img4Property& property, const std::string& what, const std::string& reason,
-                        ordered_json& json) const {
-    fault(property.value.data, what + " " + reason);
-    json["fault"] = reason;
-    json["hex"] = hexText(property.value);
+Elements propertiesIn(const DERItem& content, const std::uint8_t* file, unsigned depth) {
+    return [=](const auto& take) {
+        std::set<DERTag> seen;
+        DerItems elements(content);
+        while (elements.next()) {
+            Element property = describe(elements.item(), elements.encoding(), file, depth);
+            if (!seen.insert(elements.item().tag).second)
+                property.json["hidden"] = "behind an earlier one of that tag, which a lookup takes";
+            if (!take(property))
+                return;
+        }
+        if (const DERRefusal* why = elements.refusal()) {
+            Element broken{{{"name", "the rest"}, {"offset", elements.encoding().data - file}}, {}};
+            setFault(broken.json, "is no strict DER: " + derFaultText(*why), why->place - file);
+            take(broken);
+        }
+    };
 }
 
-void Reader::describeValue(const Img4Property& property, const std::string& what, unsigned depth,
-                           Element& shown) const {
-    const DERItem& value = property.value;
-    ordered_json& json = shown.json;
-    bool truth = false;
-    std::uint64_t number = 0;
-    json["type"] = derTagName(property.valueTag);
-    switch (property.valueTag) {
-    case DERTagBoolean:
-        if (DERParseBoolean(&value, &truth) == DERSuccess)
-            json["value"] = truth;
-        else
-            valueFault(property, what, "is a BOOLEAN that is not 00 or FF", json);
-        break;
-    case DERTagInteger:
-        if (DERParseInteger64(&value, &number) == DERSuccess)
-            json["value"] = number;
-        else
-            valueFault(property, what, numberReason(value, 64), json);
-        break;
-    case DERTagIA5String:
-        json["value"] = escapedText(value);
-        if (value.length > mostCharactersShown)
-            json["sha256"] = sha256Text(value);
-        break;
-    case DERTagSet:
-    case DERTagSequence:
-        if (depth < deepestDictionary && looksLikeDictionary(value))
-            json["properties"] =
-                shown.lists.add(dictionary(value, quotedCode(property.tag & DERTagNumberMask), depth + 1));
-        else
-            json.update(dataJson(value));
-        break;
-    default:
-        if (const auto why = derContentFault(property.valueTag, value))
-            valueFault(property, what, "has a value that is not DER: " + why->reason, json);
-        else
-            json.update(dataJson(value));
-        break;
-    }
-}
-
-void goThrough(const Elements& properties) {
-    properties([](const Element& property) {
+void check(const Elements& properties, const std::string& where, Findings& findings) {
+    properties([&](const Element& property) {
+        const std::string name = "\"" + property.json["name"].get<std::string>() + "\"";
+        if (property.json.contains("fault"))
+            findings.fault(findings.file().data + property.json["faultOffset"].get<std::ptrdiff_t>(),
+                           name + " of " + where + " " + property.json["fault"].get<std::string>());
         if (property.json.contains("properties"))
-            goThrough(property.lists.at(property.json["properties"]));
+            check(property.lists.at(property.json["properties"]), name, findings);
         return true;
     });
 }
@@ -146,8 +101,7 @@ void goThrough(const Elements& properties) {
 } // namespace
 
 Elements readProperties(const DERItem& content, const std::string& where, Findings& findings) {
-    goThrough(Reader(findings.file(), &findings).dictionary(content, where, 0));
-    return Reader(findings.file(), nullptr).dictionary(content, where, 0);
+    Elements properties = propertiesIn(content, findings.file().data, 0);
+    check(properties, where, findings);
+    return properties;
 }
-
-} // namespace img4show

@@ -3,8 +3,6 @@
 #include "der/DERDecode.h"
 #include "tools/orloctl/DerText.h"
 
-namespace img4show {
-
 namespace {
 
 // A part of a file: what it is called, its fields by the row that takes them, its number and the last that there is.
@@ -109,16 +107,14 @@ std::string propertyReason(const Img4Refusal& refusal) {
 }
 
 std::string lookupReason(const Img4Refusal& refusal) {
-    std::string owner = refusal.subject == Img4SubjectBody   ? "the manifest's body"
-                        : refusal.subject == Img4SubjectManb ? "\"MANB\""
-                                                             : "the manifest";
+    const char* const owner = refusal.subject == Img4SubjectBody   ? "The manifest's body"
+                              : refusal.subject == Img4SubjectManb ? "\"MANB\""
+                                                                   : "The manifest";
     const std::string code = quotedCode(refusal.tag & DERTagNumberMask);
-    if (refusal.fault != Img4FaultAbsent && refusal.tag != 0)
-        return code + " of " + owner + " " + propertyReason(refusal);
-    if (owner[0] == 't')
-        owner[0] = 'T';
-    return owner + (refusal.tag != 0 ? " has no " + code
-                                     : " has an element that is no strict DER: " + derFaultText(refusal.encoding));
+    if (refusal.tag == 0)
+        return std::string(owner) + " has an element that is no strict DER: " + derFaultText(refusal.encoding);
+    return std::string(owner) + " has " +
+           (refusal.fault == Img4FaultAbsent ? "no " + code : "a " + code + " that " + propertyReason(refusal));
 }
 
 std::string numberReason(const DERItem& number, unsigned bits) {
@@ -127,5 +123,3 @@ std::string numberReason(const DERItem& number, unsigned bits) {
     return result == DERDecodeError ? "is no non-negative INTEGER in its shortest form"
                                     : "does not fit " + std::to_string(bits) + " bits";
 }
-
-} // namespace img4show

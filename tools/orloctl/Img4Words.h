@@ -6,8 +6,6 @@
 
 #include "img4/Img4.h"
 
-namespace img4show {
-
 constexpr std::uint64_t mostCharactersShown = 256;
 
 // "container", "payload", "manifest", "unsigned manifest", and "file" for what is none of them.
@@ -24,7 +22,5 @@ std::string lookupReason(const Img4Refusal& refusal);
 
 // Why the number in the content of an INTEGER is none of at most `bits` bits, in such a clause.
 std::string numberReason(const DERItem& number, unsigned bits);
-
-} // namespace img4show
 
 #endif

@@ -80,9 +80,9 @@ private:
     std::size_t depth_ = 0;
 };
 
-// How people see a member. In the line of an element, {name} is the value of that name, {name:8} the same to the right
-// of 8 columns and {"name"} in quotes when it is a text. A part in brackets is left out where a value of it is missing,
-// and a tab stands for the indentation, which otherwise comes first.
+// How people see a member. The line of an element consists of parts between strokes, each of which is left out when the
+// element has no value of the name in braces: {name} is the value, {name:8} the same to the right of 8 columns and
+// {"name"} in quotes when it is a text. A tab stands for the indentation, which otherwise comes first.
 struct Layout {
     std::string_view name;
     std::uint64_t most;  // elements of a list, those inside them counted too
@@ -92,29 +92,28 @@ struct Layout {
 };
 
 constexpr std::uint64_t all = std::numeric_limits<std::uint64_t>::max();
-constexpr std::string_view property = "{name}[  {type}][ {\"value\"}][, {length} octets][: {hex}][ (SHA-256 {sha256})]"
-                                      "[  WRONG: {fault}][  hidden {hidden}]";
+constexpr std::string_view property = "{name}|  {type}| {\"value\"}|, {length} octets|: {hex}| (SHA-256 {sha256})|"
+                                      "  WRONG: {fault}|  hidden {hidden}";
 constexpr Layout layouts[] = {
     {"", 1000, 512},
     {"notes", 1000, 2048},
     {"result", all, SIZE_MAX},
     {"response", all, SIZE_MAX},
-    {"items", 10000, 128, "{offset:8}{headerLength:5}{contentLength:9}\t{tag}[ {value}][  not DER: {fault}]",
+    {"items", 10000, 128, "{offset:8}|{headerLength:5}|{contentLength:9}|\t{tag}| {value}|  not DER: {fault}",
      "  offset  hdr  content  item"},
-    {"payload", 1000, 128,
-     "{\"key\"}  comment {\"comment\"}[  data {data}][  string {\"string\"}][  deleted {deleted}]"},
-    {"metadata", 1000, 128, "{\"key\"}[  data {data}][  string {\"string\"}]"},
+    {"payload", 1000, 128, "{\"key\"}|  comment {\"comment\"}|  data {data}|  string {\"string\"}|  deleted {deleted}"},
+    {"metadata", 1000, 128, "{\"key\"}|  data {data}|  string {\"string\"}"},
     {"properties", 10000, 128, property},
     {"body", 10000, 128, property},
     {"manifestProperties", 10000, 128, property},
-    {"certificates", 100, 128, "{length} octets at offset {offset}"},
+    {"certificates", 100, 128, "{length} octets| at offset {offset}"},
     {"chain", 1000, 512,
-     "{number}  {role}[  {subject}; issuer {issuer}; {key}; {signatureAlgorithm}; serial number {serialNumber}]"
-     "[  {fault}]"},
-    {"constraints", 1000, 512, "{dictionary} {name} {demand}: {state}[, found {found}]"},
-    {"logs", all, SIZE_MAX, "{date}{size:14}  {panic:5}  {name}[  copied to {copy}][  {note}]",
+     "{number}|  {role}|  {subject}|; issuer {issuer}|; {key}|; {signatureAlgorithm}|; serial number {serialNumber}|"
+     "  {fault}"},
+    {"constraints", 1000, 512, "{dictionary}| {name}| {demand}|: {state}|, found {found}"},
+    {"logs", all, SIZE_MAX, "{date}|{size:14}|  {panic:5}|  {name}|  copied to {copy}|  {note}",
      "  DATE                          SIZE  PANIC  NAME"},
-    {"missed", all, SIZE_MAX, "{name}: {note}"},
+    {"missed", all, SIZE_MAX, "{name}|: {note}"},
 };
 
 // That of the member, or without one of its own that of what it is in.
@@ -136,38 +135,24 @@ std::string valueText(const ordered_json& json, std::size_t longest, bool isQuot
     return text.size() == whole.size() ? shown : shown + " (" + std::to_string(whole.size()) + " characters)";
 }
 
-// What stands for a field of a layout.
-std::string fieldText(std::string_view field, const ordered_json& element, std::size_t longest, bool& isThere) {
-    const bool isQuoted = field.front() == '"';
-    const std::size_t colon = field.find(':');
-    const auto member = element.find(isQuoted ? field.substr(1, field.size() - 2) : field.substr(0, colon));
-    isThere = isThere && member != element.end();
-    const std::string text = member != element.end() ? valueText(*member, longest, isQuoted) : "";
-    const std::size_t width = colon == std::string_view::npos ? 0 : std::stoul(std::string(field.substr(colon + 1)));
-    return std::string(width - std::min(width, text.size()), ' ') + text;
-}
-
 std::string lineOf(const ordered_json& element, const Layout& layout, const std::string& indentation) {
-    std::string_view rest = layout.line;
-    std::string text = rest.find('\t') == std::string_view::npos ? indentation : "";
-    std::size_t part = 0;
-    bool isThere = true;
-    while (!rest.empty()) {
-        const char character = rest.front();
-        rest.remove_prefix(1);
-        if (character == '{') {
-            const std::string_view field = rest.substr(0, rest.find('}'));
-            rest.remove_prefix(field.size() + 1);
-            text += fieldText(field, element, layout.longest, isThere);
-        } else if (character == '[') {
-            part = text.size();
-            isThere = true;
-        } else if (character == ']')
-            text.resize(isThere ? text.size() : part);
-        else if (character == '\t')
-            text += indentation;
-        else
-            text += character;
+    const bool isIndented = layout.line.find('\t') == std::string_view::npos;
+    std::string text = isIndented ? indentation : "";
+    for (std::string_view rest = layout.line; !rest.empty();) {
+        const std::string_view part = rest.substr(0, rest.find('|'));
+        rest.remove_prefix(std::min(rest.size(), part.size() + 1));
+        const std::size_t open = part.find('{'), close = part.find('}');
+        const std::string_view field = part.substr(open + 1, close - open - 1);
+        const bool isQuoted = field.front() == '"';
+        const std::size_t colon = field.find(':');
+        const auto member = element.find(isQuoted ? field.substr(1, field.size() - 2) : field.substr(0, colon));
+        if (member == element.end())
+            continue;
+        const std::string value = valueText(*member, layout.longest, isQuoted);
+        const std::size_t width = colon == field.npos ? 0 : std::stoul(std::string(field.substr(colon + 1)));
+        text += part.front() == '\t' ? indentation : std::string(part.substr(0, open));
+        text += std::string(width - std::min(width, value.size()), ' ') + value;
+        text += part.substr(close + 1);
     }
     return text;
 }
@@ -258,7 +243,7 @@ private:
 
 void writeJson(std::ostream& out, const Report& report) {
     JsonWriter writer(out);
-    ordered_json json{{"exitStatus", static_cast<int>(report.outcome())}};
+    ordered_json json{{"exitStatus", static_cast<int>(report.outcome)}};
     json.update(report.json);
     if (!report.problem.empty())
         json["problem"] = report.problem;

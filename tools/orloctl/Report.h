@@ -60,12 +60,15 @@ enum class Outcome {
 struct Report { // NOLINT(bugprone-exception-escape): moving JSON asserts, which throws nothing here
     nlohmann::ordered_json json = nlohmann::ordered_json::object();
     Lists lists = {};
-    bool ok = true;
-    std::string problem = {}; // a sentence that says what is wrong and where; empty when ok
+    Outcome outcome = Outcome::Success;
+    std::string problem = {}; // sentences that say what is wrong and where; empty on success
     std::string note = {};    // what the JSON does not say and the user should know
-    Outcome failure = Outcome::BadInput;
 
-    Outcome outcome() const { return ok ? Outcome::Success : failure; }
+    bool ok() const { return outcome == Outcome::Success; }
+    void fail(std::string why, Outcome how = Outcome::BadInput) {
+        problem = std::move(why);
+        outcome = how;
+    }
 };
 
 // Writes the report as one JSON object, whole, with its lists in their places, beginning with "exitStatus". An integer

@@ -90,21 +90,21 @@ BlobAnswer setBcfg(const ServiceAddress& address, const std::string& devicePath)
     const FileDescriptor lock = openLock();
     BlobAnswer found;
     if (!take(lock, address.deadline())) {
-        found.answer.problem = noAnswerReason(address) + " while another orloctl has a configuration blob rewritten. " +
-                               "The request was not sent.";
+        found.answer.report.fail(
+            noAnswerReason(address) +
+                " while another orloctl has a configuration blob rewritten. The request was not sent.",
+            Outcome::Unreachable);
         return found;
     }
     const BlobResult result;
     found.answer = sendRequest(address, "setGlobalbCfg", {{"bcfgDataPath", devicePath}});
-    if (found.answer.outcome != Outcome::Success)
+    if (!found.answer.report.ok())
         return found;
     if (found.answer.serviceUser)
         found.result = result.read(*found.answer.serviceUser, devicePath);
     else
         found.result.problem = "The service has left the bus, so that nobody knows whose the result must be.";
-    if (!found.result.problem.empty()) {
-        found.answer.outcome = Outcome::Failure;
-        found.answer.problem = found.result.problem;
-    }
+    if (!found.result.problem.empty())
+        found.answer.report.fail(found.result.problem, Outcome::Failure);
     return found;
 }

@@ -1,5 +1,3 @@
-#include "tools/orloctl/ShowBcfg.h"
-
 #include <cstdarg>
 #include <cstdio>
 #include <limits>
@@ -10,6 +8,7 @@
 #include "sysconfig/SysConfig3.h"
 #include "sysconfig/SysConfig3Ptr.h"
 #include "tools/orloctl/DerText.h"
+#include "tools/orloctl/ShowFile.h"
 
 namespace {
 
@@ -176,8 +175,7 @@ std::string reason(const SysConfig3Refusal& refusal, const std::string& said, co
 
 Report refused(const std::string& why, const Messages& said) {
     Report report;
-    report.ok = false;
-    report.problem = "No configuration blob. " + why;
+    report.fail("No configuration blob. " + why);
     addMessages(report.json, said);
     return report;
 }
@@ -207,9 +205,7 @@ Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
     addMessages(report.json, said);
     if (const auto behind = blob.data() + blob.size() - refusal.place; behind != 0)
         report.json["octetsBehind"] = behind;
-    if (report.json["hmacState"] == "do not match") {
-        report.ok = false;
-        report.problem = "The HMACs do not match the entries under this key.";
-    }
+    if (report.json["hmacState"] == "do not match")
+        report.fail("The HMACs do not match the entries under this key.");
     return report;
 }

@@ -5,9 +5,6 @@
 
 #include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/LocalFiles.h"
-#include "tools/orloctl/ShowBcfg.h"
-#include "tools/orloctl/ShowDer.h"
-#include "tools/orloctl/ShowImg4.h"
 
 namespace {
 
@@ -42,32 +39,32 @@ std::string formatOf(const DERItem& file) {
 
 } // namespace
 
-std::string pemProblem(const DERItem& file) {
+bool isPem(Findings& findings) {
     constexpr std::string_view mark = "-----BEGIN ";
     constexpr std::size_t longestPreface = 4096;
-    const std::string_view text = textOf(file).substr(0, longestPreface);
+    const std::string_view text = textOf(findings.file()).substr(0, longestPreface);
     const std::size_t place = text.find(mark);
     if (place == std::string_view::npos || (place != 0 && text[place - 1] != '\n') || !isText(text.substr(0, place)))
-        return "";
-    return "The file is PEM, text in which DER stands as base64, at offset " + std::to_string(place) +
-           ": turn it into DER first, for instance with openssl.";
+        return false;
+    findings.fault(findings.file().data + place, "The file is PEM, text in which DER stands as base64, which has to be "
+                                                 "turned into DER first, for instance with openssl");
+    return true;
 }
 
 Report showFile(const Value::Data& file, std::string format, const std::optional<Value::Data>& hmacKey) {
     const DERItem item = {file.data(), file.size()};
     Report report;
-    if (report.problem = pemProblem(item); !report.problem.empty()) {
-        report.ok = false;
-        report.json["format"] = "pem";
-        return report;
-    }
-    if (format.empty())
+    Findings findings(item, report);
+    if (isPem(findings))
+        format = "pem";
+    else if (format.empty())
         format = formatOf(item);
     if (hmacKey && format != "bcfg")
         throw UsageError("An HMAC key is for a configuration blob, and the file is none");
-    report = format == "bcfg"   ? showBcfg(file, hmacKey.value_or(Value::Data()))
-             : format == "img4" ? showImg4(item.data, item.length)
-                                : showDer(item.data, item.length);
+    if (format == "bcfg")
+        report = showBcfg(file, hmacKey.value_or(Value::Data()));
+    else if (format != "pem")
+        report = format == "img4" ? showImg4(item) : showDer(item);
     nlohmann::ordered_json json{{"format", format}};
     json.update(report.json);
     report.json = std::move(json);

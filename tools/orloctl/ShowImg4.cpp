@@ -1,67 +1,62 @@
-#include "tools/orloctl/ShowImg4.h"
-
 #include "img4/Img4.h"
+#include "platform/Crypto.h"
 #include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
-#include "tools/orloctl/Img4Findings.h"
+#include "tools/orloctl/Findings.h"
 #include "tools/orloctl/Img4Properties.h"
 #include "tools/orloctl/Img4Words.h"
+#include "tools/orloctl/ShowFile.h"
 
 namespace {
 
-using namespace img4show;
 using nlohmann::ordered_json;
-
-// The content of the item at the start of `encoding`; absent when there is none.
-DERItem contentOf(const DERItem& encoding) {
-    DerItems items(encoding);
-    return items.next() ? items.item().content : DERItem{};
-}
 
 // Turns what the decoder has read of a file into JSON. The findings go into `report`.
 class Reader {
 public:
-    Reader(const DERItem& file, Report& report) : whole_(file), report_(report), findings_(file, report) {}
+    Reader(const DERItem& file, Report& report) : report_(report), findings_(file, report) {}
 
     void read();
 
 private:
+    ordered_json section(const DERItem& raw, const char* what);
     ordered_json payload();
     ordered_json compression(const DERItem& content);
-    ordered_json payloadProperties();
     ordered_json manifest(bool isSigned);
-    void addBody(ordered_json& json);
     ordered_json certificates(const DERItem& content);
     void addRestoreInfo();
 
-    // The decoder does not look behind the SEQUENCE in a context item or in a bare payload, so it is no fault.
-    void noteRest(const DERItem& outer, const char* what);
+    DERItem contentOf(const DERItem& outer, const char* what);
     ordered_json properties(const DERItem& dictionary, const std::string& where) {
         return report_.lists.add(readProperties(dictionary, where, findings_));
     }
-    void addDigests(const DERItem& raw, ordered_json& json) const;
 
-    DERItem whole_;
     Report& report_;
     Findings findings_;
     Img4Record record_ = {};
 };
 
-void Reader::noteRest(const DERItem& outer, const char* what) {
+// The content of the item at the start of `outer`, absent when there is none. The decoder does not look behind the item
+// in a context item or in a bare payload, so what is there is no fault.
+DERItem Reader::contentOf(const DERItem& outer, const char* what) {
     DerItems items(outer);
-    if (!items.next() || items.encoding().length == outer.length)
-        return;
-    const std::uint8_t* end = outer.data + items.encoding().length;
-    findings_.note(std::string(what) + " is followed by octets that belong to nothing, " +
-                   std::to_string(outer.length - items.encoding().length) + " of them, " + findings_.at(end));
+    if (!items.next())
+        return {};
+    if (const std::uint64_t rest = outer.length - items.encoding().length; rest != 0)
+        findings_.note(std::string(what) + " is followed by octets that belong to nothing, " + std::to_string(rest) +
+                       " of them, at offset " +
+                       std::to_string(findings_.offsetOf(outer.data + items.encoding().length)));
+    return items.item().content;
 }
 
-void Reader::addDigests(const DERItem& raw, ordered_json& json) const {
-    json["offset"] = findings_.offsetOf(raw.data);
-    json["length"] = raw.length;
-    json["sha1"] = sha1Text(raw);
-    json["sha256"] = sha256Text(raw);
-    json["sha384"] = sha384Text(raw);
+// Where the section is that the decoder digests, and what it is called.
+ordered_json Reader::section(const DERItem& raw, const char* what) {
+    contentOf(raw, what);
+    return {{"offset", findings_.offsetOf(raw.data)},
+            {"length", raw.length},
+            {"sha1", digestText(raw, crypto::sha1Size)},
+            {"sha256", digestText(raw, crypto::sha256Size)},
+            {"sha384", digestText(raw, crypto::sha384Size)}};
 }
 
 // The decoder looks at the size only when it is asked for.
@@ -81,21 +76,10 @@ ordered_json Reader::compression(const DERItem& content) {
     return json;
 }
 
-ordered_json Reader::payloadProperties() {
-    DERItem content;
-    if (Img4DecodeGetPayloadProperties(&record_, &content) != DERSuccess)
-        return {};
-    DerItems fields(contentOf(content));
-    noteRest(content, "The SEQUENCE of payload properties");
-    return fields.next() && fields.next() && fields.item().tag == DERTagSet
-               ? properties(fields.item().content, "the payload")
-               : ordered_json::array();
-}
-
 ordered_json Reader::payload() {
     const Img4PayloadRecord& payload = record_.payload;
-    ordered_json json = ordered_json::object();
-    addDigests(record_.payloadRaw, json);
+    ordered_json json = section(record_.payloadRaw, "The payload");
+    DERItem encoding;
     if (payload.type.data != nullptr)
         json["type"] = escapedText(payload.type);
     if (payload.version.data != nullptr)
@@ -108,8 +92,11 @@ ordered_json Reader::payload() {
         json["keybag"] = dataJson(payload.keybag);
     if (payload.compression.data != nullptr)
         json["compression"] = compression(payload.compression);
-    if (ordered_json found = payloadProperties(); !found.is_null())
-        json["properties"] = std::move(found);
+    if (Img4DecodeGetPayloadProperties(&record_, &encoding) == DERSuccess) {
+        DerItems fields(contentOf(encoding, "The SEQUENCE of payload properties"));
+        if (fields.next() && fields.next() && fields.item().tag == DERTagSet)
+            json["properties"] = properties(fields.item().content, "the payload");
+    }
     return json;
 }
 
@@ -120,34 +107,30 @@ ordered_json Reader::certificates(const DERItem& content) {
         if (items.item().tag != DERTagSequence)
             findings_.fault(items.encoding().data, "Certificate " + std::to_string(count) + " of the chain is " +
                                                        derTagName(items.item().tag) + " instead of SEQUENCE");
-    if (items.isBroken())
-        findings_.headerFault(items.encoding(), "Certificate " + std::to_string(count) + " of the chain");
-    return report_.lists.add([content, file = whole_.data](const auto& take) {
+    if (const DERRefusal* why = items.refusal())
+        findings_.fault(*why, "Certificate " + std::to_string(count) + " of the chain");
+    return report_.lists.add([content, file = findings_.file().data](const auto& take) {
         DerItems list(content);
         while (list.next() && take({{{"offset", list.encoding().data - file}, {"length", list.encoding().length}}, {}}))
             ;
     });
 }
 
-void Reader::addBody(ordered_json& json) {
-    DERItem manb;
-    DERItem manp;
-    Img4Refusal refusal;
-    json["body"] = properties(contentOf(record_.manifest.body), "the manifest body");
-    if (Img4DecodeFindDictionariesExplained(&record_, &manb, &manp, &refusal) != DERSuccess)
-        findings_.fault(refusal.place, lookupReason(refusal) + ", so that every lookup fails");
-}
-
 ordered_json Reader::manifest(bool isSigned) {
     const Img4ManifestRecord& manifest = record_.manifest;
-    ordered_json json = ordered_json::object();
+    ordered_json json = section(record_.manifestRaw, "The manifest");
     std::uint32_t version = 0;
-    addDigests(record_.manifestRaw, json);
     json["signed"] = isSigned;
     if (manifest.version.data != nullptr && DERParseInteger(&manifest.version, &version) == DERSuccess)
         json["version"] = version;
-    if (manifest.body.data != nullptr)
-        addBody(json);
+    if (manifest.body.data != nullptr) {
+        DERItem manb;
+        DERItem manp;
+        Img4Refusal refusal;
+        json["body"] = properties(contentOf(manifest.body, "The manifest's body"), "the manifest body");
+        if (Img4DecodeFindDictionariesExplained(&record_, &manb, &manp, &refusal) != DERSuccess)
+            findings_.fault(refusal.place, lookupReason(refusal) + ", so that every lookup fails");
+    }
     if (manifest.signature.data != nullptr)
         json["signature"] = dataJson(manifest.signature);
     if (manifest.certChain.data != nullptr)
@@ -156,7 +139,9 @@ ordered_json Reader::manifest(bool isSigned) {
 }
 
 void Reader::addRestoreInfo() {
-    DerItems fields(contentOf(whole_));
+    DerItems outer(findings_.file());
+    outer.next();
+    DerItems fields(outer.item().content);
     while (fields.next() && fields.item().tag != DERTagContextConstructed(1))
         ;
     if (fields.item().tag != DERTagContextConstructed(1))
@@ -166,26 +151,23 @@ void Reader::addRestoreInfo() {
     if (record_.restoreInfo.properties.data != nullptr)
         json["properties"] = properties(record_.restoreInfo.properties, "the restore information");
     report_.json["restoreInfo"] = std::move(json);
-    noteRest(encoding, "The restore information");
+    contentOf(encoding, "The restore information");
 }
 
 void Reader::read() {
+    const DERItem& file = findings_.file();
     Img4Kind kind = Img4KindUnknown;
     Img4Refusal refusal = {};
-    report_.json["length"] = whole_.length;
-    if (Img4DecodeInitExplained(whole_.data, whole_.length, &record_, &kind, &refusal) != DERSuccess)
-        findings_.fault(refusal.place, fileReason(whole_, refusal));
+    refusal.place = file.data;
+    report_.json["length"] = file.length;
+    if (Img4DecodeInitExplained(file.data, file.length, &record_, &kind, &refusal) != DERSuccess)
+        findings_.fault(refusal.place, fileReason(file, refusal));
     if (kind != Img4KindUnknown)
         report_.json["kind"] = kindName(kind);
-    if (record_.payloadRaw.data != nullptr) {
+    if (record_.payloadRaw.data != nullptr)
         report_.json["payload"] = payload();
-        noteRest(record_.payloadRaw, "The payload");
-    }
-    if (record_.manifestRaw.data != nullptr) {
+    if (record_.manifestRaw.data != nullptr)
         report_.json["manifest"] = manifest(kind != Img4KindUnsignedManifest);
-        if (kind == Img4KindContainer)
-            noteRest(record_.manifestRaw, "The manifest");
-    }
     if (kind == Img4KindContainer)
         addRestoreInfo();
     report_.json["notes"] = findings_.notes();
@@ -193,8 +175,8 @@ void Reader::read() {
 
 } // namespace
 
-Report showImg4(const std::uint8_t* data, std::size_t length) {
+Report showImg4(const DERItem& file) {
     Report report;
-    Reader({data, length}, report).read();
+    Reader(file, report).read();
     return report;
 }

@@ -17,7 +17,6 @@
 
 #include "Daemon/Conversions.h"
 #include "platform/Crypto.h"
-#include "platform/linux/system/JsonReader.h"
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/Client.h"
 #include "tools/orloctl/Completion.h"
@@ -58,29 +57,15 @@ private:
     const CLI::App& verb_;
 };
 
-Report reportOf(const Answer& answer) {
-    Report report;
-    if (!answer.response.empty())
-        report.json["response"] = jsonFromValue(answer.response);
-    report.ok = answer.outcome == Outcome::Success;
-    report.failure = answer.outcome;
-    report.problem = answer.problem;
-    return report;
-}
-
-// The result is copied to the file that -o names, if any. A copy that fails does not take the answer along.
-Report reportOfCopy(const Answer& answer, const Words& words, const Value::Data& result) {
-    Report report = reportOf(answer);
+// Copies a result to the file that -o names, if any. A copy that fails does not take the answer along.
+void copyResult(Report& report, const Words& words, const Value::Data& result) {
     try {
         if (const auto path = words.find("--output"))
             writeLocalFile(*path, result);
     } catch (const UsageError& failure) {
         report.note = failure.what();
-        report.ok = false;
-        report.failure = Outcome::Usage;
-        report.problem = "The request was carried out, but its result was not copied.";
+        report.fail("The request was carried out, but its result was not copied.", Outcome::Usage);
     }
-    return report;
 }
 
 std::string placeOf(const std::string& path, const Value::Data& contents) {
@@ -90,21 +75,20 @@ std::string placeOf(const std::string& path, const Value::Data& contents) {
 // A request with no arguments, or the operand under a key.
 auto request(const char* command, const char* key = nullptr, const char* operand = nullptr) {
     return [=](const ServiceAddress& address, const Words& words) {
-        return reportOf(
-            sendRequest(address, command, key ? Value::Dictionary{{key, words[operand]}} : Value::Dictionary()));
+        return sendRequest(address, command, key ? Value::Dictionary{{key, words[operand]}} : Value::Dictionary())
+            .report;
     };
 }
 
 Report call(const ServiceAddress& address, const Words& words) {
-    return reportOf(sendRequest(address, words["COMMAND"], parseArguments(words.all("ARGUMENT"))));
+    return sendRequest(address, words["COMMAND"], parseArguments(words.all("ARGUMENT"))).report;
 }
 
 Report checkEntitlement(const ServiceAddress& address, const Words&) {
-    const Answer answer = sendRequest(address, "checkCorvoPostSwapEntitlement", {});
-    Report report = reportOf(answer);
-    if (Value(answer.response)["response"]["IsPostSwapEntitled"] == Value(false))
-        report.note = "The boot ticket does not hold the entitlement, or cannot be read. " + answer.reasons;
-    return report;
+    Answer answer = sendRequest(address, "checkCorvoPostSwapEntitlement", {});
+    if (answer.response["response"]["IsPostSwapEntitled"] == Value(false))
+        answer.report.note = "The boot ticket does not hold the entitlement, or cannot be read. " + answer.reasons;
+    return std::move(answer.report);
 }
 
 // Without classes the choice is the plug-in's.
@@ -113,38 +97,37 @@ Report exportClasses(const ServiceAddress& address, const Words& words) {
     Value::Dictionary arguments;
     if (!classes.empty())
         arguments["ExportList"] = Value::Array(classes.begin(), classes.end());
-    return reportOf(sendRequest(address, "OrloExport", arguments));
+    return sendRequest(address, "OrloExport", arguments).report;
 }
 
 Report getTcrt(const ServiceAddress& address, const Words& words) {
-    Answer answer = sendRequest(address, "getTCRT", {});
-    if (answer.outcome != Outcome::Success)
-        return reportOf(answer);
-    const Value response(answer.response);
+    auto [report, response, user, reasons] = sendRequest(address, "getTCRT", {});
     const std::string* text = response["response"]["CertData"].text();
+    if (!report.ok())
+        return std::move(report);
     if (!text || text->empty()) {
-        answer.outcome = Outcome::Failure;
-        answer.problem = "The certificate in the hardware registry is empty.";
-        return reportOf(answer);
+        report.fail("The certificate in the hardware registry is empty.", Outcome::Failure);
+        return std::move(report);
     }
     const Value::Data certificate = hexString2Binary(*text);
-    Report report = reportOfCopy(answer, words, certificate);
+    copyResult(report, words, certificate);
     if (const auto path = words.find("--output"))
         report.json["result"] = placeOf(*path, certificate);
     if (report.note.empty() && response["response"]["CertSerialNumber"] == Value("DummyCertificateSerialNumber"))
         report.note = "the serial number cannot be read: the hardware registry holds no certificate but other bytes";
-    return report;
+    return std::move(report);
 }
 
 Report rewriteBlob(const ServiceAddress& address, const Words& words) {
-    const auto [answer, result] = setBcfg(address, words["DEVICE-FILE"]);
-    if (answer.outcome != Outcome::Success)
-        return reportOf(answer);
-    Report report = reportOfCopy(answer, words, result.contents);
+    auto [answer, result] = setBcfg(address, words["DEVICE-FILE"]);
+    Report& report = answer.report;
+    if (!report.ok())
+        return std::move(report);
+    copyResult(report, words, result.contents);
     report.json["result"] = placeOf(std::string(blobResultPath) + " on the device", result.contents);
     if (report.note.empty())
         report.note = result.note;
-    return report;
+    return std::move(report);
 }
 
 Report crashLogs(const ServiceAddress&, const Words& words) {
@@ -322,7 +305,10 @@ public:
         } catch (const CLI::Success& printed) {
             return app_.exit(printed);
         } catch (const CLI::ParseError& wrong) {
-            return print(wrongUsage(std::string(wrong.what()) + " (orloctl --help says more)"));
+            const auto words = app_.remaining();
+            const bool isUnknown = app_.get_subcommands().empty() && !words.empty();
+            return print(wrongUsage((isUnknown ? "There is no verb \"" + words.front() + "\"" : wrong.what()) +
+                                    " (orloctl --help says more)"));
         } catch (const std::exception& failure) {
             return print(wrongUsage(failure.what()));
         }
@@ -356,9 +342,7 @@ private:
 
     static Report wrongUsage(const std::string& problem) {
         Report report;
-        report.ok = false;
-        report.failure = Outcome::Usage;
-        report.problem = problem;
+        report.fail(problem, Outcome::Usage);
         return report;
     }
 
@@ -373,7 +357,7 @@ private:
                 if (!sentence.empty())
                     ::print(std::cerr, "orloctl: " + sentence);
         }
-        return static_cast<int>(report.outcome());
+        return static_cast<int>(report.outcome);
     }
 
     CLI::App app_{"Sends requests to the Veltra Orlo services, and reads their file formats offline.", "orloctl"};
