@@ -84,13 +84,12 @@ class Server:
 
 
 class NginxStore:
-    """nginx as the store and as the server of the trust object. `extra` goes into the server of the store, `certificate`
-    to Authority.certify."""
+    """nginx as the store and as the server of the trust object."""
 
     configuration = "nginx-store.conf"
     ports = ("PROXY", "ACCOUNT", "CONTAINER", "OBJECT", "UNUSED")
 
-    def __init__(self, extra="", **certificate):
+    def __init__(self):
         self.folder = pathlib.Path(tempfile.mkdtemp(prefix="veltra-store-"))
         self.store_port, self.ca_port, *ports = free_ports(2 + len(self.ports))
         self.values = {
@@ -98,21 +97,18 @@ class NginxStore:
             "DIGEST": hashlib.sha256(TRUST_OBJECT).hexdigest(), **dict(zip(self.ports, ports)),
         }
         self.authority = Authority(self.folder)
-        self.authority.certify("store", **certificate)
+        self.authority.certify("store")
         (self.folder / "trust-object").write_bytes(TRUST_OBJECT)
         (self.folder / "store").mkdir()
         self.servers = []
         try:
-            self.start(extra)
+            self.start()
         except BaseException:
             self.close()
             raise
 
-    def start(self, extra):
+    def start(self):
         configuration = self.configure(self.configuration)
-        if extra:
-            text = configuration.read_text()
-            configuration.write_text(text.replace("        root ", extra + "        root "))
         # nginx goes to the background once it listens, and then writes its process id, before it answers anything. Its
         # worker writes the records as the user of the lab.
         as_user = ["-g", "user root;"] if os.geteuid() == 0 else []
@@ -172,8 +168,8 @@ class ObjectStore(NginxStore):
     patience = ()  # options of curl
     conditional = {}
 
-    def start(self, extra):
-        super().start(extra)
+    def start(self):
+        super().start()
         self.use_bucket("orlo-records")
 
     def use_bucket(self, name):
@@ -207,7 +203,7 @@ class SwiftStore(ObjectStore):
 
     conditional = {"conditional": False}
 
-    def start(self, extra):
+    def start(self):
         self.values |= {"SECRET": self.secret, "SUFFIX": os.urandom(8).hex()}
         ports = [self.values[kind] for kind in ("ACCOUNT", "CONTAINER", "OBJECT")]
         for folder in ("devices/d1", "recon"):
@@ -224,7 +220,7 @@ class SwiftStore(ObjectStore):
             if starter.returncode == 0:
                 self.servers.append(Server(int(pid)))
         assert len(self.servers) == len(starting), "one of Swift's servers did not start"
-        super().start(extra)
+        super().start()
 
 
 class CephStore(ObjectStore):
@@ -233,7 +229,7 @@ class CephStore(ObjectStore):
     ports = ("PROXY", "MONITOR")
     patience = ("--retry", "120", "--retry-delay", "1", "--retry-connrefused")
 
-    def start(self, extra):
+    def start(self):
         cluster, disk = str(uuid.uuid4()), str(uuid.uuid4())
         members, keys, disk_key = (self.folder / name for name in ("members", "keyring", "osd/keyring"))
         self.values["CLUSTER"] = cluster
@@ -264,7 +260,7 @@ class CephStore(ObjectStore):
         do("radosgw-admin", "user", "create", "--uid=orlo", "--display-name=orlo", f"--access-key={self.access_key}",
             f"--secret={self.secret}")
         serve("radosgw", "-n", "client.admin")
-        super().start(extra)
+        super().start()
 
 
 STORES = {"nginx": NginxStore, "swift": SwiftStore, "ceph": CephStore}

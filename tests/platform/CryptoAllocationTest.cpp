@@ -1,5 +1,4 @@
 // Runs out of memory inside the cryptographic library, at each of its allocations in turn.
-#include <cstdlib>
 #include <cstring>
 
 #include <gtest/gtest.h>
@@ -8,26 +7,9 @@
 #include <unistd.h>
 
 #include "platform/Crypto.h"
+#include "tests/support/FailingAllocation.h"
 
 namespace {
-
-int allocationsLeft = -1; // those that still succeed; negative for all
-
-bool mayAllocate() {
-    return allocationsLeft < 0 || allocationsLeft-- > 0;
-}
-
-void* allocate(std::size_t size, const char*, int) {
-    return mayAllocate() ? std::malloc(size) : nullptr;
-}
-
-void* reallocate(void* old, std::size_t size, const char*, int) {
-    return mayAllocate() ? std::realloc(old, size) : nullptr;
-}
-
-void release(void* old, const char*, int) {
-    std::free(old);
-}
 
 enum Outcome {
     Computed = 0,
@@ -35,10 +17,10 @@ enum Outcome {
     Wrong = 2
 };
 
-// The HMAC of RFC 4231, test case 2.
+// The HMAC of RFC 4231, test case 2, with so many allocations that still succeed.
 Outcome computeWith(int allocations) {
     constexpr std::uint8_t expected[] = {0x5b, 0xdc, 0xc1, 0x46, 0xbf, 0x60, 0x75, 0x4e};
-    allocationsLeft = allocations;
+    failAllocation(allocations + 1);
     std::uint8_t out[crypto::sha256Size] = {1};
     crypto::HMACSHA256 hmac;
     hmac.init("Jefe", 4);
@@ -69,7 +51,7 @@ void expectRightOrRefusedWhereverMemoryEnds() {
 }
 
 TEST(CryptoAllocation, anHmacIsRightOrRefusedWhereverMemoryEnds) {
-    CRYPTO_set_mem_functions(allocate, reallocate, release);
+    failAllocationsOfOpenSSL();
     if (OpenSSL_version_num() < 0x30500000) // a newer one does not end when memory does in its first use
         expectRightOrRefusedWhereverMemoryEnds();
     ASSERT_TRUE(crypto::prepare());

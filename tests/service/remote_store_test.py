@@ -175,14 +175,10 @@ NAMES = ["S1", "a b", "100%", "a+b=c", "~-._", "...", "a%2Fb", "a:b", "?x=1&y", 
 
 class PlainStore(RemoteTest, StoreCases):
     KEPT = ""
-    REFUSALS = """
-        location = /v2/records/psd2/BROKEN { return 500; }
-        location = /v2/records/psd2/MOVED { return 302 /v2/records/psd2/VAN0001; }
-"""
 
     def setUp(self):
         super().setUp()
-        self.store = self.closing(NginxStore(extra=self.REFUSALS))
+        self.store = self.closing(NginxStore())
         self.describe()
 
     def test_names(self):
@@ -197,27 +193,17 @@ class PlainStore(RemoteTest, StoreCases):
 
     def test_what_a_server_refuses_is_answered_with_its_reason(self):
         self.assertEqual(self.service.put(b"record"), SUCCESS)
-        for name, status in (("BROKEN", 500), ("MOVED", 302)):
-            with self.subTest(name):
-                self.describe(vanter=name)
-                reason = f"{DATA_STORE}/v2/records/psd2/{name}: HTTP status {status}"
-                self.assertEqual(self.error_of_get(), (TRANSPORT, "GET " + reason))
-                lines = self.service.messages_of(lambda: self.assertEqual(self.service.put(b"x")[2]["code"], 1011))
-                self.assertIn("Put: PUT " + reason, lines)
-        self.describe()
         (self.store.folder / "trust-object").write_bytes(b"another one")
-        code, text = self.error_of_get()
-        self.assertEqual((code, text), (NOT_PERMITTED, f"GET {DATA_STORE}/v2/records/psd2/VAN0001: HTTP status 403"))
+        self.assertEqual(self.error_of_get(),
+                         (NOT_PERMITTED, f"GET {DATA_STORE}/v2/records/psd2/VAN0001: HTTP status 403"))
         error = self.service.answer("export")[2]
         self.assertEqual((error["domain"], error["code"]), ("OrloExport", 2012))
         self.assertRegex(error["description"], f"^Orlo Export Failed due to - Data Upload to server failed with Reason "
                                                f"--> PUT {DATA_STORE}/v1/exports/.*\\.json: HTTP status 403$")
         self.store.nginx.stop()
-        reason = f"Trust Object Copy from Server failed with Reason --> GET {TRUST_URL}: Failed to connect to "
-        for words, prefix, code in ((["get-psd2", "/tmp/out"], " ", 1008),
-                                    (["export"], "Orlo Export Failed due to - ", 2007)):
-            error = self.service.answer(*words)[2]
-            self.assertEqual((error["code"], error["description"].startswith(prefix + reason)), (code, True), error)
+        reason = f" Trust Object Copy from Server failed with Reason --> GET {TRUST_URL}: Failed to connect to "
+        error = self.service.get()[2]
+        self.assertEqual((error["code"], error["description"].startswith(reason)), (1008, True), error)
         self.assertEqual(self.store.stored(), {"v2/records/psd2/VAN0001": b"record"})
 
     def test_a_put_repeated_after_a_broken_connection_leaves_one_whole_record(self):

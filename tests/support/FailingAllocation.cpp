@@ -1,7 +1,8 @@
 #include "tests/support/FailingAllocation.h"
 
 #include <cstdlib>
-#include <new>
+
+#include <openssl/crypto.h>
 
 namespace {
 
@@ -12,27 +13,23 @@ bool failed = false;
 
 void failAllocation(int count) {
     remaining = count;
-    failed = false;
+    failed = failed && count == 0;
 }
 
 bool allocationHasFailed() {
     return failed;
 }
 
-void* operator new(std::size_t size) {
-    if (remaining > 0 && --remaining == 0) {
-        failed = true;
-        throw std::bad_alloc();
-    }
-    if (void* memory = std::malloc(size == 0 ? 1 : size))
-        return memory;
-    throw std::bad_alloc();
+bool mayAllocate() {
+    if (remaining == 0 || --remaining > 0)
+        return true;
+    failed = true;
+    return false;
 }
 
-void operator delete(void* memory) noexcept {
-    std::free(memory);
-}
-
-void operator delete(void* memory, std::size_t) noexcept {
-    std::free(memory);
+void failAllocationsOfOpenSSL() {
+    CRYPTO_set_mem_functions(
+        [](std::size_t size, const char*, int) { return mayAllocate() ? std::realloc(nullptr, size) : nullptr; },
+        [](void* old, std::size_t size, const char*, int) { return mayAllocate() ? std::realloc(old, size) : nullptr; },
+        [](void* old, const char*, int) { std::free(old); });
 }

@@ -1,32 +1,15 @@
 // Every allocation of the library fails in turn. The linker leads the library's calls of malloc and calloc here;
-// OpenSSL, which computes the HMACs, takes its memory through the functions that main installs.
+// OpenSSL, which computes the HMACs, is led by main.
 #include <cstdlib>
 #include <string>
 
 #include <gtest/gtest.h>
-#include <openssl/crypto.h>
 
 #include "platform/Crypto.h"
 #include "sysconfig/SysConfig3Internal.h"
+#include "tests/support/FailingAllocation.h"
 #include "tests/sysconfig/Blob.h"
 #include "tests/sysconfig/Recorder.h"
-
-namespace {
-
-// Allocations until the one that fails. Negative while none shall fail.
-int countdown = -1;
-bool hasFailed = false;
-
-bool mayAllocate() {
-    if (countdown < 0)
-        return true;
-    if (countdown-- > 0)
-        return true;
-    hasFailed = true;
-    return false;
-}
-
-} // namespace
 
 extern "C" {
 void* __real_malloc(std::size_t size);
@@ -45,18 +28,6 @@ namespace {
 
 using sysconfig::SysConfig3Ptr;
 
-void* allocateForOpenSSL(std::size_t size, const char*, int) {
-    return mayAllocate() ? __real_malloc(size) : nullptr;
-}
-
-void* reallocateForOpenSSL(void* block, std::size_t size, const char*, int) {
-    return mayAllocate() ? std::realloc(block, size) : nullptr;
-}
-
-void releaseForOpenSSL(void* block, const char*, int) {
-    std::free(block);
-}
-
 bool reported = false;
 
 // Does not allocate, unlike the recorder of the other tests.
@@ -69,13 +40,12 @@ SYSCONFIG3_PRINTF(2, 3) void noteReport(int, const char*, ...) {
 template <typename Operation>
 bool run(int failing, Operation operation) {
     reported = false;
-    hasFailed = false;
     setSysConfig3LogHandler(noteReport);
-    countdown = failing;
+    failAllocation(failing + 1);
     const bool success = operation();
-    countdown = -1;
+    failAllocation(0);
     setSysConfig3LogHandler(nullptr);
-    EXPECT_TRUE(success || (hasFailed && reported)) << "allocation " << failing;
+    EXPECT_TRUE(success || (allocationHasFailed() && reported)) << "allocation " << failing;
     return success;
 }
 
@@ -83,7 +53,7 @@ bool run(int failing, Operation operation) {
 template <typename Test>
 int failEach(Test test) {
     int failing = 0;
-    for (test(failing); hasFailed; test(failing))
+    for (test(failing); allocationHasFailed(); test(failing))
         ++failing;
     return failing;
 }
@@ -115,7 +85,7 @@ TEST(AllocationFailure, makesDecodeGiveNone) {
     const int failures = failEach([&](int failing) {
         SysConfig3Ptr object;
         const bool success = run(failing, [&] { return (object = decode(blob)) != nullptr; });
-        EXPECT_EQ(success, !hasFailed);
+        EXPECT_EQ(success, !allocationHasFailed());
     });
     // The object, two manifests of three HMACs, sixteen entries and two indexes.
     EXPECT_GE(failures, 1 + 2 * 4 + 16 + 2);
@@ -127,8 +97,8 @@ TEST(AllocationFailure, makesAddFailAndChangeNothing) {
         const int failures = failEach([&](int failing) {
             const SysConfig3Ptr object = filledObject(0x30003);
             const bool success = run(failing, [&] { return add(object, entry); });
-            EXPECT_EQ(success, !hasFailed);
-            EXPECT_EQ(contentOf(object) == before, hasFailed);
+            EXPECT_EQ(success, !allocationHasFailed());
+            EXPECT_EQ(contentOf(object) == before, allocationHasFailed());
         });
         EXPECT_EQ(failures, 2);
     };
@@ -170,8 +140,8 @@ TEST(AllocationFailure, makesARegisteredKeyAbsent) {
     const int failures = failEach([](int failing) {
         const SysConfig3Ptr object = filledObject(0x30002);
         const bool success = run(failing, [&] { return sysConfig3SetHMACKey(object.get(), hmacKey); });
-        EXPECT_EQ(success, !hasFailed);
-        EXPECT_EQ(object->hmacKey.data == nullptr && object->hmacKey.length == 0, hasFailed);
+        EXPECT_EQ(success, !allocationHasFailed());
+        EXPECT_EQ(object->hmacKey.data == nullptr && object->hmacKey.length == 0, allocationHasFailed());
     });
     EXPECT_EQ(failures, 1);
 }
@@ -207,9 +177,9 @@ TEST(AllocationFailure, makesEncodeFailAndLeaveTheResultAlone) {
 TEST(AllocationFailure, isReportedByTheOperationThatMeetsIt) {
     const auto firstLineWhen = [](int failing, auto operation) {
         const Recorder recorder;
-        countdown = failing;
+        failAllocation(failing + 1);
         operation();
-        countdown = -1;
+        failAllocation(0);
         return Recorder::lines.empty() ? std::string() : Recorder::lines.front();
     };
     const SysConfig3Ptr object = filledObject(0x30003);
@@ -226,7 +196,7 @@ TEST(AllocationFailure, isReportedByTheOperationThatMeetsIt) {
 } // namespace
 
 int main(int argc, char** argv) {
-    CRYPTO_set_mem_functions(allocateForOpenSSL, reallocateForOpenSSL, releaseForOpenSSL);
+    failAllocationsOfOpenSSL();
     // OpenSSL sets itself up once, which is not what is tested here.
     const SysConfig3Ptr object(allocSysConfig3WithHMACKey(bCfg, 0x30002, hmacKey));
     testing::InitGoogleTest(&argc, argv);
