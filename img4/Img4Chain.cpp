@@ -29,8 +29,7 @@ bool isAbsentOrNull(const DERItem& parameters) {
 }
 
 bool parseAlgorithm(const DERItem& content, DERAlgorithmId* algorithm) {
-    return DERParseSequenceContent(&content, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, algorithm,
-                                   sizeof *algorithm) == DERSuccess;
+    return parseContent(content, {DERAlgorithmIdItemSpecs, DERNumAlgorithmIdItemSpecs}, algorithm) == DERSuccess;
 }
 
 // The octets of a BIT STRING whose bits fill them.
@@ -54,8 +53,8 @@ bool isPointOfItsCurve(const DERItem& key, const DERItem& parameters) {
 bool parseKey(const DERItem& subjectPublicKeyInfo, KeyKind kind, DERItem* key) {
     DERSubjPubKeyInfo info;
     DERAlgorithmId algorithm;
-    if (DERParseSequenceContent(&subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info,
-                                sizeof info) != DERSuccess ||
+    if (parseContent(subjectPublicKeyInfo, {DERSubjPubKeyInfoItemSpecs, DERNumSubjPubKeyInfoItemSpecs}, &info) !=
+            DERSuccess ||
         !parseAlgorithm(info.algorithm, &algorithm) || !parseOctets(info.publicKey, key))
         return false;
     if (kind == KeyKind::RSA)
@@ -64,10 +63,10 @@ bool parseKey(const DERItem& subjectPublicKeyInfo, KeyKind kind, DERItem* key) {
 }
 
 Img4ChainFault parseCertificate(const DERItem& encoding, KeyKind kind, Certificate* certificate) {
-    if (DERParseSequence(&encoding, DERNumSignedCertCrlItemSpecs, DERSignedCertCrlItemSpecs, &certificate->fields,
-                         sizeof certificate->fields) != DERSuccess ||
-        DERParseSequence(&certificate->fields.tbs, DERNumTBSCertItemSpecs, DERTBSCertItemSpecs, &certificate->tbs,
-                         sizeof certificate->tbs) != DERSuccess)
+    if (parseSequence(encoding, {DERSignedCertCrlItemSpecs, DERNumSignedCertCrlItemSpecs}, &certificate->fields) !=
+            DERSuccess ||
+        parseSequence(certificate->fields.tbs, {DERTBSCertItemSpecs, DERNumTBSCertItemSpecs}, &certificate->tbs) !=
+            DERSuccess)
         return Img4ChainEncoding;
     return parseKey(certificate->tbs.subjectPublicKeyInfo, kind, &certificate->key) ? Img4ChainSound : Img4ChainKey;
 }
@@ -136,8 +135,8 @@ bool findCommonName(const DERItem& attributes, DERItem* name) {
     while (DERDecodeSeqNext(&rest, &element) == DERSuccess) {
         DERAttributeTypeAndValue attribute;
         if (element.tag != DERTagSequence ||
-            DERParseSequenceContent(&element.content, DERNumAttributeTypeAndValueItemSpecs,
-                                    DERAttributeTypeAndValueItemSpecs, &attribute, sizeof attribute) != DERSuccess)
+            parseContent(element.content, {DERAttributeTypeAndValueItemSpecs, DERNumAttributeTypeAndValueItemSpecs},
+                         &attribute) != DERSuccess)
             return false;
         *name = attribute.value;
         if (DEROidCompare(&attribute.type, &oidCommonName))
@@ -173,8 +172,7 @@ bool findConstraints(const DERItem& extensions, const DERItem& oid, DERItem* cer
     for (; result == DERSuccess; result = DERDecodeSeqNext(&rest, &element)) {
         DERExtension extension;
         if (element.tag != DERTagSequence ||
-            DERParseSequenceContent(&element.content, DERNumExtensionItemSpecs, DERExtensionItemSpecs, &extension,
-                                    sizeof extension) != DERSuccess)
+            parseContent(element.content, {DERExtensionItemSpecs, DERNumExtensionItemSpecs}, &extension) != DERSuccess)
             return false;
         if (!DEROidCompare(&extension.extensionID, &oid))
             continue;

@@ -11,22 +11,17 @@ constexpr DERTag measurementTag = Img4PropertyTag(Img4FourCC('m', 'a', 'n', 'x')
 constexpr DERTag mustBePresent = DERTagContextConstructed(0);
 constexpr DERTag mustBeAbsent = DERTagContextConstructed(1);
 
-// Where a check says what it finds: to a callback each constraint, or what is refused first, or nothing. With a
-// callback it goes on behind a failure.
+// What a check tells of each constraint, unless `each` is null. With it the check goes on behind a failure.
 struct Listener {
     Img4ConstraintCallback each;
     void* context;
-    Img4Refusal* first;
 
     DERReturn hear(DERReturn result, Img4Constraint& constraint) const {
         constraint.refusal.subject = Img4SubjectConstraints;
         if (each != nullptr)
             each(&constraint, context);
-        if (first != nullptr && result != DERSuccess)
-            *first = constraint.refusal;
         return result;
     }
-    bool wants() const { return each != nullptr || first != nullptr; }
 };
 
 // Judges the search for the constrained property, whose content is `found` when `search` is a success.
@@ -72,7 +67,7 @@ DERReturn checkEach(const DERItem& set, const Img4Constraint& where, const Liste
         const DERItem encoding = {start, static_cast<uint64_t>(end - start)};
         if (!isBroken)
             result = check(element, encoding);
-        else if (listener.wants()) {
+        else if (listener.each != nullptr) {
             Img4Constraint broken = {where.dictionary, encoding, 0, {}, where.isChecked, {}};
             DERDecodeItemExplained(&encoding, &element, &broken.refusal.encoding);
             refuse(&broken.refusal, result, broken.refusal.encoding);
@@ -106,7 +101,7 @@ DERReturn constrain(const DERItem* bound, const DERDecodedInfo& constraints, con
                     const Listener& listener) {
     Img4Property constraining;
     Img4Constraint row = {constraints.tag, whole, 0, {}, bound != nullptr, {}};
-    Img4Refusal* const refusal = listener.wants() ? &row.refusal : nullptr;
+    Img4Refusal* const refusal = listener.each != nullptr ? &row.refusal : nullptr;
     if (const DERReturn result =
             DERImg4DecodePropertyExplained(&constraints.content, constraints.tag, &constraining, refusal);
         result != DERSuccess)
@@ -169,14 +164,19 @@ DERReturn check(const Img4Record& record, const Listener& listener) {
 } // namespace
 
 DERReturn img4::checkConstraints(const Img4Record& record, Img4Refusal* refusal) {
-    return check(record, {nullptr, nullptr, refusal});
+    const auto keepFirst = [](const Img4Constraint* constraint, void* first) {
+        Img4Refusal* const kept = static_cast<Img4Refusal*>(first);
+        if (constraint->isChecked && constraint->refusal.fault != Img4FaultNone && kept->fault == Img4FaultNone)
+            *kept = constraint->refusal;
+    };
+    return check(record, {keepFirst, refusal});
 }
 
 DERReturn Img4DecodeEvaluateCertificateProperties(const Img4Record* record) {
-    return record != nullptr ? check(*record, {nullptr, nullptr, nullptr}) : DERParamError;
+    return record != nullptr ? check(*record, {nullptr, nullptr}) : DERParamError;
 }
 
 DERReturn Img4DecodeEvaluateCertificatePropertiesExplained(const Img4Record* record, Img4ConstraintCallback callback,
                                                            void* context) {
-    return record != nullptr && callback != nullptr ? check(*record, {callback, context, nullptr}) : DERParamError;
+    return record != nullptr && callback != nullptr ? check(*record, {callback, context}) : DERParamError;
 }

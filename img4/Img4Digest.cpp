@@ -22,17 +22,23 @@ Source manifestOf(const Img4Record& record) {
             record.manifestHashed != 0 ? record.manifest.digest : nullptr};
 }
 
+// The first octets of the digest that the record holds, or what `compute` makes of the raw encoding.
+template <typename Compute>
+DERReturn copy(const Source& source, uint8_t* out, uint64_t length, Compute compute) {
+    if (source.raw == nullptr)
+        return DEREndOfSequence;
+    if (source.stored == nullptr)
+        return compute(*source.raw);
+    std::memcpy(out, source.stored, static_cast<std::size_t>(length));
+    return DERSuccess;
+}
+
 DERReturn copyHash(const Img4Record* record, Source (*sourceOf)(const Img4Record&), uint8_t* out, uint64_t length,
                    Img4DigestFunction digest, void* context) {
     if (record == nullptr || out == nullptr || digest == nullptr || length != Img4HashLength)
         return DERParamError;
-    const Source source = sourceOf(*record);
-    if (source.raw == nullptr)
-        return DEREndOfSequence;
-    if (source.stored == nullptr)
-        return digest(source.raw->data, source.raw->length, out, context);
-    std::memcpy(out, source.stored, Img4HashLength);
-    return DERSuccess;
+    return copy(sourceOf(*record), out, length,
+                [&](const DERItem& raw) { return digest(raw.data, raw.length, out, context); });
 }
 
 DERReturn copyDigest(const Img4Record* record, Source (*sourceOf)(const Img4Record&), uint8_t* out, uint64_t length,
@@ -41,13 +47,8 @@ DERReturn copyDigest(const Img4Record* record, Source (*sourceOf)(const Img4Reco
         return DERParamError;
     if (length > Img4MaxDigestLength)
         return DERBufferOverflow;
-    const Source source = sourceOf(*record);
-    if (source.raw == nullptr)
-        return DEREndOfSequence;
-    if (source.stored == nullptr)
-        return profile->computeDigest(source.raw, out, length, profile);
-    std::memcpy(out, source.stored, static_cast<std::size_t>(length));
-    return DERSuccess;
+    return copy(sourceOf(*record), out, length,
+                [&](const DERItem& raw) { return profile->computeDigest(&raw, out, length, profile); });
 }
 
 } // namespace

@@ -6,70 +6,54 @@ namespace {
 
 constexpr uint16_t required = 0;
 
+struct PayloadProperties {
+    DERItem magic;
+    DERItem properties;
+};
+
 } // namespace
 
-const DERItemSpec DERImg4ItemSpecs[] = {
+constexpr DERItemSpec DERImg4ItemSpecs[] = {
     {offsetof(Img4Container, magic), DERTagIA5String, required},
     {offsetof(Img4Container, payload), DERTagSequence, DEROptionSaveDER},
     {offsetof(Img4Container, manifest), DERTagContextConstructed(0), DEROptionOptional},
     {offsetof(Img4Container, restoreInfo), DERTagContextConstructed(1), DEROptionOptional},
 };
-const uint16_t DERNumImg4ItemSpecs = std::size(DERImg4ItemSpecs);
 
 const DERItemSpec DERImg4PayloadWithPropertiesItemSpecs[] = {
-    {offsetof(Img4PayloadWithProperties, magic), DERTagIA5String, required},
-    {offsetof(Img4PayloadWithProperties, type), DERTagIA5String, required},
-    {offsetof(Img4PayloadWithProperties, version), DERTagIA5String, required},
-    {offsetof(Img4PayloadWithProperties, data), DERTagOctetString, required},
-    {offsetof(Img4PayloadWithProperties, keybag), DERTagOctetString, DEROptionOptional},
-    {offsetof(Img4PayloadWithProperties, compression), DERTagSequence, DEROptionOptional},
+    {offsetof(Img4PayloadWithProperties, payload.magic), DERTagIA5String, required},
+    {offsetof(Img4PayloadWithProperties, payload.type), DERTagIA5String, required},
+    {offsetof(Img4PayloadWithProperties, payload.version), DERTagIA5String, required},
+    {offsetof(Img4PayloadWithProperties, payload.data), DERTagOctetString, required},
+    {offsetof(Img4PayloadWithProperties, payload.keybag), DERTagOctetString, DEROptionOptional},
+    {offsetof(Img4PayloadWithProperties, payload.compression), DERTagSequence, DEROptionOptional},
     {offsetof(Img4PayloadWithProperties, properties), DERTagContextConstructed(0), DEROptionOptional},
 };
-const uint16_t DERNumImg4PayloadWithPropertiesItemSpecs = std::size(DERImg4PayloadWithPropertiesItemSpecs);
-
-const DERItemSpec DERImg4PayloadItemSpecs[] = {
-    {offsetof(Img4PayloadRecord, magic), DERTagIA5String, required},
-    {offsetof(Img4PayloadRecord, type), DERTagIA5String, required},
-    {offsetof(Img4PayloadRecord, version), DERTagIA5String, required},
-    {offsetof(Img4PayloadRecord, data), DERTagOctetString, required},
-    {offsetof(Img4PayloadRecord, keybag), DERTagOctetString, DEROptionOptional},
-    {offsetof(Img4PayloadRecord, compression), DERTagSequence, DEROptionOptional},
-};
-const uint16_t DERNumImg4PayloadItemSpecs = std::size(DERImg4PayloadItemSpecs);
+constexpr img4::ItemSpecs DERImg4PayloadItemSpecs(DERImg4PayloadWithPropertiesItemSpecs, 6);
 
 const DERItemSpec DERImg4CompressionItemSpecs[] = {
     {offsetof(Img4Compression, algorithm), DERTagInteger, required},
     {offsetof(Img4Compression, uncompressedSize), DERTagInteger, required},
 };
-const uint16_t DERNumImg4CompressionItemSpecs = std::size(DERImg4CompressionItemSpecs);
 
-const DERItemSpec DERImg4PayloadPropertiesItemSpecs[] = {
-    {offsetof(Img4PayloadProperties, magic), DERTagIA5String, required},
-    {offsetof(Img4PayloadProperties, properties), DERTagSet, required},
+constexpr DERItemSpec DERImg4PayloadPropertiesItemSpecs[] = {
+    {offsetof(PayloadProperties, magic), DERTagIA5String, required},
+    {offsetof(PayloadProperties, properties), DERTagSet, required},
 };
-const uint16_t DERNumImg4PayloadPropertiesItemSpecs = std::size(DERImg4PayloadPropertiesItemSpecs);
 
-const DERItemSpec DERImg4ManifestItemSpecs[] = {
+constexpr DERItemSpec DERImg4ManifestItemSpecs[] = {
     {offsetof(Img4ManifestRecord, magic), DERTagIA5String, required},
     {offsetof(Img4ManifestRecord, version), DERTagInteger, required},
     {offsetof(Img4ManifestRecord, body), DERTagSet, DEROptionSaveDER},
     {offsetof(Img4ManifestRecord, signature), DERTagOctetString, required},
     {offsetof(Img4ManifestRecord, certChain), DERTagSequence, required},
 };
-const uint16_t DERNumImg4ManifestItemSpecs = std::size(DERImg4ManifestItemSpecs);
+constexpr img4::ItemSpecs DERImg4UnsignedManifestItemSpecs(DERImg4ManifestItemSpecs, 3);
 
-const DERItemSpec DERImg4UnsignedManifestItemSpecs[] = {
-    {offsetof(Img4ManifestRecord, magic), DERTagIA5String, required},
-    {offsetof(Img4ManifestRecord, version), DERTagInteger, required},
-    {offsetof(Img4ManifestRecord, body), DERTagSet, DEROptionSaveDER},
-};
-const uint16_t DERNumImg4UnsignedManifestItemSpecs = std::size(DERImg4UnsignedManifestItemSpecs);
-
-const DERItemSpec DERImg4RestoreInfoItemSpecs[] = {
+constexpr DERItemSpec DERImg4RestoreInfoItemSpecs[] = {
     {offsetof(Img4RestoreInfoRecord, magic), DERTagIA5String, required},
     {offsetof(Img4RestoreInfoRecord, properties), DERTagSet, required},
 };
-const uint16_t DERNumImg4RestoreInfoItemSpecs = std::size(DERImg4RestoreInfoItemSpecs);
 
 namespace {
 
@@ -107,21 +91,19 @@ DERReturn checkNumber(const DERItem& number, uint32_t highest, Img4Refusal* refu
 // Whatever is wrong, the status is that of a bad parameter.
 DERReturn checkCompressionInfo(const DERItem& content, Img4Refusal* refusal) {
     Img4Compression compression;
-    DERRefusal why = {};
+    Img4Refusal why = {};
     enter(refusal, Img4SubjectCompression);
-    if (DERParseSequenceContentExplained(&content, DERNumImg4CompressionItemSpecs, DERImg4CompressionItemSpecs,
-                                         &compression, sizeof compression, sizeof compression, &why) != DERSuccess)
-        return refuse(refusal, DERParamError, why);
+    if (parseContent(content, DERImg4CompressionItemSpecs, &compression, &why) != DERSuccess)
+        return refuse(refusal, DERParamError, why.encoding);
     return checkNumber(compression.algorithm, highestCompressionAlgorithm, refusal) == DERSuccess ? DERSuccess
                                                                                                   : DERParamError;
 }
 
 // Whatever is wrong, the status is that of an unexpected tag.
 DERReturn checkPayloadProperties(const DERItem& encoding, Img4Refusal* refusal) {
-    Img4PayloadProperties fields;
+    PayloadProperties fields;
     enter(refusal, Img4SubjectPayloadProperties);
-    const DERReturn result = parseSequence(encoding, DERNumImg4PayloadPropertiesItemSpecs,
-                                           DERImg4PayloadPropertiesItemSpecs, &fields, refusal);
+    const DERReturn result = parseSequence(encoding, DERImg4PayloadPropertiesItemSpecs, &fields, refusal);
     return result == DERSuccess ? checkMagic(fields.magic, payloadPropertiesMagic, refusal) : DERUnexpectedTag;
 }
 
@@ -129,14 +111,10 @@ DERReturn checkPayloadProperties(const DERItem& encoding, Img4Refusal* refusal) 
 // is wrong with it the longer one tells.
 DERReturn parsePayload(const DERItem& encoding, Img4PayloadWithProperties* fields, Img4Refusal* refusal) {
     Img4Refusal why = {};
-    if (parseSequence(encoding, DERNumImg4PayloadWithPropertiesItemSpecs, DERImg4PayloadWithPropertiesItemSpecs, fields,
-                      refusal != nullptr ? &why : nullptr) == DERSuccess)
+    if (parseSequence(encoding, DERImg4PayloadWithPropertiesItemSpecs, fields, refusal != nullptr ? &why : nullptr) ==
+        DERSuccess)
         return DERSuccess;
-    static_assert(offsetof(Img4PayloadRecord, digest) == offsetof(Img4PayloadWithProperties, properties),
-                  "both tables fill the same fields");
-    const DERReturn result =
-        DERParseSequenceToObject(&encoding, DERNumImg4PayloadItemSpecs, DERImg4PayloadItemSpecs, fields,
-                                 offsetof(Img4PayloadWithProperties, properties), sizeof *fields);
+    const DERReturn result = parseSequence(encoding, DERImg4PayloadItemSpecs, fields);
     return result == DERSuccess ? result : refuse(refusal, result, why.encoding);
 }
 
@@ -145,34 +123,20 @@ DERReturn decodePayload(const DERItem& encoding, Img4PayloadRecord* payload, Img
     enter(refusal, Img4SubjectPayload);
     DERReturn result = parsePayload(encoding, &fields, refusal);
     if (result == DERSuccess)
-        result = checkMagic(fields.magic, payloadMagic, refusal);
-    if (goesOn(result, refusal) && isPresent(fields.compression))
-        result = firstOf(result, checkCompressionInfo(fields.compression, refusal));
+        result = checkMagic(fields.payload.magic, payloadMagic, refusal);
+    if (goesOn(result, refusal) && isPresent(fields.payload.compression))
+        result = firstOf(result, checkCompressionInfo(fields.payload.compression, refusal));
     if (goesOn(result, refusal) && isPresent(fields.properties))
         result = firstOf(result, checkPayloadProperties(fields.properties, refusal));
-    if (!goesOn(result, refusal))
-        return result;
-    payload->magic = fields.magic;
-    payload->type = fields.type;
-    payload->version = fields.version;
-    payload->data = fields.data;
-    payload->keybag = fields.keybag;
-    payload->compression = fields.compression;
+    if (goesOn(result, refusal))
+        *payload = fields.payload;
     return result;
 }
 
-enum class Signing {
-    Signed,
-    Unsigned
-};
-
-DERReturn decodeManifest(const DERItem& encoding, Signing signing, Img4ManifestRecord* manifest, Img4Refusal* refusal) {
-    const bool isSigned = signing == Signing::Signed;
+// `specs` is the table of a signed or of an unsigned manifest.
+DERReturn decodeManifest(const DERItem& encoding, ItemSpecs specs, Img4ManifestRecord* manifest, Img4Refusal* refusal) {
     enter(refusal, Img4SubjectManifest);
-    DERReturn result =
-        isSigned ? parseSequence(encoding, DERNumImg4ManifestItemSpecs, DERImg4ManifestItemSpecs, manifest, refusal)
-                 : parseSequence(encoding, DERNumImg4UnsignedManifestItemSpecs, DERImg4UnsignedManifestItemSpecs,
-                                 manifest, refusal);
+    DERReturn result = parseSequence(encoding, specs, manifest, refusal);
     if (result == DERSuccess)
         result = checkMagic(manifest->magic, manifestMagic, refusal);
     return result == DERSuccess ? checkNumber(manifest->version, highestManifestVersion, refusal) : result;
@@ -180,30 +144,35 @@ DERReturn decodeManifest(const DERItem& encoding, Signing signing, Img4ManifestR
 
 DERReturn decodeRestoreInfo(const DERItem& encoding, Img4RestoreInfoRecord* restoreInfo, Img4Refusal* refusal) {
     enter(refusal, Img4SubjectRestoreInfo);
-    const DERReturn result =
-        parseSequence(encoding, DERNumImg4RestoreInfoItemSpecs, DERImg4RestoreInfoItemSpecs, restoreInfo, refusal);
+    const DERReturn result = parseSequence(encoding, DERImg4RestoreInfoItemSpecs, restoreInfo, refusal);
     return result == DERSuccess ? checkMagic(restoreInfo->magic, restoreInfoMagic, refusal) : result;
+}
+
+// Decodes the first item of the buffer, which must be a SEQUENCE.
+DERReturn decodeSequence(const DERItem& buffer, Img4Subject subject, DERDecodedInfo* whole, Img4Refusal* refusal) {
+    DERRefusal why;
+    enter(refusal, subject);
+    if (const DERReturn result = DERDecodeItemExplained(&buffer, whole, &why); result != DERSuccess)
+        return refuse(refusal, result, why);
+    return whole->tag == DERTagSequence
+               ? DERSuccess
+               : refuse(refusal, DERUnexpectedTag,
+                        {DERFaultNoSequence, 0, buffer.data, buffer.data, whole->tag, DERTagSequence});
 }
 
 DERReturn parseContainer(const DERItem& buffer, Img4Container* container, Img4Refusal* refusal) {
     DERDecodedInfo whole;
-    DERRefusal why = {};
-    enter(refusal, Img4SubjectContainer);
-    if (const DERReturn result = DERDecodeItemExplained(&buffer, &whole, &why); result != DERSuccess)
-        return refuse(refusal, result, why);
-    if (whole.tag != DERTagSequence)
-        return refuse(refusal, DERUnexpectedTag,
-                      {DERFaultNoSequence, 0, buffer.data, buffer.data, whole.tag, DERTagSequence});
+    DERReturn result = decodeSequence(buffer, Img4SubjectContainer, &whole, refusal);
+    if (result != DERSuccess)
+        return result;
     const uint8_t* const end = whole.content.data + whole.content.length;
-    DERReturn result = DERSuccess;
     if (end != buffer.data + buffer.length)
         result = refuse(refusal, DERBufferOverflow, Img4FaultLength, end);
     if (!goesOn(result, refusal))
         return result;
-    const DERReturn parsed = DERParseSequenceContentExplained(&whole.content, DERNumImg4ItemSpecs, DERImg4ItemSpecs,
-                                                              container, sizeof *container, sizeof *container, &why);
-    if (parsed != DERSuccess)
-        return firstOf(result, refuse(refusal, parsed, why));
+    if (const DERReturn parsed = parseContent(whole.content, DERImg4ItemSpecs, container, refusal);
+        parsed != DERSuccess)
+        return firstOf(result, parsed);
     return firstOf(result, checkMagic(container->magic, containerMagic, refusal));
 }
 
@@ -213,7 +182,8 @@ DERReturn decodeContainer(const DERItem& buffer, Img4Record* record, Img4Refusal
     if (goesOn(result, refusal) && isPresent(container.payload))
         result = firstOf(result, decodePayload(container.payload, &record->payload, refusal));
     if (goesOn(result, refusal) && isPresent(container.manifest))
-        result = firstOf(result, decodeManifest(container.manifest, Signing::Signed, &record->manifest, refusal));
+        result =
+            firstOf(result, decodeManifest(container.manifest, DERImg4ManifestItemSpecs, &record->manifest, refusal));
     if (goesOn(result, refusal) && isPresent(container.restoreInfo))
         result = firstOf(result, decodeRestoreInfo(container.restoreInfo, &record->restoreInfo, refusal));
     if (goesOn(result, refusal)) {
@@ -228,8 +198,8 @@ DERReturn decodeBarePayload(const DERItem& buffer, Img4Record* record, Img4Refus
     return decodePayload(buffer, &record->payload, refusal);
 }
 
-DERReturn decodeBareManifest(const DERItem& buffer, Signing signing, Img4Record* record, Img4Refusal* refusal) {
-    DERReturn result = decodeManifest(buffer, signing, &record->manifest, refusal);
+DERReturn decodeBareManifest(const DERItem& buffer, ItemSpecs specs, Img4Record* record, Img4Refusal* refusal) {
+    DERReturn result = decodeManifest(buffer, specs, &record->manifest, refusal);
     if (result == DERSuccess && !isPresent(record->manifest.body))
         result = DERDecodeError;
     DERDecodedInfo whole;
@@ -246,13 +216,8 @@ DERReturn decodeBareManifest(const DERItem& buffer, Signing signing, Img4Record*
 DERReturn findKind(const DERItem& buffer, Img4Kind* kind, Img4Refusal* refusal) {
     DERDecodedInfo whole;
     DERDecodedInfo magic = {};
-    DERRefusal why;
-    enter(refusal, Img4SubjectFile);
-    if (const DERReturn result = DERDecodeItemExplained(&buffer, &whole, &why); result != DERSuccess)
-        return refuse(refusal, result, why);
-    if (whole.tag != DERTagSequence)
-        return refuse(refusal, DERUnexpectedTag,
-                      {DERFaultNoSequence, 0, buffer.data, buffer.data, whole.tag, DERTagSequence});
+    if (const DERReturn result = decodeSequence(buffer, Img4SubjectFile, &whole, refusal); result != DERSuccess)
+        return result;
     const bool hasMagic = DERDecodeItem(&whole.content, &magic) == DERSuccess && magic.tag == DERTagIA5String;
     *kind = !hasMagic                                     ? Img4KindUnknown
             : equalsFourCC(magic.content, containerMagic) ? Img4KindContainer
@@ -271,12 +236,12 @@ DERReturn decodeKind(const DERItem& buffer, Img4Record* record, Img4Kind* kind, 
         return decodeContainer(buffer, record, refusal);
     if (*kind == Img4KindPayload)
         return decodeBarePayload(buffer, record, refusal);
-    if (decodeBareManifest(buffer, Signing::Unsigned, record, nullptr) == DERSuccess) {
+    if (decodeBareManifest(buffer, DERImg4UnsignedManifestItemSpecs, record, nullptr) == DERSuccess) {
         *kind = Img4KindUnsignedManifest;
         return DERSuccess;
     }
     *record = Img4Record{};
-    return decodeBareManifest(buffer, Signing::Signed, record, refusal);
+    return decodeBareManifest(buffer, DERImg4ManifestItemSpecs, record, refusal);
 }
 
 } // namespace
@@ -290,13 +255,14 @@ DERReturn Img4DecodeInitPayload(const uint8_t* buffer, uint64_t length, Img4Reco
 }
 
 DERReturn Img4DecodeInitManifest(const uint8_t* buffer, uint64_t length, Img4Record* record) {
-    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, Signing::Signed, record, nullptr)
+    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, DERImg4ManifestItemSpecs, record, nullptr)
                                    : DERParamError;
 }
 
 DERReturn Img4DecodeInitUnsignedManifest(const uint8_t* buffer, uint64_t length, Img4Record* record) {
-    return prepare(buffer, record) ? decodeBareManifest({buffer, length}, Signing::Unsigned, record, nullptr)
-                                   : DERParamError;
+    return prepare(buffer, record)
+               ? decodeBareManifest({buffer, length}, DERImg4UnsignedManifestItemSpecs, record, nullptr)
+               : DERParamError;
 }
 
 DERReturn Img4DecodeInitExplained(const uint8_t* buffer, uint64_t length, Img4Record* record, Img4Kind* kind,

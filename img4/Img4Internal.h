@@ -5,7 +5,7 @@
 #include "der/DERDecode.h"
 #include "img4/Img4.h"
 
-#include <iterator>
+#include <span>
 
 // Records that the tables fill and that Img4Record does not keep.
 struct Img4Container {
@@ -16,12 +16,7 @@ struct Img4Container {
 };
 
 struct Img4PayloadWithProperties {
-    DERItem magic;
-    DERItem type;
-    DERItem version;
-    DERItem data;
-    DERItem keybag;
-    DERItem compression;
+    Img4PayloadRecord payload;
     DERItem properties;
 };
 
@@ -30,27 +25,9 @@ struct Img4Compression {
     DERItem uncompressedSize;
 };
 
-struct Img4PayloadProperties {
-    DERItem magic;
-    DERItem properties;
-};
-
-extern const DERItemSpec DERImg4ItemSpecs[];
-extern const uint16_t DERNumImg4ItemSpecs;
-extern const DERItemSpec DERImg4PayloadItemSpecs[];
-extern const uint16_t DERNumImg4PayloadItemSpecs;
-extern const DERItemSpec DERImg4PayloadWithPropertiesItemSpecs[];
-extern const uint16_t DERNumImg4PayloadWithPropertiesItemSpecs;
-extern const DERItemSpec DERImg4CompressionItemSpecs[];
-extern const uint16_t DERNumImg4CompressionItemSpecs;
-extern const DERItemSpec DERImg4PayloadPropertiesItemSpecs[];
-extern const uint16_t DERNumImg4PayloadPropertiesItemSpecs;
-extern const DERItemSpec DERImg4ManifestItemSpecs[];
-extern const uint16_t DERNumImg4ManifestItemSpecs;
-extern const DERItemSpec DERImg4UnsignedManifestItemSpecs[];
-extern const uint16_t DERNumImg4UnsignedManifestItemSpecs;
-extern const DERItemSpec DERImg4RestoreInfoItemSpecs[];
-extern const uint16_t DERNumImg4RestoreInfoItemSpecs;
+// The tables that are wanted beside initialisation too.
+extern const DERItemSpec DERImg4PayloadWithPropertiesItemSpecs[7];
+extern const DERItemSpec DERImg4CompressionItemSpecs[2];
 
 namespace img4 {
 
@@ -104,14 +81,21 @@ inline DERReturn refuse(Img4Refusal* refusal, DERReturn status, const DERRefusal
     return refuse(refusal, status, Img4FaultEncoding, encoding.place);
 }
 
-// DERParseSequenceExplained into `fields`, all of which are cleared first.
+using ItemSpecs = std::span<const DERItemSpec>;
+
+// DERParseSequenceExplained and DERParseSequenceContentExplained into `fields`, all of which are cleared first.
 template <typename Fields>
-DERReturn parseSequence(const DERItem& encoding, uint16_t rows, const DERItemSpec* specs, Fields* fields,
-                        Img4Refusal* refusal) {
+DERReturn parseSequence(const DERItem& encoding, ItemSpecs specs, Fields* fields, Img4Refusal* refusal = nullptr,
+                        decltype(DERParseSequenceExplained)* parse = DERParseSequenceExplained) {
     DERRefusal why;
-    const DERReturn result = DERParseSequenceExplained(&encoding, rows, specs, fields, sizeof *fields, sizeof *fields,
-                                                       refusal != nullptr ? &why : nullptr);
+    const DERReturn result = parse(&encoding, static_cast<uint16_t>(specs.size()), specs.data(), fields, sizeof *fields,
+                                   sizeof *fields, refusal != nullptr ? &why : nullptr);
     return result == DERSuccess || refusal == nullptr ? result : refuse(refusal, result, why);
+}
+
+template <typename Fields>
+DERReturn parseContent(const DERItem& content, ItemSpecs specs, Fields* fields, Img4Refusal* refusal = nullptr) {
+    return parseSequence(content, specs, fields, refusal, DERParseSequenceContentExplained);
 }
 
 // Passes the failure of a search in `dictionary` on that ended at `end`.
@@ -119,7 +103,7 @@ DERReturn refuseSearch(DERReturn result, const DERItem& dictionary, const uint8_
 
 // As DERImg4DecodeFindProperty, for arguments that are there.
 DERReturn findProperty(const DERItem& dictionary, DERTag tag, DERTag valueType, Img4Property* property,
-                       Img4Refusal* refusal);
+                       Img4Refusal* refusal = nullptr);
 
 // The values of "MANB" and "MANP" of a record with a manifest.
 DERReturn findManifestDictionaries(const Img4Record& record, DERItem* manb, DERItem* manp,
@@ -132,6 +116,16 @@ using Parser = DERReturn (*)(const DERItem* item, T* value);
 inline DERReturn parseData(const DERItem* item, DERItem* value) {
     *value = *item;
     return DERSuccess;
+}
+
+// The value of the property that `find` finds.
+template <typename T, typename Find>
+DERReturn getValue(T* value, Parser<T> parse, Find find) {
+    Img4Property property;
+    if (value == nullptr)
+        return DERParamError;
+    const DERReturn result = find(&property);
+    return result == DERSuccess ? parse(&property.value, value) : result;
 }
 
 // Passes `result` on, and clears *value when it is a failure.

@@ -4,39 +4,25 @@ using namespace img4;
 
 namespace {
 
-DERReturn findObject(const Img4Record& record, uint32_t object, DERItem* properties) {
+DERReturn findObjectProperty(const Img4Record* record, uint32_t object, DERTag tag, DERTag valueType,
+                             Img4Property* property) {
     DERItem manb;
     DERItem manp;
     Img4Property found;
-    if (const DERReturn result = findManifestDictionaries(record, &manb, &manp); result != DERSuccess)
-        return result;
-    if (const DERReturn result = DERImg4DecodeFindProperty(&manb, Img4PropertyTag(object), DERTagSet, &found);
-        result != DERSuccess)
-        return result;
-    *properties = found.value;
-    return DERSuccess;
-}
-
-DERReturn findObjectProperty(const Img4Record* record, uint32_t object, DERTag tag, DERTag valueType,
-                             Img4Property* property) {
-    DERItem properties;
     if (record == nullptr || property == nullptr)
         return DERParamError;
-    if (const DERReturn result = findObject(*record, object, &properties); result != DERSuccess)
-        return result;
-    return DERImg4DecodeFindProperty(&properties, tag, valueType, property);
+    DERReturn result = findManifestDictionaries(*record, &manb, &manp);
+    if (result == DERSuccess)
+        result = findProperty(manb, Img4PropertyTag(object), DERTagSet, &found);
+    return result == DERSuccess ? findProperty(found.value, tag, valueType, property) : result;
 }
 
 template <typename T>
 DERReturn getObjectValue(const Img4Record* record, uint32_t object, uint32_t name, DERTag type, Parser<T> parse,
                          T* value) {
-    Img4Property property;
-    if (value == nullptr)
-        return DERParamError;
-    if (const DERReturn result = findObjectProperty(record, object, Img4PropertyTag(name), type, &property);
-        result != DERSuccess)
-        return result;
-    return parse(&property.value, value);
+    return getValue(value, parse, [&](Img4Property* property) {
+        return findObjectProperty(record, object, Img4PropertyTag(name), type, property);
+    });
 }
 
 // The octets that hold the properties of a section; absent when the section is.
@@ -53,32 +39,25 @@ const DERItem* sectionItem(const Img4Record& record, uint32_t section) {
 
 DERReturn findSectionProperty(const Img4Record* record, uint32_t section, DERTag tag, DERTag valueType,
                               Img4Property* property) {
-    if (record == nullptr || property == nullptr)
-        return DERParamError;
-    const DERItem* item = sectionItem(*record, section);
-    if (item == nullptr)
+    const DERItem* item = record != nullptr ? sectionItem(*record, section) : nullptr;
+    if (item == nullptr || property == nullptr)
         return DERParamError;
     if (!isPresent(*item))
         return DEREndOfSequence;
     if (section == Img4SectionRestoreInfo)
-        return DERImg4DecodeFindProperty(item, tag, valueType, property);
+        return findProperty(*item, tag, valueType, property);
     DERItem manb;
     DERItem manp;
-    if (const DERReturn result = findManifestDictionaries(*record, &manb, &manp); result != DERSuccess)
-        return result;
-    return DERImg4DecodeFindProperty(&manp, tag, valueType, property);
+    const DERReturn result = findManifestDictionaries(*record, &manb, &manp);
+    return result == DERSuccess ? findProperty(manp, tag, valueType, property) : result;
 }
 
 template <typename T>
 DERReturn getSectionValue(const Img4Record* record, uint32_t section, uint32_t name, DERTag type, Parser<T> parse,
                           T* value) {
-    Img4Property property;
-    if (value == nullptr)
-        return DERParamError;
-    if (const DERReturn result = findSectionProperty(record, section, Img4PropertyTag(name), type, &property);
-        result != DERSuccess)
-        return result;
-    return parse(&property.value, value);
+    return getValue(value, parse, [&](Img4Property* property) {
+        return findSectionProperty(record, section, Img4PropertyTag(name), type, property);
+    });
 }
 
 // Unlike those of an object, the getters of a section touch a number only once its property was found.

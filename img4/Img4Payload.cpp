@@ -35,20 +35,16 @@ DERReturn parseCompression(const Img4Record& record, uint32_t* algorithm, uint32
     if (!hasContent(record.payload.compression))
         return DEREndOfSequence;
     Img4Compression fields;
-    if (const DERReturn result = DERParseSequenceContent(&record.payload.compression, DERNumImg4CompressionItemSpecs,
-                                                         DERImg4CompressionItemSpecs, &fields, sizeof fields);
-        result != DERSuccess)
-        return result;
-    if (const DERReturn result = DERParseInteger(&fields.algorithm, algorithm); result != DERSuccess)
-        return result;
-    return DERParseInteger(&fields.uncompressedSize, uncompressedSize);
+    DERReturn result = parseContent(record.payload.compression, DERImg4CompressionItemSpecs, &fields);
+    if (result == DERSuccess)
+        result = DERParseInteger(&fields.algorithm, algorithm);
+    return result == DERSuccess ? DERParseInteger(&fields.uncompressedSize, uncompressedSize) : result;
 }
 
 // The content of the payload's [0], absent when there is none.
 DERReturn parseProperties(const Img4Record& record, DERItem* properties) {
     Img4PayloadWithProperties fields = {};
-    const DERReturn result = DERParseSequence(&record.payloadRaw, DERNumImg4PayloadWithPropertiesItemSpecs,
-                                              DERImg4PayloadWithPropertiesItemSpecs, &fields, sizeof fields);
+    const DERReturn result = parseSequence(record.payloadRaw, DERImg4PayloadWithPropertiesItemSpecs, &fields);
     *properties = fields.properties;
     return result;
 }
@@ -62,21 +58,16 @@ DERReturn requireProperties(const Img4Record& record, DERItem* properties) {
 DERReturn findPropertySet(const Img4Record& record, DERItem* set) {
     DERItem properties;
     DERItem sequence;
-    if (const DERReturn result = requireProperties(record, &properties); result != DERSuccess)
-        return result;
-    if (const DERReturn result = findFirst(properties, DERTagSequence, &sequence); result != DERSuccess)
-        return result;
-    return findFirst(sequence, DERTagSet, set);
+    DERReturn result = requireProperties(record, &properties);
+    if (result == DERSuccess)
+        result = findFirst(properties, DERTagSequence, &sequence);
+    return result == DERSuccess ? findFirst(sequence, DERTagSet, set) : result;
 }
 
 template <typename T>
 DERReturn getPropertyValue(const Img4Record* record, DERTag tag, DERTag type, Parser<T> parse, T* value) {
-    Img4Property property;
-    if (value == nullptr)
-        return DERParamError;
-    if (const DERReturn result = Img4DecodePayloadProperty(record, tag, type, &property); result != DERSuccess)
-        return result;
-    return parse(&property.value, value);
+    return getValue(value, parse,
+                    [&](Img4Property* property) { return Img4DecodePayloadProperty(record, tag, type, property); });
 }
 
 // Looks whether the element with the content `element` is a property named `name`. Anything else leaves *value absent;
@@ -98,8 +89,7 @@ DERReturn matchProperty(const DERItem& element, uint32_t name, DERItem* value) {
     if (const DERReturn result = findFirst(inner.content, DERTagIA5String, &firstString); result != DERSuccess)
         return result;
     NameAndValue fields;
-    if (equalsFourCC(firstString, name) &&
-        DERParseSequence(&element, std::size(specs), specs, &fields, sizeof fields) == DERSuccess)
+    if (equalsFourCC(firstString, name) && parseSequence(element, specs, &fields) == DERSuccess)
         *value = fields.value;
     return DERSuccess;
 }
@@ -176,9 +166,8 @@ DERReturn Img4DecodePayloadProperty(const Img4Record* record, DERTag tag, DERTag
     DERItem set;
     if (record == nullptr || property == nullptr)
         return DERParamError;
-    if (const DERReturn result = findPropertySet(*record, &set); result != DERSuccess)
-        return result;
-    return DERImg4DecodeFindProperty(&set, tag, valueType, property);
+    const DERReturn result = findPropertySet(*record, &set);
+    return result == DERSuccess ? findProperty(set, tag, valueType, property) : result;
 }
 
 DERReturn Img4DecodeGetPayloadPropertiesBoolean(const Img4Record* record, DERTag tag, bool* value) {
@@ -232,11 +221,10 @@ DERReturn Img4DecodePayloadPropertiesFindItemWithTag(const DERItem* properties, 
         DERItem found;
         if (const DERReturn matched = matchProperty(element.content, name, &found); matched != DERSuccess)
             return matched;
-        if (isPresent(found) && found.length == 0)
-            return DERUnexpectedTag;
         if (isPresent(found)) {
-            *value = found;
-            return DERSuccess;
+            if (found.length != 0)
+                *value = found;
+            return found.length != 0 ? DERSuccess : DERUnexpectedTag;
         }
         result = DERDecodeSeqNext(&elements, &element);
     }

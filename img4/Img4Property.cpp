@@ -55,12 +55,10 @@ DERReturn decodeProperty(const DERItem& item, const DERTag* tag, Img4Property* p
 // The value of the single property `item`, which must be named `name` and of the type `type`.
 template <typename T>
 DERReturn getPropertyValue(const DERItem* item, uint32_t name, DERTag type, Parser<T> parse, T* value) {
-    Img4Property property;
-    if (value == nullptr)
-        return DERParamError;
-    if (const DERReturn result = DERImg4DecodeProperty(item, Img4PropertyTag(name), &property); result != DERSuccess)
-        return result;
-    return property.valueTag == type ? parse(&property.value, value) : DERUnexpectedTag;
+    return getValue(value, parse, [&](Img4Property* property) {
+        const DERReturn result = DERImg4DecodeProperty(item, Img4PropertyTag(name), property);
+        return result == DERSuccess && property->valueTag != type ? DERUnexpectedTag : result;
+    });
 }
 
 } // namespace
@@ -109,7 +107,7 @@ DERReturn img4::findProperty(const DERItem& dictionary, DERTag tag, DERTag value
         {offsetof(NameAndValue, value), valueType, 0},
     };
     NameAndValue fields;
-    DERReturn result = parseSequence(element, std::size(specs), specs, &fields, refusal);
+    DERReturn result = parseSequence(element, specs, &fields, refusal);
     if (refusal != nullptr && result == DERUnexpectedTag && refusal->encoding.fault == DERFaultTag)
         refusal->fault = refusal->encoding.row == 0 ? Img4FaultName : Img4FaultValueType;
     if (result == DERSuccess && !isNameOf(fields.name, tag))
@@ -120,7 +118,7 @@ DERReturn img4::findProperty(const DERItem& dictionary, DERTag tag, DERTag value
 }
 
 DERReturn DERImg4DecodeFindProperty(const DERItem* dictionary, DERTag tag, DERTag valueType, Img4Property* property) {
-    return dictionary != nullptr && property != nullptr ? findProperty(*dictionary, tag, valueType, property, nullptr)
+    return dictionary != nullptr && property != nullptr ? findProperty(*dictionary, tag, valueType, property)
                                                         : DERParamError;
 }
 
@@ -166,10 +164,10 @@ DERReturn Img4DecodeGetPayloadVersionPropertyString(const DERItem* property, DER
         return result;
     if (outer.valueTag != DERTagSet && outer.valueTag != DERTagSequence)
         return DERUnexpectedTag;
-    if (const DERReturn result = findFirst(outer.value, tag, &element); result != DERSuccess)
-        return result;
-    if (const DERReturn result = decodeProperty(element, &tag, &inner); result != DERSuccess)
-        return result;
-    *value = inner.value;
-    return DERSuccess;
+    DERReturn result = findFirst(outer.value, tag, &element);
+    if (result == DERSuccess)
+        result = decodeProperty(element, &tag, &inner);
+    if (result == DERSuccess)
+        *value = inner.value;
+    return result;
 }

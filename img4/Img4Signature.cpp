@@ -32,8 +32,7 @@ bool parseRSAKey(const DERItem& encoding, RSAKey* key) {
     DERItem content;
     DERRSAPubKeyPKCS1 fields;
     return isWholeItem(encoding, DERTagSequence, &content) &&
-           DERParseSequenceContent(&content, DERNumRSAPubKeyPKCS1ItemSpecs, DERRSAPubKeyPKCS1ItemSpecs, &fields,
-                                   sizeof fields) == DERSuccess &&
+           parseContent(content, {DERRSAPubKeyPKCS1ItemSpecs, DERNumRSAPubKeyPKCS1ItemSpecs}, &fields) == DERSuccess &&
            parseNumber(fields.modulus, &key->modulus) && parseNumber(fields.publicExponent, &key->exponent);
 }
 
@@ -107,8 +106,7 @@ bool isECDSASignature(const DERItem& encoding, const NamedCurve& curve) {
     const DERItemSpec specs[] = {{offsetof(Numbers, r), DERTagInteger, 0}, {offsetof(Numbers, s), DERTagInteger, 0}};
     DERItem content;
     Numbers numbers;
-    return isWholeItem(encoding, DERTagSequence, &content) &&
-           DERParseSequenceContent(&content, std::size(specs), specs, &numbers, sizeof numbers) == DERSuccess &&
+    return isWholeItem(encoding, DERTagSequence, &content) && parseContent(content, specs, &numbers) == DERSuccess &&
            isPositive(numbers.r, curve.coordinateLength) && isPositive(numbers.s, curve.coordinateLength);
 }
 

@@ -26,11 +26,10 @@ DERReturn storeDigest(const Flow& flow, const DERItem& data, uint8_t (&digest)[I
     return DERSuccess;
 }
 
-// One evaluation of a record under a profile.
-struct Evaluation {
+// What both orders of steps work on.
+struct Flow {
     Img4Record& record;
-    const Img4TrustCallbacks& callbacks;
-    const Img4TrustProfile& profile;
+    Img4TrustCallbacks callbacks;
     void* context;
     Img4TrustRefusal* why; // null unless asked for
 
@@ -41,13 +40,19 @@ struct Evaluation {
         enter(refusal(), subject);
         return status == DERSuccess ? status : refuse(refusal(), status, Img4FaultOther, place);
     }
+    DERReturn findObject(uint32_t object) const;
+    DERReturn judgeAll(Img4Subject subject, const DERItem& dictionary, uint32_t selector) const;
+};
+
+// The newer one: an evaluation under a profile.
+struct Evaluation : Flow {
+    const Img4TrustProfile& profile;
 
     DERReturn computeDigest(const DERItem& data, uint8_t* out) const {
         return profile.computeDigest(&data, out, profile.digestInfo->length, &profile);
     }
     bool isTrustedDigest() const;
     DERReturn verifySignature() const;
-    DERReturn findObject(uint32_t object) const;
     DERReturn checkLeaf() const;
     DERReturn run(const uint32_t* object) const;
 };
@@ -74,7 +79,7 @@ DERReturn Evaluation::verifySignature() const {
                 manifest.signature.data);
 }
 
-DERReturn Evaluation::findObject(uint32_t object) const {
+DERReturn Flow::findObject(uint32_t object) const {
     const DERTag tag = Img4PropertyTag(object);
     Img4Property found = {};
     enter(refusal(), Img4SubjectObject);
@@ -94,17 +99,26 @@ DERReturn Evaluation::checkLeaf() const {
     return step(Img4SubjectConstraints, profile.evaluateCertificateProperties(&record), record.manifest.certChain.data);
 }
 
-// A record without payload has nothing to digest.
-template <typename Flow>
-DERReturn digestPayload(Img4Record& record, const Flow& flow) {
-    if (!hasContent(record.payload.data))
-        return DERSuccess;
-    return storeDigest(flow, record.payloadRaw, record.payload.digest, &record.payloadHashed);
+// The steps that the two orders have in common, between the signature and, in one of them, the manifest's digest.
+template <typename AnyFlow>
+DERReturn evaluateContents(const AnyFlow& flow, const uint32_t* object, bool verified) {
+    Img4Record& record = flow.record;
+    DERReturn result = findManifestDictionaries(record, &record.manb, &record.manp, flow.refusal());
+    if (result == DERSuccess && object != nullptr)
+        result = flow.findObject(*object);
+    if (result == DERSuccess && verified)
+        result = flow.checkLeaf();
+    // A record without payload has nothing to digest.
+    if (result == DERSuccess && hasContent(record.payload.data))
+        result = flow.step(Img4SubjectPayloadDigest,
+                           storeDigest(flow, record.payloadRaw, record.payload.digest, &record.payloadHashed),
+                           record.payloadRaw.data);
+    if (result == DERSuccess)
+        result = flow.judgeAll(Img4SubjectManifestProperties, record.manp, Img4SelectorManifest);
+    if (result == DERSuccess && object != nullptr)
+        result = flow.judgeAll(Img4SubjectObjectProperties, record.objp, Img4SelectorObject);
+    return result;
 }
-
-// Has every property in `dictionary` judged.
-DERReturn judgeAll(const DERItem& dictionary, uint32_t selector, Img4PropertyCallback evaluateProperty, void* context,
-                   Img4Refusal* refusal = nullptr);
 
 // Evaluates the manifest alone when `object` is null.
 DERReturn Evaluation::run(const uint32_t* object) const {
@@ -112,22 +126,9 @@ DERReturn Evaluation::run(const uint32_t* object) const {
     if (result != DERSuccess)
         return step(Img4SubjectManifestDigest, result, record.manifestRaw.data);
     const bool verified = !isTrustedDigest();
-    if (verified && (result = verifySignature()) != DERSuccess)
-        return result;
-    if ((result = findManifestDictionaries(record, &record.manb, &record.manp, refusal())) != DERSuccess)
-        return result;
-    if (object != nullptr && (result = findObject(*object)) != DERSuccess)
-        return result;
-    if (verified && (result = checkLeaf()) != DERSuccess)
-        return result;
-    if ((result = digestPayload(record, *this)) != DERSuccess)
-        return step(Img4SubjectPayloadDigest, result, record.payloadRaw.data);
-    enter(refusal(), Img4SubjectManifestProperties);
-    result = judgeAll(record.manp, Img4SelectorManifest, callbacks.evaluateProperty, context, refusal());
-    if (object == nullptr || result != DERSuccess)
-        return result;
-    enter(refusal(), Img4SubjectObjectProperties);
-    return judgeAll(record.objp, Img4SelectorObject, callbacks.evaluateProperty, context, refusal());
+    if (verified)
+        result = verifySignature();
+    return result == DERSuccess ? evaluateContents(*this, object, verified) : result;
 }
 
 DERReturn evaluate(const uint32_t* object, Img4Record* record, const Img4TrustCallbacks* callbacks,
@@ -137,7 +138,7 @@ DERReturn evaluate(const uint32_t* object, Img4Record* record, const Img4TrustCa
         return DERParamError;
     if (profile->digestInfo->length > Img4MaxDigestLength)
         return DERBufferOverflow;
-    return Evaluation{*record, *callbacks, *profile, context, why}.run(object);
+    return Evaluation{{*record, *callbacks, context, why}, *profile}.run(object);
 }
 
 bool isJudgedType(DERTag valueTag) {
@@ -171,7 +172,7 @@ DERReturn judge(const DERDecodedInfo& element, const uint8_t* start, uint32_t se
 }
 
 DERReturn judgeAll(const DERItem& dictionary, uint32_t selector, Img4PropertyCallback evaluateProperty, void* context,
-                   Img4Refusal* refusal) {
+                   Img4Refusal* refusal = nullptr) {
     DERSequence rest;
     DERDecodedInfo element;
     const uint8_t* start = dictionary.data;
@@ -184,6 +185,11 @@ DERReturn judgeAll(const DERItem& dictionary, uint32_t selector, Img4PropertyCal
         start = rest.next;
     }
     return result == DEREndOfSequence ? DERSuccess : refuseSearch(result, dictionary, rest.next, refusal);
+}
+
+DERReturn Flow::judgeAll(Img4Subject subject, const DERItem& dictionary, uint32_t selector) const {
+    enter(refusal(), subject);
+    return ::judgeAll(dictionary, selector, callbacks.evaluateProperty, context, refusal());
 }
 
 } // namespace
@@ -259,6 +265,31 @@ DERReturn verifyWithChain(const DERItem* chain, const DERItem* signature, const 
     return img4_verify_signature_with_chain(chain, signature, digest, certProperties);
 }
 
+// The older order, with the parts of a caller.
+struct EvaluationByParts : Flow {
+    Img4SignatureWithChainVerifier verify;
+    Img4CertificateCheck checkCertificate;
+    Img4DigestFunction digest;
+
+    DERReturn computeDigest(const DERItem& data, uint8_t* out) const {
+        return digest(data.data, data.length, out, context);
+    }
+    DERReturn checkLeaf() const { return checkCertificate(&record); }
+    DERReturn run(uint32_t object) const;
+};
+
+DERReturn EvaluationByParts::run(uint32_t object) const {
+    Img4ManifestRecord& manifest = record.manifest;
+    DERReturn result = storeDigest(*this, manifest.body, manifest.bodyDigest, nullptr);
+    if (result == DERSuccess)
+        result =
+            verify(&manifest.certChain, &manifest.signature, manifest.bodyDigest, &manifest.certProperties, context);
+    if (result == DERSuccess)
+        result = evaluateContents(*this, &object, true);
+    return result == DERSuccess ? storeDigest(*this, record.manifestRaw, manifest.digest, &record.manifestHashed)
+                                : result;
+}
+
 } // namespace
 
 DERReturn Img4DecodeEvaluateTrust(uint32_t object, Img4Record* record, Img4PropertyCallback evaluateProperty,
@@ -266,53 +297,6 @@ DERReturn Img4DecodeEvaluateTrust(uint32_t object, Img4Record* record, Img4Prope
     return Img4DecodeEvaluateTrustWithCallbacks(object, record, evaluateProperty, verifyWithChain,
                                                 Img4DecodeEvaluateCertificateProperties, hashWithSHA1, context);
 }
-
-namespace {
-
-// The parts of the SHA-1 flow.
-struct Parts {
-    Img4PropertyCallback evaluateProperty;
-    Img4SignatureWithChainVerifier verify;
-    Img4CertificateCheck checkCertificate;
-    Img4DigestFunction digest;
-    void* context;
-
-    DERReturn computeDigest(const DERItem& data, uint8_t* out) const {
-        return digest(data.data, data.length, out, context);
-    }
-    DERReturn verifySignature(Img4ManifestRecord& manifest) const;
-    DERReturn run(uint32_t object, Img4Record& record) const;
-};
-
-DERReturn Parts::verifySignature(Img4ManifestRecord& manifest) const {
-    if (const DERReturn result = storeDigest(*this, manifest.body, manifest.bodyDigest, nullptr); result != DERSuccess)
-        return result;
-    return verify(&manifest.certChain, &manifest.signature, manifest.bodyDigest, &manifest.certProperties, context);
-}
-
-DERReturn Parts::run(uint32_t object, Img4Record& record) const {
-    Img4Property found = {};
-    DERReturn result = verifySignature(record.manifest);
-    if (result != DERSuccess)
-        return result;
-    if ((result = findManifestDictionaries(record, &record.manb, &record.manp)) != DERSuccess)
-        return result;
-    result = DERImg4DecodeFindProperty(&record.manb, Img4PropertyTag(object), DERTagSet, &found);
-    if (result != DERSuccess)
-        return result;
-    record.objp = found.value;
-    if ((result = checkCertificate(&record)) != DERSuccess)
-        return result;
-    if ((result = digestPayload(record, *this)) != DERSuccess)
-        return result;
-    if ((result = Img4DecodeEvaluateManifestProperties(&record, evaluateProperty, context)) != DERSuccess)
-        return result;
-    if ((result = Img4DecodeEvaluateObjectProperties(&record, evaluateProperty, context)) != DERSuccess)
-        return result;
-    return storeDigest(*this, record.manifestRaw, record.manifest.digest, &record.manifestHashed);
-}
-
-} // namespace
 
 DERReturn Img4DecodeEvaluateTrustWithCallbacks(uint32_t object, Img4Record* record,
                                                Img4PropertyCallback evaluateProperty,
@@ -322,7 +306,9 @@ DERReturn Img4DecodeEvaluateTrustWithCallbacks(uint32_t object, Img4Record* reco
     if (record == nullptr || evaluateProperty == nullptr || verify == nullptr || checkCertificate == nullptr ||
         digest == nullptr || !isPresent(record->manifestRaw))
         return DERParamError;
-    return Parts{evaluateProperty, verify, checkCertificate, digest, context}.run(object, *record);
+    return EvaluationByParts{
+        {*record, {evaluateProperty, nullptr, nullptr}, context, nullptr}, verify, checkCertificate, digest}
+        .run(object);
 }
 
 DERReturn img4_verify_signature_with_chain(const DERItem* chain, const DERItem* signature, const uint8_t* digest,
