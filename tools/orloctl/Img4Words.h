@@ -2,6 +2,7 @@
 #ifndef VELTRA_TOOLS_ORLOCTL_IMG4WORDS_H
 #define VELTRA_TOOLS_ORLOCTL_IMG4WORDS_H
 
+#include <cstdint>
 #include <string>
 
 #include "img4/Img4.h"
