@@ -1,5 +1,6 @@
 #include "Daemon/Conversions.h"
 
+#include <algorithm>
 #include <charconv>
 #include <optional>
 
