@@ -156,14 +156,11 @@ Bytes behind(const Bytes& content) {
 }
 
 TEST(Img4PayloadProperties, canBeFoundByName) {
-    const Bytes wanted = property("want", integer(5));
+    const Bytes wanted = property("want", integer(5)), wanted6 = sequence({ia5("want"), integer(6)});
     const FindCase rows[] = {
         {"sound", inSet({property("othr", integer(1)), wanted}), DERSuccess, {5}},
         {"first SEQUENCE behind another item", join({integer(1), inSet({wanted})}), DERSuccess, {5}},
-        {"name counts, not the tag",
-         inSet({item(propertyTag("othr"), sequence({ia5("want"), integer(6)}))}),
-         DERSuccess,
-         {6}},
+        {"name counts, not the tag", inSet({item(propertyTag("othr"), wanted6)}), DERSuccess, {6}},
         {"value of any type", inSet({property("want", set({boolean(true)}))}), DERSuccess, {1, 1, 0xFF}},
         {"element that holds no item", inSet({octets({0x30}), wanted}), DERSuccess, {5}},
         {"name without a value", behind(sequence({ia5("want")})), DERSuccess, {5}},

@@ -1,7 +1,6 @@
 #include "tests/img4/TrustDomain.h"
 #include "tests/support/MissingArguments.h"
 
-#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -14,33 +13,23 @@ namespace {
 using namespace img4maker;
 using namespace signedmanifest;
 
-// Numbers without sign or size, as big-endian octets.
-using Number = std::unique_ptr<BIGNUM, decltype(&BN_free)>;
+// Numbers without sign, as big-endian octets.
 
-Number number(const Bytes& octets) {
-    return {BN_bin2bn(octets.data(), static_cast<int>(octets.size()), nullptr), BN_free};
-}
-
-Number parameter(const Key& key, const char* name) {
+Bytes parameter(const Key& key, const char* name) {
     BIGNUM* value = nullptr;
     EXPECT_EQ(EVP_PKEY_get_bn_param(key.get(), name, &value), 1) << name;
-    return {value, BN_free};
-}
-
-Bytes octetsOf(const BIGNUM* value, std::size_t length) {
-    Bytes octets(length);
-    EXPECT_EQ(BN_bn2binpad(value, octets.data(), static_cast<int>(length)), static_cast<int>(length));
+    Bytes octets(static_cast<std::size_t>(BN_num_bytes(value)));
+    BN_bn2bin(value, octets.data());
+    BN_free(value);
     return octets;
 }
 
-Bytes octetsOf(const BIGNUM* value) {
-    return octetsOf(value, static_cast<std::size_t>(BN_num_bytes(value)));
-}
-
-Bytes sum(const Bytes& one, const BIGNUM* other) {
-    const Number total = number(one);
-    EXPECT_EQ(BN_add(total.get(), total.get(), other), 1);
-    return octetsOf(total.get());
+// Of two numbers of the same length.
+Bytes sum(Bytes one, const Bytes& other) {
+    unsigned carry = 0;
+    for (std::size_t i = one.size(); i-- > 0; carry >>= 8)
+        one[i] = static_cast<std::uint8_t>(carry += one[i] + other.at(i));
+    return join({Bytes(carry, 1), one});
 }
 
 // The INTEGER with these content octets, made non-negative or not.
@@ -89,24 +78,14 @@ Bytes signRaw(const Key& key, const Bytes& block) {
     return signature;
 }
 
-// What a padded block consists of (RFC 8017 9.2).
-struct Block {
-    Bytes start = {0x00, 0x01};
-    std::size_t paddingLength = 0; // 0: as much as fills the block
-    Bytes separator = {0x00};
-    Bytes digestInfo = {};
-    Bytes rest = {};
-    std::uint8_t padding = 0xFF;
-};
+// The padded block (RFC 8017 9.2) of that length.
+Bytes padded(const Bytes& digestInfo, std::size_t length) {
+    return join({{0x00, 0x01}, Bytes(length - 3 - digestInfo.size(), 0xFF), {0x00}, digestInfo});
+}
 
-Bytes encode(const Block& block, std::size_t length) {
-    const std::size_t others =
-        block.start.size() + block.separator.size() + block.digestInfo.size() + block.rest.size();
-    Bytes encoded =
-        join({block.start, Bytes(block.paddingLength != 0 ? block.paddingLength : length - others, block.padding),
-              block.separator, block.digestInfo, block.rest});
-    encoded.resize(length, 0xAA);
-    return encoded;
+Bytes changedAt(Bytes bytes, std::size_t place, std::uint8_t octet) {
+    bytes.at(place) = octet;
+    return bytes;
 }
 
 // A SEQUENCE with its length in the long form, which is no DER as long as the content is short.
@@ -114,36 +93,39 @@ Bytes longSequence(const Bytes& content) {
     return join({Bytes{0x30, 0x81, static_cast<std::uint8_t>(content.size())}, content});
 }
 
-struct BlockCase {
+struct Case {
     const char* name;
-    Block block;
+    Bytes octets;
     bool accepted = false;
 };
 
-// The blocks of this digest under the algorithm with this encoded OBJECT IDENTIFIER.
-std::vector<BlockCase> blockCases(const Bytes& digest, const Bytes& oid) {
+// The blocks of that length for this digest under the algorithm with this encoded OBJECT IDENTIFIER.
+std::vector<Case> blockCases(const Bytes& digest, const Bytes& oid, std::size_t length) {
     const Bytes algorithm = sequence({oid, null});
-    const Bytes sound = sequence({algorithm, octets(digest)});
-    const auto with = [](const Bytes& digestInfo) { return Block{.digestInfo = digestInfo}; };
+    const Bytes info = sequence({algorithm, octets(digest)});
+    const Bytes sound = padded(info, length);
+    const auto with = [length](const List& digestInfo) { return padded(sequence(digestInfo), length); };
+    const auto shortened = [&](std::size_t padding) {
+        return join({padded(info, padding + 3 + info.size()), Bytes(length - padding - 3 - info.size(), 0xAA)});
+    };
     const Bytes longDigest = join({Bytes{0x04, 0x81, static_cast<std::uint8_t>(digest.size())}, digest});
     return {
-        {"sound", with(sound), true},
-        {"no NULL", with(sequence({sequence({oid}), octets(digest)}))},
-        {"other parameters", with(sequence({sequence({oid, octets({})}), octets(digest)}))},
-        {"long length of the digest", with(sequence({algorithm, longDigest}))},
-        {"octets behind the digest", with(sequence({algorithm, octets(digest), null}))},
-        {"other digest algorithm", with(sequence({sequence({lastChanged(oid, 0x03), null}), octets(digest)}))},
-        {"digest that lacks an octet", with(sequence({algorithm, octets(Bytes(digest.begin(), digest.end() - 1))}))},
-        {"digest alone", with(digest)},
-        {"other digest", with(sequence({algorithm, octets(lastChanged(digest))}))},
-        {"octets behind the DigestInfo", {.digestInfo = sound, .rest = {0x00}}},
-        {"short padding and octets behind", {.paddingLength = 8, .digestInfo = sound}},
-        {"padding of seven octets", {.paddingLength = 7, .digestInfo = sound}},
-        {"other octets in the padding", {.digestInfo = sound, .padding = 0xFE}},
-        {"zeros as padding", {.digestInfo = sound, .padding = 0x00}},
-        {"no end of the padding", {.separator = {}, .digestInfo = sound}},
-        {"padding of encryption", {.start = {0x00, 0x02}, .digestInfo = sound}},
-        {"first octet left out", {.start = {0x01}, .digestInfo = sound}},
+        {"sound", sound, true},
+        {"no NULL", with({sequence({oid}), octets(digest)})},
+        {"other parameters", with({sequence({oid, octets({})}), octets(digest)})},
+        {"long length of the digest", with({algorithm, longDigest})},
+        {"octets behind the digest", with({algorithm, octets(digest), null})},
+        {"other digest algorithm", with({sequence({lastChanged(oid, 0x03), null}), octets(digest)})},
+        {"digest that lacks an octet", with({algorithm, octets(Bytes(digest.begin(), digest.end() - 1))})},
+        {"digest alone", padded(digest, length)},
+        {"other digest", lastChanged(sound)},
+        {"octet behind the DigestInfo", shortened(length - 4 - info.size())},
+        {"short padding and octets behind", shortened(8)},
+        {"padding of seven octets", shortened(7)},
+        {"other octet in the padding", changedAt(sound, 2, 0xFE)},
+        {"zero in the padding", changedAt(sound, 12, 0x00)},
+        {"no end of the padding", changedAt(sound, length - info.size() - 1, 0xFF)},
+        {"padding of encryption", changedAt(sound, 1, 0x02)},
     };
 }
 
@@ -167,9 +149,8 @@ void checkBlocks(const Key& key, const Img4DigestInfo& info) {
     const Bytes bits = publicKeyBits(key);
     const std::size_t size = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
     EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info.length, message), digest));
-    for (const BlockCase& row : blockCases(digest, oid(*info.oid)))
-        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, encode(row.block, size)), digest),
-                  row.accepted)
+    for (const Case& row : blockCases(digest, oid(*info.oid), size))
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, row.octets), digest), row.accepted)
             << info.length << " at " << size << ", " << row.name;
 }
 
@@ -185,15 +166,10 @@ TEST(Img4RSASignature, isOverTheExactBlock) {
 TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
     const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
     const Bytes digest = digestOfMessage(profile);
-    const Number modulus = parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_N);
-    const Bytes n = octetsOf(modulus.get());
-    const Bytes e = octetsOf(parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_E).get());
+    const Bytes n = parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_N);
+    const Bytes e = parameter(rsaKey(), OSSL_PKEY_PARAM_RSA_E);
     const Bytes sound = sign(rsaKey(), digest.size(), message);
-    Block block;
-    block.digestInfo = sequence({sequence({oid(*profile.digestInfo->oid), null}), octets(digest)});
-    const Bytes forged = encode(block, n.size());
-    Bytes even = n;
-    even.at(n.size() - 1) ^= 1;
+    const Bytes forged = padded(sequence({sequence({oid(*profile.digestInfo->oid), null}), octets(digest)}), n.size());
     const Bytes whole = sequence({positiveInteger(n), positiveInteger(e)});
     struct Row {
         const char* name;
@@ -205,7 +181,7 @@ TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
         {"sound", whole, sound, true},
         {"zeros before the modulus", sequence({rawInteger(join({Bytes{0, 0}, n})), positiveInteger(e)}), sound, true},
         {"negative modulus", sequence({rawInteger(n), positiveInteger(e)}), sound},
-        {"even modulus", sequence({positiveInteger(even), positiveInteger(e)}), sound},
+        {"even modulus", sequence({positiveInteger(lastChanged(n)), positiveInteger(e)}), sound},
         {"modulus of zero", sequence({positiveInteger({}), positiveInteger(e)}), {0x00}},
         {"no modulus", sequence({rawInteger({}), positiveInteger(e)}), sound},
         {"exponent 1", sequence({positiveInteger(n), positiveInteger({1})}), forged},
@@ -222,7 +198,7 @@ TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
         {"none", {}, sound},
         {"signature with a zero in front", whole, join({Bytes{0}, sound})},
         {"signature that lacks an octet", whole, Bytes(sound.begin(), sound.end() - 1)},
-        {"signature plus modulus", whole, sum(sound, modulus.get())},
+        {"signature plus modulus", whole, sum(sound, n)},
         {"signature of zero", whole, Bytes(n.size())},
         {"modulus as signature", whole, n},
         {"no signature", whole, {}},
@@ -263,70 +239,26 @@ struct CurveUnderTest {
 const CurveUnderTest curves[] = {{"P-256", &kImg4DecodeSecureBootEc256Sha256},
                                  {"P-384", &kImg4DecodeSecureBootEc384Sha384}};
 
-// The magnitudes of the numbers of a sound signature, and the order of its curve.
-struct Sound {
-    Bytes r;
-    Bytes s;
-    Number order;
-};
-
-Sound soundSignature(const Key& key, const Img4TrustProfile& profile) {
-    const Bytes signature = sign(key, profile.digestInfo->length, message);
-    const std::size_t lengthOfR = signature[3];
-    Sound sound = {Bytes(signature.begin() + 4, signature.begin() + 4 + static_cast<long>(lengthOfR)),
-                   Bytes(signature.begin() + 6 + static_cast<long>(lengthOfR), signature.end()),
-                   parameter(key, OSSL_PKEY_PARAM_EC_ORDER)};
-    sound.r = octetsOf(number(sound.r).get());
-    sound.s = octetsOf(number(sound.s).get());
-    return sound;
-}
-
-Bytes difference(const BIGNUM* one, const Bytes& other) {
-    const Number result = number(other);
-    EXPECT_EQ(BN_sub(result.get(), one, result.get()), 1);
-    return octetsOf(result.get());
-}
-
-// The content octets of a negative INTEGER.
-Bytes negative(const Bytes& magnitude) {
-    Bytes octets = join({Bytes{0x00}, magnitude});
-    for (std::uint8_t& octet : octets)
-        octet = static_cast<std::uint8_t>(~octet);
-    for (std::size_t i = octets.size(); i-- > 0 && ++octets[i] == 0;) {
-    }
-    return octets;
-}
-
 Bytes pair(const Bytes& r, const Bytes& s) {
     return sequence({positiveInteger(r), positiveInteger(s)});
 }
 
-struct PairCase {
-    const char* name;
-    Bytes encoding;
-    bool accepted = false;
-};
-
-std::vector<PairCase> pairCases(const Sound& sound) {
-    const Bytes &r = sound.r, &s = sound.s;
-    const Bytes R = positiveInteger(r), S = positiveInteger(s);
-    const BIGNUM* const n = sound.order.get();
-    const Bytes order = octetsOf(n);
-    const Bytes whole = pair(r, s);
+// The signature of the numbers r and s, both of which have their highest bit set, and others made of them.
+std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) {
+    const Bytes R = positiveInteger(r), S = positiveInteger(s), whole = pair(r, s);
     const Bytes longR = join({Bytes{0x02, 0x81}, Bytes(R.begin() + 1, R.end())});
     return {
         {"sound", whole, true},
-        {"s on the other side of the order", pair(r, difference(n, s)), true},
         {"r and s swapped", pair(s, r)},
         {"r = 0", pair({}, s)},
         {"s = 0", pair(r, {})},
         {"r = 0, s = 1", pair({}, {1})},
         {"r = order", pair(order, s)},
         {"s = order", pair(r, order)},
-        {"r plus order", pair(sum(r, n), s)},
-        {"s plus order", pair(r, sum(s, n))},
-        {"r negative", sequence({rawInteger(negative(r)), S})},
-        {"s negative", sequence({R, rawInteger(negative(s))})},
+        {"r plus order", pair(sum(r, order), s)},
+        {"s plus order", pair(r, sum(s, order))},
+        {"r negative", sequence({rawInteger(r), S})},
+        {"s negative", sequence({R, rawInteger(s)})},
         {"zeros before r", sequence({rawInteger(join({Bytes{0, 0}, r})), S})},
         {"zeros before s", sequence({R, rawInteger(join({Bytes{0, 0}, s}))})},
         {"r empty", sequence({rawInteger({}), S})},
@@ -350,32 +282,32 @@ TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDER) {
     for (const CurveUnderTest& curve : curves) {
         const Key key = makeECKey(curve.name);
         const Bytes digest = digestOfMessage(*curve.profile);
-        for (const PairCase& row : pairCases(soundSignature(key, *curve.profile)))
-            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), row.encoding, digest),
+        const std::size_t size = digest.size();
+        Bytes signature;
+        do
+            signature = sign(key, size, message);
+        while (signature.size() != 8 + 2 * size); // until both numbers need a zero in front
+        const Bytes r(signature.end() - static_cast<long>(2 * size + 3), signature.end() - static_cast<long>(size + 3));
+        const Bytes s(signature.end() - static_cast<long>(size), signature.end());
+        for (const Case& row : pairCases(r, s, parameter(key, OSSL_PKEY_PARAM_EC_ORDER)))
+            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), row.octets, digest),
                       row.accepted)
                 << curve.name << ", " << row.name;
     }
 }
 
-Bytes withForm(Bytes point, std::uint8_t form) {
-    point.front() = form;
-    return point;
-}
-
-std::vector<std::pair<const char*, Bytes>> refusedPoints(const Key& key) {
+std::vector<Case> pointCases(const Key& key) {
     const Bytes point = publicKeyBits(key);
     const std::size_t half = point.size() / 2;
-    const Bytes x(point.begin() + 1, point.end() - static_cast<long>(half));
-    const Bytes y(point.end() - static_cast<long>(half), point.end());
-    const Number p = parameter(key, OSSL_PKEY_PARAM_EC_P);
-    const Bytes field = octetsOf(p.get(), half);
-    const std::uint8_t parity = y.back() & 1;
+    const std::uint8_t parity = point.back() & 1;
+    const Bytes field = parameter(key, OSSL_PKEY_PARAM_EC_P);
     const bool isP256 = half == 32;
     return {
+        {"sound", point, true},
         {"not on the curve", lastChanged(point)},
-        {"hybrid", withForm(point, 0x06 | parity)},
-        {"compressed", join({Bytes{static_cast<std::uint8_t>(0x02 | parity)}, x})},
-        {"form of a compressed point", withForm(point, 0x02)},
+        {"hybrid", changedAt(point, 0, 0x06 | parity)},
+        {"compressed", changedAt(Bytes(point.begin(), point.end() - static_cast<long>(half)), 0, 0x02 | parity)},
+        {"form of a compressed point", changedAt(point, 0, 0x02)},
         {"infinity", {0x00}},
         {"coordinates of the field's size", join({Bytes{0x04}, field, field})},
         {"octet behind", join({point, Bytes{0}})},
@@ -392,10 +324,9 @@ TEST(Img4ECDSASignature, needsAnUncompressedPointOnItsCurve) {
         const Key key = makeECKey(curve.name);
         const Bytes digest = digestOfMessage(*curve.profile);
         const Bytes signature = sign(key, digest.size(), message);
-        ASSERT_TRUE(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), signature, digest));
-        for (const auto& [name, point] : refusedPoints(key))
-            EXPECT_FALSE(accepts(verify_signature_ecdsa, *curve.profile, point, signature, digest))
-                << curve.name << ", " << name;
+        for (const Case& row : pointCases(key))
+            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, row.octets, signature, digest), row.accepted)
+                << curve.name << ", " << row.name;
     }
 }
 
