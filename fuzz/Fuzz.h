@@ -15,6 +15,13 @@
         }                                                                                                              \
     } while (false)
 
+namespace fuzz {
+
+// Set by a target whose reader takes the input, for Replay.cpp.
+inline bool taken = false;
+
+} // namespace fuzz
+
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size);
 
 #endif

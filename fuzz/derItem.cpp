@@ -121,6 +121,8 @@ void checkWalk(const DERItem& content, int depth) {
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const DERItem input = {data, size};
     checkDecodersAgree(input);
+    DERDecodedInfo item;
+    fuzz::taken = DERDecodeItem(&input, &item) == DERSuccess;
     checkPrimitives(input);
     checkWalk(input, 0);
     return 0;

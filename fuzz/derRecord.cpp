@@ -1,16 +1,30 @@
-// A record filled by a table, both made from the input, and written again.
+// A record filled by a table, both made from the input, and written again. The input is one octet with the number of
+// rows of a table, one with the number of DERItems in the record, two for each row (tag, options), and then the content
+// to parse.
 #include <algorithm>
+#include <array>
 #include <memory>
 #include <vector>
 
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "fuzz/Fuzz.h"
-#include "fuzz/derRecordInput.h"
 
 namespace {
 
-using namespace recordInput;
+constexpr std::uint8_t mostRows = 8;
+
+// A row's tag octet, modulo the size of the list, is an index into it.
+constexpr std::array<DERTag, 8> tags = {
+    DERTagBoolean,  DERTagInteger,   DERTagOctetString,           DERTagObjectIdentifier,
+    DERTagSequence, DERTagBitString, DERTagContextConstructed(0), DERTagPrivateConstructed(0x53504159),
+};
+
+// A row's options octet.
+constexpr std::uint8_t decoderOptions = 0x0F; // as in DERItemSpec
+constexpr std::uint8_t signedInteger = 0x10;  // DEROptionSignedInteger
+constexpr std::uint8_t writeDER = 0x20;       // DEROptionWriteDER
+constexpr std::uint8_t farAway = 0x40;        // the row's place lies beyond every record
 
 struct Case {
     std::vector<DERItemSpec> specs;
@@ -31,8 +45,8 @@ bool readCase(const std::uint8_t* data, std::size_t size, Case* out) {
         return false;
     for (std::uint64_t row = 0; row < rows; ++row, next += 2) {
         unsigned options = next[1] & decoderOptions;
-        options |= (next[1] & signedInteger) != 0 ? DEROptionSignedInteger : 0U;
-        options |= (next[1] & writeDER) != 0 ? DEROptionWriteDER : 0U;
+        options |= (next[1] & signedInteger) != 0 ? unsigned{DEROptionSignedInteger} : 0U;
+        options |= (next[1] & writeDER) != 0 ? unsigned{DEROptionWriteDER} : 0U;
         const std::uint64_t offset = (next[1] & farAway) != 0 ? UINT64_MAX - row : row * sizeof(DERItem);
         out->specs.push_back({offset, tags[next[0] % tags.size()], static_cast<std::uint16_t>(options)});
     }
@@ -133,6 +147,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
                                                              record.data(), recordSize, recordSize);
     FUZZ_REQUIRE(result == DERSuccess || result == DERUnexpectedTag || result == DERDecodeError ||
                  result == DERIncompleteSequence || result == DERBufferOverflow);
+    fuzz::taken = result == DERSuccess;
     checkStored(input, record);
     encode(record, input.specs);
     if (result == DERSuccess && keepsEverything(input, record))

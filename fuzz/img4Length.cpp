@@ -25,6 +25,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
         Img4DecodeParseLengthFromBufferWithTag(data, size, Img4FourCC('I', 'M', '4', 'P'), &payloadTotal);
     FUZZ_REQUIRE((result == DERSuccess) == (total != 0) && (payload == DERSuccess) == (payloadTotal != 0));
     FUZZ_REQUIRE(result != DERSuccess || payload == DERUnexpectedTag);
+    fuzz::taken = result == DERSuccess;
     if (result == DERSuccess)
         checkPrefixes(data, size, total);
     Img4Record record;

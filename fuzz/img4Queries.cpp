@@ -27,7 +27,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const std::uint8_t* buffer = size == 0 ? &none : data;
     img4answers::askAll(buffer, size);
     Img4Record record;
-    if (Img4DecodeInit(buffer, size, &record) == DERSuccess)
+    fuzz::taken = Img4DecodeInit(buffer, size, &record) == DERSuccess;
+    if (fuzz::taken)
         checkContainer(record);
     return 0;
 }

@@ -153,6 +153,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const SysConfig3Ptr object(decodeSysConfig3(data, static_cast<std::uint32_t>(size)));
     if (object == nullptr)
         return 0;
+    fuzz::taken = true;
     Model model(object.get());
     checkLists(object.get(), model);
     registerKey(object.get());
