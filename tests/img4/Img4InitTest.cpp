@@ -30,9 +30,17 @@ Bytes containerWith(const Bytes& oddPayload) {
     return container(oddPayload, {}, {});
 }
 
-Bytes manifestOf(const Bytes& magic, const Bytes& version, const Bytes& body) {
-    return sequence({magic, version, body, octets(filler(8)), emptySequence});
+const Bytes body = manifestBody({});
+const Bytes negative = item(DERTagInteger, {0x80});
+
+Bytes manifestOf(const Bytes& version, const Bytes& content = body, const Bytes& magic = ia5("IM4M")) {
+    return sequence({magic, version, content, octets(filler(8)), emptySequence});
 }
+
+constexpr Initialise asContainer = Img4DecodeInit;
+constexpr Initialise asPayload = Img4DecodeInitPayload;
+constexpr Initialise asManifest = Img4DecodeInitManifest;
+constexpr Initialise asUnsigned = Img4DecodeInitUnsignedManifest;
 
 struct Case {
     const char* name;
@@ -41,87 +49,88 @@ struct Case {
     DERReturn expected;
 };
 
-const Bytes body = manifestBody({});
-
 const Case cases[] = {
-    {"payload only", Img4DecodeInit, containerWith(soundPayload), DERSuccess},
-    {"everything", Img4DecodeInit, exampleContainer(), DERSuccess},
-    {"restore information without manifest", Img4DecodeInit, container(soundPayload, {}, soundRestoreInfo), DERSuccess},
-    {"trailing octet", Img4DecodeInit, with(containerWith(soundPayload), {0}), DERBufferOverflow},
-    {"SET for a container", Img4DecodeInit, set({ia5("IMG4"), soundPayload}), DERUnexpectedTag},
-    {"wrong magic", Img4DecodeInit, sequence({ia5("IMG5"), soundPayload}), DERUnexpectedTag},
-    {"magic of five characters", Img4DecodeInit, sequence({ia5("IMG44"), soundPayload}), DERUnexpectedTag},
-    {"no payload", Img4DecodeInit, sequence({ia5("IMG4")}), DERIncompleteSequence},
-    {"manifest instead of payload", Img4DecodeInit, sequence({ia5("IMG4"), context(0, soundManifest)}),
-     DERUnexpectedTag},
-    {"unknown entry at the end", Img4DecodeInit, sequence({ia5("IMG4"), soundPayload, context(2, {})}),
-     DERUnexpectedTag},
-    {"entry after the last", Img4DecodeInit,
+    {"payload only", asContainer, containerWith(soundPayload), DERSuccess},
+    {"everything", asContainer, exampleContainer(), DERSuccess},
+    {"restore information without manifest", asContainer, container(soundPayload, {}, soundRestoreInfo), DERSuccess},
+    {"trailing octet", asContainer, with(containerWith(soundPayload), {0}), DERBufferOverflow},
+    {"SET for a container", asContainer, set({ia5("IMG4"), soundPayload}), DERUnexpectedTag},
+    {"wrong magic", asContainer, sequence({ia5("IMG5"), soundPayload}), DERUnexpectedTag},
+    {"magic of five characters", asContainer, sequence({ia5("IMG44"), soundPayload}), DERUnexpectedTag},
+    {"no payload", asContainer, sequence({ia5("IMG4")}), DERIncompleteSequence},
+    {"manifest instead of payload", asContainer, sequence({ia5("IMG4"), context(0, soundManifest)}), DERUnexpectedTag},
+    {"unknown entry at the end", asContainer, sequence({ia5("IMG4"), soundPayload, context(2, {})}), DERUnexpectedTag},
+    {"entry after the last", asContainer,
      sequence({ia5("IMG4"), soundPayload, context(1, soundRestoreInfo), integer(1)}), DERDecodeError},
-    {"empty manifest entry", Img4DecodeInit, sequence({ia5("IMG4"), soundPayload, context(0, {})}), DERDecodeError},
-    {"unsigned manifest in a container", Img4DecodeInit, container(soundPayload, unsignedManifest({}), {}),
+    {"empty manifest entry", asContainer, sequence({ia5("IMG4"), soundPayload, context(0, {})}), DERDecodeError},
+    {"unsigned manifest in a container", asContainer, container(soundPayload, unsignedManifest({}), {}),
      DERIncompleteSequence},
-    {"wrong magic of the restore information", Img4DecodeInit,
+    {"wrong magic of the restore information", asContainer,
      container(soundPayload, {}, sequence({ia5("IM4S"), set({})})), DERUnexpectedTag},
-    {"restore information in a SEQUENCE", Img4DecodeInit,
+    {"restore information in a SEQUENCE", asContainer,
      container(soundPayload, {}, sequence({ia5("IM4R"), emptySequence})), DERUnexpectedTag},
 
-    {"wrong magic of the payload", Img4DecodeInitPayload, sequence({ia5("IM4Q"), ia5("sepi"), ia5("1"), octets({1})}),
+    {"wrong magic of the payload", asPayload, sequence({ia5("IM4Q"), ia5("sepi"), ia5("1"), octets({1})}),
      DERUnexpectedTag},
-    {"payload without data", Img4DecodeInitPayload, sequence({ia5("IM4P"), ia5("sepi"), ia5("1")}),
-     DERIncompleteSequence},
-    {"octets after a bare payload", Img4DecodeInitPayload, with(soundPayload, {1, 2}), DERSuccess},
-    {"algorithm 1", Img4DecodeInit, containerWith(payloadWith({compression(1, 5)})), DERSuccess},
-    {"algorithm 2", Img4DecodeInit, containerWith(payloadWith({compression(2, 5)})), DERParamError},
-    {"size that no 32 bits hold", Img4DecodeInitPayload, payloadWith({compression(0, 0x100000000)}), DERSuccess},
-    {"negative algorithm", Img4DecodeInitPayload, payloadWith({sequence({item(DERTagInteger, {0x80}), integer(1)})}),
+    {"payload without data", asPayload, sequence({ia5("IM4P"), ia5("sepi"), ia5("1")}), DERIncompleteSequence},
+    {"octets after a bare payload", asPayload, with(soundPayload, {1, 2}), DERSuccess},
+    {"algorithm 1", asContainer, containerWith(payloadWith({compression(1, 5)})), DERSuccess},
+    {"algorithm 2", asContainer, containerWith(payloadWith({compression(2, 5)})), DERParamError},
+    {"size that no 32 bits hold", asPayload, payloadWith({compression(0, 0x100000000)}), DERSuccess},
+    {"negative algorithm", asPayload, payloadWith({sequence({item(DERTagInteger, {0x80}), integer(1)})}),
      DERParamError},
-    {"compression without size", Img4DecodeInitPayload, payloadWith({sequence({integer(1)})}), DERParamError},
-    {"empty compression", Img4DecodeInitPayload, payloadWith({emptySequence}), DERParamError},
-    {"payload properties", Img4DecodeInitPayload, payloadWith({context(0, payloadProperties({}))}), DERSuccess},
-    {"payload properties with a wrong magic", Img4DecodeInitPayload,
-     payloadWith({context(0, sequence({ia5("PAYQ"), set({})}))}), DERUnexpectedTag},
-    {"payload properties without a SET", Img4DecodeInitPayload, payloadWith({context(0, sequence({ia5("PAYP")}))}),
+    {"compression without size", asPayload, payloadWith({sequence({integer(1)})}), DERParamError},
+    {"empty compression", asPayload, payloadWith({emptySequence}), DERParamError},
+    {"payload properties", asPayload, payloadWith({context(0, payloadProperties({}))}), DERSuccess},
+    {"payload properties with a wrong magic", asPayload, payloadWith({context(0, sequence({ia5("PAYQ"), set({})}))}),
      DERUnexpectedTag},
-    {"empty payload properties", Img4DecodeInitPayload, payloadWith({context(0, {})}), DERUnexpectedTag},
-    {"compression is looked at before the properties", Img4DecodeInitPayload,
-     payloadWith({compression(2, 1), context(0, {})}), DERParamError},
+    {"payload properties without a SET", asPayload, payloadWith({context(0, sequence({ia5("PAYP")}))}),
+     DERUnexpectedTag},
+    {"empty payload properties", asPayload, payloadWith({context(0, {})}), DERUnexpectedTag},
+    {"compression is looked at before the properties", asPayload, payloadWith({compression(2, 1), context(0, {})}),
+     DERParamError},
     // Neither table fits; the status is that of the table without properties.
-    {"entry after the payload properties", Img4DecodeInitPayload,
-     payloadWith({context(0, payloadProperties({})), integer(1)}), DERUnexpectedTag},
-    {"entry after compression and properties", Img4DecodeInitPayload,
+    {"entry after the payload properties", asPayload, payloadWith({context(0, payloadProperties({})), integer(1)}),
+     DERUnexpectedTag},
+    {"entry after compression and properties", asPayload,
      payloadWith({compression(1, 1), context(0, payloadProperties({})), integer(1)}), DERDecodeError},
 
-    {"bare manifest", Img4DecodeInitManifest, soundManifest, DERSuccess},
-    {"manifest with a trailing octet", Img4DecodeInitManifest, with(soundManifest, {0}), DERBufferOverflow},
-    {"container for a manifest", Img4DecodeInitManifest, exampleContainer(), DERUnexpectedTag},
-    {"wrong magic of the manifest", Img4DecodeInitManifest, manifestOf(ia5("IM4N"), integer(0), body),
+    {"bare manifest", asManifest, soundManifest, DERSuccess},
+    {"manifest with a trailing octet", asManifest, with(soundManifest, {0}), DERBufferOverflow},
+    {"container for a manifest", asManifest, exampleContainer(), DERUnexpectedTag},
+    {"wrong magic of the manifest", asManifest, manifestOf(integer(0), body, ia5("IM4N")), DERUnexpectedTag},
+    {"version 2", asManifest, manifestOf(integer(2)), DERSuccess},
+    {"version 3", asManifest, manifestOf(integer(3)), DERUnexpectedTag},
+    {"negative version", asManifest, manifestOf(negative), DERDecodeError},
+    {"version of 33 bits", asManifest, manifestOf(integer(0x100000000)), DERBufferOverflow},
+    {"the magic is looked at before the version", asManifest, manifestOf(negative, body, ia5("IM4N")),
      DERUnexpectedTag},
-    {"version 2", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(2), body), DERSuccess},
-    {"version 3", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(3), body), DERUnexpectedTag},
-    {"negative version", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), item(DERTagInteger, {0x80}), body),
-     DERDecodeError},
-    {"version of 33 bits", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(0x100000000), body),
-     DERBufferOverflow},
-    {"the magic is looked at before the version", Img4DecodeInitManifest,
-     manifestOf(ia5("IM4N"), item(DERTagInteger, {0x80}), body), DERUnexpectedTag},
-    {"body in a SEQUENCE", Img4DecodeInitManifest, manifestOf(ia5("IM4M"), integer(0), emptySequence),
-     DERUnexpectedTag},
-    {"unsigned for a signed manifest", Img4DecodeInitManifest, unsignedManifest({}), DERIncompleteSequence},
-    {"signed for an unsigned manifest", Img4DecodeInitUnsignedManifest, soundManifest, DERDecodeError},
-    {"unsigned manifest", Img4DecodeInitUnsignedManifest, unsignedManifest({}), DERSuccess},
-    {"unsigned manifest with a trailing octet", Img4DecodeInitUnsignedManifest, with(unsignedManifest({}), {0}),
-     DERBufferOverflow},
-    {"no octets", Img4DecodeInit, {}, DERDecodeError},
+    {"body in a SEQUENCE", asManifest, manifestOf(integer(0), emptySequence), DERUnexpectedTag},
+    {"unsigned for a signed manifest", asManifest, unsignedManifest({}), DERIncompleteSequence},
+    {"signed for an unsigned manifest", asUnsigned, soundManifest, DERDecodeError},
+    {"unsigned manifest", asUnsigned, unsignedManifest({}), DERSuccess},
+    {"unsigned manifest with a trailing octet", asUnsigned, with(unsignedManifest({}), {0}), DERBufferOverflow},
+    {"no octets", asContainer, {}, DERDecodeError},
 };
+
+// The initialisation that finds out the kind by itself; none for a kind that is unknown.
+constexpr Initialise ofKind[] = {nullptr, asContainer, asPayload, asManifest, asUnsigned};
 
 TEST(Img4Init, reportsTheFirstCheckThatFails) {
     for (const Case& row : cases) {
+        SCOPED_TRACE(row.name);
         Img4Record record;
+        Img4Kind kind;
+        Img4Refusal refusal;
         // A vector's data may be null when it is empty; the buffer must not be.
         const std::uint8_t none = 0;
         const std::uint8_t* buffer = row.buffer.empty() ? &none : row.buffer.data();
-        EXPECT_EQ(row.initialise(buffer, row.buffer.size(), &record), row.expected) << row.name;
+        EXPECT_EQ(row.initialise(buffer, row.buffer.size(), &record), row.expected);
+        const DERReturn explained = Img4DecodeInitExplained(buffer, row.buffer.size(), &record, &kind, &refusal);
+        EXPECT_EQ(explained, ofKind[kind] == row.initialise ? row.expected : explained);
+        EXPECT_EQ(refusal.status, explained);
+        EXPECT_EQ(refusal.fault == Img4FaultNone, explained == DERSuccess);
+        EXPECT_EQ(refusal.place >= buffer && refusal.place <= buffer + row.buffer.size(), explained != DERSuccess);
     }
 }
 
