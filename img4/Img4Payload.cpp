@@ -18,17 +18,17 @@ DERReturn checkPayload(const Img4Record* record, const void* out) {
 }
 
 DERReturn getPayloadItem(const Img4Record* record, DERItem Img4PayloadRecord::*field, DERItem* item) {
-    if (const DERReturn result = checkPayload(record, item); result != DERSuccess)
-        return clearOnFailure(result, item);
-    *item = record->payload.*field;
-    return DERSuccess;
+    const DERReturn result = checkPayload(record, item);
+    if (result == DERSuccess)
+        *item = record->payload.*field;
+    return clearOnFailure(result, item);
 }
 
 DERReturn payloadItemExists(const Img4Record* record, DERItem Img4PayloadRecord::*field, bool* exists) {
-    if (const DERReturn result = checkPayload(record, exists); result != DERSuccess)
-        return clearOnFailure(result, exists);
-    *exists = hasContent(record->payload.*field);
-    return DERSuccess;
+    const DERReturn result = checkPayload(record, exists);
+    if (result == DERSuccess)
+        *exists = hasContent(record->payload.*field);
+    return clearOnFailure(result, exists);
 }
 
 DERReturn parseCompression(const Img4Record& record, uint32_t* algorithm, uint32_t* uncompressedSize) {
