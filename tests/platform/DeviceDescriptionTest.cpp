@@ -48,14 +48,6 @@ TEST(Json, textsBecomeValues) {
     }
 }
 
-TEST(DeviceDescription, isReadAtEveryCall) {
-    const TemporaryRoot root;
-    for (const int number : {1, 2}) {
-        root.write(path, R"({"UniqueChipID": )" + std::to_string(number) + "}");
-        EXPECT_EQ(deviceDescription()["UniqueChipID"], Value(number));
-    }
-}
-
 // Both on the console and as errors under the framework's handle.
 void expectLines(const std::vector<std::string>& lines, const char* of) {
     std::vector<std::string> console, log;

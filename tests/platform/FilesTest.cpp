@@ -14,6 +14,7 @@
 #include <sys/inotify.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 
 #include <gtest/gtest.h>
@@ -21,6 +22,19 @@
 #include "platform/DeviceRoot.h"
 #include "tests/support/OwnProcess.h"
 #include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+std::string flushed; // a letter for each file and directory that was
+
+} // namespace
+
+extern "C" int fsync(int descriptor) {
+    struct stat status = {};
+    EXPECT_EQ(::fstat(descriptor, &status), 0);
+    flushed += S_ISREG(status.st_mode) ? (status.st_size > 0 ? 'f' : 'e') : 'd';
+    return static_cast<int>(::syscall(SYS_fsync, descriptor));
+}
 
 namespace {
 
@@ -214,6 +228,19 @@ TEST(Files, replaceRefusesWhatIsNoRegularFileAndLeavesEverythingAsItWas) {
              "/tmp/file/x", "/tmp/", "/tmp/..", "/tmp/.", "/", "", longName, cutName})
         EXPECT_FALSE(files::replace(path, bytes("new"))) << path;
     EXPECT_EQ(root.contents(), before);
+}
+
+TEST(Files, whatIsReplacedOrMadeOutlastsAPowerCut) {
+    const TemporaryRoot root;
+    root.makeDirectory("/tmp");
+    flushed.clear();
+    EXPECT_TRUE(files::replace("/tmp/blob", bytes("whole")));
+    EXPECT_EQ(flushed, "fd"); // the new file before it takes its place, and then the place
+    flushed.clear();
+    EXPECT_TRUE(makeDirectoryInRoot("/var/lib/orlo/", 0700));
+    EXPECT_EQ(flushed, "ddd");
+    EXPECT_EQ(mode(root.host("/var/lib")), 0755u);
+    EXPECT_EQ(mode(root.host("/var/lib/orlo")), 0700u);
 }
 
 // A file-size limit stands in for a full disk: the write that crosses it is cut short and the next one fails.

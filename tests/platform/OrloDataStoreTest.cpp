@@ -12,11 +12,24 @@
 #include <sqlite3.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include "tests/support/OwnProcess.h"
 #include "tests/support/TemporaryRoot.h"
+
+namespace {
+
+int flushes = 0;
+
+} // namespace
+
+// What SQLite flushes a file with.
+extern "C" __attribute__((visibility("default"))) int fdatasync(int descriptor) {
+    ++flushes;
+    return static_cast<int>(::syscall(SYS_fdatasync, descriptor));
+}
 
 namespace {
 
@@ -210,6 +223,18 @@ TEST_F(OrloDataStore, keepsRecordsByClassInstanceAndDataVersion) {
               (std::vector<std::string>{"1|psd2|S1|010002", "2|psd2|S1|32"}));
     EXPECT_EQ(std::filesystem::status(root_.host(storePath)).permissions(), std::filesystem::perms(0600));
     EXPECT_EQ(root_.read(trustPath).size(), 64U);
+}
+
+TEST_F(OrloDataStore, flushesWhatItHasAcknowledged) {
+    const Session session = openFor("psd2", "S1");
+    for (const char data : {'a', 'b', 'c'}) {
+        flushes = 0;
+        EXPECT_EQ(put(session, "psd2", "S1", Data{static_cast<std::uint8_t>(data)}), 0);
+        EXPECT_GE(flushes, 1);
+        flushes = 0;
+        EXPECT_EQ(exportAll(session, {"psd2"}, {"S1"}), 0);
+        EXPECT_GE(flushes, 1);
+    }
 }
 
 TEST_F(OrloDataStore, exportsAllPairsOrNone) {

@@ -83,37 +83,25 @@ TEST_F(ReverseProxy, eventsComeInTheirOrderAndNotBeforeTheyAreDue) {
 }
 
 TEST_F(ReverseProxy, malformedEventsAreLeftOutAndTimesAreBounded) {
-    const std::string good = R"({"status": 2})";
-    for (const char* odd : {"null", "1", "\"1\"", "[1]", "{}", R"({"status": null})", R"({"status": "1"})",
-                            R"({"status": 1.0})", R"({"status": 4294967297})", R"({"status": -2147483649})",
-                            R"({"status": 2147483648})", R"({"status": 18446744073709551617})"}) {
-        describe(R"({"events": [)" + std::string(odd) + ", " + good + "]}");
-        Deliveries deliveries;
-        const RegistrationPtr proxy = registration(deliveries);
-        ASSERT_NE(proxy, nullptr);
-        RPRegistrationResume(proxy.get());
-        EXPECT_EQ(deliveries.waitFor(1), Statuses{2}) << odd;
-    }
-    const std::pair<const char*, Statuses> rows[] = {
+    std::vector<std::pair<std::string, Statuses>> rows = {
         {R"([{"status": -2147483648}, {"status": 2147483647}])", {INT32_MIN, INT32_MAX}},
         {R"([{"status": 1, "afterMs": -5}, {"status": true, "afterMs": "soon"}])", {1, 1}},
         {R"([{"status": 1, "afterMs": -9223372036854775808}])", {1}},
+        {"7", {}},
+        {"{}", {}},
+        {"null", {}},
     };
+    for (const char* odd : {"null", "1", "\"1\"", "[1]", "{}", R"({"status": null})", R"({"status": "1"})",
+                            R"({"status": 1.0})", R"({"status": 4294967297})", R"({"status": -2147483649})",
+                            R"({"status": 2147483648})", R"({"status": 18446744073709551617})"})
+        rows.push_back({"[" + std::string(odd) + R"(, {"status": 2}])", {2}});
     for (const auto& [events, statuses] : rows) {
-        describe(R"({"events": )" + std::string(events) + "}");
-        Deliveries deliveries;
-        const RegistrationPtr proxy = registration(deliveries);
-        ASSERT_NE(proxy, nullptr);
-        RPRegistrationResume(proxy.get());
-        EXPECT_EQ(deliveries.waitFor(statuses.size()), statuses) << events;
-    }
-    for (const char* events : {"7", "{}", "null"}) {
-        describe(R"({"events": )" + std::string(events) + "}");
+        describe(R"({"events": )" + events + "}");
         Deliveries deliveries;
         const RegistrationPtr proxy = registration(deliveries);
         ASSERT_NE(proxy, nullptr) << events;
         RPRegistrationResume(proxy.get());
-        EXPECT_EQ(deliveries.waitFor(0), Statuses{}) << events;
+        EXPECT_EQ(deliveries.waitFor(statuses.size()), statuses) << events;
     }
 }
 
