@@ -126,21 +126,26 @@ private:
     std::string incomplete_;
 };
 
+struct Input {
+    const void* bytes;
+    ssize_t length; // below 1 for nothing
+};
+
 // Writes the input and reads what comes meanwhile; the child then sees the end of its input. Once the child has ended,
 // nobody else is waited for to take the rest.
-void feed(std::string_view program, const Child& child, FileDescriptor input, const void* bytes, std::size_t length,
-          Output& output) {
-    const char* next = static_cast<const char*>(bytes);
-    processes::makeNonBlocking(input.get());
+void feed(std::string_view program, const Child& child, FileDescriptor writeEnd, const Input& input, Output& output) {
+    const char* next = static_cast<const char*>(input.bytes);
+    std::size_t length = input.length > 0 ? static_cast<std::size_t>(input.length) : 0;
+    processes::makeNonBlocking(writeEnd.get());
     while (length > 0) {
-        const processes::Ready ready = child.waitUntilReady(input.get(), output.descriptor());
+        const processes::Ready ready = child.waitUntilReady(writeEnd.get(), output.descriptor());
         if (ready.toRead && output.descriptor() >= 0)
             output.readChunk();
         if (!ready.toWrite && ready.hasEnded)
             break;
         if (!ready.toWrite)
             continue;
-        const ssize_t count = processes::writeSome(input.get(), next, length);
+        const ssize_t count = processes::writeSome(writeEnd.get(), next, length);
         if (count >= 0) {
             next += count;
             length -= static_cast<std::size_t>(count);
@@ -179,40 +184,38 @@ struct Outcome {
     std::string output = {};
 };
 
-Outcome run(const std::vector<std::string>& argv) {
-    pid_t process = 0;
-    const int readEnd = hs_spawn_command(argv, process, true, nullptr);
-    if (readEnd < 0)
-        return {};
-    Child child(process);
-    Output output{FileDescriptor(readEnd)};
-    pipeLog.info("Start Reading output from shell command\n");
-    output.readToEnd(child);
-    const int result = resultOf(child.wait(), programOf(argv), false);
-    return {result, output.takeText()};
-}
-
-Outcome runWithInput(const std::vector<std::string>& argv, const void* bytes, ssize_t length) {
-    const processes::BrokenPipeIgnored brokenPipeIgnored;
-    pipeLog.info("entering hs_execute_command_with_input_data: %s (%p - %zu)\n", programOf(argv), bytes, length);
+Outcome run(const std::vector<std::string>& argv, const Input* input) {
+    std::optional<processes::BrokenPipeIgnored> brokenPipeIgnored;
+    if (input) {
+        brokenPipeIgnored.emplace();
+        pipeLog.info("entering hs_execute_command_with_input_data: %s (%p - %zu)\n", programOf(argv), input->bytes,
+                     input->length);
+    }
     pid_t process = 0;
     int writeEnd = -1;
-    const int readEnd = hs_spawn_command(argv, process, false, &writeEnd);
+    const int readEnd = hs_spawn_command(argv, process, !input, input ? &writeEnd : nullptr);
     if (readEnd < 0)
         return {};
     Child child(process);
     Output output{FileDescriptor(readEnd)};
-    feed(programOf(argv), child, FileDescriptor(writeEnd), bytes, length > 0 ? static_cast<std::size_t>(length) : 0,
-         output);
+    if (input)
+        feed(programOf(argv), child, FileDescriptor(writeEnd), *input, output);
     pipeLog.info("Start Reading output from shell command\n");
     output.readToEnd(child);
-    pipeLog.info("waiting for child to exit\n");
-    const int result = resultOf(child.wait(), programOf(argv), true);
+    if (input)
+        pipeLog.info("waiting for child to exit\n");
+    const int result = resultOf(child.wait(), programOf(argv), input != nullptr);
     return {result, output.takeText()};
 }
 
-// Reports the outcome of a call; a response of null means that nothing was run.
-int conclude(Outcome outcome, const char* failureFormat, Value* response, std::optional<Error>* error) {
+// Runs the program, unless there is no response to describe the outcome in.
+int execute(const std::vector<std::string>& argv, const Input* input, const char* failureFormat, Value* response,
+            std::optional<Error>* error) {
+    Outcome outcome;
+    if (response)
+        outcome = run(argv, input);
+    else
+        pipeLog.error("Input response dictionary pointer is NULL.");
     Value::Dictionary dictionary{{"Status", outcome.result == 0 ? 0 : failed}, {"Error", ""}};
     dictionary["Output"] = std::move(outcome.output); // in the list it would be copied
     if (outcome.result != 0) {
@@ -261,22 +264,13 @@ int hs_spawn_command(const std::vector<std::string>& argv, pid_t& child, bool co
 }
 
 int hs_execute_command(const std::vector<std::string>& argv, Value* response, std::optional<Error>* error) {
-    Outcome outcome;
-    if (response)
-        outcome = run(argv);
-    else
-        pipeLog.error("Input response dictionary pointer is NULL.");
-    return conclude(std::move(outcome), "Error executing command, result = %d\n", response, error);
+    return execute(argv, nullptr, "Error executing command, result = %d\n", response, error);
 }
 
 int hs_execute_command_with_input_data(const std::vector<std::string>& argv, const void* input, ssize_t length,
                                        Value* response, std::optional<Error>* error) {
-    Outcome outcome;
-    if (response)
-        outcome = runWithInput(argv, input, length);
-    else
-        pipeLog.error("Input response dictionary pointer is NULL.");
-    return conclude(std::move(outcome), "Error executing command with data, result = %d\n", response, error);
+    const Input given{input, length};
+    return execute(argv, &given, "Error executing command with data, result = %d\n", response, error);
 }
 
 int HSPipeUtil::HSPipeUtilExecCommand(const std::string& command, const std::vector<std::string>& options,
