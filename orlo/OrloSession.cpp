@@ -39,17 +39,19 @@ std::optional<Value::Data> readApTicket(const LogSource& log) {
     return ticket;
 }
 
-OrloTrustResult setTrustObjectOptions(__QDOrlo* session, const Value::Data& trustObject) {
+std::optional<Error> setTrustObjectOptions(const LogSource& log, std::string_view domain, __QDOrlo* session,
+                                           const Value::Data& trustObject, OrloErrorHere noDigest,
+                                           OrloErrorHere noMemory) {
     QDOrloSetOption(session, "TrustObject", trustObject);
     std::uint8_t digest[crypto::sha256Size];
     const std::int32_t status =
         QDSupportDigestSha256(trustObject.data(), static_cast<std::uint32_t>(trustObject.size()), digest);
     if (status != 0)
-        return {OrloTrustResult::DigestFailed, status};
+        return makeOrloError(log, domain, noDigest, status);
     std::optional<Value::Data> value =
         madeIfMemorySuffices([&] { return Value::Data(std::begin(digest), std::end(digest)); });
     if (!value)
-        return {OrloTrustResult::NoMemoryForData, status};
+        return makeOrloError(log, domain, noMemory);
     QDOrloSetOption(session, "TrustObjectDigest", std::move(*value));
-    return {OrloTrustResult::Trusted, status};
+    return std::nullopt;
 }

@@ -57,18 +57,10 @@ Value joinedInstance(const Value& first, const Value& second);
 // The bytes of the device's boot ticket, or none. Writes to `log` where it is, and at level 4 when it cannot be read.
 std::optional<Value::Data> readApTicket(const LogSource& log);
 
-// What became of the trust object that a session was given.
-struct OrloTrustResult {
-    enum Outcome {
-        Trusted,
-        DigestFailed,   // `status` says how; the session has the trust object
-        NoMemoryForData // the digest cannot be made a value; the session has the trust object
-    };
-    Outcome outcome;
-    std::int32_t status;
-};
-
-// Sets the options "TrustObject" and "TrustObjectDigest" (its SHA-256) on the session.
-OrloTrustResult setTrustObjectOptions(__QDOrlo* session, const Value::Data& trustObject);
+// Sets the options "TrustObject" and "TrustObjectDigest" (its SHA-256) on the session, which keeps the trust object
+// when the second fails: with `noDigest`, a format for a status, or with `noMemory`.
+std::optional<Error> setTrustObjectOptions(const LogSource& log, std::string_view domain, __QDOrlo* session,
+                                           const Value::Data& trustObject, OrloErrorHere noDigest,
+                                           OrloErrorHere noMemory);
 
 #endif

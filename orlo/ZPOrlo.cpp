@@ -121,13 +121,7 @@ std::optional<Error> ZPOrlo::setTrustObject() {
         return makeError(trustObjectFailed, libraryError->text);
     if (!copied)
         return makeError(trustObjectFailedSilently);
-
-    const OrloTrustResult result = setTrustObjectOptions(orloRef(), trustObject);
-    if (result.outcome == OrloTrustResult::DigestFailed)
-        return makeError(digestFailed, result.status);
-    if (result.outcome == OrloTrustResult::NoMemoryForData)
-        return makeError(digestValueFailed);
-    return std::nullopt;
+    return setTrustObjectOptions(zplog, errorDomain, orloRef(), trustObject, digestFailed, digestValueFailed);
 }
 
 std::optional<Error> ZPOrlo::prepare(OrloAction action, const Value& dataClass, const Value& dataInstance) {

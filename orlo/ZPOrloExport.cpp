@@ -140,12 +140,7 @@ private:
         if (!QDOrloDataCopyTrustObject(session_.get(), trustObjectURL, &trustObject, &libraryError_))
             return libraryError_ ? makeError(trustObjectFailed, libraryError_->text)
                                  : makeError(trustObjectFailedSilently);
-        const OrloTrustResult result = setTrustObjectOptions(session_.get(), trustObject);
-        if (result.outcome == OrloTrustResult::DigestFailed)
-            return makeError(digestFailed, result.status);
-        if (result.outcome == OrloTrustResult::NoMemoryForData)
-            return makeError(digestValueFailed);
-        return std::nullopt;
+        return setTrustObjectOptions(zplog, errorDomain, session_.get(), trustObject, digestFailed, digestValueFailed);
     }
 
     std::optional<Error> upload() {
