@@ -36,9 +36,6 @@ Kind kindOf(std::string_view path);
 // it cannot be listed.
 std::vector<std::string> list(std::string_view path);
 
-// Whether there is anything at `path`, whatever its kind; a symbolic link counts as what it leads to.
-bool exists(std::string_view path);
-
 // Makes `contents` the whole contents of the file at `path`: a new file of mode 0600 in the same directory, flushed to
 // the disk and then renamed over the target. A symbolic link at the end is not followed. Returns false, and leaves
 // everything as it was, when the directory is missing or the target exists and is no regular file. The same goes for a

@@ -20,7 +20,7 @@ HSMessageResponse fail(const HSMessageRequest& request, const char* key, const c
 }
 
 bool exists(const Value& path) {
-    return path.text() && files::exists(*path.text());
+    return path.text() && files::kindOf(*path.text()) != files::Kind::Nothing;
 }
 
 // Writes the record over the file at `path`.

@@ -68,10 +68,6 @@ std::vector<std::string> list(std::string_view path) {
     return namesIn(openDirectoryInRoot(path)).value_or(std::vector<std::string>());
 }
 
-bool exists(std::string_view path) {
-    return static_cast<bool>(openInRoot(path, O_PATH));
-}
-
 bool replace(std::string_view path, std::span<const std::uint8_t> contents, std::optional<Error>* writeError) {
     const std::optional<DevicePath> parts = splitDevicePath(path);
     if (!parts)

@@ -14,10 +14,12 @@
 
 namespace bus {
 
-void fail(int result) {
+int check(int result) {
     if (result == -ENOMEM)
         throw std::bad_alloc();
-    throw std::system_error(-result, std::generic_category());
+    if (result < 0)
+        throw std::system_error(-result, std::generic_category());
+    return result;
 }
 
 std::string reasonOf(int result) {
@@ -25,13 +27,6 @@ std::string reasonOf(int result) {
 }
 
 namespace {
-
-// Passes a result of libsystemd on, or raises the failure that it reports.
-int check(int result) {
-    if (result < 0)
-        fail(result);
-    return result;
-}
 
 // Reads the values of one message, and keeps the names of the keys that lead to the one in hand for a refusal.
 class Reader {
@@ -238,7 +233,7 @@ private:
     // Raises when the message would grow beyond what a bus carries, before anything that long is copied.
     void count(std::size_t octets) {
         if (octets > maximumOctets - octets_)
-            fail(-EMSGSIZE);
+            check(-EMSGSIZE);
         octets_ += octets;
     }
 

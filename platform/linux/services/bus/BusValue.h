@@ -33,18 +33,18 @@ constexpr std::size_t maximumOctets = std::size_t{28} << 20;
 // Raised for a message that holds what no Value can. The sentence names the key.
 using Refusal = std::invalid_argument;
 
-// Raises what a negative result of libsystemd, a negative errno, stands for: std::bad_alloc for -ENOMEM, otherwise a
-// std::system_error.
-[[noreturn]] void fail(int result);
+// Passes a result of libsystemd on, or raises what a negative one, a negative errno, stands for: std::bad_alloc for
+// -ENOMEM, otherwise a std::system_error.
+int check(int result);
 
 // The words for such a result.
 std::string reasonOf(int result);
 
-// Reads the a{sv} that stands next in `message`. Raises Refusal, and as fail.
+// Reads the a{sv} that stands next in `message`. Raises Refusal, and as check.
 Value::Dictionary readDictionary(sd_bus_message* message);
 
 // Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
-// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and as fail, which is for
+// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and as check, which is for
 // -EMSGSIZE for more than a message holds.
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary);
 

@@ -77,21 +77,18 @@ void appendResponse(sd_bus_message* message, const HSMessageResponse& response) 
                                  {"statusCode", &statusCode}});
 }
 
-// Raises what bus::fail does when nothing was sent.
+// Raises what bus::check does when nothing was sent.
 void sendReply(sd_bus_message* request, bool completed, const std::optional<HSMessageResponse>& response) {
     sd_bus_message* reply = nullptr;
-    if (const int result = sd_bus_message_new_method_return(request, &reply); result < 0)
-        bus::fail(result);
+    bus::check(sd_bus_message_new_method_return(request, &reply));
     const std::unique_ptr<sd_bus_message, decltype(&sd_bus_message_unref)> owner(reply, sd_bus_message_unref);
     const int completedValue = completed;
-    if (const int result = sd_bus_message_append_basic(reply, SD_BUS_TYPE_BOOLEAN, &completedValue); result < 0)
-        bus::fail(result);
+    bus::check(sd_bus_message_append_basic(reply, SD_BUS_TYPE_BOOLEAN, &completedValue));
     if (response)
         appendResponse(reply, *response);
     else
         bus::appendEntries(reply, {});
-    if (const int result = sd_bus_send(nullptr, reply, nullptr); result < 0)
-        bus::fail(result);
+    bus::check(sd_bus_send(nullptr, reply, nullptr));
 }
 
 int serve(VeltraPluginServerInterface& server, sd_bus_message* message) {
