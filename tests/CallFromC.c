@@ -59,6 +59,11 @@ static void checkDER(void) {
               refusal.fault == DERFaultTag && refusal.row == 1 && refusal.place == buffer + 6 &&
               refusal.item == buffer + 6 && refusal.tag == DERTagOctetString && refusal.expected == DERTagInteger,
           "DERRefusal");
+    const DERItem part = {buffer, 9};
+    check(DERParseSequenceExplained(&part, 2, pairItemSpecs, &read, sizeof read, 0, &refusal) == DERDecodeError &&
+              refusal.fault == DERFaultContentCutShort && refusal.place == buffer + 9 && refusal.item == buffer &&
+              refusal.row == 0 && refusal.tag == 0 && refusal.expected == 0,
+          "DERRefusal of a header");
 }
 
 /* Img4 */

@@ -43,6 +43,13 @@ TEST(Decode, readsTheSmallestBlobAndNoPrefixOfIt) {
     EXPECT_EQ(Recorder::lines, Lines{});
 }
 
+std::string joinedLines() {
+    std::string joined;
+    for (const std::string& line : Recorder::lines)
+        joined += (joined.empty() ? "" : "\n") + line;
+    return joined;
+}
+
 TEST(Decode, refusesABlobThatIsNotWellFormed) {
     Bytes sixElements = smallest;
     sixElements[1] += 2;
@@ -60,116 +67,48 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         SysConfig3Subject subject;
         std::ptrdiff_t offset;
         DERFault fault;
-        Lines lines;
+        std::string lines = "";
     } rows[] = {
-        {"a sixth element", sixElements, SysConfig3SubjectBlob, 50, DERFaultExcess, {}},
-        {"a SET around", set, SysConfig3SubjectBlob, 0, DERFaultNoSequence, {}},
-        {"no element", item("30", {}), SysConfig3SubjectMagic, 2, DERFaultMissing, {}},
-        {"another version element", item("30", bytes("02 01 00 04 00")), SysConfig3SubjectVersion, 5, DERFaultTag, {}},
-        {"another magic",
-         magic("67 66 43 00"),
-         SysConfig3SubjectMagic,
-         4,
-         DERFaultNone,
-         {"Sysconfig magic 0x436667 is not valid"}},
-        {"three octets of magic",
-         magic("67 66 43"),
-         SysConfig3SubjectMagic,
-         4,
-         DERFaultNone,
-         {"Sysconfig magic 0x0 is not valid"}},
-        {"five octets of magic",
-         magic("67 66 43 62 00"),
-         SysConfig3SubjectMagic,
-         4,
-         DERFaultNone,
-         {"Sysconfig magic 0x0 is not valid"}},
-        {"a later version",
-         version("04 00 03 00"),
-         SysConfig3SubjectVersion,
-         10,
-         DERFaultNone,
-         {"allocSysConfig3: invalid version provided 0x00030004",
-          "Unable to allocate sysconfig3vX object. Likely due to an unsupported magic: 0x62436667 or version: "
-          "0x30004"}},
-        {"no payload",
-         payload({}),
-         SysConfig3SubjectPayload,
-         21,
-         DERFaultHeaderCutShort,
-         {"Unable to decode payload with error 3"}},
-        {"a SEQUENCE as payload",
-         payload(bytes("30 00")),
-         SysConfig3SubjectPayload,
-         21,
-         DERFaultTag,
-         {"Tag was not the expected Payload tag 2000000000000010"}},
-        {"a cut-off payload",
-         payload(bytes("31 05 00")),
-         SysConfig3SubjectPayload,
-         21,
-         DERFaultContentCutShort,
-         {"Unable to decode payload with error 3"}},
-        {"no metadata",
-         metadata({}),
-         SysConfig3SubjectMetadata,
-         30,
-         DERFaultHeaderCutShort,
-         {"Unable to decode metadata with error 3"}},
-        {"an OCTET STRING as metadata",
-         metadata(bytes("04 00")),
-         SysConfig3SubjectMetadata,
-         30,
-         DERFaultTag,
-         {"Tag was not the expected metadata tag 4"}},
-        {"no manifest",
-         manifest({}),
-         SysConfig3SubjectManifest,
-         39,
-         DERFaultHeaderCutShort,
-         {"Unable to decode manifest with error 3"}},
-        {"a SET as manifest",
-         manifest(bytes("31 09 04 01 00 04 01 00 04 01 00")),
-         SysConfig3SubjectManifest,
-         39,
-         DERFaultTag,
-         {"Tag was not the expected manifest tag 2000000000000011"}},
-        {"a fourth item in an entry",
-         payload(setOf({payloadEntry(joined({someData, item("05", {})}))})),
-         SysConfig3SubjectPayloadEntry,
-         23,
-         DERFaultNone,
-         {"Decode sequence error: 2"}},
-        {"an empty entry",
-         payload(setOf({bytes("30 00")})),
-         SysConfig3SubjectPayloadEntry,
-         23,
-         DERFaultNone,
-         {"Decode sequence error: 5"}},
-        {"a deleted flag of 1",
-         payload(setOf({payloadEntry(bytes("01 01 01"))})),
-         SysConfig3SubjectPayloadEntry,
-         23,
-         DERFaultNone,
-         {"Decode sequence error: 3"}},
-        {"a cut-off entry after a good one",
-         payload(setOf({miGB, bytes("30 7F")})),
-         SysConfig3SubjectPayloadEntry,
-         38,
-         DERFaultContentCutShort,
-         {"Decode sequence error: 3"}},
-        {"a metadata entry without a key",
-         metadata(setOf({item("30", someData)})),
-         SysConfig3SubjectMetadataEntry,
-         32,
-         DERFaultNone,
-         {"Decode sequence error: 2"}},
-        {"values in the wrong order",
-         metadata(setOf({metadataEntry("k", joined({someText, someData}))})),
-         SysConfig3SubjectMetadataEntry,
-         32,
-         DERFaultNone,
-         {"Decode sequence error: 3"}},
+        {"a sixth element", sixElements, SysConfig3SubjectBlob, 50, DERFaultExcess},
+        {"a SET around", set, SysConfig3SubjectBlob, 0, DERFaultNoSequence},
+        {"no element", item("30", {}), SysConfig3SubjectMagic, 2, DERFaultMissing},
+        {"another version element", item("30", bytes("02 01 00 04 00")), SysConfig3SubjectVersion, 5, DERFaultTag},
+        {"another magic", magic("67 66 43 00"), SysConfig3SubjectMagic, 4, DERFaultNone,
+         "Sysconfig magic 0x436667 is not valid"},
+        {"three octets of magic", magic("67 66 43"), SysConfig3SubjectMagic, 4, DERFaultNone,
+         "Sysconfig magic 0x0 is not valid"},
+        {"five octets of magic", magic("67 66 43 62 00"), SysConfig3SubjectMagic, 4, DERFaultNone,
+         "Sysconfig magic 0x0 is not valid"},
+        {"a later version", version("04 00 03 00"), SysConfig3SubjectVersion, 10, DERFaultNone,
+         "allocSysConfig3: invalid version provided 0x00030004\n"
+         "Unable to allocate sysconfig3vX object. Likely due to an unsupported magic: 0x62436667 or version: "
+         "0x30004"},
+        {"no payload", payload({}), SysConfig3SubjectPayload, 21, DERFaultHeaderCutShort,
+         "Unable to decode payload with error 3"},
+        {"a SEQUENCE as payload", payload(bytes("30 00")), SysConfig3SubjectPayload, 21, DERFaultTag,
+         "Tag was not the expected Payload tag 2000000000000010"},
+        {"a cut-off payload", payload(bytes("31 05 00")), SysConfig3SubjectPayload, 21, DERFaultContentCutShort,
+         "Unable to decode payload with error 3"},
+        {"no metadata", metadata({}), SysConfig3SubjectMetadata, 30, DERFaultHeaderCutShort,
+         "Unable to decode metadata with error 3"},
+        {"an OCTET STRING as metadata", metadata(bytes("04 00")), SysConfig3SubjectMetadata, 30, DERFaultTag,
+         "Tag was not the expected metadata tag 4"},
+        {"no manifest", manifest({}), SysConfig3SubjectManifest, 39, DERFaultHeaderCutShort,
+         "Unable to decode manifest with error 3"},
+        {"a SET as manifest", manifest(bytes("31 09 04 01 00 04 01 00 04 01 00")), SysConfig3SubjectManifest, 39,
+         DERFaultTag, "Tag was not the expected manifest tag 2000000000000011"},
+        {"a fourth item in an entry", payload(setOf({payloadEntry(joined({someData, item("05", {})}))})),
+         SysConfig3SubjectPayloadEntry, 23, DERFaultNone, "Decode sequence error: 2"},
+        {"an empty entry", payload(setOf({bytes("30 00")})), SysConfig3SubjectPayloadEntry, 23, DERFaultNone,
+         "Decode sequence error: 5"},
+        {"a deleted flag of 1", payload(setOf({payloadEntry(bytes("01 01 01"))})), SysConfig3SubjectPayloadEntry, 23,
+         DERFaultNone, "Decode sequence error: 3"},
+        {"a cut-off entry after a good one", payload(setOf({miGB, bytes("30 7F")})), SysConfig3SubjectPayloadEntry, 38,
+         DERFaultContentCutShort, "Decode sequence error: 3"},
+        {"a metadata entry without a key", metadata(setOf({item("30", someData)})), SysConfig3SubjectMetadataEntry, 32,
+         DERFaultNone, "Decode sequence error: 2"},
+        {"values in the wrong order", metadata(setOf({metadataEntry("k", joined({someText, someData}))})),
+         SysConfig3SubjectMetadataEntry, 32, DERFaultNone, "Decode sequence error: 3"},
     };
     std::set<std::string> formats;
     for (const auto& row : rows) {
@@ -180,7 +119,7 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         EXPECT_EQ(refused.subject, row.subject) << row.what;
         EXPECT_EQ(refused.place - row.blob.data(), row.offset) << row.what;
         EXPECT_EQ(refused.encoding.fault, row.fault) << row.what;
-        EXPECT_EQ(Recorder::lines, row.lines) << row.what;
+        EXPECT_EQ(joinedLines(), row.lines) << row.what;
         formats.insert(Recorder::formats.begin(), Recorder::formats.end());
     }
     const std::set<std::string> unformatted = {
