@@ -88,7 +88,7 @@ TEST_F(Orlo, eachPutAndGetGrantsAndTrustsAnewAndLeavesTheResponse) {
     const auto stepsOf = [&](const auto& act) {
         recordLog();
         EXPECT_EQ(act(), std::nullopt);
-        return recordedCalls();
+        return recordedBehind("> ");
     };
     const auto put = [&] { return orlo.orloPut("tcrt", "S1", {'d'}, &response); };
     const Lines once = stepsOf(put);

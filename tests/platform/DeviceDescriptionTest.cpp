@@ -55,7 +55,7 @@ void expectLines(const std::vector<std::string>& lines, const char* of) {
         console.push_back("Device description /etc/veltra/device.json" + line);
         log.push_back("4 " + console.back());
     }
-    EXPECT_EQ(recordedConsole(), console) << of;
+    EXPECT_EQ(recordedBehind("console: "), console) << of;
     EXPECT_EQ(recordedLog(), log) << of;
 }
 

@@ -135,7 +135,7 @@ TEST_F(ZPOrloServicesTest, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure
             limitMemory(row.memory);
             EXPECT_EQ(request("corvoSCPair", {{"waftonUrl", "http://host"}}).statusCode(), 0);
             bool created = false, loaded = false;
-            for (const std::string& call : recordedCalls()) {
+            for (const std::string& call : recordedBehind("> ")) {
                 created = created || call.starts_with("VanterUpdaterCreate");
                 loaded = loaded || call == "the patch load returned 0";
             }

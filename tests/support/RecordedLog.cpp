@@ -30,15 +30,6 @@ void append(std::string line) {
     lines.push_back(std::move(line));
 }
 
-// The lines that `isWanted` chooses, without their marks.
-std::vector<std::string> recorded(bool (*isWanted)(std::string_view), std::size_t markSize = 0) {
-    std::vector<std::string> wanted;
-    for (const std::string& line : recordedLines())
-        if (isWanted(line))
-            wanted.push_back(line.substr(markSize));
-    return wanted;
-}
-
 } // namespace
 
 SystemLog* systemLogCreate(std::string_view, std::string_view category) {
@@ -84,15 +75,17 @@ std::vector<std::string> recordedLines() {
     return lines;
 }
 
-std::vector<std::string> recordedConsole() {
-    return recorded([](std::string_view line) { return line.starts_with(consoleMark); }, consoleMark.size());
-}
-
-std::vector<std::string> recordedCalls() {
-    return recorded([](std::string_view line) { return line.starts_with(callMark); }, callMark.size());
+std::vector<std::string> recordedBehind(std::string_view mark) {
+    std::vector<std::string> wanted;
+    for (const std::string& line : recordedLines())
+        if (line.starts_with(mark))
+            wanted.push_back(line.substr(mark.size()));
+    return wanted;
 }
 
 std::vector<std::string> recordedLog() {
-    return recorded(
-        [](std::string_view line) { return !line.starts_with(consoleMark) && !line.starts_with(callMark); });
+    std::vector<std::string> log = recordedLines();
+    std::erase_if(log,
+                  [](const std::string& line) { return line.starts_with(consoleMark) || line.starts_with(callMark); });
+    return log;
 }

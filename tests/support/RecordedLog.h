@@ -10,18 +10,16 @@
 // Starts recording; earlier lines are forgotten.
 void recordLog();
 
-// The console lines since recordLog, with the line number of an operation's line left out: "<operation> - <message>".
-std::vector<std::string> recordedConsole();
-
 // Keeps a call of a service that stands in for the device's, in its place among the lines.
 void recordCall(std::string_view call);
 
-// The calls since recordLog.
-std::vector<std::string> recordedCalls();
-
 // Everything since recordLog in its order: the lines of the log as recordedLog has them, those of the console behind
-// "console: " and the calls behind "> ".
+// "console: ", with the line number of an operation's line left out ("<operation> - <message>"), and the calls behind
+// "> ".
 std::vector<std::string> recordedLines();
+
+// Those behind `mark`, without it.
+std::vector<std::string> recordedBehind(std::string_view mark);
 
 // The lines since recordLog, as "<level> [<file>] <message>", without time and line number; those that were written to
 // the framework's handle of the system log as "<level> <message>". What went to neither handle is marked.

@@ -201,12 +201,12 @@ public:
         });
     }
 
-    // After how many whole seconds.
+    // After how many seconds, in steps of five, since on a busy machine a thread may be late.
     std::string invalidate(const Value& output) {
         const auto waited = std::chrono::steady_clock::now() - resumed_;
         for (const std::int32_t status : statusesOf(output))
             callback(status);
-        return format(" after %ld s", std::chrono::duration_cast<std::chrono::seconds>(waited).count());
+        return format(" after %ld s", waited / std::chrono::seconds(5) * 5);
     }
 
 private:
