@@ -31,6 +31,9 @@ template <class... Kinds>
 struct PerKind : Kinds... {
     using Kinds::operator()...;
 };
+// Clang 14 to 16 do not deduce an aggregate's parameters by themselves.
+template <class... Kinds>
+PerKind(Kinds...) -> PerKind<Kinds...>;
 
 } // namespace
 
