@@ -6,23 +6,19 @@
 
 #include "tools/orloctl/Report.h"
 
-// A report and its text as people read it.
+// A report as people and programs get it: its text, and its JSON with the lists in their places.
 struct PrintedReport : Report {
     PrintedReport(Report report) : Report(std::move(report)) {
-        std::ostringstream out;
-        writeText(out, *this);
-        text = out.str();
+        std::ostringstream lines, object;
+        writeText(lines, *this);
+        writeJson(object, *this);
+        text = lines.str();
+        json = nlohmann::ordered_json::parse(object.str());
     }
+
+    bool says(const std::string& words) const { return text.find(words) != std::string::npos; }
 
     std::string text;
 };
-
-// Its JSON too as a program reads it from what is printed, lists and all.
-inline PrintedReport printed(PrintedReport report) {
-    std::ostringstream out;
-    writeJson(out, report);
-    report.json = nlohmann::ordered_json::parse(out.str());
-    return report;
-}
 
 #endif

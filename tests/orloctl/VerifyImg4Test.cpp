@@ -36,63 +36,45 @@ Bytes soundManifest(const std::string& profile) {
     return signer.manifest(standardManifest(), signer.standardChain());
 }
 
-Report verify(const Bytes& bytes, const TrustDomain& domain, const std::string& object = "",
+TrustDomain testDomain(const std::optional<std::string>& profile = std::nullopt) {
+    return readTrustDomain(TEST_TRUST_DOMAIN, profile);
+}
+
+Report verify(const Bytes& bytes, const TrustDomain& domain = testDomain(), const std::string& object = "",
               const std::string& payloadDigest = "") {
     VerifyRequest request;
     if (!object.empty())
         request.object = fourCharacterCode("--object", object);
     if (!payloadDigest.empty())
         request.payloadDigest = fourCharacterCode("--payload-digest", payloadDigest);
-    return printed(verifyImg4({bytes.data(), bytes.size()}, domain, request));
+    return verifyImg4({bytes.data(), bytes.size()}, domain, request);
 }
 
-TrustDomain testDomain(const std::optional<std::string>& profile = std::nullopt) {
-    return readTrustDomain(TEST_TRUST_DOMAIN, profile);
-}
-
-TEST(VerifyImg4, trustsWhatEveryProfileSignsAndFindsThatProfile) {
+TEST(VerifyImg4, findsTheProfileThatHasSigned) {
     const TrustDomain all = testDomain();
     ASSERT_EQ(all.profiles.size(), Img4NumTrustProfiles);
     for (const DomainProfile& profile : all.profiles) {
         const Img4TrustProfileEntry& entry = *profile.entry;
         const Bytes manifest = soundManifest(entry.name);
-        for (const TrustDomain& domain : {testDomain(), testDomain(entry.name)}) {
-            const Report report = verify(container(payload({}), manifest, {}), domain, "sepi");
-            EXPECT_TRUE(report.ok()) << entry.name << "\n" << report.problem;
+        for (const Report& report : {verify(manifest, all, "sepi"), verify(manifest, testDomain(entry.name))}) {
+            EXPECT_TRUE(report.ok()) << report.problem;
             EXPECT_EQ(report.json["profile"], entry.name);
-            EXPECT_EQ(report.json["root"], entry.rootName);
-            EXPECT_EQ(report.json["trusted"], true);
             EXPECT_EQ(report.json["chain"].size(), entry.chainLength);
-            EXPECT_EQ(report.json["chain"].front()["role"], "root");
             EXPECT_EQ(report.json["chain"].back()["role"], "leaf");
-            EXPECT_EQ(report.json["digests"]["payload"].get<std::string>().size(),
-                      2 * entry.profile->digestInfo->length);
-            EXPECT_FALSE(report.json.contains("failedStep"));
+            EXPECT_EQ(report.json["digests"]["body"].get<std::string>().size(), 2 * entry.profile->digestInfo->length);
         }
-        for (const DomainProfile& other : all.profiles)
-            EXPECT_EQ(verify(manifest, testDomain(other.entry->name)).ok(), &entry == other.entry)
-                << entry.name << " under " << other.entry->name;
+        // A root that is built in has the name of the tests' root, and another key.
+        const Report forged = verify(manifest, builtInTrustDomain(std::nullopt));
+        EXPECT_EQ(forged.json["profile"], entry.name);
+        EXPECT_NE(forged.problem.find("another key of that name has signed it"), std::string::npos) << forged.problem;
     }
 }
 
-TEST(VerifyImg4, showsWhatTheManifestSaysAndTheLeafDemands) {
-    const Report alone = verify(container(payload({}), soundManifest(ec384), {}), testDomain());
-    EXPECT_NE(alone.text.find("No object was named"), std::string::npos) << alone.text;
-    EXPECT_EQ(alone.json["objects"], ordered_json({"boot", "sepi"}));
-    EXPECT_FALSE(alone.json.contains("object"));
-    ASSERT_EQ(alone.json["constraints"].size(), 2U);
-    EXPECT_EQ(alone.json["constraints"][0]["demand"], "must be INTEGER 7");
-    EXPECT_EQ(alone.json["constraints"][0]["state"], "met");
-    EXPECT_EQ(alone.json["constraints"][1]["dictionary"], "OBJP");
-    EXPECT_EQ(alone.json["constraints"][1]["state"], "not checked");
-    EXPECT_EQ(alone.json["manifestProperties"].size(), 4U);
-    EXPECT_NE(alone.text.find("\n  ABCD  INTEGER 7\n"), std::string::npos) << alone.text;
-
-    const Report object = verify(soundManifest(ec384), testDomain(), "sepi");
-    EXPECT_EQ(object.json["object"]["name"], "sepi");
-    EXPECT_EQ(object.json["object"]["properties"][2]["value"], 300);
-    EXPECT_EQ(object.json["constraints"][1]["state"], "met");
-    EXPECT_NE(object.text.find("\nresult: trusted under kImg4DecodeSecureBootEc384Sha384: "), std::string::npos);
+TEST(VerifyImg4, judgesNoObjectUnlessOneIsNamed) {
+    const Report report = verify(container(payload({}), soundManifest(ec384), {}));
+    EXPECT_TRUE(report.says("No object was named"));
+    EXPECT_EQ(report.json["constraints"][1]["state"], "not checked");
+    EXPECT_FALSE(report.json.contains("object"));
 }
 
 // A file that is refused, and what is said of it.
@@ -108,14 +90,6 @@ struct RefusalCase {
 Bytes constrained(const List& constraints, Manifest fields = standardManifest()) {
     const Signer& signer = signerOf(ec384);
     return signer.manifest(std::move(fields), signer.chainWith(signer.issue(signer.leaf(constraints))));
-}
-
-TEST(VerifyImg4, showsAValueWholeForProgramsAndItsBeginningForPeople) {
-    const Report report =
-        verify(constrained({object("MANP", {property("NONE", octets(Bytes(300, 7)))})}), testDomain());
-    const std::string demand = report.json["constraints"][0]["demand"];
-    EXPECT_GT(demand.size(), 600U);
-    EXPECT_EQ((report.text + report.problem).find(demand), std::string::npos);
 }
 
 Bytes withProperty(const Bytes& encoding) {
@@ -299,15 +273,13 @@ std::vector<RefusalCase> refusalCases() {
 
 TEST(VerifyImg4, saysWhyItRefusesAndWhere) {
     for (const RefusalCase& row : refusalCases()) {
-        const Report report = verify(
-            row.bytes, testDomain(row.profile != nullptr ? std::optional<std::string>(row.profile) : std::nullopt),
-            row.object);
+        const auto profile = row.profile != nullptr ? std::optional<std::string>(row.profile) : std::nullopt;
+        const Report report = verify(row.bytes, testDomain(profile), row.object);
         EXPECT_FALSE(report.ok()) << row.problem;
         EXPECT_NE(report.problem.find(row.problem), std::string::npos) << row.problem << "\n" << report.problem;
         EXPECT_EQ(report.json["failedStep"], row.step) << row.problem;
         EXPECT_LE(report.json["problemOffset"], row.bytes.size()) << row.problem;
         EXPECT_EQ(report.json["trusted"], false);
-        EXPECT_NE(report.text.find("\ntrusted: false\n"), std::string::npos);
     }
 }
 
@@ -324,44 +296,21 @@ TEST(VerifyImg4, showsPropertiesOnlyOnceTheSignatureWasVerified) {
     EXPECT_FALSE(incomplete.json.contains("object"));
 }
 
-// The roots that are built in have the names of the tests' roots, and other keys.
-TEST(VerifyImg4, aRootOfTheSameNameIsNotTheRoot) {
-    for (unsigned i = 0; i < Img4NumTrustProfiles; ++i) {
-        const char* name = Img4TrustProfiles[i].name;
-        const Report report = verify(soundManifest(name), builtInTrustDomain(std::nullopt));
-        EXPECT_FALSE(report.ok());
-        EXPECT_EQ(report.json["profile"], name);
-        EXPECT_NE(report.problem.find("another key of that name has signed it"), std::string::npos) << report.problem;
-    }
-}
-
 TEST(VerifyImg4, hostileNamesStayWithinTheLine) {
-    Manifest fields = standardManifest();
-    fields.properties.push_back(property("EVIL", ia5("\x1B[2J\nresult: trusted")));
-    const Signer& signer = signerOf(ec384);
-    Certificate leaf = signer.leaf({});
+    Certificate leaf = signerOf(ec384).leaf({});
     leaf.subject = distinguishedName("a,O=b\x1B[31m\n\"+\\;<> ");
-    const Report report = verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain());
-    ASSERT_TRUE(report.ok()) << report.problem;
-    EXPECT_EQ(report.json["chain"][1]["subject"], "CN=a\\,O=b\\1B[31m\\0A\\\"\\+\\\\\\;\\<\\>\\ ");
-    EXPECT_EQ(report.text.find('\x1B'), std::string::npos);
-    EXPECT_EQ(report.text.find("\nresult: trusted\n"), std::string::npos);
-
-    leaf.subject = set({integer(1)});
-    EXPECT_FALSE(verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain()).ok());
+    EXPECT_EQ(verify(signedBy(leaf)).json["chain"][1]["subject"], R"(CN=a\,O=b\1B[31m\0A\"\+\\\;\<\>\ )");
     leaf.subject = sequence({integer(1), integer(2)});
-    EXPECT_EQ(
-        verify(signer.manifest(fields, signer.chainWith(signer.issue(leaf))), testDomain()).json["chain"][1]["subject"],
-        "#020101020102");
+    EXPECT_EQ(verify(signedBy(leaf)).json["chain"][1]["subject"], "#020101020102");
+    const Report value = verify(withProperty(property("EVIL", ia5("\x1B[2J\nresult: trusted"))));
+    EXPECT_FALSE(value.says("\x1B") || value.says("\nresult: trusted\n"));
 }
 
 TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
-    const Report report = verify(withProperty(property("BAD!", item(DERTagBoolean, {1}))), testDomain());
+    const Report report = verify(withProperty(property("BAD!", item(DERTagBoolean, {1}))));
     EXPECT_TRUE(report.ok()) << report.problem;
-    ASSERT_EQ(report.json["notes"].size(), 1U);
-    EXPECT_NE(report.text.find("\n  \"BAD!\" of the manifest has a value that is not DER: a BOOLEAN is 00 or FF"),
-              std::string::npos)
-        << report.text;
+    EXPECT_EQ(report.json["notes"].size(), 1U);
+    EXPECT_TRUE(report.says("\n  \"BAD!\" of the manifest has a value that is not DER: a BOOLEAN is 00 or FF"));
 }
 
 TEST(VerifyImg4, comparesThePayloadWithThePropertyThatIsNamed) {
@@ -402,15 +351,18 @@ TEST(VerifyImg4, comparesThePayloadWithThePropertyThatIsNamed) {
 
 TEST(VerifyImg4, boundsWhatItShows) {
     Manifest fields = standardManifest();
-    for (int i = 0; i < 1500; ++i)
-        fields.objects.push_back(object(largeObjectName(static_cast<unsigned>(i % 1000)), {}));
-    const Report objects = verify(constrained({}, fields), testDomain());
-    EXPECT_EQ(objects.json["objects"].size(), 1502U);
-    EXPECT_NE(objects.text.find(" and 502 more\n"), std::string::npos);
+    for (unsigned i = 0; i < 1500; ++i)
+        fields.objects.push_back(object(largeObjectName(i % 1000), {}));
+    const Report report = verify(constrained({object("MANP", {property("NONE", octets(Bytes(300, 7)))})}, fields));
+    const std::string demand = report.json["constraints"][0]["demand"];
+    EXPECT_GT(demand.size(), 600U);
+    EXPECT_FALSE(report.says(demand) || report.problem.find(demand) != std::string::npos);
+    EXPECT_EQ(report.json["objects"].size(), 1502U);
+    EXPECT_TRUE(report.says(" and 502 more\n"));
 
-    const Report chain = verify(withChain(ec384, List(150, sequence({}))), testDomain());
+    const Report chain = verify(withChain(ec384, List(150, sequence({}))));
     EXPECT_EQ(chain.json["chain"].size(), 101U); // with the root
-    EXPECT_NE(chain.text.find("50 further certificates are not shown"), std::string::npos);
+    EXPECT_TRUE(chain.says("50 further certificates are not shown"));
 }
 
 } // namespace
