@@ -1,4 +1,4 @@
-"""An HTTPS server that misbehaves in the way that the last segment of a request's path names, the first one of a POST."""
+"""An HTTPS server that misbehaves in the way that a segment of a request's path names: the last, of a POST the first."""
 import hashlib
 import http.client
 import http.server
@@ -17,9 +17,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
         pass
 
     def handle_request(self):
-        measure = self.server.context and self.path == "/orlotrustobject"
-        segment = self.path.split("/")[1 if self.command == "POST" else -1]
-        behaviour, *argument = (not measure and self.server.instead or segment).split("-")
+        behaviour, *argument = self.path.split("/")[1 if self.command == "POST" else -1].split("-")
         with self.server.lock:
             self.server.seen.append((self.command, self.path))
             count = self.server.counts[self.path] = self.server.counts.get(self.path, 0) + 1
@@ -213,14 +211,13 @@ class Handler(http.server.BaseHTTPRequestHandler):
 
 
 class HostileServer(http.server.ThreadingHTTPServer):
-    """Speaks plain HTTP without a certificate. `instead`, when set, is the behaviour for every path. `seen` has method and
-    path of each request, `posts` path and body of each POST and whether a proxy passed it on."""
+    """Speaks plain HTTP without a certificate. `seen` has method and path of each request, `posts` path and body of
+    each POST and whether a proxy passed it on."""
 
     daemon_threads = True
 
     def __init__(self, certificate, key, trust_object):
         super().__init__(("127.0.0.1", 0), Handler)
-        self.instead = None
         self.trust_object, self.seen, self.posts, self.counts, self.failing = trust_object, [], [], {}, 0
         self.objects, self.racing, self.refusal = {}, 0, 412
         self.lock, self.closing, self.answered, self.finished = threading.Lock(), *(threading.Event() for _ in range(3))

@@ -1,5 +1,4 @@
-"""Records, exports and certificates through the running service: what goes in, what stands in the store, and what cannot
-be lost."""
+"""Records, exports and certificates through the running service: what goes in, what the store has, what stays."""
 import os
 import random
 import subprocess
@@ -109,7 +108,8 @@ class Store(OrloTest):
         """Gives the store a small file system of its own, or skips the test where that is not allowed."""
         folder = self.root / "var/lib/orlo"
         folder.mkdir(parents=True, exist_ok=True)
-        if subprocess.run(["mount", "-t", "tmpfs", "-o", "size=1m", "veltra", folder], stderr=subprocess.DEVNULL).returncode:
+        mount = ["mount", "-t", "tmpfs", "-o", "size=1m", "veltra", folder]
+        if subprocess.run(mount, stderr=subprocess.DEVNULL).returncode:
             self.skipTest("mounting takes a privilege that this test has not")
         self.addCleanup(lambda: subprocess.run(["umount", "-l", folder], check=True))
 
