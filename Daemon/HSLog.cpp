@@ -22,10 +22,6 @@ struct LogState {
 // Null until logInit has run. Never released, since any thread may log until the process is gone.
 std::atomic<const LogState*> logInitialized = nullptr;
 
-// Of the levels from LogLevelDefault on.
-constexpr SystemLogType types[] = {SystemLogType::Default, SystemLogType::Info, SystemLogType::Debug,
-                                   SystemLogType::Error};
-
 void initialize(const char* name) {
     auto* const state = new LogState;
     if (name)
@@ -38,7 +34,7 @@ void initialize(const char* name) {
 
 void writeLine(const LogState& state, int level, const std::string& line) {
     if (level >= LogLevelDefault && level <= LogLevelError) {
-        const SystemLogType type = types[level - LogLevelDefault];
+        const auto type = static_cast<SystemLogType>(level - LogLevelDefault); // in the same order
         if (systemLogTypeEnabled(state.connObj, type))
             systemLogWrite(state.connObj, type, line);
     }

@@ -68,11 +68,8 @@ std::optional<std::vector<CertificateRef>> copyCertificatesFromCertsOnlyMessage(
         return std::nullopt;
     const std::unique_ptr<STACK_OF(X509), FreeCertificates> found(CMS_get1_certs(content.get()));
     std::vector<CertificateRef> certificates;
-    for (int i = 0; found && i < sk_X509_num(found.get()); ++i) {
-        X509* x509 = sk_X509_value(found.get(), i);
-        X509_up_ref(x509);
-        certificates.push_back(wrap(Owner<X509, X509_free>(x509)));
-    }
+    while (found && sk_X509_num(found.get()) > 0)
+        certificates.push_back(wrap(Owner<X509, X509_free>(sk_X509_shift(found.get()))));
     return certificates;
 }
 
