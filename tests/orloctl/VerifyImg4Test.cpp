@@ -162,52 +162,31 @@ Bytes withBody(const Bytes& body, std::uint64_t version = 0) {
                      sequence(signer.standardChain())});
 }
 
-List twice(List list) {
-    list.push_back(list.back());
-    return list;
-}
-
-Bytes shortened(Bytes bytes) {
-    bytes.pop_back();
-    return bytes;
-}
-
 std::vector<RefusalCase> refusalCases() {
     Certificate unusedBits = signerOf(ec384).leaf({});
     unusedBits.unusedBits = 1;
     return {
         {"file", "The file is empty", Bytes{}},
-        {"file", "content is cut short", shortened(soundManifest(ec384))},
+        {"file", "content is cut short", {0x30, 0x05, 0x16}},
         {"file", "has neither a signature nor a chain", unsignedManifest({})},
         {"file", "is a bare payload", payload({})},
         {"file", "The container has no manifest", container(payload({}), {}, {})},
 
-        {"chain", "The chain has 1 certificate, the root included, and the profile demands 2", withChain(ec384, {}),
-         ec384},
-        {"chain", "The chain has 3 certificates, the root included, and the profile demands 2",
-         withChain(ec384, twice(signerOf(ec384).standardChain()))},
+        {"chain", "The chain has 1 certificate, the root included", withChain(ec384, {}), ec384},
+        {"chain", "The chain has 3 certificates", withChain(ec384, List(2, signerOf(ec384).standardChain().back()))},
         {"chain", "Certificate 1 is no certificate", withChain(ec384, {sequence({integer(1)})})},
         {"chain", "Certificate 1 is no strict DER: the length is indefinite", withChain(ec384, {{0x30, 0x80}})},
         {"chain", "Certificate 1 is longer than 131071 octets", withChain(ec384, {sequence({octets(filler(131071))})})},
-        {"chain",
-         R"(Certificate 1 ("CN=Tevari Manifest Signing,O=Tevari") has the key RSA 4096 bits, and the profile demands )"
-         "EC on P-256 or P-384, an uncompressed point",
-         soundManifest(rsa4k), ec384},
-        {"chain",
-         R"(names the issuer "CN=Tevari RSA 4096 Root CA,O=Tevari", and the one before it is the root )"
-         R"(("CN=Tevari RSA 3072 Root CA,O=Tevari"))",
-         soundManifest(rsa4k), rsa3k},
-        {"chain",
-         R"(Certificate 2 ("CN=Manifest Signing of a Test") names the issuer "CN=Nobody", and the one before it )"
-         R"(is certificate 1 ("CN=)",
+        {"chain", "has the key RSA 4096 bits, and the profile demands EC on P-256 or P-384", soundManifest(rsa4k),
+         ec384},
+        {"chain", "has the key EC P-384, and the profile demands RSA without parameters", soundManifest(ec384), rsa4k},
+        {"chain", R"(CA,O=Tevari", and the one before it is the root ("CN=Tevari RSA 3072)", soundManifest(rsa4k),
+         rsa3k},
+        {"chain", R"(issuer "CN=Nobody", and the one before it is certificate 1 ("CN=)",
          withLeaf(localPolicy, &Certificate::issuer, distinguishedName("Nobody"))},
-        {"chain",
-         R"(No known root has signed this chain: its first certificate ("CN=Manifest Signing of a Test") names )"
-         R"(the issuer "CN=Nobody")",
+        {"chain", "No known root has signed this chain",
          withLeaf(ec384, &Certificate::issuer, distinguishedName("Nobody"))},
-        {"signature",
-         R"(does not verify under the key of the leaf, certificate 1 ("CN=Manifest Signing of a Test"): the key is no )"
-         "uncompressed point of its curve",
+        {"signature", "the key is no uncompressed point of its curve",
          withLeaf(ec384, &Certificate::publicKeyInfo, otherKey(ec384))},
         {"signature", "the key has an even modulus or an unsound exponent", // 65536
          withLeaf(rsa3k, &Certificate::publicKeyInfo, otherKey(rsa3k))},
@@ -220,47 +199,34 @@ std::vector<RefusalCase> refusalCases() {
          R"(key of the root ("CN=Tevari Local P-384 Root CA,O=Tevari"): the certificate was changed)",
          changedAt(soundManifest(ec384), "Tevari Manifest Signing")},
         {"chain", "is no BIT STRING of whole octets", signedBy(unusedBits)},
-        {"chain",
-         R"(common name of the secure-boot authority as a PrintableString: "Tevari Secure Boot Certification Authority")",
-         withoutAuthority()},
-        {"chain", "has a malformed or empty list of extensions",
-         withLeaf(ec384, &Certificate::extensions, extensions({}))},
+        {"chain", R"(PrintableString: "Tevari Secure Boot Certification Authority", at offset)", withoutAuthority()},
+        {"chain", "empty list of extensions", withLeaf(ec384, &Certificate::extensions, extensions({}))},
 
-        {"signature",
-         R"(does not verify under the key of the leaf, certificate 1 ("CN=Tevari Manifest Signing,O=Tevari"): the manifest's )"
-         "body was changed",
+        {"signature", R"(Signing,O=Tevari"): the manifest's body was changed)",
          changedAt(soundManifest(ec384), "text")},
-        {"signature", R"(("CN=Tevari Manifest Signing,O=Tevari"): it has 511 octets, and those of the key have 512)",
-         withSignature(rsa4k, filler(511))},
+        {"signature", "it has 511 octets, and those of the key have 512", withSignature(rsa4k, filler(511))},
+        {"signature", "it has not the form that the algorithm demands", withSignature(ec384, filler(48))},
 
         {"dictionaries", R"(The manifest's body has no "MANB")", withBody(set({object("MANX", {})}))},
-        {"dictionaries", R"(The manifest's body has a "MANB" that is SET instead of SEQUENCE)",
-         withBody(manifestBody(standardManifest()), 2)},
+        {"dictionaries", R"(a "MANB" that is SET instead of)", withBody(manifestBody(standardManifest()), 2)},
         {"dictionaries", R"("MANB" has no "MANP")", withBody(set({object("MANB", {})}))},
 
         {"object", R"(The manifest has no "xyzt")", soundManifest(ec384), nullptr, "xyzt"},
-        {"object", R"(The manifest has a "sepi" that is INTEGER instead of SET)",
-         withObject(property("sepi", integer(1))), nullptr, "sepi"},
-        {"object", R"(The manifest has a "sepi" that is named "boot" inside)",
-         withObject(item(propertyTag("sepi"), sequence({ia5("boot"), set({})}))), nullptr, "sepi"},
+        {"object", R"(a "sepi" that is INTEGER instead of)", withObject(property("sepi", integer(1))), nullptr, "sepi"},
 
         {"constraints", "The leaf certificate carries no constraints", withLeaf(ec384, &Certificate::extensions, {})},
         {"constraints", R"(says that "ABCD" of the manifest must be INTEGER 8, and it is INTEGER 7)",
          constrained({object("MANP", {property("ABCD", integer(8))})})},
-        {"constraints", R"(says that "ABCD" of the manifest must be BOOLEAN true, and it is INTEGER 7)",
-         constrained({object("MANP", {property("ABCD", boolean(true))})})},
         {"constraints", R"(says that "NONE" of the manifest must be OCTET STRING 07, and there is none)",
          constrained({object("MANP", {property("NONE", octets({7}))})})},
         {"constraints", R"(says that "NONE" of the object must be there, and there is none)",
          constrained({object("OBJP", {mustBePresent("NONE")})}), nullptr, "sepi"},
         {"constraints", R"(says that "ABCD" of the manifest must not be there, and it is INTEGER 7)",
          constrained({object("MANP", {mustBePresent("TEXT"), mustBeAbsent("ABCD")})})},
-        {"constraints", R"(private "ABCD" is IA5String, which is no kind of constraint)",
+        {"constraints", R"("ABCD" is IA5String, which is no kind of constraint)",
          constrained({object("MANP", {property("ABCD", ia5("text"))})})},
         {"constraints", R"(private "NEWP" is no dictionary of constraints)", constrained({object("NEWP", {})})},
         {"constraints", R"(private "MANP" is INTEGER instead of SET)", constrained({property("MANP", integer(1))})},
-        {"constraints", R"(private "MANP" is named "OBJP" inside)",
-         constrained({item(propertyTag("MANP"), sequence({ia5("OBJP"), set({})}))})},
 
         {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
          withProperty(property("LIST", sequence({})))},

@@ -3,6 +3,7 @@
 #include <limits>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "sysconfig/SysConfig3.h"
@@ -19,56 +20,48 @@ using nlohmann::ordered_json;
 
 constexpr std::size_t mostMessages = 100;
 
-// The library's messages, of which a blob can cause several for each of its entries.
-struct Messages {
-    std::vector<std::string> first;
-    std::size_t leftOut = 0;
-    std::string last;
-};
-
-Messages* messages = nullptr;
-
-// Keeps a message of the library, without the prototype that most begin with.
-void keepMessage(int, const char* text, ...) {
-    char line[512];
-    va_list arguments;
-    va_start(arguments, text);
-    (void)std::vsnprintf(line, sizeof line, text, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
-    va_end(arguments);
-    const std::string message = line;
-    const std::size_t prototypeEnd = text[0] == '%' && text[1] == 's' ? message.find(") ") : std::string::npos;
-    messages->last = prototypeEnd == std::string::npos ? message : message.substr(prototypeEnd + 2);
-    if (messages->first.size() < mostMessages)
-        messages->first.push_back(messages->last);
-    else
-        ++messages->leftOut;
-}
-
-// Collects the library's messages for as long as it lives.
-class MessageCollector {
+// Collects the library's messages, of which a blob can cause several for each of its entries, for as long as it lives.
+class Messages {
 public:
-    MessageCollector() : earlier_(getSysConfig3LogHandler()) {
-        messages = &collected_;
-        setSysConfig3LogHandler(keepMessage);
+    Messages() : earlier_(getSysConfig3LogHandler()) {
+        current = this;
+        setSysConfig3LogHandler(keep);
     }
-    ~MessageCollector() {
-        setSysConfig3LogHandler(earlier_);
-        messages = nullptr;
-    }
-    MessageCollector(const MessageCollector&) = delete;
-    MessageCollector& operator=(const MessageCollector&) = delete;
+    ~Messages() { setSysConfig3LogHandler(earlier_); }
+    Messages(const Messages&) = delete;
+    Messages& operator=(const Messages&) = delete;
 
-    const Messages& collected() const { return collected_; }
+    const std::string& last() const { return last_; }
+    void addTo(ordered_json& json) const {
+        json["messages"] = first_;
+        if (leftOut_ != 0)
+            json["messagesLeftOut"] = leftOut_;
+    }
 
 private:
-    Messages collected_;
-    SysConfig3LogHandler earlier_;
+    static void keep(int level, const char* format, ...);
+
+    static inline Messages* current = nullptr;
+    const SysConfig3LogHandler earlier_;
+    std::vector<std::string> first_;
+    std::size_t leftOut_ = 0;
+    std::string last_;
 };
 
-void addMessages(ordered_json& json, const Messages& said) {
-    json["messages"] = said.first;
-    if (said.leftOut != 0)
-        json["messagesLeftOut"] = said.leftOut;
+// Keeps a message without the prototype that most begin with.
+void Messages::keep(int, const char* format, ...) {
+    char line[512];
+    va_list arguments;
+    va_start(arguments, format);
+    (void)std::vsnprintf(line, sizeof line, format, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
+    va_end(arguments);
+    const std::string message = line;
+    const std::size_t end = std::string_view(format).starts_with("%s") ? message.find(") ") : std::string::npos;
+    current->last_ = end == std::string::npos ? message : message.substr(end + 2);
+    if (current->first_.size() < mostMessages)
+        current->first_.push_back(current->last_);
+    else
+        ++current->leftOut_;
 }
 
 std::string hexadecimal(std::uint32_t number) {
@@ -104,19 +97,13 @@ ordered_json metadataEntry(const __SysConfig3MetadataEntry* entry) {
     return json;
 }
 
-Elements payloadEntries(const ObjectPtr& object) {
-    return [object](const auto& take) {
-        const auto* entry = sysConfig3GetHeadPayloadEntry(object.get());
-        while (entry && take({payloadEntry(entry), {}}))
-            entry = sysConfig3PayloadEntryGetNextEntry(entry);
-    };
-}
-
-Elements metadataEntries(const ObjectPtr& object) {
-    return [object](const auto& take) {
-        const auto* entry = sysConfig3GetHeadMetadataEntry(object.get());
-        while (entry && take({metadataEntry(entry), {}}))
-            entry = sysConfig3MetadataEntryGetNextEntry(entry);
+template <typename Entry>
+Elements entries(const ObjectPtr& object, const Entry* (*head)(const __SysConfig3*), const Entry* (*next)(const Entry*),
+                 ordered_json (*describe)(const Entry*)) {
+    return [=](const auto& take) {
+        const Entry* entry = head(object.get());
+        while (entry && take({describe(entry), {}}))
+            entry = next(entry);
     };
 }
 
@@ -176,33 +163,35 @@ std::string reason(const SysConfig3Refusal& refusal, const std::string& said, co
 Report refused(const std::string& why, const Messages& said) {
     Report report;
     report.fail("No configuration blob. " + why);
-    addMessages(report.json, said);
+    said.addTo(report.json);
     return report;
 }
 
 } // namespace
 
 Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
-    const MessageCollector collector;
+    const Messages said;
     if (blob.size() > std::numeric_limits<std::uint32_t>::max())
-        return refused("It is larger than 4 GiB.", {});
+        return refused("It is larger than 4 GiB.", said);
     if (blob.empty())
-        return refused("The file is empty.", {});
+        return refused("The file is empty.", said);
     SysConfig3Refusal refusal;
     const ObjectPtr object(decodeSysConfig3Explained(blob.data(), static_cast<std::uint32_t>(blob.size()), &refusal),
                            sysconfig::Release());
-    const Messages& said = collector.collected();
     if (!object)
-        return refused(reason(refusal, said.last, blob), said);
+        return refused(reason(refusal, said.last(), blob), said);
     Report report;
-    report.json = {
-        {"magic", codeText(sysConfig3GetMagic(object.get()))},
-        {"version", hexadecimal(sysConfig3GetVersion(object.get()))},
-        {"payload", report.lists.add(payloadEntries(object), sysConfig3GetPayloadEntryCount(object.get()))},
-        {"metadata", report.lists.add(metadataEntries(object), sysConfig3GetMetadataEntryCount(object.get()))},
-        {"hmacState", hmacState(object.get(), hmacKey)},
-        {"hmacs", manifestHMACs(object.get())}};
-    addMessages(report.json, said);
+    const Elements payload =
+        entries(object, sysConfig3GetHeadPayloadEntry, sysConfig3PayloadEntryGetNextEntry, payloadEntry);
+    const Elements metadata =
+        entries(object, sysConfig3GetHeadMetadataEntry, sysConfig3MetadataEntryGetNextEntry, metadataEntry);
+    report.json = {{"magic", codeText(sysConfig3GetMagic(object.get()))},
+                   {"version", hexadecimal(sysConfig3GetVersion(object.get()))},
+                   {"payload", report.lists.add(payload, sysConfig3GetPayloadEntryCount(object.get()))},
+                   {"metadata", report.lists.add(metadata, sysConfig3GetMetadataEntryCount(object.get()))},
+                   {"hmacState", hmacState(object.get(), hmacKey)},
+                   {"hmacs", manifestHMACs(object.get())}};
+    said.addTo(report.json);
     if (const auto behind = blob.data() + blob.size() - refusal.place; behind != 0)
         report.json["octetsBehind"] = behind;
     if (report.json["hmacState"] == "do not match")
