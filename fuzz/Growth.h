@@ -6,7 +6,7 @@
 #include <cstddef>
 #include <functional>
 
-#ifdef VELTRA_SANITIZE
+#ifdef VELTRA_FUZZ
 #include <sanitizer/allocator_interface.h>
 #endif
 
@@ -16,7 +16,7 @@
 // before.
 inline void requireProportion(std::size_t size, std::size_t base, std::size_t perOctet,
                               const std::function<void()>& read) {
-#ifdef VELTRA_SANITIZE
+#ifdef VELTRA_FUZZ
     static std::atomic<std::size_t> held = 0, most = 0;
     static const int installed = __sanitizer_install_malloc_and_free_hooks(
         [](const volatile void*, std::size_t octets) {
@@ -33,7 +33,7 @@ inline void requireProportion(std::size_t size, std::size_t base, std::size_t pe
     read();
     FUZZ_REQUIRE(most - before <= base + perOctet * size);
 #else
-    static_cast<void>(size + base + perOctet); // only the sanitizer's allocator tells what is held
+    static_cast<void>(size + base + perOctet); // only Clang's sanitizer tells what is held
     read();
 #endif
 }

@@ -186,27 +186,6 @@ TEST(Entry, ignoresALengthThatComesWithoutData) {
     EXPECT_TRUE(sysConfig3MetadataEntriesAreEqual(metadata.get(), metadataString("k", "text").get()));
 }
 
-TEST(PayloadList, keepsTheOrderOfInsertion) {
-    const SysConfig3Ptr object = newObject();
-    const auto remove = [&](std::uint32_t key) {
-        EXPECT_TRUE(sysConfig3DeletePayloadEntryForKey(object.get(), key));
-        EXPECT_EQ(sysConfig3GetPayloadEntryForKey(object.get(), key), nullptr);
-        return payloadOf(object);
-    };
-    EXPECT_TRUE(add(object, payloadData(keyWCh0, {1})));
-    EXPECT_TRUE(add(object, payloadString(keyMiGB, "text")));
-    EXPECT_TRUE(add(object, payloadDeleted(0x41424344)));
-    EXPECT_TRUE(add(object, payloadData(keyWCh0, {2})));
-    EXPECT_EQ(payloadOf(object), "MiGB=string text, ABCD=deleted, WCh0=data 02");
-    EXPECT_EQ(remove(0x41424344), "MiGB=string text, WCh0=data 02");
-    EXPECT_EQ(remove(0x41424344), "MiGB=string text, WCh0=data 02");
-    EXPECT_EQ(remove(keyWCh0), "MiGB=string text");
-    EXPECT_EQ(remove(keyMiGB), "");
-    EXPECT_TRUE(add(object, payloadData(keyWCh0, {3})));
-    EXPECT_EQ(payloadOf(object), "WCh0=data 03");
-    EXPECT_EQ(sysConfig3GetPayloadEntryCount(object.get()), 1U);
-}
-
 TEST(PayloadList, takesMoreEntriesThanSixteenBitsCount) {
     constexpr std::uint32_t count = 70000, removed = 17;
     const SysConfig3Ptr object = newObject();
@@ -302,6 +281,19 @@ TEST(Manifest, comparesHMACsByVersion) {
         EXPECT_EQ(_sysConfig3HMACsAreEqual(row.version, row.a, row.b), row.equal) << &row - rows;
     EXPECT_FALSE(sysConfig3ManifestsAreEqual(nullptr, nullptr));
     EXPECT_EQ(sysConfig3ManifestGetVersion(sysConfig3GetManifest(newObject(0x30001).get())), 0x30001U);
+}
+
+TEST(Manifest, isEqualByItsVersionAndEachHMAC) {
+    std::uint8_t one[] = {1}, two[] = {2};
+    const SysConfigData same = {one, 1}, other = {two, 1};
+    const ManifestPtr manifests[] = {
+        ManifestPtr(allocSysConfig3Manifest(0x30003, &same, &same, &same)),
+        ManifestPtr(allocSysConfig3Manifest(0x30001, &same, &same, &same)),
+        ManifestPtr(allocSysConfig3Manifest(0x30003, &other, &same, &same)),
+        ManifestPtr(allocSysConfig3Manifest(0x30003, &same, &other, &same)),
+        ManifestPtr(allocSysConfig3Manifest(0x30003, &same, &same, &other)),
+    };
+    expectDistinct(manifests, sysConfig3ManifestsAreEqual, copySysConfig3Manifest);
 }
 
 TEST(Object, withAnUnsupportedMagicIsNotReleased) {
