@@ -81,6 +81,10 @@ class Help(unittest.TestCase):
                 words = [word.split("\t")[0] for word in run("--complete", *line.split(" ")).splitlines()]
                 self.assertEqual(words, offered)
 
+    def test_an_unknown_verb_is_named(self):
+        done = subprocess.run([ORLOCTL, "shw"], stderr=subprocess.PIPE, text=True)
+        self.assertEqual(done.stderr, 'orloctl: There is no verb "shw" (orloctl --help says more)\n')
+
 
 if __name__ == "__main__":
     unittest.main()
