@@ -252,7 +252,7 @@ std::string askSections(const Img4Record* record) {
         .ask<bool>(Img4DecodeSectionExists, record, Img4SectionManifest)
         .ask<bool>(Img4DecodeRestoreInfoExists, record)
         .ask<bool>(Img4DecodeSectionExists, record, Img4SectionRestoreInfo)
-        .ask<bool>(Img4DecodeSectionExists, record, 2)
+        .ask<bool>(Img4DecodeSectionExists, record, 2U)
         .text();
 }
 
