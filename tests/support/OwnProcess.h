@@ -22,10 +22,7 @@ void inOwnProcess(Body body) {
     EXPECT_EXIT(run(), testing::ExitedWithCode(0), "");
 }
 
-// The sanitizers need more address space than any limit leaves them, and end the process where an allocation fails.
-#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
-#define VELTRA_MEMORY_CAN_BE_LIMITED
-
+#ifdef VELTRA_MEMORY_CAN_BE_LIMITED
 // Lets the process, one of inOwnProcess, have `bytes` of memory more than it has now.
 inline void limitMemory(std::size_t bytes) {
     std::size_t pages = 0;
