@@ -26,67 +26,49 @@ private:
     const std::uint8_t* end_;
 };
 
-constexpr const char* types[] = {"s", "b",  "y",  "n",  "q",     "i",     "u",    "x", "t",  "d",  "o",
-                                 "g", "ay", "as", "av", "a{sv}", "a{ss}", "(sv)", "v", "ai", "aay"};
+constexpr const char* types[] = {"s",     "b",    "y", "n",  "q",   "i",      "u",   "x",
+                                 "t",     "d",    "o", "g",  "ay",  "as",     "av",  "a{sv}",
+                                 "a{ss}", "(sv)", "v", "ai", "aay", "a{sas}", "aab", "a{us}"};
 
-void writeEntries(sd_bus_message* message, Input& input, int depth);
-
-void writeVariant(sd_bus_message* message, Input& input, int depth);
-
-// Writes one complete value of the first type in `type`.
+// Writes one complete value of the type `type`.
 void writeValue(sd_bus_message* message, const std::string& type, Input& input, int depth) {
-    using Bus = LooseBus;
-    const std::uint64_t word = input.word();
-    const char* text = word % 3 == 0   ? ""
-                       : word % 3 == 1 ? "k"
-                                       : "Gr\xC3\xBC\xC3\x9F"
-                                         "e";
-    if (type == "s") {
-        Bus::require(sd_bus_message_append_basic(message, 's', text));
-    } else if (type == "o") {
-        Bus::require(sd_bus_message_append_basic(message, 'o', "/a"));
-    } else if (type == "g") {
-        Bus::require(sd_bus_message_append_basic(message, 'g', "a{sv}"));
-    } else if (type == "b") {
-        const int truth = word & 1;
-        Bus::require(sd_bus_message_append_basic(message, 'b', &truth));
-    } else if (type == "v") {
-        writeVariant(message, input, depth + 1);
-    } else if (type == "a{sv}") {
-        writeEntries(message, input, depth + 1);
-    } else if (type[0] == 'a') {
-        Bus::require(sd_bus_message_open_container(message, 'a', type.c_str() + 1));
-        for (int i = input.byte() % 4; i > 0; --i) {
-            if (type == "a{ss}")
-                Bus::require(sd_bus_message_append(message, "{ss}", i % 2 ? "a" : text, "b"));
-            else
-                writeValue(message, type.substr(1), input, depth + 1);
-        }
-        Bus::require(sd_bus_message_close_container(message));
-    } else if (type[0] == '(') {
-        Bus::require(sd_bus_message_append(message, "(sv)", text, "s", text));
-    } else {
-        Bus::require(sd_bus_message_append_basic(message, type[0], &word));
+    const auto isDone = [](int result) { LooseBus::require(result); };
+    const std::string inner = type.substr(1, type.size() - 2); // of an entry or a structure
+    const char* texts[] = {"", "k", "Gr\xC3\xBC\xC3\x9F"};
+    switch (type[0]) {
+    case 's':
+        return isDone(sd_bus_message_append_basic(message, 's', texts[input.word() % 3]));
+    case 'o':
+        return isDone(sd_bus_message_append_basic(message, 'o', "/a"));
+    case 'g':
+        return isDone(sd_bus_message_append_basic(message, 'g', "a{sv}"));
+    case 'b': {
+        const int truth = input.word() & 1;
+        return isDone(sd_bus_message_append_basic(message, 'b', &truth));
     }
-}
-
-void writeVariant(sd_bus_message* message, Input& input, int depth) {
-    const std::size_t count = sizeof types / sizeof types[0];
-    const std::string type = depth > 36 ? "b" : types[input.byte() % count];
-    LooseBus::require(sd_bus_message_open_container(message, 'v', type.c_str()));
-    writeValue(message, type, input, depth);
-    LooseBus::require(sd_bus_message_close_container(message));
-}
-
-void writeEntries(sd_bus_message* message, Input& input, int depth) {
-    LooseBus::require(sd_bus_message_open_container(message, 'a', "{sv}"));
-    for (int i = input.byte() % 4; i > 0 && !input.empty(); --i) {
-        LooseBus::require(sd_bus_message_open_container(message, 'e', "sv"));
-        LooseBus::require(sd_bus_message_append_basic(message, 's', std::to_string(input.byte() % 8).c_str()));
-        writeVariant(message, input, depth);
-        LooseBus::require(sd_bus_message_close_container(message));
+    case 'v': {
+        const std::string content = depth > 36 ? "b" : types[input.byte() % (sizeof types / sizeof types[0])];
+        isDone(sd_bus_message_open_container(message, 'v', content.c_str()));
+        writeValue(message, content, input, depth + 1);
+        break;
     }
-    LooseBus::require(sd_bus_message_close_container(message));
+    case 'a':
+        isDone(sd_bus_message_open_container(message, 'a', type.c_str() + 1));
+        for (int i = input.byte() % 4; i > 0 && !input.empty(); --i)
+            writeValue(message, type.substr(1), input, depth + 1);
+        break;
+    case '(':
+    case '{':
+        isDone(sd_bus_message_open_container(message, type[0] == '{' ? 'e' : 'r', inner.c_str()));
+        writeValue(message, inner.substr(0, 1), input, depth);
+        writeValue(message, inner.substr(1), input, depth);
+        break;
+    default: {
+        const std::uint64_t word = input.word();
+        return isDone(sd_bus_message_append_basic(message, type[0], &word));
+    }
+    }
+    isDone(sd_bus_message_close_container(message));
 }
 
 } // namespace
@@ -95,7 +77,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     static LooseBus looseBus;
     Input input(data, size);
     const LooseBus::Message message = looseBus.message();
-    writeEntries(message.get(), input, 0);
+    writeValue(message.get(), "a{sv}", input, 0);
     LooseBus::finish(message);
 
     Value::Dictionary read;

@@ -53,6 +53,11 @@ TEST(BusValue, everyTypeThatAHostMaySendBecomesItsValue) {
         {"texts", entry("as", 2, "a", "b"), Value::Array{"a", "b"}},
         {"array", entry("av", 2, "s", "a", "b", 0), Value::Array{"a", false}},
         {"dictionary of texts", entry("a{ss}", 1, "a", "b"), Dictionary{{"a", "b"}}},
+        {"integers", entry("an", 2, -1, 1), Value::Array{-1, 1}},
+        {"dictionary of arrays of texts", entry("a{sas}", 2, "a", 1, "b", "c", 0),
+         Dictionary{{"a", Value::Array{"b"}}, {"c", Value::Array{}}}},
+        {"array of dictionaries", entry("aa{sv}", 1, 1, "a", "b", 1), Value::Array{Dictionary{{"a", true}}}},
+        {"arrays of data", entry("aaay", 1, 2, 0, 1, 255), Value::Array{Value::Array{Value::Data{}, Value::Data{255}}}},
         {"dictionary", entry("a{sv}", 1, "a", "av", 0), Dictionary{{"a", Value::Array{}}}},
     };
     LooseBus bus;
@@ -85,7 +90,8 @@ TEST(BusValue, whatNoValueHoldsIsRefusedWithItsKey) {
         {"double", entry("d", 1.5), "\"k\" has the D-Bus type \"d\""},
         {"file descriptor", entry("h", 0), "\"k\" has the D-Bus type \"h\""},
         {"structure", entry("(ss)", "a", "b"), "\"k\" has the D-Bus type \"(ss)\""},
-        {"array of integers", entry("ai", 1, 1), "\"k\" has the D-Bus type \"ai\""},
+        {"no doubles in an array", entry("ad", 0), "\"k\" has the D-Bus type \"ad\""},
+        {"doubles far inside", entry("a{saad}", 0), "\"k\" has the D-Bus type \"a{saad}\""},
         {"variant in a variant", entry("v", "s", "a"), "\"k\" has the D-Bus type \"v\""},
         {"other keys", entry("a{us}", 1, 1, "a"), "\"k\" has the D-Bus type \"a{us}\""},
         {"unsigned beyond 63 bits", entry("t", ~std::uint64_t{0}), "\"k\" does not fit a signed 64-bit integer"},

@@ -28,30 +28,42 @@ std::string reasonOf(int result) {
 
 namespace {
 
+// Whether a value can be of the D-Bus type `type`, one complete type.
+bool isValueType(std::string_view type, bool isInContainer = false) {
+    if (type == "v")
+        return isInContainer;
+    if (type.starts_with("a{s"))
+        return isValueType(type.substr(3, type.size() - 4), true);
+    if (type.starts_with("a"))
+        return isValueType(type.substr(1), true);
+    return type.size() == 1 && std::string_view("sogbynqiuxt").find(type[0]) != std::string_view::npos;
+}
+
 // Reads the values of one message, and keeps the names of the keys that lead to the one in hand for a refusal.
 class Reader {
 public:
     explicit Reader(sd_bus_message* message) : message_(message) {}
 
-    // The dictionary that stands next, with variants ("{sv}") or with texts ("{ss}") as its values.
-    Value::Dictionary dictionary(const char* contents) {
+    // The dictionary that stands next, whose entries are of the type `entry`: "s" and that of the values.
+    Value::Dictionary dictionary(const std::string& entry) {
         const Level level(*this);
-        const std::string entry(contents + 1, 2);
         Value::Dictionary result;
-        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_ARRAY, contents));
+        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_ARRAY, ("{" + entry + "}").c_str()));
         while (check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_DICT_ENTRY, entry.c_str())) > 0) {
             std::string key = string(SD_BUS_TYPE_STRING);
             path_.push_back(key);
             if (result.contains(key))
                 refuse("is given twice");
-            Value value = entry == "sv" ? variant() : text(SD_BUS_TYPE_STRING);
-            result.emplace(std::move(key), std::move(value));
+            result.emplace(std::move(key), value(entry.substr(1)));
             path_.pop_back();
             check(sd_bus_message_exit_container(message_));
         }
         check(sd_bus_message_exit_container(message_));
         return result;
     }
+
+    // About how many octets of the message have been read.
+    std::size_t octets() const { return octets_ + values_ * octetsAroundValue; }
 
 private:
     // One more array or dictionary around the value in hand.
@@ -81,62 +93,53 @@ private:
             refuse("brings the message to more than " + std::to_string(maximumValues) + " values");
     }
 
-    Value variant() {
-        char type = 0;
-        const char* contents = nullptr;
-        check(sd_bus_message_peek_type(message_, &type, &contents));
-        const std::string signature = contents ? contents : "";
-        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_VARIANT, signature.c_str()));
-        Value value = content(signature);
-        check(sd_bus_message_exit_container(message_));
-        return value;
-    }
-
-    Value content(const std::string& signature) {
-        if (signature.size() == 1)
-            return basic(signature[0]);
-        if (signature == "ay")
+    // The value of a type that isValueType lets through.
+    Value value(const std::string& type) {
+        if (type == "v")
+            return variant();
+        count();
+        if (type == "ay")
             return bytes();
-        if (signature == "av" || signature == "as")
-            return array(signature[1]);
-        if (signature == "a{sv}" || signature == "a{ss}") {
-            count();
-            return dictionary(signature.c_str() + 1);
-        }
-        refuseType(signature);
+        if (type.starts_with("a{"))
+            return dictionary(type.substr(2, type.size() - 3));
+        if (type.starts_with("a"))
+            return array(type.substr(1));
+        return basic(type[0]);
     }
 
-    [[noreturn]] void refuseType(const std::string& signature) const {
-        refuse("has the D-Bus type \"" + signature + "\", which a request cannot carry");
+    Value variant() {
+        const char* contents = nullptr;
+        check(sd_bus_message_peek_type(message_, nullptr, &contents));
+        const std::string type = contents ? contents : "";
+        if (!isValueType(type))
+            refuse("has the D-Bus type \"" + type + "\", which a request cannot carry");
+        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_VARIANT, type.c_str()));
+        Value content = value(type);
+        check(sd_bus_message_exit_container(message_));
+        return content;
     }
 
     Value bytes() {
-        count();
         const void* data = nullptr;
         std::size_t length = 0;
         check(sd_bus_message_read_array(message_, SD_BUS_TYPE_BYTE, &data, &length));
+        octets_ += length;
         const auto* first = static_cast<const std::uint8_t*>(data);
         return Value::Data(first, first + length);
     }
 
-    Value array(char element) {
+    Value array(const std::string& element) {
         const Level level(*this);
-        count();
-        const char contents[] = {element, 0};
         Value::Array result;
-        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_ARRAY, contents));
+        check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_ARRAY, element.c_str()));
         while (check(sd_bus_message_at_end(message_, 0)) == 0)
-            result.push_back(element == SD_BUS_TYPE_VARIANT ? variant() : text(element));
+            result.push_back(value(element));
         check(sd_bus_message_exit_container(message_));
         return result;
     }
 
     Value basic(char type) {
         switch (type) {
-        case SD_BUS_TYPE_STRING:
-        case SD_BUS_TYPE_OBJECT_PATH:
-        case SD_BUS_TYPE_SIGNATURE:
-            return text(type);
         case SD_BUS_TYPE_BOOLEAN:
             return number<int>(type) != 0;
         case SD_BUS_TYPE_BYTE:
@@ -158,33 +161,33 @@ private:
             return value;
         }
         default:
-            refuseType(std::string(1, type));
+            return string(type);
         }
     }
 
     template <class Number>
     Number number(char type) {
-        count();
         Number value = 0;
         check(sd_bus_message_read_basic(message_, type, &value));
         return value;
     }
 
-    Value text(char type) {
-        count();
-        return string(type);
-    }
-
     std::string string(char type) {
         const char* characters = nullptr;
         check(sd_bus_message_read_basic(message_, type, &characters));
-        return characters;
+        std::string text = characters;
+        octets_ += text.size();
+        return text;
     }
+
+    // The most that lengths, types and alignment take beside a value and its key.
+    static constexpr std::size_t octetsAroundValue = 32;
 
     sd_bus_message* message_;
     std::vector<std::string> path_;
     int nesting_ = 0;
     std::size_t values_ = 0;
+    std::size_t octets_ = 0; // of texts and data
 };
 
 const char* signatureOf(const Value& value) {
@@ -305,8 +308,12 @@ private:
 
 } // namespace
 
-Value::Dictionary readDictionary(sd_bus_message* message) {
-    return Reader(message).dictionary("{sv}");
+Value::Dictionary readDictionary(sd_bus_message* message, std::size_t* octets) {
+    Reader reader(message);
+    Value::Dictionary result = reader.dictionary("sv");
+    if (octets)
+        *octets = reader.octets();
+    return result;
 }
 
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary) {

@@ -2,8 +2,8 @@
 //
 //   text  s        data  ay       integer  x       boolean  b       array  av       dictionary  a{sv}
 //
-// On the way in every integer type that fits 64 signed bits is an integer, `o` and `g` are texts, `as` is an array and
-// `a{ss}` a dictionary. Nothing else is a Value.
+// On the way in every integer type that fits 64 signed bits is an integer, `o` and `g` are texts, and arrays and
+// dictionaries with text keys may be of any one of these types, as `as` and `a{sas}` are. Nothing else is a Value.
 #ifndef VELTRA_PLATFORM_LINUX_BUS_VALUE_H
 #define VELTRA_PLATFORM_LINUX_BUS_VALUE_H
 
@@ -40,8 +40,9 @@ int check(int result);
 // The words for such a result.
 std::string reasonOf(int result);
 
-// Reads the a{sv} that stands next in `message`. Raises Refusal, and as check.
-Value::Dictionary readDictionary(sd_bus_message* message);
+// Reads the a{sv} that stands next in `message`. Raises Refusal, and as check. *octets is about what it takes in the
+// message, never less than its texts and data.
+Value::Dictionary readDictionary(sd_bus_message* message, std::size_t* octets = nullptr);
 
 // Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
 // entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and as check, which is for
