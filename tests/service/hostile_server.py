@@ -36,7 +36,7 @@ class Handler(http.server.BaseHTTPRequestHandler):
 
     def answer(self, status, body=b"", **headers):
         self.send_response(status)
-        for name, value in {"Content-Length": len(body), **headers}.items():
+        for name, value in {"Content_Length": len(body), **headers}.items():
             self.send_header(name.replace("_", "-"), str(value))
         self.end_headers()
         if self.command != "HEAD":
@@ -127,6 +127,13 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.wfile.write(b"half")
         self.close_notify()
 
+    def chunked(self, count):
+        self.body()
+        self.send_response(200)
+        self.send_header("Transfer-Encoding", "chunked")
+        self.end_headers()
+        self.wfile.write(b"2\r\na\0\r\n1\r\nb\r\n0\r\n\r\n")
+
     def encoded(self, count):
         self.body()
         self.answer(200, b"\x1f\x8b", Content_Encoding="gzip")
@@ -146,27 +153,15 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.plain(count)
         self.drop()
 
-    def pass_on(self, body, port):
-        onward = http.client.HTTPConnection("127.0.0.1", int(port))
-        onward.request(self.command, self.path, body, dict(self.headers.items()))
-        answer = onward.getresponse()
-        contents = answer.read()
-        onward.close()
-        return answer.status, contents
-
     def relay(self, count, port, changed_bit):
         """Passes the request on to another server, with one bit of the body changed or none."""
         body = bytearray(self.body())
         body[0] ^= int(changed_bit)
-        self.answer(*self.pass_on(bytes(body), port))
-
-    def lost(self, count, port, *_):
-        """Passes the request on too, but the first answer never arrives."""
-        answer = self.pass_on(self.body(), port)
-        if count == 1:
-            self.drop()
-        else:
-            self.answer(*answer)
+        onward = http.client.HTTPConnection("127.0.0.1", int(port))
+        onward.request(self.command, self.path, bytes(body), dict(self.headers.items()))
+        answer = onward.getresponse()
+        self.answer(answer.status, answer.read())
+        onward.close()
 
     def keep(self, count, how="", *_):
         """An object store that knows conditions, with a weakness or a bad moment."""
@@ -240,51 +235,3 @@ class HostileServer(http.server.ThreadingHTTPServer):
         self.closing.set()
         self.shutdown()
         self.server_close()
-
-
-class Cutter:
-    """Passes connections on to a port of this computer, and cuts the first `cuts` of them off after so many bytes."""
-
-    def __init__(self, port, after):
-        self.target, self.after, self.cuts = port, after, 0
-        self.listener = socket.create_server(("127.0.0.1", 0))
-        self.port = self.listener.getsockname()[1]
-        threading.Thread(target=self.serve, daemon=True).start()
-
-    def serve(self):
-        try:
-            while True:
-                client, _ = self.listener.accept()
-                server = socket.create_connection(("127.0.0.1", self.target))
-                limit = self.after if self.cuts > 0 else None
-                threading.Thread(target=self.join, args=(client, server, limit), daemon=True).start()
-        except OSError:
-            pass  # closed
-
-    def join(self, client, server, limit):
-        with client, server:
-            answers = threading.Thread(target=self.copy, args=(server, client, None))
-            answers.start()
-            self.copy(client, server, limit)
-            answers.join()
-
-    def copy(self, source, sink, limit):
-        passed = 0
-        try:
-            while bytes_ := source.recv(65536):
-                passed += len(bytes_)
-                if limit is not None and passed > limit:
-                    self.cuts -= 1
-                    break
-                sink.sendall(bytes_)
-        except OSError:
-            pass
-        for end in (source, sink):
-            try:
-                end.shutdown(socket.SHUT_RDWR)
-            except OSError:
-                pass
-
-    def close(self):
-        self.listener.shutdown(socket.SHUT_RDWR)
-        self.listener.close()

@@ -9,8 +9,8 @@ import unittest
 import urllib.parse
 
 from forward_proxy import ForwardProxy
-from harness import BIN, HONEST_MEMORY, SUCCESS, Case, Service, ServiceTest, at_once, kilobytes
-from hostile_server import Cutter, HostileServer
+from harness import BIN, HONEST_MEMORY, SUCCESS, Case, ServiceTest, kilobytes
+from hostile_server import HostileServer
 from lab import CA_HOST, HOST, TRUST_OBJECT, Authority, NginxStore, SwiftStore
 
 CLASSES = (
@@ -91,10 +91,9 @@ class SessionTest(Case):
 class RemoteTest(ServiceTest, SessionTest):
     """Those whose store the service uses too."""
 
-    def describe(self, service=None, vanter="VAN0001", **changes):
-        service = service or self.service
-        store = self.store.describe(service.root, **changes)
-        service.describe(answers={"VanterSerialNumber": vanter}, reverseProxy=None, store=store)
+    def describe(self, vanter="VAN0001", **changes):
+        store = self.store.describe(self.root, **changes)
+        self.service.describe(answers={"VanterSerialNumber": vanter}, reverseProxy=None, store=store)
 
     def error_of_get(self):
         """Code and text of the library's error."""
@@ -148,26 +147,13 @@ class StoreCases:
         self.assertEqual(self.store.stored(), {f"v1/records/psd2/{name}": name.encode() for name in names})
         connections = {line[4] for line in self.store.requests()[before:] if "/records/" in line[1]}
         self.assertEqual(len(connections), 1, "a session makes one connection")
-
-    def test_two_services(self):
-        other = self.closing(Service())
-        self.describe(other)
-        records = [bytes([number]) * (200_000 + number) for number in range(12)]
-        outcomes = []
-
-        def put(service, mine):
-            for record in mine:
-                outcomes.append(service.put(record))
-
-        def get():
-            for _ in range(12):
-                if self.service.get() == SUCCESS:
-                    self.assertIn(self.service.read("tmp/out"), records)
-
-        at_once(lambda: put(self.service, records[::2]), lambda: put(other, records[1::2]), get)
-        self.assertEqual(outcomes, [SUCCESS] * 12)
-        (_, record), = self.store.stored().items()
-        self.assertIn(record, records[-2:])
+        process = pathlib.Path(f"/proc/{session.process.pid}")
+        inodes = (process / "net/tcp").read_text().split()
+        sockets = [link.name for link in (process / "fd").iterdir() if link.readlink().name[len("socket:["):-1] in inodes]
+        self.assertEqual(len(sockets), 2)
+        for number in sockets:
+            flags = (process / "fdinfo" / number).read_text().split("flags:")[1].split()[0]
+            self.assertTrue(int(flags, 8) & os.O_CLOEXEC, "a program that is started inherits the connection")
 
 
 NAMES = ["S1", "a b", "100%", "a+b=c", "~-._", "...", "a%2Fb", "a:b", "?x=1&y", "#f", "é-日本", "a\\..\\b", "'\"<>"]
@@ -205,18 +191,6 @@ class PlainStore(RemoteTest, StoreCases):
         error = self.service.get()[2]
         self.assertEqual((error["code"], error["description"].startswith(reason)), (1008, True), error)
         self.assertEqual(self.store.stored(), {"v2/records/psd2/VAN0001": b"record"})
-
-    def test_a_put_repeated_after_a_broken_connection_leaves_one_whole_record(self):
-        cutter = self.closing(Cutter(self.store.store_port, after=300_000))
-        record = os.urandom(2 << 20)
-        for attempts, outcome in ((1, TRANSPORT), (2, 0)):
-            cutter.cuts = 1
-            session = self.session(HTTPMaxAttempts=attempts)
-            session.describe(self.store.describe(session.root, **routes(cutter.port, self.store.store_port)))
-            session.open(HTTPMaxAttempts=attempts)
-            self.assertEqual(session.put("S1", record)[0], outcome)
-            self.assertEqual(cutter.cuts, 0)
-            self.assertEqual(self.store.stored(), {"v1/records/psd2/S1": record} if outcome == 0 else {})
 
     def test_the_session_says_which_requests_pass_through_the_devices_proxy(self):
         proxy = self.closing(ForwardProxy(self.store.folder))
@@ -261,19 +235,6 @@ class ObjectStore(RemoteTest, StoreCases):
             with self.subTest((data_class, instance)):
                 session.run("grant", data_class, instance)
                 self.assertEqual(session.run("get", data_class, instance, "/got")[0], STORAGE)
-
-    def test_a_put_whose_answer_was_lost_leaves_one_whole_record(self):
-        relay = self.closing(HostileServer(*self.store.authority.certify("relay"), TRUST_OBJECT))
-        session = self.session()
-        session.describe(self.store.describe(session.root, **routes(relay.server_port, self.store.store_port)))
-        record, stored = os.urandom(1 << 20), {}
-        for attempts, outcome in ((1, TRANSPORT), (2, 0)):
-            name = f"lost-{self.store.values['PROXY']}-{attempts}"
-            session.open(HTTPMaxAttempts=attempts)
-            self.assertEqual(session.put(name, record)[0], outcome)
-            self.assertEqual(len([path for _, path in relay.seen if path.endswith(name)]), attempts)
-            stored[f"v1/records/psd2/{name}"] = record
-            self.assertEqual(self.store.stored(), stored)
 
     def assert_refused(self, code, reason):
         """Neither a get, a put nor an export is done."""
@@ -384,7 +345,8 @@ class Failures(HostileTest):
                 self.assertTrue(text.startswith(f"{verb.upper()} {DATA_STORE}/v1/records/psd2/{name}: "), text)
                 self.assertRegex(text, reason)
         self.assertEqual({path for _, path in self.server.seen if path.endswith("plain")}, set(), "was redirected")
-        self.assertEqual((hasty.get("plain"), patient.get("plain")), ((0, ""), (0, "")))
+        self.assertEqual([session.get(name) for session in (hasty, patient) for name in ("plain", "chunked")],
+                         [(0, "")] * 4)
         self.assertLess(kilobytes("VmHWM", patient.process.pid), 200 << 10)
 
     def test_only_what_may_pass_is_tried_again_and_only_so_often(self):
@@ -422,6 +384,23 @@ class Failures(HostileTest):
             self.assertEqual(session.run("export", ["psd2"], ["S1"])[0], code)
             seen = self.server.seen[before:]
             self.assertEqual((len(seen), len(set(seen))), (3, 1), "each attempt is for the same export")
+
+    def test_a_pairing_ticket_arrives_byte_for_byte_or_not_at_all(self):
+        server = self.closing(HostileServer(None, None, b""))
+        session = self.session()
+        for behaviour, ticket, code in (
+            ("plain", os.urandom(5000), 0), ("plain", b"\0a\r\n\0", 0), ("plain", b"", 0), ("chunked", b"a\0b", 0),
+            ("status-204", b"", 0), ("status-404", None, 404), ("half", None, 18),
+        ):
+            with self.subTest((behaviour, ticket)):
+                server.trust_object = ticket or b""
+                server.posts.clear()
+                url = f"http://127.0.0.1:{server.server_port}/{behaviour}"
+                self.assertEqual(session.run("pair", url, "/ticket")[0], code)
+                told = [] if ticket is None else [(f"/{behaviour}/pair/result", b"0", False)]
+                self.assertEqual(server.posts, [(f"/{behaviour}/pair", b"", False), *told])
+                if ticket is not None:
+                    self.assertEqual((session.root / "ticket").read_bytes(), ticket)
 
     def test_a_connection_that_the_server_ended_is_made_again(self):
         session = self.session()

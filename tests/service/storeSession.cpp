@@ -3,6 +3,7 @@
 // environment's.
 //   ["open", OPTIONS]  ["trust", URL]  ["grant", CLASS, INSTANCE]  ["put", CLASS, INSTANCE, PATH]
 //   ["get", CLASS, INSTANCE, PATH]  ["export", [CLASS...], [INSTANCE...]]
+// and, to the pairing library, ["pair", URL, PATH], which puts the ticket into the file.
 #include <iostream>
 #include <optional>
 #include <string>
@@ -10,6 +11,7 @@
 #include "platform/Files.h"
 #include "platform/Json.h"
 #include "platform/OrloDataStore.h"
+#include "platform/Pairing.h"
 #include "platform/linux/services/device/DeviceDescription.h"
 
 namespace {
@@ -39,6 +41,8 @@ public:
             done = get(word(1), word(2), word(3).description(), &error);
         else if (verb == "export")
             done = exportAll(*word(1).array(), *word(2).array(), &error);
+        else if (verb == "pair")
+            done = pair(word(1).description(), word(2).description(), &error);
         else
             return Error{"", -1, "no such command"};
         return done || error ? error : Error{"", -1, "failed without an error"};
@@ -72,6 +76,12 @@ private:
     bool get(const Value& dataClass, const Value& instance, const std::string& path, std::optional<Error>* error) {
         const std::optional<Value::Data> record = QDOrloDataCopy(session_, dataClass, instance, error);
         return record && files::replace(path, *record);
+    }
+
+    static bool pair(const std::string& url, const std::string& path, std::optional<Error>* error) {
+        return BWCPairCorvoWithProxy(url, {}, error, [&](const std::uint8_t* ticket, std::size_t length) {
+            return files::replace(path, {ticket, length}) ? 0 : 1;
+        });
     }
 
     bool exportAll(const Value::Array& classes, const Value::Array& instances, std::optional<Error>* error) {
