@@ -1,4 +1,4 @@
-// The tables, on a certificate that another implementation made.
+// The tables, on a whole certificate.
 #include <gtest/gtest.h>
 
 #include "der/DERDecode.h"

@@ -76,7 +76,7 @@ std::vector<LeafCase> leafCases(const Img4TrustProfileEntry& entry) {
     const auto signature = &Certificate::signatureAlgorithm;
     const auto key = &Certificate::publicKeyInfo;
     const auto constraints = [](const Bytes& value) {
-        return signedmanifest::extension(oidTevariImg4ManifestCertSpec, value);
+        return signedmanifest::extension(oid(oidTevariImg4ManifestCertSpec), value);
     };
     const Bytes none = constraints(set({}));
     const Certificate sound = signer.leaf();
@@ -149,7 +149,8 @@ TEST(Img4Chain, leavesAreJudgedByTheirFields) {
             SCOPED_TRACE(std::string(entry->name) + ", " + row.name);
             Certificate leaf = signer.leaf();
             leaf.*row.field = row.value;
-            leaf.digestLength = row.digestLength;
+            if (row.digestLength != 0)
+                leaf.digestLength = row.digestLength;
             const Bytes chain = join(signer.chainWith(signer.issue(leaf)));
             const Verdict verdict = verify(*entry, chain);
             const bool isSound = row.fault == Img4ChainSound;
@@ -215,7 +216,7 @@ std::vector<ChainCase> chainCases(const Signer& s) {
         {"leaf cut short", Img4ChainEncoding, 1, Bytes(chain.begin(), chain.end() - 1)},
         {"fourth element", Img4ChainEncoding, 1, with(sequence({Bytes(leaf.begin() + 4, leaf.end()), null}))},
         {"leaf that is no certificate", Img4ChainEncoding, 1, with(sequence({integer(1), null}))},
-        {"leaf signed with its own key", Img4ChainSignature, 1, with(s.issue(s.leaf(), s.leafKey()))},
+        {"leaf signed with its own key", Img4ChainSignature, 1, with(issue(s.leaf(), s.leafKey()))},
         {"octet of the to-be-signed part changed", Img4ChainSignature, 1, with(renamed)},
         {"octet of the signature changed", Img4ChainSignature, 1, with(lastChanged(leaf))},
         {"unused bits in the signature", Img4ChainSignature, 1, with(unusedBitsIn(s))},
@@ -280,7 +281,7 @@ TEST(Img4Chain, middleCertificateOfTheRSAChainBelongsToTheAuthority) {
             middle.publicKeyInfo = lastChanged(publicKeyInfo(signer.issuerKey()), row.keyChange);
             Certificate leaf = signer.leaf();
             leaf.issuer = row.subject;
-            const Bytes issued = signer.issue(middle, row.signedByRoot ? signer.rootKey() : signer.issuerKey());
+            const Bytes issued = issue(middle, row.signedByRoot ? signer.rootKey() : signer.issuerKey());
             const Verdict verdict = verify(*entry, join({issued, signer.issue(leaf)}));
             const Img4ChainFault fault = isEC(*entry) ? row.ofEC : row.ofRSA;
             EXPECT_EQ(verdict.refusal.fault, fault);

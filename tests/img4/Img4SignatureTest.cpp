@@ -158,7 +158,7 @@ const Bytes longExponent = {0x01, 0, 0, 0, 0, 0, 0, 0, 0x0D};
 
 TEST(Img4RSASignature, isOverTheExactBlock) {
     // OpenSSL itself does not verify with exponents of more than 64 bits under moduli of more than 3072.
-    for (const Key& key : {rsaKey(), makeMultiPrimeRSAKey(3080, longExponent)})
+    for (const Key& key : {rsaKey(), makeRSAKey(3080, longExponent)})
         for (const Img4DigestInfo* info : digestInfos)
             checkBlocks(key, *info);
 }
@@ -221,7 +221,7 @@ TEST(Img4RSASignature, needsAModulusWithinTheVerifiersLimits) {
          {Row{1016, false, false}, Row{1024, true, true}, Row{3072, true, true}, Row{3073, true, false},
           Row{4096, true, false}, Row{4097, false, false}, Row{2048, true, true, {0x03}},
           Row{3072, true, true, longExponent}, Row{4096, true, false, {0x03}}, Row{4096, true, false, longExponent}}) {
-        const Key key = row.bits > 1024 ? makeMultiPrimeRSAKey(row.bits, row.exponent) : makeRSAKey(row.bits);
+        const Key key = makeRSAKey(row.bits, row.exponent);
         const Bytes bits = publicKeyBits(key);
         const Bytes signature = sign(key, digest.size(), message);
         EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature, digest), row.accepted) << row.bits;

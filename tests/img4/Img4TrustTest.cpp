@@ -481,7 +481,7 @@ TEST(Img4Trust, isNotInForgeries) {
 TEST(Img4TrustBySHA1, isThatOfTheSmallestProfileWithKeysOfAnySize) {
     const Signer& signer = signerOf(entryOf(kImg4DecodeSecureBootRsa1kSha1));
     const Signer& other = signerOf(entryOf(kImg4DecodeSecureBootRsa4kSha384));
-    const Key key = makeMultiPrimeRSAKey(4096);
+    const Key key = makeRSAKey(4096);
     Certificate leaf = signer.leaf();
     leaf.publicKeyInfo = publicKeyInfo(key);
     const List chain = signer.chainWith(signer.issue(leaf));

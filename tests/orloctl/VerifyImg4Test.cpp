@@ -145,7 +145,7 @@ Bytes withoutAuthority() {
     middle.subject = distinguishedName("Somebody");
     Certificate leaf = signer.leaf({});
     leaf.issuer = middle.subject;
-    return withChain(rsa1k, {signer.issue(middle, signer.rootKey()), signer.issue(leaf)});
+    return withChain(rsa1k, {issue(middle, signer.rootKey()), signer.issue(leaf)});
 }
 
 Bytes withSignature(const char* profile, const Bytes& signature) {
