@@ -17,8 +17,10 @@
 
 namespace fuzz {
 
-// Set by a target whose reader takes the input, for Replay.cpp.
+// For Replay.cpp, set by a target whose reader takes the input, and a digest of what it says of it, by one that has
+// that: 0 for nothing.
 inline bool taken = false;
+inline std::uint64_t answer = 0;
 
 } // namespace fuzz
 

@@ -1,6 +1,7 @@
 // The main program of a target where there is no fuzzer: `fuzz-<target> FOLDER` runs the target on every seed in the
 // folder, on every prefix of it, and on all that one flipped bit makes of it. Of these it must take as many as the
-// suffix of the seed's file says, unless that is "-". Seeds with the suffix "x" are left out.
+// suffix of the seed's file says, unless that is "-", and none may have the seed's answer. Seeds with the suffix "x"
+// are left out.
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -20,10 +21,13 @@ bool isTaken(const std::vector<std::uint8_t>& octets) {
 
 int takenFlips(std::vector<std::uint8_t> seed) {
     int count = 0;
+    isTaken(seed);
+    const std::uint64_t sound = fuzz::answer;
     for (std::uint8_t& octet : seed) {
         for (int bit = 0; bit < 8; ++bit) {
             octet = static_cast<std::uint8_t>(octet ^ 1 << bit);
             count += isTaken(seed) ? 1 : 0;
+            FUZZ_REQUIRE(sound == 0 || fuzz::answer != sound);
             octet = static_cast<std::uint8_t>(octet ^ 1 << bit);
         }
     }

@@ -4,13 +4,11 @@
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "fuzz/Fuzz.h"
+#include "fuzz/Views.h"
 
 namespace {
 
-bool isInside(const DERItem& item, const DERItem& outer) {
-    return item.data >= outer.data && item.data <= outer.data + outer.length &&
-           item.length <= static_cast<std::uint64_t>(outer.data + outer.length - item.data);
-}
+using fuzz::isInside;
 
 bool isSame(const DERDecodedInfo& a, const DERDecodedInfo& b) {
     return a.tag == b.tag && a.content.data == b.content.data && a.content.length == b.content.length;

@@ -9,8 +9,11 @@
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "fuzz/Fuzz.h"
+#include "fuzz/Views.h"
 
 namespace {
+
+using fuzz::isInside;
 
 constexpr std::uint8_t mostRows = 8;
 
@@ -52,11 +55,6 @@ bool readCase(const std::uint8_t* data, std::size_t size, Case* out) {
     }
     out->content = {next, static_cast<std::uint64_t>(end - next)};
     return true;
-}
-
-bool isInside(const DERItem& item, const DERItem& outer) {
-    return item.data >= outer.data && item.data <= outer.data + outer.length &&
-           item.length <= static_cast<std::uint64_t>(outer.data + outer.length - item.data);
 }
 
 void checkStored(const Case& input, const std::vector<DERItem>& record) {

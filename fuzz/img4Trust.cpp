@@ -4,19 +4,14 @@
 #include <cstring>
 
 #include "fuzz/Fuzz.h"
+#include "fuzz/Views.h"
 #include "img4/Img4Trust.h"
 
 namespace {
 
-struct Input {
-    const std::uint8_t* data;
-    std::size_t size;
-
-    bool holds(const DERItem& item) const {
-        return item.length == 0 || (item.data >= data && item.data <= data + size &&
-                                    item.length <= static_cast<std::uint64_t>(data + size - item.data));
-    }
-};
+bool isIn(const DERItem& input, const DERItem& view) {
+    return view.length == 0 || fuzz::isInside(view, input);
+}
 
 DERReturn acceptSignature(const DERItem* key, const DERItem* signature, const std::uint8_t* digest,
                           std::uint64_t length, const Img4TrustProfile* profile) {
@@ -25,17 +20,17 @@ DERReturn acceptSignature(const DERItem* key, const DERItem* signature, const st
 }
 
 DERReturn checkProperty(DERTag tag, const Img4PropertyValue* value, std::uint32_t selector, void* context) {
-    FUZZ_REQUIRE(static_cast<const Input*>(context)->holds(value->content));
+    FUZZ_REQUIRE(isIn(*static_cast<const DERItem*>(context), value->content));
     FUZZ_REQUIRE(selector <= Img4SelectorObject && (tag >> 61) == 7); // private, constructed
     return DERSuccess;
 }
 
-bool initialise(const Input& input, Img4Record* record) {
-    return Img4DecodeInit(input.data, input.size, record) == DERSuccess ||
-           Img4DecodeInitManifest(input.data, input.size, record) == DERSuccess;
+bool initialise(const DERItem& input, Img4Record* record) {
+    return Img4DecodeInit(input.data, input.length, record) == DERSuccess ||
+           Img4DecodeInitManifest(input.data, input.length, record) == DERSuccess;
 }
 
-void evaluate(const Input& input, const Img4TrustProfileEntry& entry) {
+void evaluate(const DERItem& input, const Img4TrustProfileEntry& entry) {
     Img4DomainProfile accepting;
     Img4ChainRefusal refusal = {};
     FUZZ_REQUIRE(Img4DecodeMakeDomainProfile(&entry, entry.root, &Img4BuiltInTrustDomain, &accepting) == DERSuccess);
@@ -49,17 +44,17 @@ void evaluate(const Input& input, const Img4TrustProfileEntry& entry) {
     const DERReturn chain =
         accepting.profile.verifyChain(&record.manifest.certChain, &key, &properties, &accepting.profile);
     FUZZ_REQUIRE((chain == DERSuccess) == (refusal.fault == Img4ChainSound));
-    FUZZ_REQUIRE(input.holds(key) && input.holds(properties));
+    FUZZ_REQUIRE(isIn(input, key) && isIn(input, properties));
     FUZZ_REQUIRE(chain == DERSuccess ? key.length != 0 : key.length == 0 && properties.length == 0);
 
-    void* const context = const_cast<Input*>(&input);
+    void* const context = const_cast<DERItem*>(&input);
     const std::uint32_t object = Img4FourCC('s', 'e', 'p', 'i');
     const DERReturn status =
         Img4DecodePerformTrustEvaluation(object, &record, checkProperty, &accepting.profile, context);
     FUZZ_REQUIRE(record.manifestHashed == 1);
     FUZZ_REQUIRE(status != DERSuccess || chain == DERSuccess);
     for (const DERItem& view : {record.manb, record.manp, record.objp, record.manifest.certProperties})
-        FUZZ_REQUIRE(input.holds(view));
+        FUZZ_REQUIRE(isIn(input, view));
 
     Img4Record strict;
     FUZZ_REQUIRE(initialise(input, &strict));
@@ -71,8 +66,7 @@ void evaluate(const Input& input, const Img4TrustProfileEntry& entry) {
 } // namespace
 
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    const std::uint8_t none = 0;
-    const Input input = {size == 0 ? &none : data, size};
+    const DERItem input = fuzz::viewOf(data, size);
     Img4Record record;
     if (!initialise(input, &record) || record.manifestRaw.data == nullptr)
         return 0;
