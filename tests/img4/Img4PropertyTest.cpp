@@ -20,8 +20,8 @@ const Bytes data = {1, 2, 3};
 const Bytes null = {0x05, 0x00};
 
 // An element and what is answered when it is asked for as a boolean, a number of 32 and of 64 bits, data and a string:
-// the first letter of success, the end, an unexpected tag, broken encoding, an incomplete sequence or an overflow. The
-// letter is large when the value was found and cannot be read.
+// the first letter of success, the end, an unexpected tag, broken encoding, an incomplete sequence, an overflow or a
+// parameter that is missing. The letter is large when the value was found and cannot be read.
 struct Row {
     const char* name;
     Bytes content;
@@ -84,6 +84,8 @@ DERReturn statusOf(char answer) {
         return DERIncompleteSequence;
     case 'o':
         return DERBufferOverflow;
+    case 'p':
+        return DERParamError;
     default:
         return DERDecodeError;
     }
@@ -109,12 +111,13 @@ void check(char answer, bool isKept, const Bytes& expected, Value before, Query 
     Value value = before;
     EXPECT_EQ(query(&value), statusOf(answer));
     EXPECT_EQ(shown(value), answer == 's' ? expected : shown(isKept ? before : Value{}));
+    EXPECT_EQ(query(nullptr), DERParamError);
 }
 
 template <typename Call, typename... String>
-void checkFamily(const char* family, OnFailure onFailure, bool isSingle, Call call, auto getBoolean, auto getInteger,
-                 auto getInteger64, auto getData, String... getString) {
-    for (const Row& row : rows) {
+void checkFamily(const char* family, const Img4Record& record, OnFailure onFailure, bool isSingle, Call call,
+                 auto getBoolean, auto getInteger, auto getInteger64, auto getData, String... getString) {
+    const auto checkRow = [&](const Row& row, const Img4Record* from) {
         SCOPED_TRACE(std::string(family) + " " + row.name);
         const std::string answers = isSingle && row.single != 0 ? std::string(5, row.single) : row.answers;
         const bool keeps = onFailure == OnFailure::Keeps;
@@ -123,14 +126,18 @@ void checkFamily(const char* family, OnFailure onFailure, bool isSingle, Call ca
         };
         const DERItem before = {row.content.data(), row.content.size()};
         check(answers[0], true, shown(row.number), row.number == 0,
-              [&](bool* out) { return call(getBoolean, row, out); });
+              [&](bool* out) { return call(getBoolean, from, row, out); });
         check(answers[1], keepsNumber(answers[1]), shown(row.number), std::uint32_t{77},
-              [&](std::uint32_t* out) { return call(getInteger, row, out); });
+              [&](std::uint32_t* out) { return call(getInteger, from, row, out); });
         check(answers[2], keepsNumber(answers[2]), shown(row.number), std::uint64_t{77},
-              [&](std::uint64_t* out) { return call(getInteger64, row, out); });
-        check(answers[3], keeps, row.octets, before, [&](DERItem* out) { return call(getData, row, out); });
-        (check(answers[4], keeps, row.octets, before, [&](DERItem* out) { return call(getString, row, out); }), ...);
-    }
+              [&](std::uint64_t* out) { return call(getInteger64, from, row, out); });
+        check(answers[3], keeps, row.octets, before, [&](DERItem* out) { return call(getData, from, row, out); });
+        (check(answers[4], keeps, row.octets, before, [&](DERItem* out) { return call(getString, from, row, out); }),
+         ...);
+    };
+    for (const Row& row : rows)
+        checkRow(row, &record);
+    checkRow({"data", data, "ppppp"}, nullptr);
 }
 
 class Img4Properties : public testing::Test {
@@ -152,30 +159,30 @@ protected:
 TEST_F(Img4Properties, areFoundByEveryFamilyAlike) {
     for (const std::uint32_t section : {Img4SectionManifest, Img4SectionRestoreInfo})
         checkFamily(
-            section == Img4SectionManifest ? "manifest" : "section 1", OnFailure::KeepsNumbersNotFound, false,
-            [&](auto get, const Row& row, auto* out) { return get(&record, section, fourCC(row.name), out); },
+            section == Img4SectionManifest ? "manifest" : "section 1", record, OnFailure::KeepsNumbersNotFound, false,
+            [&](auto get, auto* from, const Row& row, auto* out) { return get(from, section, fourCC(row.name), out); },
             Img4DecodeGetBooleanFromSection, Img4DecodeGetIntegerFromSection, Img4DecodeGetInteger64FromSection,
             Img4DecodeGetDataFromSection);
     checkFamily(
-        "restore information", OnFailure::KeepsNumbersNotFound, false,
-        [&](auto get, const Row& row, auto* out) { return get(&record, fourCC(row.name), out); },
+        "restore information", record, OnFailure::KeepsNumbersNotFound, false,
+        [](auto get, auto* from, const Row& row, auto* out) { return get(from, fourCC(row.name), out); },
         Img4DecodeGetRestoreInfoBoolean, Img4DecodeGetRestoreInfoInteger, Img4DecodeGetRestoreInfoInteger64,
         Img4DecodeGetRestoreInfoData);
     checkFamily(
-        "object", OnFailure::Clears, false,
-        [&](auto get, const Row& row, auto* out) { return get(&record, sepi, fourCC(row.name), out); },
+        "object", record, OnFailure::Clears, false,
+        [](auto get, auto* from, const Row& row, auto* out) { return get(from, sepi, fourCC(row.name), out); },
         Img4DecodeGetObjectPropertyBoolean, Img4DecodeGetObjectPropertyInteger, Img4DecodeGetObjectPropertyInteger64,
         Img4DecodeGetObjectPropertyData, Img4DecodeGetObjectPropertyString);
     checkFamily(
-        "payload", OnFailure::Keeps, false,
-        [&](auto get, const Row& row, auto* out) { return get(&record, propertyTag(row.name), out); },
+        "payload", record, OnFailure::Keeps, false,
+        [](auto get, auto* from, const Row& row, auto* out) { return get(from, propertyTag(row.name), out); },
         Img4DecodeGetPayloadPropertiesBoolean, Img4DecodeGetPayloadPropertiesInteger,
         Img4DecodeGetPayloadPropertiesInteger64, Img4DecodeGetPayloadPropertiesData);
     checkFamily(
-        "single", OnFailure::Clears, true,
-        [&](auto get, const Row& row, auto* out) {
+        "single", record, OnFailure::Clears, true,
+        [](auto get, auto* from, const Row& row, auto* out) {
             const DERItem content = {row.content.data(), row.content.size()};
-            return get(&content, fourCC(row.name), out);
+            return get(from != nullptr ? &content : nullptr, fourCC(row.name), out);
         },
         Img4DecodeGetPropertyBoolean, Img4DecodeGetPropertyInteger, Img4DecodeGetPropertyInteger64,
         Img4DecodeGetPropertyData);
@@ -186,34 +193,42 @@ TEST_F(Img4Properties, areRecordsWithNameTagsAndValue) {
     struct Family {
         const char* name;
         bool keeps;
-        std::function<DERReturn(DERTag, DERTag, Img4Property*)> get;
+        std::function<DERReturn(const Img4Record*, DERTag, DERTag, Img4Property*)> get;
     };
     const Family families[] = {
-        {"manifest", false, [&](auto... a) { return Img4DecodeGetPropertyFromSection(&record, 0, a...); }},
-        {"section 1", false, [&](auto... a) { return Img4DecodeGetPropertyFromSection(&record, 1, a...); }},
-        {"object", false, [&](auto... a) { return Img4DecodeGetObjectProperty(&record, sepi, a...); }},
-        {"payload", true, [&](auto... a) { return Img4DecodePayloadProperty(&record, a...); }},
+        {"manifest", false, [](auto* r, auto... a) { return Img4DecodeGetPropertyFromSection(r, 0, a...); }},
+        {"section 1", false, [](auto* r, auto... a) { return Img4DecodeGetPropertyFromSection(r, 1, a...); }},
+        {"object", false, [](auto* r, auto... a) { return Img4DecodeGetObjectProperty(r, sepi, a...); }},
+        {"payload", true, Img4DecodePayloadProperty},
         {"dictionary", true,
-         [&](auto... a) { return DERImg4DecodeFindProperty(&record.restoreInfo.properties, a...); }},
+         [](auto* r, auto... a) {
+             return DERImg4DecodeFindProperty(r != nullptr ? &r->restoreInfo.properties : nullptr, a...);
+         }},
     };
     const DERTag tag = propertyTag("data");
     for (const Family& family : families) {
         SCOPED_TRACE(family.name);
         Img4Property found = {};
-        ASSERT_EQ(family.get(tag, DERTagOctetString, &found), DERSuccess);
+        ASSERT_EQ(family.get(&record, tag, DERTagOctetString, &found), DERSuccess);
         EXPECT_EQ(shown(found.name), Bytes({'d', 'a', 't', 'a'}));
         EXPECT_EQ(shown(found.value), data);
         EXPECT_EQ(found.tag, tag);
         EXPECT_EQ(found.valueTag, DERTagOctetString);
-        EXPECT_EQ(family.get(tag, DERTagSet, &found), DERUnexpectedTag);
-        EXPECT_EQ(found.name.length, family.keeps ? 4U : 0U);
-        EXPECT_EQ(found.tag, family.keeps ? tag : 0U);
+        const Img4Property whole = found;
+        for (const auto& [from, expected] : {std::pair(&record, DERUnexpectedTag), {nullptr, DERParamError}}) {
+            found = whole;
+            EXPECT_EQ(family.get(from, tag, DERTagSet, &found), expected);
+            EXPECT_EQ(found.name.length, family.keeps ? 4U : 0U);
+            EXPECT_EQ(found.tag, family.keeps ? tag : 0U);
+        }
+        EXPECT_EQ(family.get(&record, tag, DERTagSet, nullptr), DERParamError);
         // The whole tag counts, not only its number.
-        EXPECT_EQ(family.get(fourCC("data"), DERTagOctetString, &found), DEREndOfSequence);
+        EXPECT_EQ(family.get(&record, fourCC("data"), DERTagOctetString, &found), DEREndOfSequence);
     }
     const Bytes content = named("data", octets(data));
     const DERItem view = {content.data(), content.size()};
     Img4Property single;
+    expectNeedsAll(DERParamError, DERImg4DecodeProperty, &view, tag, &single);
     EXPECT_EQ(DERImg4DecodeProperty(&view, fourCC("data"), &single), DERUnexpectedTag) << "no property tag";
     EXPECT_EQ(DERImg4DecodeProperty(&view, tag, &single), DERSuccess);
     EXPECT_EQ(single.tag, tag);
@@ -227,38 +242,6 @@ TEST(Img4Property, needsAPrivateTag) {
     const DERItem elements = {content.data(), content.size()};
     Img4Property found;
     EXPECT_EQ(DERImg4DecodeFindProperty(&elements, tag, DERTagInteger, &found), DERUnexpectedTag);
-}
-
-// Without a record or an item an operation does to its out-value what it does at any failure.
-TEST_F(Img4Properties, cannotBeReadWithoutArguments) {
-    const DERItem content = record.restoreInfo.properties;
-    const DERTag tag = propertyTag("data");
-    Img4Property found = {content, tag, content, tag};
-    bool flag = true;
-    std::uint32_t kept = 77, cleared = 77;
-    DERItem keptItem = content, ofSection = content, ofObject = content, ofSingle = content;
-    expectNeedsAll(DERParamError, Img4DecodeGetBooleanFromSection, &record, 0, sepi, &flag);
-    expectNeedsAll(DERParamError, Img4DecodeGetIntegerFromSection, &record, 0, sepi, &kept);
-    expectNeedsAll(DERParamError, Img4DecodeGetDataFromSection, &record, 0, sepi, &ofSection);
-    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyBoolean, &record, sepi, sepi, &flag);
-    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyInteger, &record, sepi, sepi, &cleared);
-    expectNeedsAll(DERParamError, Img4DecodeGetObjectPropertyString, &record, sepi, sepi, &ofObject);
-    expectNeedsAll(DERParamError, Img4DecodeGetPayloadPropertiesInteger, &record, tag, &kept);
-    expectNeedsAll(DERParamError, Img4DecodeGetPayloadPropertiesData, &record, tag, &keptItem);
-    expectNeedsAll(DERParamError, Img4DecodeGetPropertyBoolean, &content, sepi, &flag);
-    expectNeedsAll(DERParamError, Img4DecodeGetPropertyData, &content, sepi, &ofSingle);
-    expectNeedsAll(DERParamError, DERImg4DecodeFindProperty, &content, tag, tag, &found);
-    expectNeedsAll(DERParamError, DERImg4DecodeProperty, &content, tag, &found);
-    expectNeedsAll(DERParamError, Img4DecodePayloadProperty, &record, tag, tag, &found);
-    EXPECT_TRUE(flag);
-    EXPECT_EQ(kept, 77U);
-    EXPECT_EQ(cleared, 0U);
-    EXPECT_EQ(keptItem.length, content.length);
-    EXPECT_EQ(ofSection.length + ofObject.length + ofSingle.length, 0U);
-    EXPECT_EQ(found.tag, tag);
-    expectNeedsAll(DERParamError, Img4DecodeGetPropertyFromSection, &record, 0, tag, tag, &found);
-    EXPECT_EQ(found.tag, 0U);
-    expectNeedsAll(DERParamError, Img4DecodeGetObjectProperty, &record, sepi, tag, tag, &found);
 }
 
 } // namespace
