@@ -2,6 +2,8 @@
 #ifndef VELTRA_PLATFORM_DATA_CLASSES_H
 #define VELTRA_PLATFORM_DATA_CLASSES_H
 
+#include <cstddef>
+#include <string>
 #include <string_view>
 
 enum class ComponentIdentity {
@@ -21,6 +23,24 @@ enum class ComponentIdentity {
     ScreenSerialNumber,
 };
 
+// The names that their values have in the device description, in the order of the enumeration.
+inline constexpr std::string_view identityNames[] = {
+    "",
+    "MiravelSerialNumber",
+    "CoverGlassSerialNumber",
+    "AmbientLightSensorSerialNumber",
+    "BackglassCompassSerialNumber",
+    "VanterSerialNumber",
+    "VanterChipID",
+    "VanterUID",
+    "LoddenChipID",
+    "LoddenUID",
+    "ProxSerialNumber",
+    "FrontCameraModuleSerialNumber",
+    "TopModuleAuthChipID",
+    "ScreenSerialNumber",
+};
+
 struct DataClass {
     std::string_view name; // four characters
     // The instance is the first identity, or both with a dash between them.
@@ -28,6 +48,14 @@ struct DataClass {
     ComponentIdentity second = ComponentIdentity::None;
     bool mayMissOne = false;        // whether an instance is made with "(null)" for an identity that is missing
     bool secondIsReadFirst = false; // otherwise the identities are read in the order in which they stand
+
+    // What the instance is made of, for people.
+    std::string composition() const {
+        const auto nameOf = [](ComponentIdentity identity) {
+            return std::string(identityNames[static_cast<std::size_t>(identity)]);
+        };
+        return second == ComponentIdentity::None ? nameOf(first) : nameOf(first) + "-" + nameOf(second);
+    }
 };
 
 inline constexpr DataClass dataClasses[] = {

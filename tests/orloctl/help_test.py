@@ -23,7 +23,7 @@ def told_by_help(verb=()):
         [word.strip("[].") for word in operands.split() if word != "SUBCOMMAND"],
         [(re.split(", *", names), value) for names, value in options if verb == () or "--help" not in names],
     )}
-    for name in re.findall(r"^  ([a-z]\S*)", text.partition("Subcommands:")[2].partition("\n\n")[0], re.MULTILINE):
+    for name in re.findall(r"^  ([a-z][^\s,]*)", text.partition("Subcommands:")[2].partition("\n\n")[0], re.MULTILINE):
         told |= told_by_help((*verb, name))
     return told
 
@@ -70,7 +70,7 @@ class Help(unittest.TestCase):
             ("--json crash-logs -o ", [":directories"]),
             ("crash-logs ", []),
             ("--bus s", ["system", "session"]),
-            ("export CtCl psd", ["psd1", "psd2", "psdt"]),
+            ("OrloExport CtCl psd", ["psd1", "psd2", "psdt"]),
             ("put-psd2 /bl", ["/blobs/"]),
             ("put-psd2 /blobs/hm", ["/blobs/hmac-key.bin"]),
             ("put-psd2 /blobs/hmac-key.bin /bl", []),
@@ -81,9 +81,10 @@ class Help(unittest.TestCase):
                 words = [word.split("\t")[0] for word in run("--complete", *line.split(" ")).splitlines()]
                 self.assertEqual(words, offered)
 
-    def test_an_unknown_verb_is_named(self):
-        done = subprocess.run([ORLOCTL, "shw"], stderr=subprocess.PIPE, text=True)
-        self.assertEqual(done.stderr, 'orloctl: There is no verb "shw" (orloctl --help says more)\n')
+    def test_an_unknown_verb_is_named_with_the_nearest(self):
+        for word, says in (("shw", "; is show meant?"), ("getTCRt", "; is getTCRT meant?"), ("xyzzy", "")):
+            done = subprocess.run([ORLOCTL, word], stderr=subprocess.PIPE, text=True)
+            self.assertEqual(done.stderr, f'orloctl: There is no verb "{word}"{says} (orloctl --help says more)\n')
 
 
 if __name__ == "__main__":

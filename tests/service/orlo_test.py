@@ -1,11 +1,12 @@
 """Records, exports and certificates through the running service: what goes in, what the store has, what stays."""
+import json
 import os
 import random
 import subprocess
 import time
 import unittest
 
-from harness import SUCCESS, Service, ServiceTest, at_once
+from harness import DESCRIPTION, SUCCESS, Service, ServiceTest, at_once
 
 STORE = "var/lib/orlo/store.db"
 CERTIFICATE = "sys/tesk/cert.der"
@@ -31,6 +32,29 @@ class Records(OrloTest):
         self.assertEqual(self.service.answer("put-tcrt"), SUCCESS)
         self.assertEqual(self.rows("SELECT data_version, class, instance, hex(data) FROM records ORDER BY class"), [
             f"2|psd2|VAN0001|{b'short'.hex().upper()}", f"1|tcrt|SCR0001-TMA0001|{certificate.hex().upper()}"])
+
+    def test_a_local_file_passes_through_the_device_and_leaves_nothing_there(self):
+        (self.root / "local").write_bytes(b"\0record")
+        self.assertEqual(self.service.answer("put-psd2", "--local", self.root / "local"), SUCCESS)
+        status, answer = self.service.orloctl("get-psd2", "-o", self.root / "copy")
+        self.assertEqual((status, answer["result"]), (0, f"{self.root}/copy, 7 bytes"), answer)
+        self.assertEqual((self.root / "copy").read_bytes(), b"\0record")
+        self.service.describe(answers={"VanterSerialNumber": None})
+        for words in (["put-psd2", "--local", self.root / "local"], ["get-psd2", "-o", self.root / "other"]):
+            self.assertEqual(self.service.answer(*words)[0], -1)
+        self.assertFalse((self.root / "other").exists())
+        self.assertEqual(os.listdir(self.root / "tmp"), [])
+
+    def test_the_instance_of_each_class_is_made_of_what_the_client_lists(self):
+        self.service.describe(answers={"VanterUID": "VUID", "LoddenUID": "LUID"})
+        description = json.loads(self.service.read(DESCRIPTION))
+        given = description["answers"] | description["tansu"]
+        expected = {}
+        for row in self.service.orloctl("list-classes")[1]["classes"]:
+            expected[row["class"]] = "-".join(str(given[name]) for name in row["instance"].split("-"))
+        status, answer = self.service.orloctl("export", *expected, "psd2")
+        self.assertEqual((status, answer["result"]), (0, "29 classes exported"), answer)
+        self.assertEqual(dict(row.split("|") for row in self.rows("SELECT class, instance FROM export_pairs")), expected)
 
     def test_a_path_leads_neither_out_of_the_device_nor_to_what_is_no_file(self):
         self.service.put(b"record")

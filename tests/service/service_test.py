@@ -138,6 +138,8 @@ class Client(ServiceTest):
             (2, ["show", self.root / "blobs/every-kind.bin", "--hmac-key-file", "/dev/null"]),
             (2, ["show", self.root / "blobs/every-kind.bin", "--hmac-key-file", ""]),
             (2, ["crash-logs", "-o", "-"]),
+            (2, ["put-psd2"]),
+            (2, ["get-psd2", "/tmp/out", "-o", self.root / "out"]),
         ):
             with self.subTest(words):
                 exit_status, answer = self.service.orloctl(*words)

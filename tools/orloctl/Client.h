@@ -23,6 +23,7 @@ struct ServiceAddress {
     std::string bus = "system"; // "system", "session" or a D-Bus address
     std::chrono::seconds timeout{600};
     std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+    bool json = false; // whether one JSON object is all that is printed
 
     std::chrono::steady_clock::time_point deadline() const { return start + timeout; }
 };

@@ -24,7 +24,7 @@ void offerBuses(const std::string& typed) {
 
 void offerDataClasses(const std::string& typed) {
     for (const DataClass& dataClass : dataClasses)
-        offer(std::string(dataClass.name), typed);
+        offer(std::string(dataClass.name), typed, dataClass.composition());
 }
 
 void offerTrustProfiles(const std::string& typed) {
@@ -115,7 +115,7 @@ void printCompletions(const CLI::App& app, const std::vector<std::string>& words
     bool optionsHaveEnded = false;
     for (std::size_t i = 0; i + 1 < words.size(); ++i) {
         const std::string& word = words[i];
-        const auto verbs = verb->get_subcommands([&](const CLI::App* known) { return known->get_name() == word; });
+        const auto verbs = verb->get_subcommands([&](const CLI::App* known) { return known->check_name(word); });
         if (waiting)
             waiting = nullptr;
         else if (!optionsHaveEnded && word.starts_with('-') && word.size() > 1) {

@@ -113,6 +113,7 @@ constexpr Layout layouts[] = {
     {"constraints", 1000, 512, "{dictionary}| {name}| {demand}|: {state}|, found {found}"},
     {"logs", all, SIZE_MAX, "{date}|{size:14}|  {panic:5}|  {name}|  copied to {copy}|  {note}",
      "  DATE                          SIZE  PANIC  NAME"},
+    {"classes", all, SIZE_MAX, "{class}|  {instance}"},
     {"missed", all, SIZE_MAX, "{name}|: {note}"},
 };
 

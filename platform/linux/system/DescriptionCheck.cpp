@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <numeric>
 #include <string_view>
 #include <utility>
 
@@ -11,6 +10,7 @@
 #include <sys/stat.h>
 
 #include "platform/DeviceRoot.h"
+#include "platform/NearestName.h"
 #include "platform/Utf8.h"
 #include "platform/linux/system/DescribedValue.h"
 
@@ -116,21 +116,6 @@ std::string_view kindOf(const Value& value) {
                                 : nothing;
 }
 
-// How many characters have to be put in, taken out or changed to make one name of the other (Levenshtein distance).
-std::size_t distance(std::string_view from, std::string_view to) {
-    std::vector<std::size_t> row(to.size() + 1);
-    std::iota(row.begin(), row.end(), std::size_t{0});
-    for (std::size_t i = 0; i < from.size(); ++i) {
-        std::size_t diagonal = std::exchange(row[0], i + 1);
-        for (std::size_t j = 0; j < to.size(); ++j) {
-            const std::size_t changed = diagonal + (from[i] != to[j] ? 1 : 0);
-            diagonal = row[j + 1];
-            row[j + 1] = std::min({changed, row[j] + 1, diagonal + 1});
-        }
-    }
-    return row.back();
-}
-
 class Check {
 public:
     void checkObject(const Value& value, std::string_view section, const std::string& place) {
@@ -203,16 +188,12 @@ private:
     }
 
     static std::string nearest(std::string_view name, std::string_view section) {
-        if (name.size() > longestName)
-            return {};
-        std::string_view best;
-        std::size_t least = name.npos;
+        std::vector<std::string_view> known;
         for (const Key& key : keys)
-            if (key.section == section && distance(name, key.name) < least) {
-                best = key.name;
-                least = distance(name, best);
-            }
-        return least > best.size() / 3 ? "" : "; is " + std::string(best) + " meant?";
+            if (key.section == section)
+                known.push_back(key.name);
+        const std::string_view meant = nearestName(name, known);
+        return meant.empty() ? "" : "; is " + std::string(meant) + " meant?";
     }
 
     static std::string shown(std::string_view name) {

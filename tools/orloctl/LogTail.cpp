@@ -1,0 +1,124 @@
+#include "tools/orloctl/LogTail.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <optional>
+#include <string>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/inotify.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/DeviceRoot.h"
+#include "tools/orloctl/LocalFiles.h"
+
+namespace {
+
+constexpr off_t pieceSize = 65536;
+
+[[noreturn]] void refuse() {
+    throw UsageError(std::string("Cannot read the log ") + logPath + " on the device: " + std::strerror(errno) +
+                     " (the journal has it too where systemd has started the service: journalctl -u "
+                     "veltra-orlo-services)");
+}
+
+// Wakes up whenever something changes in the folder of the log.
+class Watch {
+public:
+    Watch() : events_(::inotify_init1(IN_CLOEXEC)) {
+        const std::string path = logPath;
+        const FileDescriptor folder = openDirectoryInRoot(path.substr(0, path.rfind('/')));
+        const std::string name = "/proc/self/fd/" + std::to_string(folder.get());
+        if (!folder || ::inotify_add_watch(events_.get(), name.c_str(), IN_MODIFY | IN_CREATE | IN_MOVED_TO) < 0)
+            refuse();
+    }
+
+    void wait() const {
+        char events[4096];
+        if (::read(events_.get(), events, sizeof events) < 0)
+            refuse();
+    }
+
+private:
+    FileDescriptor events_;
+};
+
+// Where the last `lines` lines of the file begin.
+off_t startOfLast(const FileDescriptor& file, std::size_t lines) {
+    const off_t end = ::lseek(file.get(), 0, SEEK_END);
+    for (off_t place = end; place > 0 && lines > 0;) {
+        std::string piece(static_cast<std::size_t>(std::min(place, pieceSize)), '\0');
+        place -= static_cast<off_t>(piece.size());
+        if (::pread(file.get(), piece.data(), piece.size(), place) < 0)
+            refuse();
+        for (std::size_t i = piece.size(); i-- > 0;)
+            if (const off_t next = place + static_cast<off_t>(i) + 1; piece[i] == '\n' && next != end && --lines == 0)
+                return next;
+    }
+    return lines == 0 ? end : 0;
+}
+
+// The log from a place on, line by line.
+class Reader {
+public:
+    explicit Reader(std::size_t lines) : file_(openInRoot(logPath, O_RDONLY)) {
+        if (file_)
+            place_ = startOfLast(file_, lines);
+    }
+
+    explicit operator bool() const { return static_cast<bool>(file_); }
+
+    // Hands on what there is up to the end; a line that has no end yet waits for it. False when `take` wants no more.
+    bool readOn(const std::function<bool(std::string_view)>& take) {
+        std::string piece(static_cast<std::size_t>(pieceSize), '\0');
+        while (file_) {
+            const ssize_t count = ::pread(file_.get(), piece.data(), piece.size(), place_);
+            if (count < 0)
+                refuse();
+            if (count == 0)
+                break;
+            place_ += count;
+            pending_.append(piece, 0, static_cast<std::size_t>(count));
+            std::size_t start = 0;
+            for (std::size_t end; (end = pending_.find('\n', start)) != pending_.npos; start = end + 1)
+                if (!take(std::string_view(pending_).substr(start, end - start)))
+                    return false;
+            pending_.erase(0, start);
+        }
+        return true;
+    }
+
+    // Goes to the beginning of the file that has taken the place of this one; false when there is none.
+    bool isReplaced() {
+        FileDescriptor now = openInRoot(logPath, O_RDONLY);
+        struct stat here = {}, there = {};
+        if (!now || ::fstat(now.get(), &there) != 0)
+            return false;
+        if (file_ && ::fstat(file_.get(), &here) == 0 && here.st_dev == there.st_dev && here.st_ino == there.st_ino &&
+            there.st_size >= place_)
+            return false;
+        file_ = std::move(now);
+        place_ = 0;
+        return true;
+    }
+
+private:
+    FileDescriptor file_;
+    off_t place_ = 0;
+    std::string pending_;
+};
+
+} // namespace
+
+void readLog(std::size_t lines, bool isFollowed, const std::function<bool(std::string_view line)>& take) {
+    const std::optional<Watch> watch = isFollowed ? std::make_optional<Watch>() : std::nullopt;
+    Reader reader(lines);
+    if (!reader && !isFollowed)
+        refuse();
+    while (reader.readOn(take) && isFollowed)
+        if (!reader.isReplaced())
+            watch->wait();
+}
