@@ -193,19 +193,6 @@ TEST_F(CrashLogs, noFolderOnTheWayIsALink) {
     EXPECT_FALSE(check_panic_version(logs + "panic-1.ips"));
 }
 
-TEST_F(CrashLogs, anUnreadableFileIsLeftOut) {
-    root_.write(logs + "good.log", "good");
-    root_.write(logs + "secret.log", "secret");
-    fs::permissions(root_.host(logs + "secret.log"), fs::perms::none);
-    fs::permissions(root_.around(), fs::perms::group_exec | fs::perms::others_exec, fs::perm_options::add);
-    inOwnProcess([&] {
-        const uid_t reader = ::geteuid() == 0 ? 65534 : ::geteuid(); // root may read everything
-        ASSERT_EQ(::seteuid(reader), 0);
-        EXPECT_EQ(collect(), Lines{logs + "good.log NO 4: good"});
-        EXPECT_TRUE(logged("Failed to load " + logs + "secret.log: "));
-    });
-}
-
 TEST_F(CrashLogs, aLargeLogIsCollectedWhole) {
     constexpr std::size_t size = std::size_t{200} << 20;
     root_.write(logs + "large.log", "start");
