@@ -109,14 +109,13 @@ TEST(ShowFile, saysWhyABlobIsNoneOrNotProtected) {
         std::optional<Bytes> key = std::nullopt;
     } rows[] = {
         {"The HMACs do not match the entries under this key.", readLocalFile(examples + "/blobs/bCfg-30002.bin"), key},
-        {"The file is empty.", {}},
-        {"The blob, at offset 0, is SET and should be SEQUENCE.", set({})},
-        {"The blob ends before the magic, at offset 2.", sequence({})},
-        {"The version, at offset 8, is IA5String and should be INTEGER.", sequence({number(1), ia5("x")})},
-        {"The blob, at offset 0, is no DER: the content is cut short: 0 of 3 octets are there.", {0x30, 0x03}},
-        {"The payload entry, at offset 23, lacks a field.", blob({sequence({number(1)})})},
-        {"The payload entry, at offset 36, has a field that does not belong there.",
-         blob({entry, sequence({set({})})})},
+        {"The file is empty, at offset 0.", {}},
+        {"The blob is SET instead of SEQUENCE, at offset 0.", set({})},
+        {"The blob ends before its magic, at offset 2.", sequence({})},
+        {"The blob has IA5String instead of INTEGER as its version, at offset 8.", sequence({number(1), ia5("x")})},
+        {"The blob is no strict DER: the content is cut short: 0 of 3 octets are there, at offset 0.", {0x30, 0x03}},
+        {"The payload entry lacks a field, at offset 23.", blob({sequence({number(1)})})},
+        {"The payload entry has a field that does not belong there, at offset 36.", blob({entry, sequence({set({})})})},
     };
     for (const auto& row : rows) {
         const Report report = showFile(row.file, "bcfg", row.key);

@@ -231,7 +231,7 @@ std::vector<RefusalCase> refusalCases() {
         {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
          withProperty(property("LIST", sequence({})))},
         {"properties", "INTEGER of the manifest is no property", withProperty(integer(1))},
-        {"properties", R"(private "LONG" of the object goes on behind its value)",
+        {"properties", R"(private "LONG" of the object has a content that holds an item behind)",
          withObject(object("sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))})),
          nullptr, "sepi"},
     };

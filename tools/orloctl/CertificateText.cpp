@@ -14,16 +14,22 @@
 
 namespace {
 
-constexpr std::uint64_t mostOctets = 256;
+template <auto Free>
+struct Release {
+    void operator()(auto* object) const { Free(object); }
+};
+template <class Object, auto Free>
+using Owner = std::unique_ptr<Object, Release<Free>>;
 
-using KeyPtr = std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)>;
-
-// Null when OpenSSL cannot read it.
-KeyPtr parsedKey(const DERItem& subjectPublicKeyInfo) {
-    const auto encoding = derEncoding(DERTagSequence, subjectPublicKeyInfo);
+// What OpenSSL's reader makes of the SEQUENCE with that content; null when it cannot read it.
+template <class Object>
+Object* parsed(const DERItem& content, Object* (*read)(Object**, const unsigned char**, long)) {
+    const auto encoding = derEncoding(DERTagSequence, content);
     const std::uint8_t* place = encoding.data();
-    return {d2i_PUBKEY(nullptr, &place, static_cast<long>(encoding.size())), EVP_PKEY_free};
+    return read(nullptr, &place, static_cast<long>(encoding.size()));
 }
+
+using Key = Owner<EVP_PKEY, EVP_PKEY_free>;
 
 std::string ecText(const EVP_PKEY* key, const DERItem& point) {
     char name[80] = "";
@@ -35,11 +41,16 @@ std::string ecText(const EVP_PKEY* key, const DERItem& point) {
            (isUncompressed ? "" : ", with a point that is not in uncompressed form");
 }
 
+// The fields of a SEQUENCE that has them.
+template <class Fields>
+bool read(const DERItem& content, std::uint16_t count, const DERItemSpec* specs, Fields* fields) {
+    return DERParseSequenceContent(&content, count, specs, fields, sizeof *fields) == DERSuccess;
+}
+
 // The number's digits, without the octet that keeps it positive.
-std::string serialText(DERItem serialNumber) {
-    if (serialNumber.length > 1 && serialNumber.data[0] == 0)
-        serialNumber = {serialNumber.data + 1, serialNumber.length - 1};
-    return hexText(serialNumber);
+std::string serialText(const DERItem& number) {
+    const std::uint64_t unneeded = number.length > 1 && number.data[0] == 0 ? 1 : 0;
+    return hexText({number.data + unneeded, number.length - unneeded});
 }
 
 } // namespace
@@ -54,31 +65,26 @@ std::optional<Certificate> readCertificate(const DERItem& encoding) {
     return certificate;
 }
 
-std::string nameText(const DERItem& name, std::size_t longest) {
-    const auto encoding = derEncoding(DERTagSequence, name);
-    const std::uint8_t* place = encoding.data();
-    const std::unique_ptr<X509_NAME, decltype(&X509_NAME_free)> parsed(
-        d2i_X509_NAME(nullptr, &place, static_cast<long>(encoding.size())), X509_NAME_free);
-    const std::unique_ptr<BIO, decltype(&BIO_free)> out(BIO_new(BIO_s_mem()), BIO_free);
-    if (!parsed || !out || X509_NAME_print_ex(out.get(), parsed.get(), 0, XN_FLAG_RFC2253) < 0)
-        return shortened("#" + hexText(name), longest);
+std::string nameText(const DERItem& name) {
+    const Owner<X509_NAME, X509_NAME_free> read(parsed(name, d2i_X509_NAME));
+    const Owner<BIO, BIO_free> out(BIO_new(BIO_s_mem()));
+    if (!read || !out || X509_NAME_print_ex(out.get(), read.get(), 0, XN_FLAG_RFC2253) < 0)
+        return "#" + hexText(name);
     char* text = nullptr;
     const auto length = static_cast<std::size_t>(BIO_get_mem_data(out.get(), &text));
-    return shortened(std::string(text, length), longest);
+    return {text, length};
 }
 
-std::string keyText(const DERItem& subjectPublicKeyInfo, std::uint64_t most) {
+std::string keyText(const DERItem& subjectPublicKeyInfo) {
     DERSubjPubKeyInfo info;
     DERAlgorithmId algorithm;
-    if (DERParseSequenceContent(&subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info,
-                                sizeof info) != DERSuccess ||
-        DERParseSequenceContent(&info.algorithm, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, &algorithm,
-                                sizeof algorithm) != DERSuccess)
-        return "malformed #" + hexText(subjectPublicKeyInfo, most);
+    if (!read(subjectPublicKeyInfo, DERNumSubjPubKeyInfoItemSpecs, DERSubjPubKeyInfoItemSpecs, &info) ||
+        !read(info.algorithm, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, &algorithm))
+        return "malformed #" + hexText(subjectPublicKeyInfo);
     const std::string name = algorithmName(algorithm.algorithm);
-    const KeyPtr key = parsedKey(subjectPublicKeyInfo);
+    const Key key(parsed(subjectPublicKeyInfo, d2i_PUBKEY));
     if (!key)
-        return name + " #" + hexText(info.publicKey, most);
+        return name + " #" + hexText(info.publicKey);
     if (EVP_PKEY_is_a(key.get(), "EC"))
         return ecText(key.get(), info.publicKey);
     if (!EVP_PKEY_is_a(key.get(), "RSA"))
@@ -88,29 +94,28 @@ std::string keyText(const DERItem& subjectPublicKeyInfo, std::uint64_t most) {
 }
 
 bool isKey(const DERItem& subjectPublicKeyInfo) {
-    return parsedKey(subjectPublicKeyInfo) != nullptr;
+    return Key(parsed(subjectPublicKeyInfo, d2i_PUBKEY)) != nullptr;
 }
 
 std::string algorithmName(const DERItem& oid) {
     const std::string name = oidText(oid, true);
-    return name.empty() ? "malformed " + hexText(oid, mostOctets) : name;
+    return name.empty() ? "malformed " + hexText(oid) : name;
 }
 
 std::string algorithmText(const DERItem& identifier) {
     DERAlgorithmId algorithm;
-    return DERParseSequenceContent(&identifier, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, &algorithm,
-                                   sizeof algorithm) == DERSuccess
+    return read(identifier, DERNumAlgorithmIdItemSpecs, DERAlgorithmIdItemSpecs, &algorithm)
                ? algorithmName(algorithm.algorithm)
-               : "malformed " + hexText(identifier, mostOctets);
+               : "malformed " + hexText(identifier);
 }
 
 nlohmann::ordered_json certificateJson(const DERItem& encoding) {
     const auto certificate = readCertificate(encoding);
     if (!certificate)
         return {{"fault", "is no certificate"}};
-    return {{"subject", nameText(certificate->tbs.subject, SIZE_MAX)},
-            {"issuer", nameText(certificate->tbs.issuer, SIZE_MAX)},
-            {"key", keyText(certificate->tbs.subjectPublicKeyInfo, UINT64_MAX)},
+    return {{"subject", nameText(certificate->tbs.subject)},
+            {"issuer", nameText(certificate->tbs.issuer)},
+            {"key", keyText(certificate->tbs.subjectPublicKeyInfo)},
             {"signatureAlgorithm", algorithmText(certificate->fields.signatureAlgorithm)},
             {"serialNumber", serialText(certificate->tbs.serialNumber)},
             {"sha256", digestText(encoding, crypto::sha256Size)}};

@@ -20,13 +20,11 @@ struct Certificate {
 std::optional<Certificate> readCertificate(const DERItem& encoding);
 
 // The content of a Name in the form of RFC 2253, "CN=Tevari Root CA,O=Tevari". Octets that are no printable ASCII are
-// escaped, and values that are no text are in hexadecimal. A name of more than `longest` characters ends in an
-// ellipsis.
-std::string nameText(const DERItem& name, std::size_t longest = 512);
+// escaped, and values that are no text are in hexadecimal.
+std::string nameText(const DERItem& name);
 
-// The content of a SubjectPublicKeyInfo: "RSA 4096 bits", "EC P-384". Of a key that cannot be read at most `most`
-// octets are shown.
-std::string keyText(const DERItem& subjectPublicKeyInfo, std::uint64_t most = 256);
+// The content of a SubjectPublicKeyInfo: "RSA 4096 bits", "EC P-384"; of a key that cannot be read its octets.
+std::string keyText(const DERItem& subjectPublicKeyInfo);
 
 // Whether OpenSSL can read the key in that content: an EC key that it cannot is no point of its curve.
 bool isKey(const DERItem& subjectPublicKeyInfo);
@@ -36,7 +34,7 @@ bool isKey(const DERItem& subjectPublicKeyInfo);
 std::string algorithmName(const DERItem& oid);
 std::string algorithmText(const DERItem& identifier);
 
-// Whole: "subject", "issuer", "key", "signatureAlgorithm", "serialNumber" and the "sha256" of the encoding; with a
+// "subject", "issuer", "key", "signatureAlgorithm", "serialNumber" and the "sha256" of the encoding; with a
 // "fault" instead when it is no certificate.
 nlohmann::ordered_json certificateJson(const DERItem& encoding);
 

@@ -3,6 +3,7 @@
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "platform/Hexadecimal.h"
+#include "tools/orloctl/Report.h"
 
 #include <algorithm>
 #include <iterator>
@@ -42,50 +43,26 @@ bool isOneOf(std::uint32_t types, DERTag tag) {
 
 // Why the octets are none of that primitive type.
 std::optional<DerFault> octetsFault(DERTag type, const DERItem& content) {
-    const std::uint64_t length = content.length;
-    const std::uint8_t* const octets = content.data;
+    const auto [octets, length] = content;
     const std::uint8_t* const last = octets + length - 1;
-    DERItem bits;
+    const bool isBits = type == DERTagBitString, isNumber = type == DERTagInteger || type == enumerated;
+    const bool isIdentifier = type == DERTagObjectIdentifier || type == relativeOid;
     std::uint8_t unused = 0;
-    switch (type) {
-    case DERTagBoolean:
-        if (length != 1)
-            return DerFault{octets, "a BOOLEAN has one octet, and this one has " + std::to_string(length)};
-        if (octets[0] != 0x00 && octets[0] != 0xFF)
-            return DerFault{octets, "a BOOLEAN is 00 or FF, and this one is " + hexText(content)};
-        break;
-    case DERTagInteger:
-    case enumerated:
-        if (length == 0)
-            return DerFault{octets, "the number has no octets"};
-        if (length > 1 && octets[0] == ((octets[1] & 0x80) != 0 ? 0xFF : 0x00))
-            return DerFault{octets, "the number is not in its shortest form"};
-        break;
-    case DERTagBitString:
-        if (DERParseBitString(&content, &bits, &unused) == DERSuccess)
-            break;
-        if (length == 0)
-            return DerFault{octets, "a BIT STRING has at least one octet"};
-        if (unused > 7 || length == 1)
-            return DerFault{octets, "the count of unused bits is " + std::to_string(unused)};
-        return DerFault{last, "the unused bits are not zero"};
-    case null:
-        if (length != 0)
-            return DerFault{octets, "a NULL has no content"};
-        break;
-    case DERTagObjectIdentifier:
-    case relativeOid:
-        if (length == 0)
-            return DerFault{octets, "an identifier has at least one octet"};
-        for (std::uint64_t i = 0; i < length; ++i)
-            if (octets[i] == 0x80 && (i == 0 || octets[i - 1] < 0x80))
-                return DerFault{octets + i, "a component is not in its shortest form"};
-        if (*last >= 0x80)
-            return DerFault{last, "the last component is cut short"};
-        break;
-    default:
-        break;
-    }
+    if ((type == DERTagBoolean && length != 1) || (type == null && length != 0) ||
+        (length == 0 && (isNumber || isBits || isIdentifier)))
+        return DerFault{octets, std::string(typeNames[type]) + " never has " + std::to_string(length) + " octets"};
+    if (type == DERTagBoolean && octets[0] != 0x00 && octets[0] != 0xFF)
+        return DerFault{octets, "a BOOLEAN is 00 or FF, and this one is " + hexText(content)};
+    if (isNumber && length > 1 && octets[0] == ((octets[1] & 0x80) != 0 ? 0xFF : 0x00))
+        return DerFault{octets, "the number is not in its shortest form"};
+    if (DERItem bits; isBits && DERParseBitString(&content, &bits, &unused) != DERSuccess)
+        return unused > 7 || length == 1 ? DerFault{octets, "the count of unused bits is " + std::to_string(unused)}
+                                         : DerFault{last, "the unused bits are not zero"};
+    for (std::uint64_t i = 0; isIdentifier && i < length; ++i)
+        if (octets[i] == 0x80 && (i == 0 || octets[i - 1] < 0x80))
+            return DerFault{octets + i, "a component is not in its shortest form"};
+    if (isIdentifier && *last >= 0x80)
+        return DerFault{last, "the last component is cut short"};
     return std::nullopt;
 }
 
@@ -93,51 +70,45 @@ bool isPrintable(std::uint8_t octet) {
     return octet >= 0x20 && octet <= 0x7E;
 }
 
-// The octets of a number, without zeros before them.
-Octets octetsOf(std::uint64_t number) {
-    Octets octets(1, static_cast<std::uint8_t>(number));
-    while ((number >>= 8) != 0)
-        octets.insert(octets.begin(), static_cast<std::uint8_t>(number));
-    return octets;
-}
-
-// Quotes and backslashes would be mistaken for those around a code.
-bool isSpelling(const Octets& octets) {
-    return octets.size() == 4 && std::ranges::all_of(octets, [](std::uint8_t octet) {
-               return isPrintable(octet) && octet != '"' && octet != '\\';
-           });
-}
-
-std::string codeOf(std::uint64_t number, const std::string& quote) {
-    const Octets octets = octetsOf(number);
-    return isSpelling(octets) ? quote + std::string(octets.begin(), octets.end()) + quote : "0x" + hexadecimal(octets);
-}
-
 } // namespace
 
 std::string derFaultText(const DERRefusal& refusal) {
+    constexpr const char* texts[] = {"",
+                                     "the header is cut short",
+                                     "the tag number begins with a zero digit",
+                                     "the tag number fits one octet and is written in the long form",
+                                     "the tag number does not fit 61 bits",
+                                     "the length is indefinite, which DER does not allow",
+                                     "",
+                                     "the length is not in its shortest form"};
     const DERItem der = {refusal.item, static_cast<std::uint64_t>(refusal.place - refusal.item)};
     DERDecodedInfo there;
     std::uint64_t declared = 0;
-    switch (refusal.fault) {
-    case DERFaultHeaderCutShort:
-        return "the header is cut short";
-    case DERFaultTagLeadingZero:
-        return "the tag number begins with a zero digit";
-    case DERFaultTagForm:
-        return "the tag number fits one octet and is written in the long form";
-    case DERFaultTagNumber:
-        return "the tag number does not fit 61 bits";
-    case DERFaultLengthIndefinite:
-        return "the length is indefinite, which DER does not allow";
-    case DERFaultLengthOctets:
+    if (refusal.fault == DERFaultLengthOctets)
         return "the length takes " + std::to_string(*refusal.place & 0x7F) + " octets, and at most 8 are allowed";
-    case DERFaultLengthForm:
-        return "the length is not in its shortest form";
+    if (refusal.fault != DERFaultContentCutShort)
+        return texts[refusal.fault];
+    DERDecodeItemPartialBufferGetLength(&der, &there, &declared);
+    return "the content is cut short: " + std::to_string(there.content.length) + " of " + std::to_string(declared) +
+           " octets are there";
+}
+
+std::string derRefusalText(const DERRefusal& refusal, const char* field, const std::uint8_t* file) {
+    switch (refusal.fault) {
+    case DERFaultNoSequence:
+        return "is " + derTagName(refusal.tag) + " instead of SEQUENCE";
+    case DERFaultTag:
+        return "has " + derTagName(refusal.tag) + " instead of " + derTagName(refusal.expected) + " as its " + field;
+    case DERFaultMissing:
+        return std::string("ends before its ") + field;
+    case DERFaultExcess:
+        return "holds " + (refusal.tag != 0 ? derTagName(refusal.tag) : "an item") + " behind its last field";
     default:
-        DERDecodeItemPartialBufferGetLength(&der, &there, &declared);
-        return "the content is cut short: " + std::to_string(there.content.length) + " of " + std::to_string(declared) +
-               " octets are there";
+        return "is no strict DER" +
+               (file == nullptr || file == refusal.item
+                    ? ""
+                    : " in the item at offset " + std::to_string(refusal.item - file)) +
+               ": " + derFaultText(refusal);
     }
 }
 
@@ -186,35 +157,39 @@ std::string derTagName(DERTag tag) {
         return (isUsual ? "" : isConstructed(tag) ? "constructed " : "primitive ") + std::string(typeNames[number]);
     }
     const std::uint64_t tagClass = tag >> classShift;
-    return std::string(classes[tagClass]) + " " +
-           (tagClass == 3 && isSpelling(octetsOf(number)) ? quotedCode(number) : "[" + std::to_string(number) + "]") +
+    const std::string code = tagClass == 3 ? codeText(number, "\"") : "";
+    return std::string(classes[tagClass]) + " " + (code.starts_with('"') ? code : "[" + std::to_string(number) + "]") +
            (isConstructed(tag) ? "" : " primitive");
 }
 
-std::string codeText(std::uint64_t number) {
-    return codeOf(number, "");
+std::string codeText(std::uint64_t number, const char* quote) {
+    Octets octets(1, static_cast<std::uint8_t>(number));
+    for (std::uint64_t rest = number >> 8; rest != 0; rest >>= 8)
+        octets.insert(octets.begin(), static_cast<std::uint8_t>(rest));
+    // Quotes and backslashes would be mistaken for those around a code.
+    const bool isSpelled = octets.size() == 4 && std::ranges::all_of(octets, [](std::uint8_t octet) {
+                               return isPrintable(octet) && octet != '"' && octet != '\\';
+                           });
+    return isSpelled ? quote + std::string(octets.begin(), octets.end()) + quote : "0x" + hexadecimal(octets);
 }
 
-std::string quotedCode(std::uint64_t number) {
-    return codeOf(number, "\"");
-}
-
-std::string escapedText(const DERItem& text, std::uint64_t most) {
+std::string escapedText(const DERItem& text) {
     std::string escaped;
-    for (std::uint64_t i = 0; i < std::min(text.length, most); ++i)
+    for (std::uint64_t i = 0; i < text.length; ++i)
         if (isPrintable(text.data[i]) && text.data[i] != '\\')
             escaped += static_cast<char>(text.data[i]);
         else
             escaped += "\\x" + hexText({text.data + i, 1});
-    return escaped + (text.length > most ? "..." : "");
+    return escaped;
 }
 
-std::string quotedText(const DERItem& text, std::uint64_t most) {
-    return "\"" + escapedText(text, most) + "\"";
+std::string quotedText(const std::string& text) {
+    constexpr std::size_t mostInSentence = 512;
+    return "\"" + shortened(text, mostInSentence) + "\"";
 }
 
-std::string hexText(const DERItem& data, std::uint64_t most) {
-    return hexadecimal({data.data, std::min(data.length, most)}) + (data.length > most ? "..." : "");
+std::string hexText(const DERItem& data) {
+    return hexadecimal({data.data, data.length});
 }
 
 Octets derEncoding(DERTag tag, const DERItem& content) {

@@ -10,11 +10,6 @@ void Findings::fault(const std::uint8_t* place, const std::string& reason) {
     report_.fail(reason + ", at offset " + std::to_string(offsetOf(place)) + ".");
 }
 
-void Findings::fault(const DERRefusal& refusal, const std::string& what) {
-    fault(refusal.place, what + ", which begins at offset " + std::to_string(offsetOf(refusal.item)) +
-                             ", is no strict DER: " + derFaultText(refusal));
-}
-
 std::string digestText(const DERItem& data, std::size_t size) {
     std::uint8_t digest[crypto::sha384Size];
     const auto compute = size == crypto::sha1Size     ? crypto::sha1

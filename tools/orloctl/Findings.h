@@ -17,9 +17,6 @@ public:
     // Makes "<reason>, at offset <place>." the problem of the report, unless it has one already.
     void fault(const std::uint8_t* place, const std::string& reason);
 
-    // The same for an item that cannot be decoded, which `what` names.
-    void fault(const DERRefusal& refusal, const std::string& what);
-
     void note(const std::string& text) { notes_.push_back(text); }
     const nlohmann::ordered_json& notes() const { return notes_; }
 

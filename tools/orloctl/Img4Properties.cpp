@@ -12,6 +12,7 @@ namespace {
 using nlohmann::ordered_json;
 
 constexpr unsigned deepestDictionary = 8;
+constexpr std::uint64_t longestWithoutDigest = 256;
 
 bool looksLikeDictionary(const DERItem& content) {
     DERDecodedInfo first;
@@ -59,7 +60,7 @@ Element describe(const DERDecodedInfo& element, const DERItem& encoding, const s
     } else if (property.valueTag == DERTagBoolean || property.valueTag == DERTagInteger ||
                property.valueTag == DERTagIA5String) {
         json["value"] = derValue(property.valueTag, value);
-        if (value.length > mostCharactersShown)
+        if (value.length > longestWithoutDigest)
             json["sha256"] = digestText(value, crypto::sha256Size);
     } else {
         json.update(dataJson(value));

@@ -8,7 +8,7 @@ namespace {
 // A part of a file: what it is called, its fields by the row that takes them, its number and the last that there is.
 struct Part {
     const char* name;
-    const char* fields[7];
+    const char* fields[8];
     const char* magic = "";
     const char* number = "";
     const char* last = "";
@@ -25,22 +25,31 @@ constexpr Part parts[] = {
     {"restore information", {"magic", "SET"}, R"("IM4R")"},
 };
 
-std::string encodingReason(const DERItem& file, const Part& part, const DERRefusal& refusal) {
-    const std::string the = std::string("The ") + part.name;
+// Why an initialisation refuses the file, in a sentence without its full stop.
+std::string fileReason(const DERItem& file, const Img4Refusal& refusal) {
+    if (file.length == 0)
+        return "The file is empty";
+    const Part& part = parts[refusal.subject - Img4SubjectFile];
+    const std::string found = quotedText(escapedText(refusal.found));
+    const DERRefusal& encoding = refusal.encoding;
+    std::uint32_t number = 0;
     switch (refusal.fault) {
-    case DERFaultNoSequence:
-        return the + " is no SEQUENCE but " + derTagName(refusal.tag);
-    case DERFaultTag:
-        return the + "'s " + part.fields[refusal.row] + " is " + derTagName(refusal.tag) + " instead of " +
-               derTagName(refusal.expected);
-    case DERFaultMissing:
-        return the + " ends before its " + part.fields[refusal.row];
-    case DERFaultExcess:
-        return the + " holds " + derTagName(refusal.tag) + " behind its last field";
+    case Img4FaultMagic:
+        if (refusal.subject != Img4SubjectFile)
+            return "The magic is " + found + " instead of " + part.magic;
+        return "The file is no Img4: it begins with " +
+               (refusal.found.length == sizeof number ? found : "no four-character magic") + " instead of " +
+               part.magic;
+    case Img4FaultNumber:
+        return std::string("The ") + part.number + " " + numberReason(refusal.found, 32);
+    case Img4FaultRange:
+        DERParseInteger(&refusal.found, &number);
+        return std::string("The ") + part.number + " is " + std::to_string(number) + ", and " + part.last +
+               " is the last";
+    case Img4FaultLength:
+        return std::string("Octets follow the ") + part.name;
     default:
-        return (refusal.item == file.data ? the : std::string("An item of the ") + part.name) +
-               ", which begins at offset " + std::to_string(refusal.item - file.data) +
-               ", is no strict DER: " + derFaultText(refusal);
+        return std::string("The ") + part.name + " " + derRefusalText(encoding, part.fields[encoding.row], file.data);
     }
 }
 
@@ -51,30 +60,14 @@ const char* kindName(Img4Kind kind) {
     return names[kind];
 }
 
-std::string fileReason(const DERItem& file, const Img4Refusal& refusal) {
-    if (file.length == 0)
-        return "The file is empty";
-    const Part& part = parts[refusal.subject - Img4SubjectFile];
-    std::uint32_t number = 0;
-    switch (refusal.fault) {
-    case Img4FaultMagic:
-        if (refusal.subject != Img4SubjectFile)
-            return "The magic is " + quotedText(refusal.found, mostCharactersShown) + " instead of " + part.magic;
-        return "The file is no Img4: it begins with " +
-               (refusal.found.length == sizeof number ? quotedText(refusal.found, mostCharactersShown)
-                                                      : "no four-character magic") +
-               " instead of " + part.magic;
-    case Img4FaultNumber:
-        return std::string("The ") + part.number + " " + numberReason(refusal.found, 32);
-    case Img4FaultRange:
-        DERParseInteger(&refusal.found, &number);
-        return std::string("The ") + part.number + " is " + std::to_string(number) + ", and " + part.last +
-               " is the last";
-    case Img4FaultLength:
-        return std::string("Octets follow the ") + part.name;
-    default:
-        return encodingReason(file, part, refusal.encoding);
-    }
+Img4Kind readImg4(Findings& findings, Img4Record* record) {
+    const DERItem& file = findings.file();
+    Img4Kind kind = Img4KindUnknown;
+    Img4Refusal refusal = {};
+    refusal.place = file.data;
+    if (Img4DecodeInitExplained(file.data, file.length, record, &kind, &refusal) != DERSuccess)
+        findings.fault(refusal.place, fileReason(file, refusal));
+    return kind;
 }
 
 std::string propertyReason(const Img4Refusal& refusal) {
@@ -83,7 +76,7 @@ std::string propertyReason(const Img4Refusal& refusal) {
     case Img4FaultTag:
         return "is no property";
     case Img4FaultName:
-        return refusal.found.length == 4 ? "is named " + quotedText(refusal.found, 4) + " inside"
+        return refusal.found.length == 4 ? "is named " + quotedText(escapedText(refusal.found)) + " inside"
                                          : "has no four-character name inside";
     case Img4FaultValueType:
         return "is " + derTagName(encoding.tag) +
@@ -92,17 +85,7 @@ std::string propertyReason(const Img4Refusal& refusal) {
     case Img4FaultLength:
         return "goes on behind the SEQUENCE of name and value";
     default:
-        break;
-    }
-    switch (encoding.fault) {
-    case DERFaultNoSequence:
-        return "holds " + derTagName(encoding.tag) + " instead of SEQUENCE";
-    case DERFaultMissing:
-        return encoding.row == 0 ? "is empty inside" : "has no value";
-    case DERFaultExcess:
-        return "goes on behind its value";
-    default:
-        return "is no strict DER inside: " + derFaultText(encoding);
+        return "has a content that " + derRefusalText(encoding, encoding.row == 0 ? "name" : "value");
     }
 }
 
@@ -110,7 +93,7 @@ std::string lookupReason(const Img4Refusal& refusal) {
     const char* const owner = refusal.subject == Img4SubjectBody   ? "The manifest's body"
                               : refusal.subject == Img4SubjectManb ? "\"MANB\""
                                                                    : "The manifest";
-    const std::string code = quotedCode(refusal.tag & DERTagNumberMask);
+    const std::string code = codeText(refusal.tag & DERTagNumberMask, "\"");
     if (refusal.tag == 0)
         return std::string(owner) + " has an element that is no strict DER: " + derFaultText(refusal.encoding);
     return std::string(owner) + " has " +

@@ -3,7 +3,6 @@
 #include <limits>
 #include <memory>
 #include <string>
-#include <string_view>
 #include <vector>
 
 #include "sysconfig/SysConfig3.h"
@@ -21,48 +20,43 @@ using nlohmann::ordered_json;
 constexpr std::size_t mostMessages = 100;
 
 // Collects the library's messages, of which a blob can cause several for each of its entries, for as long as it lives.
-class Messages {
-public:
-    Messages() : earlier_(getSysConfig3LogHandler()) {
+struct Messages {
+    Messages() : earlier(getSysConfig3LogHandler()) {
         current = this;
         setSysConfig3LogHandler(keep);
     }
-    ~Messages() { setSysConfig3LogHandler(earlier_); }
+    ~Messages() { setSysConfig3LogHandler(earlier); }
     Messages(const Messages&) = delete;
     Messages& operator=(const Messages&) = delete;
 
-    const std::string& last() const { return last_; }
     void addTo(ordered_json& json) const {
-        json["messages"] = first_;
-        if (leftOut_ != 0)
-            json["messagesLeftOut"] = leftOut_;
+        json["messages"] = first;
+        if (leftOut != 0)
+            json["messagesLeftOut"] = leftOut;
     }
 
-private:
-    static void keep(int level, const char* format, ...);
+    // Keeps a message without the prototype that most begin with.
+    static void keep(int, const char* format, ...) {
+        char line[512];
+        va_list arguments;
+        va_start(arguments, format);
+        (void)std::vsnprintf(line, sizeof line, format, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
+        va_end(arguments);
+        current->last = line;
+        if (const auto end = current->last.find(") "); end != std::string::npos && format[0] == '%' && format[1] == 's')
+            current->last.erase(0, end + 2);
+        if (current->first.size() < mostMessages)
+            current->first.push_back(current->last);
+        else
+            ++current->leftOut;
+    }
 
     static inline Messages* current = nullptr;
-    const SysConfig3LogHandler earlier_;
-    std::vector<std::string> first_;
-    std::size_t leftOut_ = 0;
-    std::string last_;
+    const SysConfig3LogHandler earlier;
+    std::vector<std::string> first;
+    std::size_t leftOut = 0;
+    std::string last;
 };
-
-// Keeps a message without the prototype that most begin with.
-void Messages::keep(int, const char* format, ...) {
-    char line[512];
-    va_list arguments;
-    va_start(arguments, format);
-    (void)std::vsnprintf(line, sizeof line, format, arguments); // NOLINT(clang-analyzer-valist.Uninitialized)
-    va_end(arguments);
-    const std::string message = line;
-    const std::size_t end = std::string_view(format).starts_with("%s") ? message.find(") ") : std::string::npos;
-    current->last_ = end == std::string::npos ? message : message.substr(end + 2);
-    if (current->first_.size() < mostMessages)
-        current->first_.push_back(current->last_);
-    else
-        ++current->leftOut_;
-}
 
 std::string hexadecimal(std::uint32_t number) {
     char digits[16];
@@ -107,13 +101,10 @@ Elements entries(const ObjectPtr& object, const Entry* (*head)(const __SysConfig
     };
 }
 
-ordered_json manifestHMACs(const __SysConfig3* object) {
-    const auto* manifest = sysConfig3GetManifest(object);
-    SysConfigData payload = {}, metadata = {}, full = {};
-    sysConfig3ManifestGetPayloadHMAC(manifest, &payload);
-    sysConfig3ManifestGetMetadataHMAC(manifest, &metadata);
-    sysConfig3ManifestGetFullHMAC(manifest, &full);
-    return {{"payload", hexDigits(payload)}, {"metadata", hexDigits(metadata)}, {"full", hexDigits(full)}};
+std::string hmac(const __SysConfig3* object, bool (*get)(const __SysConfig3ManifestEntry*, SysConfigData*)) {
+    SysConfigData octets = {};
+    get(sysConfig3GetManifest(object), &octets);
+    return hexDigits(octets);
 }
 
 std::string hmacState(__SysConfig3* object, const Value::Data& key) {
@@ -126,61 +117,47 @@ std::string hmacState(__SysConfig3* object, const Value::Data& key) {
     return sysConfig3IsValidHMAC(object) ? "valid" : "do not match";
 }
 
-// Why there is no object, of which `said` is the library's last message.
-std::string reason(const SysConfig3Refusal& refusal, const std::string& said, const Value::Data& blob) {
+// Why there is no object, in a sentence without its full stop; empty when only the library's last message says so.
+std::string reason(const SysConfig3Refusal& refusal, const std::uint8_t* blob) {
     constexpr const char* names[] = {"",         "blob",           "magic",   "version", "payload", "payload entry",
                                      "metadata", "metadata entry", "manifest"};
-    const DERRefusal& encoding = refusal.encoding;
+    const DERFault fault = refusal.encoding.fault;
     const std::string name = names[refusal.subject];
-    const std::string place = ", at offset " + std::to_string(refusal.place - blob.data());
-    const std::string subject = "The " + name + place + ", ";
-    switch (encoding.fault) {
-    case DERFaultMissing:
-        return "The blob ends before the " + name + place + ".";
-    case DERFaultExcess:
-        return "Octets follow the manifest" + place + ".";
-    case DERFaultNoSequence:
-        return subject + "is " + derTagName(encoding.tag) + " and should be SEQUENCE.";
-    case DERFaultTag:
-        return subject + "is " + derTagName(encoding.tag) + " and should be " + derTagName(encoding.expected) + ".";
-    case DERFaultNone:
-        break;
-    default:
-        return subject + "is no DER: " + derFaultText(encoding) + ".";
-    }
+    if (fault != DERFaultNone)
+        return "The " + (fault >= DERFaultNoSequence ? "blob" : name) + " " +
+               derRefusalText(refusal.encoding, name.c_str(), blob);
     switch (refusal.status) {
     case DERUnexpectedTag:
-        return subject + "has a field that does not belong there.";
+        return "The " + name + " has a field that does not belong there";
     case DERIncompleteSequence:
-        return subject + "lacks a field.";
+        return "The " + name + " lacks a field";
     case DERDecodeError:
-        return subject + "has a field that is no DER, or more fields than there are.";
+        return "The " + name + " has a field that is no DER, or more fields than there are";
     default:
-        return said;
+        return "";
     }
-}
-
-Report refused(const std::string& why, const Messages& said) {
-    Report report;
-    report.fail("No configuration blob. " + why);
-    said.addTo(report.json);
-    return report;
 }
 
 } // namespace
 
 Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
     const Messages said;
-    if (blob.size() > std::numeric_limits<std::uint32_t>::max())
-        return refused("It is larger than 4 GiB.", said);
-    if (blob.empty())
-        return refused("The file is empty.", said);
-    SysConfig3Refusal refusal;
-    const ObjectPtr object(decodeSysConfig3Explained(blob.data(), static_cast<std::uint32_t>(blob.size()), &refusal),
-                           sysconfig::Release());
-    if (!object)
-        return refused(reason(refusal, said.last(), blob), said);
     Report report;
+    Findings findings({blob.data(), blob.size()}, report);
+    SysConfig3Refusal refusal = {};
+    refusal.place = blob.data();
+    const bool fits = blob.size() <= std::numeric_limits<std::uint32_t>::max();
+    const ObjectPtr object(
+        fits ? decodeSysConfig3Explained(blob.data(), static_cast<std::uint32_t>(blob.size()), &refusal) : nullptr,
+        sysconfig::Release());
+    if (!object) {
+        const std::string why = !fits          ? "It is larger than 4 GiB"
+                                : blob.empty() ? "The file is empty"
+                                               : reason(refusal, blob.data());
+        findings.fault(refusal.place, "No configuration blob. " + (why.empty() ? said.last : why));
+        said.addTo(report.json);
+        return report;
+    }
     const Elements payload =
         entries(object, sysConfig3GetHeadPayloadEntry, sysConfig3PayloadEntryGetNextEntry, payloadEntry);
     const Elements metadata =
@@ -190,7 +167,10 @@ Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey) {
                    {"payload", report.lists.add(payload, sysConfig3GetPayloadEntryCount(object.get()))},
                    {"metadata", report.lists.add(metadata, sysConfig3GetMetadataEntryCount(object.get()))},
                    {"hmacState", hmacState(object.get(), hmacKey)},
-                   {"hmacs", manifestHMACs(object.get())}};
+                   {"hmacs",
+                    {{"payload", hmac(object.get(), sysConfig3ManifestGetPayloadHMAC)},
+                     {"metadata", hmac(object.get(), sysConfig3ManifestGetMetadataHMAC)},
+                     {"full", hmac(object.get(), sysConfig3ManifestGetFullHMAC)}}}};
     said.addTo(report.json);
     if (const auto behind = blob.data() + blob.size() - refusal.place; behind != 0)
         report.json["octetsBehind"] = behind;

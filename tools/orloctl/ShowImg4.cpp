@@ -16,162 +16,149 @@ class Reader {
 public:
     Reader(const DERItem& file, Report& report) : report_(report), findings_(file, report) {}
 
-    void read();
+    void read() {
+        report_.json["length"] = findings_.file().length;
+        const Img4Kind kind = readImg4(findings_, &record_);
+        if (kind != Img4KindUnknown)
+            report_.json["kind"] = kindName(kind);
+        if (record_.payloadRaw.data != nullptr)
+            report_.json["payload"] = payload();
+        if (record_.manifestRaw.data != nullptr)
+            report_.json["manifest"] = manifest(kind != Img4KindUnsignedManifest);
+        if (kind == Img4KindContainer)
+            addRestoreInfo();
+        report_.json["notes"] = findings_.notes();
+    }
 
 private:
-    ordered_json section(const DERItem& raw, const char* what);
-    ordered_json payload();
-    ordered_json compression(const DERItem& content);
-    ordered_json manifest(bool isSigned);
-    ordered_json certificates(const DERItem& content);
-    void addRestoreInfo();
+    // The content of the item at the start of `outer`, absent when there is none. The decoder does not look behind the
+    // item in a context item or in a bare payload, so what is there is no fault.
+    DERItem contentOf(const DERItem& outer, const char* what) {
+        DerItems items(outer);
+        if (!items.next())
+            return {};
+        if (const std::uint64_t rest = outer.length - items.encoding().length; rest != 0)
+            findings_.note(std::string(what) + " is followed by octets that belong to nothing, " +
+                           std::to_string(rest) + " of them, at offset " +
+                           std::to_string(findings_.offsetOf(outer.data + items.encoding().length)));
+        return items.item().content;
+    }
 
-    DERItem contentOf(const DERItem& outer, const char* what);
+    // Where the section is that the decoder digests, and what it is called.
+    ordered_json section(const DERItem& raw, const char* what) {
+        contentOf(raw, what);
+        return {{"offset", findings_.offsetOf(raw.data)},
+                {"length", raw.length},
+                {"sha1", digestText(raw, crypto::sha1Size)},
+                {"sha256", digestText(raw, crypto::sha256Size)},
+                {"sha384", digestText(raw, crypto::sha384Size)}};
+    }
+
     ordered_json properties(const DERItem& dictionary, const std::string& where) {
         return report_.lists.add(readProperties(dictionary, where, findings_));
+    }
+
+    // The decoder looks at the size only when it is asked for.
+    ordered_json compression(const DERItem& content) {
+        ordered_json json = ordered_json::object();
+        DerItems numbers(content);
+        for (const auto& [key, what] :
+             {std::pair("algorithm", "algorithm"), {"uncompressedSize", "uncompressed size"}}) {
+            std::uint32_t number = 0;
+            if (!numbers.next())
+                break;
+            if (DERParseInteger(&numbers.item().content, &number) == DERSuccess)
+                json[key] = number;
+            else
+                findings_.fault(numbers.item().content.data,
+                                std::string("The ") + what + " " + numberReason(numbers.item().content, 32));
+        }
+        return json;
+    }
+
+    ordered_json payload() {
+        const Img4PayloadRecord& payload = record_.payload;
+        ordered_json json = section(record_.payloadRaw, "The payload");
+        DERItem encoding;
+        for (const auto& [name, text] : {std::pair("type", payload.type), {"version", payload.version}})
+            if (text.data != nullptr)
+                json[name] = escapedText(text);
+        for (const auto& [name, data] : {std::pair("data", payload.data), {"keybag", payload.keybag}})
+            if (data.data != nullptr)
+                json[name] = dataJson(data);
+        if (payload.data.data != nullptr && payload.data.length == 0)
+            findings_.note("The payload's data is empty, so that the payload counts as absent");
+        if (payload.compression.data != nullptr)
+            json["compression"] = compression(payload.compression);
+        if (Img4DecodeGetPayloadProperties(&record_, &encoding) == DERSuccess) {
+            DerItems fields(contentOf(encoding, "The SEQUENCE of payload properties"));
+            if (fields.next() && fields.next() && fields.item().tag == DERTagSet)
+                json["properties"] = properties(fields.item().content, "the payload");
+        }
+        return json;
+    }
+
+    ordered_json certificates(const DERItem& content) {
+        const std::uint8_t* const file = findings_.file().data;
+        std::uint64_t count = 0;
+        DerItems items(content);
+        for (; items.next(); ++count)
+            if (items.item().tag != DERTagSequence)
+                findings_.fault(items.encoding().data, "Certificate " + std::to_string(count) + " of the chain is " +
+                                                           derTagName(items.item().tag) + " instead of SEQUENCE");
+        if (const DERRefusal* why = items.refusal())
+            findings_.fault(why->place,
+                            "Certificate " + std::to_string(count) + " of the chain " + derRefusalText(*why, "", file));
+        return report_.lists.add([content, file](const auto& take) {
+            DerItems list(content);
+            while (list.next() &&
+                   take({{{"offset", list.encoding().data - file}, {"length", list.encoding().length}}, {}}))
+                ;
+        });
+    }
+
+    ordered_json manifest(bool isSigned) {
+        const Img4ManifestRecord& manifest = record_.manifest;
+        ordered_json json = section(record_.manifestRaw, "The manifest");
+        std::uint32_t version = 0;
+        json["signed"] = isSigned;
+        if (manifest.version.data != nullptr && DERParseInteger(&manifest.version, &version) == DERSuccess)
+            json["version"] = version;
+        if (manifest.body.data != nullptr) {
+            DERItem manb;
+            DERItem manp;
+            Img4Refusal refusal;
+            json["body"] = properties(contentOf(manifest.body, "The manifest's body"), "the manifest body");
+            if (Img4DecodeFindDictionariesExplained(&record_, &manb, &manp, &refusal) != DERSuccess)
+                findings_.fault(refusal.place, lookupReason(refusal) + ", so that every lookup fails");
+        }
+        if (manifest.signature.data != nullptr)
+            json["signature"] = dataJson(manifest.signature);
+        if (manifest.certChain.data != nullptr)
+            json["certificates"] = certificates(manifest.certChain);
+        return json;
+    }
+
+    void addRestoreInfo() {
+        DerItems outer(findings_.file());
+        outer.next();
+        DerItems fields(outer.item().content);
+        while (fields.next() && fields.item().tag != DERTagContextConstructed(1))
+            ;
+        if (fields.item().tag != DERTagContextConstructed(1))
+            return;
+        const DERItem& encoding = fields.item().content;
+        ordered_json json = {{"offset", findings_.offsetOf(encoding.data)}, {"length", encoding.length}};
+        if (record_.restoreInfo.properties.data != nullptr)
+            json["properties"] = properties(record_.restoreInfo.properties, "the restore information");
+        report_.json["restoreInfo"] = std::move(json);
+        contentOf(encoding, "The restore information");
     }
 
     Report& report_;
     Findings findings_;
     Img4Record record_ = {};
 };
-
-// The content of the item at the start of `outer`, absent when there is none. The decoder does not look behind the item
-// in a context item or in a bare payload, so what is there is no fault.
-DERItem Reader::contentOf(const DERItem& outer, const char* what) {
-    DerItems items(outer);
-    if (!items.next())
-        return {};
-    if (const std::uint64_t rest = outer.length - items.encoding().length; rest != 0)
-        findings_.note(std::string(what) + " is followed by octets that belong to nothing, " + std::to_string(rest) +
-                       " of them, at offset " +
-                       std::to_string(findings_.offsetOf(outer.data + items.encoding().length)));
-    return items.item().content;
-}
-
-// Where the section is that the decoder digests, and what it is called.
-ordered_json Reader::section(const DERItem& raw, const char* what) {
-    contentOf(raw, what);
-    return {{"offset", findings_.offsetOf(raw.data)},
-            {"length", raw.length},
-            {"sha1", digestText(raw, crypto::sha1Size)},
-            {"sha256", digestText(raw, crypto::sha256Size)},
-            {"sha384", digestText(raw, crypto::sha384Size)}};
-}
-
-// The decoder looks at the size only when it is asked for.
-ordered_json Reader::compression(const DERItem& content) {
-    ordered_json json = ordered_json::object();
-    DerItems numbers(content);
-    for (const auto& [key, what] : {std::pair("algorithm", "algorithm"), {"uncompressedSize", "uncompressed size"}}) {
-        std::uint32_t number = 0;
-        if (!numbers.next())
-            break;
-        if (DERParseInteger(&numbers.item().content, &number) == DERSuccess)
-            json[key] = number;
-        else
-            findings_.fault(numbers.item().content.data,
-                            std::string("The ") + what + " " + numberReason(numbers.item().content, 32));
-    }
-    return json;
-}
-
-ordered_json Reader::payload() {
-    const Img4PayloadRecord& payload = record_.payload;
-    ordered_json json = section(record_.payloadRaw, "The payload");
-    DERItem encoding;
-    if (payload.type.data != nullptr)
-        json["type"] = escapedText(payload.type);
-    if (payload.version.data != nullptr)
-        json["version"] = escapedText(payload.version);
-    if (payload.data.data != nullptr)
-        json["data"] = dataJson(payload.data);
-    if (payload.data.data != nullptr && payload.data.length == 0)
-        findings_.note("The payload's data is empty, so that the payload counts as absent");
-    if (payload.keybag.data != nullptr)
-        json["keybag"] = dataJson(payload.keybag);
-    if (payload.compression.data != nullptr)
-        json["compression"] = compression(payload.compression);
-    if (Img4DecodeGetPayloadProperties(&record_, &encoding) == DERSuccess) {
-        DerItems fields(contentOf(encoding, "The SEQUENCE of payload properties"));
-        if (fields.next() && fields.next() && fields.item().tag == DERTagSet)
-            json["properties"] = properties(fields.item().content, "the payload");
-    }
-    return json;
-}
-
-ordered_json Reader::certificates(const DERItem& content) {
-    std::uint64_t count = 0;
-    DerItems items(content);
-    for (; items.next(); ++count)
-        if (items.item().tag != DERTagSequence)
-            findings_.fault(items.encoding().data, "Certificate " + std::to_string(count) + " of the chain is " +
-                                                       derTagName(items.item().tag) + " instead of SEQUENCE");
-    if (const DERRefusal* why = items.refusal())
-        findings_.fault(*why, "Certificate " + std::to_string(count) + " of the chain");
-    return report_.lists.add([content, file = findings_.file().data](const auto& take) {
-        DerItems list(content);
-        while (list.next() && take({{{"offset", list.encoding().data - file}, {"length", list.encoding().length}}, {}}))
-            ;
-    });
-}
-
-ordered_json Reader::manifest(bool isSigned) {
-    const Img4ManifestRecord& manifest = record_.manifest;
-    ordered_json json = section(record_.manifestRaw, "The manifest");
-    std::uint32_t version = 0;
-    json["signed"] = isSigned;
-    if (manifest.version.data != nullptr && DERParseInteger(&manifest.version, &version) == DERSuccess)
-        json["version"] = version;
-    if (manifest.body.data != nullptr) {
-        DERItem manb;
-        DERItem manp;
-        Img4Refusal refusal;
-        json["body"] = properties(contentOf(manifest.body, "The manifest's body"), "the manifest body");
-        if (Img4DecodeFindDictionariesExplained(&record_, &manb, &manp, &refusal) != DERSuccess)
-            findings_.fault(refusal.place, lookupReason(refusal) + ", so that every lookup fails");
-    }
-    if (manifest.signature.data != nullptr)
-        json["signature"] = dataJson(manifest.signature);
-    if (manifest.certChain.data != nullptr)
-        json["certificates"] = certificates(manifest.certChain);
-    return json;
-}
-
-void Reader::addRestoreInfo() {
-    DerItems outer(findings_.file());
-    outer.next();
-    DerItems fields(outer.item().content);
-    while (fields.next() && fields.item().tag != DERTagContextConstructed(1))
-        ;
-    if (fields.item().tag != DERTagContextConstructed(1))
-        return;
-    const DERItem& encoding = fields.item().content;
-    ordered_json json = {{"offset", findings_.offsetOf(encoding.data)}, {"length", encoding.length}};
-    if (record_.restoreInfo.properties.data != nullptr)
-        json["properties"] = properties(record_.restoreInfo.properties, "the restore information");
-    report_.json["restoreInfo"] = std::move(json);
-    contentOf(encoding, "The restore information");
-}
-
-void Reader::read() {
-    const DERItem& file = findings_.file();
-    Img4Kind kind = Img4KindUnknown;
-    Img4Refusal refusal = {};
-    refusal.place = file.data;
-    report_.json["length"] = file.length;
-    if (Img4DecodeInitExplained(file.data, file.length, &record_, &kind, &refusal) != DERSuccess)
-        findings_.fault(refusal.place, fileReason(file, refusal));
-    if (kind != Img4KindUnknown)
-        report_.json["kind"] = kindName(kind);
-    if (record_.payloadRaw.data != nullptr)
-        report_.json["payload"] = payload();
-    if (record_.manifestRaw.data != nullptr)
-        report_.json["manifest"] = manifest(kind != Img4KindUnsignedManifest);
-    if (kind == Img4KindContainer)
-        addRestoreInfo();
-    report_.json["notes"] = findings_.notes();
-}
 
 } // namespace
 

@@ -10,11 +10,8 @@ namespace {
 
 using Encodings = std::vector<DERItem>; // of certificates, the root first
 
-constexpr std::size_t whole = std::string::npos;
-constexpr std::size_t inSentence = 128;
-
-// Type and value of one encoded property, whole or as much as a sentence takes.
-std::string valueText(const DERItem& encoding, std::size_t most) {
+// Type and value of one encoded property.
+std::string valueText(const DERItem& encoding) {
     DERDecodedInfo element;
     Img4Property property;
     if (DERDecodeItem(&encoding, &element) != DERSuccess ||
@@ -22,16 +19,21 @@ std::string valueText(const DERItem& encoding, std::size_t most) {
         return "malformed";
     const auto value = derValue(property.valueTag, property.value);
     const bool isPlain = value.is_string() && property.valueTag != DERTagIA5String;
-    return derTagName(property.valueTag) + " " + shortened(isPlain ? value.get<std::string>() : value.dump(), most);
+    return derTagName(property.valueTag) + " " + (isPlain ? value.get<std::string>() : value.dump());
+}
+
+// As much of it as a sentence takes.
+std::string inSentence(const std::string& text) {
+    return shortened(text, 128);
 }
 
 // What the constraint demands; empty when it is none.
-std::string demandOf(const Img4Constraint& constraint, std::size_t most) {
+std::string demandOf(const Img4Constraint& constraint) {
     switch (constraint.kind) {
     case DERTagBoolean:
     case DERTagInteger:
     case DERTagOctetString:
-        return "must be " + valueText(constraint.encoding, most);
+        return "must be " + valueText(constraint.encoding);
     case DERTagContextConstructed(0):
         return "must be there";
     case DERTagContextConstructed(1):
@@ -44,69 +46,55 @@ std::string demandOf(const Img4Constraint& constraint, std::size_t most) {
 // Why it is none, in a clause whose subject it is.
 std::string malformedReason(const Img4Constraint& constraint, bool isRead) {
     if (!isRead)
-        return "is no strict DER: " + derFaultText(constraint.refusal.encoding);
+        return derRefusalText(constraint.refusal.encoding);
     if (constraint.kind != 0)
         return "is " + derTagName(constraint.kind) + ", which is no kind of constraint";
     return constraint.refusal.fault == Img4FaultTag ? "is no dictionary of constraints"
                                                     : propertyReason(constraint.refusal);
 }
 
-std::string brokenReason(const Img4Constraint& constraint, const std::string& code, const std::string& owner) {
-    return "The leaf certificate says that " + code + " of " + owner + " " + demandOf(constraint, inSentence) +
-           ", and " +
-           (constraint.found.data != nullptr                ? "it is " + valueText(constraint.found, inSentence)
-            : constraint.refusal.status == DEREndOfSequence ? "there is none"
-                                                            : "one of the properties there is no strict DER");
-}
-
 void add(const Img4Constraint* constraint, void* context) {
     auto& [rows, broken] = *static_cast<TrustConstraints*>(context);
-    const Img4Fault fault = constraint->refusal.fault;
-    if (constraint->dictionary == 0 && fault != Img4FaultEncoding)
+    const Img4Refusal& refusal = constraint->refusal;
+    if (constraint->dictionary == 0 && refusal.fault != Img4FaultEncoding)
         return; // it is not about one of them
     DERDecodedInfo item = {};
     const bool isRead = DERDecodeItem(&constraint->encoding, &item) == DERSuccess;
     const std::uint64_t code = item.tag & DERTagNumberMask;
     const std::string dictionary = codeText(constraint->dictionary & DERTagNumberMask);
     const std::string owner = dictionary == "MANP" ? "the manifest" : dictionary == "OBJP" ? "the object" : dictionary;
+    const std::string found = constraint->found.data != nullptr ? valueText(constraint->found) : "";
     std::string name = codeText(code);
-    std::string demand = demandOf(*constraint, whole);
-    std::string reason;
+    std::string demand = demandOf(*constraint);
+    std::string reason = "The leaf certificate says that " + codeText(code, "\"") + " of " + owner + " " +
+                         inSentence(demand) + ", and " +
+                         (!found.empty()                       ? "it is " + inSentence(found)
+                          : refusal.status == DEREndOfSequence ? "there is none"
+                                                               : "one of the properties there is no strict DER");
     if (demand.empty()) {
         name = isRead ? derTagName(item.tag) : "one";
         demand = malformedReason(*constraint, isRead);
         reason = "Of the leaf's constraints on " + owner + ", " + name + " " + demand;
-    } else {
-        reason = brokenReason(*constraint, quotedCode(code), owner);
     }
-    const bool isBroken = constraint->isChecked && fault != Img4FaultNone;
-    rows.push_back({{"dictionary", dictionary},
-                    {"name", name},
-                    {"demand", demand},
-                    {"state", !constraint->isChecked ? "not checked"
-                              : isBroken             ? "broken"
-                                                     : "met"}});
-    if (constraint->found.data != nullptr)
-        rows.back()["found"] = valueText(constraint->found, whole);
+    const bool isBroken = constraint->isChecked && refusal.fault != Img4FaultNone;
+    const char* const state = !constraint->isChecked ? "not checked" : isBroken ? "broken" : "met";
+    rows.push_back({{"dictionary", dictionary}, {"name", name}, {"demand", demand}, {"state", state}});
+    if (!found.empty())
+        rows.back()["found"] = found;
     if (isBroken && broken.empty())
         broken = reason;
 }
 
-std::string capitalised(std::string text) {
-    if (text[0] >= 'a' && text[0] <= 'z')
-        text[0] = static_cast<char>(text[0] - 'a' + 'A');
-    return text;
-}
-
-std::string quoted(const std::string& text) {
-    return "\"" + text + "\"";
+// The fields of a certificate of the chain, absent when it is none.
+Certificate certificateAt(const Encodings& chain, std::size_t number) {
+    return (number < chain.size() ? readCertificate(chain[number]) : std::nullopt).value_or(Certificate());
 }
 
 // "certificate 1", with its name.
 std::string call(const Encodings& chain, std::size_t number) {
-    const std::string what = number == 0 ? "the root" : "certificate " + std::to_string(number);
-    const auto certificate = number < chain.size() ? readCertificate(chain[number]) : std::nullopt;
-    return certificate ? what + " (" + quoted(nameText(certificate->tbs.subject)) + ")" : what;
+    const Certificate certificate = certificateAt(chain, number);
+    return (number == 0 ? "the root" : "certificate " + std::to_string(number)) +
+           (certificate.tbs.subject.data != nullptr ? " (" + quotedText(nameText(certificate.tbs.subject)) + ")" : "");
 }
 
 // What is wrong with a signature or the key that verifies it; `otherwise` when it is over something else.
@@ -134,61 +122,53 @@ std::string chainReason(const TrustEvaluation& evaluation, const Encodings& chai
     const Img4TrustRefusal& refusal = evaluation.refusal;
     const Img4DomainProfile& made = evaluation.profile->made;
     const std::uint32_t number = refusal.chain.certificate;
-    const std::string subject = capitalised(call(chain, number));
-    if (refusal.chain.fault == Img4ChainLength)
-        return "The chain has " + std::to_string(count + 1) + (count == 0 ? " certificate" : " certificates") +
-               ", the root included, and the profile demands " + std::to_string(made.chainLength);
-    if (refusal.chain.fault == Img4ChainEncoding)
-        return subject + (refusal.refusal.encoding.fault == DERFaultNone
-                              ? " is no certificate"
-                              : " is no strict DER: " + derFaultText(refusal.refusal.encoding));
-    if (refusal.chain.fault == Img4ChainCertificateSize)
-        return subject + " is longer than 131071 octets";
-    const auto refused = number < chain.size() ? readCertificate(chain[number]) : std::nullopt;
-    const auto issuer = number != 0 && refused ? readCertificate(chain[number - 1]) : std::nullopt;
-    if (!refused || (number != 0 && !issuer))
-        return "The chain cannot be verified";
-    const std::string algorithm = algorithmText(refused->fields.signatureAlgorithm);
+    const Certificate refused = certificateAt(chain, number);
+    const DERTBSCert issuer = number != 0 ? certificateAt(chain, number - 1).tbs : DERTBSCert();
+    const std::string algorithm = algorithmText(refused.fields.signatureAlgorithm);
     const std::string demanded = algorithmName(*made.profile.signatureAlgorithmOid);
     DERDecodedInfo authority = {};
-    DERDecodeItem(&made.domain.authorityName, &authority);
+    std::string subject = call(chain, number);
+    subject[0] = static_cast<char>(subject[0] - 'a' + 'A');
     switch (refusal.chain.fault) {
+    case Img4ChainLength:
+        return "The chain has " + std::to_string(count + 1) + (count == 0 ? " certificate" : " certificates") +
+               ", the root included, and the profile demands " + std::to_string(made.chainLength);
+    case Img4ChainEncoding:
+        return subject + " " +
+               (refusal.refusal.encoding.fault == DERFaultNone ? "is no certificate"
+                                                               : derRefusalText(refusal.refusal.encoding));
+    case Img4ChainCertificateSize:
+        return subject + " is longer than 131071 octets";
     case Img4ChainKey:
-        return subject + " has the key " + keyText(refused->tbs.subjectPublicKeyInfo) + ", and the profile demands " +
+        return subject + " has the key " + shortened(keyText(refused.tbs.subjectPublicKeyInfo), 512) +
+               ", and the profile demands " +
                (DEROidCompare(made.profile.keyAlgorithmOid, &oidRsa) ? "RSA without parameters"
                                                                      : "EC on P-256 or P-384, an uncompressed point");
     case Img4ChainIssuer:
-        return subject + " names the issuer " + quoted(nameText(refused->tbs.issuer)) + ", and the one before it is " +
-               call(chain, number - 1) +
-               (nameText(refused->tbs.issuer) == nameText(issuer->tbs.subject) ? " in another encoding" : "");
+        return subject + " names the issuer " + quotedText(nameText(refused.tbs.issuer)) +
+               ", and the one before it is " + call(chain, number - 1) +
+               (nameText(refused.tbs.issuer) == nameText(issuer.subject) ? " in another encoding" : "");
     case Img4ChainSignatureAlgorithm:
-        return subject + " is signed with " + algorithm +
+        return subject + " is signed with " + shortened(algorithm, 512) +
                (algorithm == demanded ? " and parameters, which it must not have"
                                       : ", and the profile demands " + demanded);
     case Img4ChainSignature:
         return "The signature on " + call(chain, number) + " does not verify under the key of " +
                call(chain, number - 1) +
-               signatureRemark(refusal.signature, issuer->tbs.subjectPublicKeyInfo,
+               signatureRemark(refusal.signature, issuer.subjectPublicKeyInfo,
                                ": the certificate was changed, or another key of that name has signed it");
     case Img4ChainAuthority:
+        DERDecodeItem(&made.domain.authorityName, &authority);
         return subject + " does not carry the common name of the secure-boot authority as a PrintableString: " +
-               quotedText(authority.content, mostCharactersShown);
+               quotedText(escapedText(authority.content));
     default:
         return subject + " has a malformed or empty list of extensions, or constraints that are no SET";
     }
 }
 
-std::string signatureReason(const TrustEvaluation& evaluation, const Encodings& chain) {
-    const auto leaf = readCertificate(chain.back());
-    return "The manifest's signature does not verify under the key of the leaf, " + call(chain, chain.size() - 1) +
-           signatureRemark(evaluation.refusal.signature, leaf ? leaf->tbs.subjectPublicKeyInfo : DERItem{},
-                           ": the manifest's body was changed, or another key has signed it");
-}
-
 std::string walkReason(const Img4Refusal& refusal, const char* owner) {
-    if (refusal.tag == 0)
-        return std::string("A property of ") + owner + " is no strict DER: " + derFaultText(refusal.encoding);
-    return derTagName(refusal.tag) + " of " + owner + " " + propertyReason(refusal);
+    return refusal.tag == 0 ? std::string("A property of ") + owner + " " + derRefusalText(refusal.encoding)
+                            : derTagName(refusal.tag) + " of " + owner + " " + propertyReason(refusal);
 }
 
 } // namespace
@@ -208,7 +188,11 @@ TrustReason explainRefusal(const TrustEvaluation& evaluation, const std::vector<
     case Img4SubjectChain:
         return {"chain", chainReason(evaluation, chain, count)};
     case Img4SubjectSignature:
-        return {"signature", signatureReason(evaluation, chain)};
+        return {"signature", "The manifest's signature does not verify under the key of the leaf, " +
+                                 call(chain, chain.size() - 1) +
+                                 signatureRemark(evaluation.refusal.signature,
+                                                 certificateAt(chain, chain.size() - 1).tbs.subjectPublicKeyInfo,
+                                                 ": the manifest's body was changed, or another key has signed it")};
     case Img4SubjectBody:
     case Img4SubjectManb:
         return {"dictionaries", lookupReason(refusal)};
