@@ -1,6 +1,7 @@
 // Every allocation of the library fails in turn. The linker leads the library's calls of malloc and calloc here;
 // OpenSSL, which computes the HMACs, is led by main.
 #include <cstdlib>
+#include <functional>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -28,36 +29,6 @@ namespace {
 
 using sysconfig::SysConfig3Ptr;
 
-bool reported = false;
-
-// Does not allocate, unlike the recorder of the other tests.
-SYSCONFIG3_PRINTF(2, 3) void noteReport(int, const char*, ...) {
-    reported = true;
-}
-
-// Runs `operation` with the allocation of the given number failing, if there is one. It must report the failure, unless
-// it succeeds all the same, as OpenSSL does without some of its memory.
-template <typename Operation>
-bool run(int failing, Operation operation) {
-    reported = false;
-    setSysConfig3LogHandler(noteReport);
-    failAllocation(failing + 1);
-    const bool success = operation();
-    failAllocation(0);
-    setSysConfig3LogHandler(nullptr);
-    EXPECT_TRUE(success || (allocationHasFailed() && reported)) << "allocation " << failing;
-    return success;
-}
-
-// Calls `test` with 0, then with 1, until nothing has failed. Returns the number of failures.
-template <typename Test>
-int failEach(Test test) {
-    int failing = 0;
-    for (test(failing); allocationHasFailed(); test(failing))
-        ++failing;
-    return failing;
-}
-
 // An object with all kinds of entry. Of version 0x30002 it has a key and valid HMACs.
 SysConfig3Ptr filledObject(SysConfig3Version version) {
     SysConfig3Ptr object = newObject(version);
@@ -80,117 +51,109 @@ std::string contentOf(const SysConfig3Ptr& object) {
     return payloadOf(object) + "; " + metadataOf(object);
 }
 
-TEST(AllocationFailure, makesDecodeGiveNone) {
+// An operation on a filled object, how many allocations it makes, and what it says when the first of them fail. OpenSSL
+// makes any number more, and succeeds without some of its memory.
+struct Row {
+    const char* name;
+    SysConfig3Version version;
+    int allocations;
+    std::function<bool(const SysConfig3Ptr&)> operation;
+    Lines lines = {};
+    bool asksOpenSSL = version == 0x30002;
+};
+
+// Runs the operation with the allocation of the given number failing, if there is one.
+void run(const Row& row, int failing) {
+    SCOPED_TRACE(std::string(row.name) + ", allocation " + std::to_string(failing));
+    const SysConfig3Ptr object = filledObject(row.version);
+    const std::string before = contentOf(object);
+    const Recorder recorder;
+    failAllocation(failing + 1);
+    const bool success = row.operation(object);
+    failAllocation(0);
+    EXPECT_TRUE(success || (allocationHasFailed() && !Recorder::lines.empty()));
+    EXPECT_TRUE(success != allocationHasFailed() || row.asksOpenSSL);
+    EXPECT_TRUE(success || contentOf(object) == before);
+    if (static_cast<std::size_t>(failing) < row.lines.size()) {
+        EXPECT_EQ(Recorder::lines.at(0), row.lines[static_cast<std::size_t>(failing)]);
+    }
+    if (row.version != 0x30002)
+        return;
+    // It is as it was, or changed and stale.
+    EXPECT_TRUE(success || sysConfig3IsValidHMAC(object.get()));
+    EXPECT_TRUE(sysConfig3UpdateHMAC(object.get()) && sysConfig3IsValidHMAC(object.get()));
+}
+
+std::function<bool(const SysConfig3Ptr&)> adding(const auto& entry) {
+    return [&entry](const SysConfig3Ptr& object) { return add(object, entry); };
+}
+
+std::function<bool(const SysConfig3Ptr&)> creating(bool (*create)(const __SysConfig3*, SysConfigData*)) {
+    return [create](const SysConfig3Ptr& object) {
+        SysConfigData out = {};
+        const bool success = create(object.get(), &out);
+        const sysconfig::BytesPtr owner(out.data);
+        EXPECT_EQ(out.data != nullptr, success);
+        EXPECT_EQ(out.length, 32U);
+        return success;
+    };
+}
+
+bool encodeInto(const SysConfig3Ptr& object) {
+    std::uint8_t octet = 9;
+    SysConfigData out = {&octet, 1};
+    const bool success = encodeSysConfig3(object.get(), &out);
+    const sysconfig::BytesPtr owner(success ? out.data : nullptr);
+    EXPECT_EQ(out.data == &octet && out.length == 1, !success);
+    return success;
+}
+
+bool registerKey(const SysConfig3Ptr& object) {
+    const bool success = sysConfig3SetHMACKey(object.get(), hmacKey);
+    EXPECT_EQ(object->hmacKey.data == nullptr && object->hmacKey.length == 0, !success);
+    return success;
+}
+
+TEST(AllocationFailure, isReportedAndLeavesEverythingAsItWas) {
     const Bytes blob = encode(filledObject(0x30003));
-    const int failures = failEach([&](int failing) {
-        SysConfig3Ptr object;
-        const bool success = run(failing, [&] { return (object = decode(blob)) != nullptr; });
-        EXPECT_EQ(success, !allocationHasFailed());
-    });
-    // The object, two manifests of three HMACs, sixteen entries and two indexes.
-    EXPECT_GE(failures, 1 + 2 * 4 + 16 + 2);
-}
-
-TEST(AllocationFailure, makesAddFailAndChangeNothing) {
-    const std::string before = contentOf(filledObject(0x30003));
-    const auto expectTwoFailures = [&](const auto& entry) {
-        const int failures = failEach([&](int failing) {
-            const SysConfig3Ptr object = filledObject(0x30003);
-            const bool success = run(failing, [&] { return add(object, entry); });
-            EXPECT_EQ(success, !allocationHasFailed());
-            EXPECT_EQ(contentOf(object) == before, allocationHasFailed());
-        });
-        EXPECT_EQ(failures, 2);
-    };
-    expectTwoFailures(payloadData(0x41414141, {9}));
-    expectTwoFailures(payloadData(keyWCh0, {9})); // a present key
-    expectTwoFailures(metadataString("new", "v"));
-    expectTwoFailures(metadataString("0", "v")); // a present key
-}
-
-TEST(AllocationFailure, leavesAKeyedObjectAsItWasOrChangedAndStale) {
-    const std::string before = contentOf(filledObject(0x30002));
-    const auto entry = payloadData(keyWCh0, {9});
-    const int failures = failEach([&](int failing) {
-        const SysConfig3Ptr object = filledObject(0x30002);
-        const bool success = run(failing, [&] { return add(object, entry); });
-        EXPECT_EQ(contentOf(object) == before, !success);
-        EXPECT_TRUE(success || sysConfig3IsValidHMAC(object.get()));
-        EXPECT_TRUE(sysConfig3UpdateHMAC(object.get()));
-        EXPECT_TRUE(sysConfig3IsValidHMAC(object.get()));
-    });
-    // Three validations and two recomputations, each of which asks OpenSSL for memory.
-    EXPECT_GE(failures, 2 * 5);
-}
-
-TEST(AllocationFailure, leavesACreatedHMACWithoutData) {
-    const SysConfig3Ptr object = filledObject(0x30002);
-    for (const auto create : {sysConfig3CreatePayloadHMAC, sysConfig3CreateMetadataHMAC, sysConfig3CreateFullHMAC}) {
-        failEach([&](int failing) {
-            SysConfigData out = {};
-            const bool success = run(failing, [&] { return create(object.get(), &out); });
-            const sysconfig::BytesPtr owner(out.data);
-            EXPECT_EQ(out.data != nullptr, success);
-            EXPECT_EQ(out.length, 32U);
-        });
-    }
-}
-
-TEST(AllocationFailure, makesARegisteredKeyAbsent) {
-    const int failures = failEach([](int failing) {
-        const SysConfig3Ptr object = filledObject(0x30002);
-        const bool success = run(failing, [&] { return sysConfig3SetHMACKey(object.get(), hmacKey); });
-        EXPECT_EQ(success, !allocationHasFailed());
-        EXPECT_EQ(object->hmacKey.data == nullptr && object->hmacKey.length == 0, allocationHasFailed());
-    });
-    EXPECT_EQ(failures, 1);
-}
-
-TEST(AllocationFailure, makesANewObjectNone) {
-    const int failures = failEach([](int failing) {
-        SysConfig3Ptr object;
-        const auto make = [&] {
-            object.reset(allocSysConfig3WithHMACKey(bCfg, 0x30002, hmacKey));
-            return object != nullptr;
-        };
-        EXPECT_TRUE(!run(failing, make) || sysConfig3IsValidHMAC(object.get()));
-    });
-    // The object, a manifest of three HMACs, the key, and the computed HMACs.
-    EXPECT_GE(failures, 1 + 4 + 1 + 3);
-}
-
-TEST(AllocationFailure, makesEncodeFailAndLeaveTheResultAlone) {
-    for (const SysConfig3Version version : {0x30002U, 0x30003U}) {
-        const SysConfig3Ptr object = filledObject(version);
-        const int failures = failEach([&](int failing) {
-            std::uint8_t octet = 9;
-            SysConfigData out = {&octet, 1};
-            const bool success = run(failing, [&] { return encodeSysConfig3(object.get(), &out); });
-            const sysconfig::BytesPtr owner(success ? out.data : nullptr);
-            EXPECT_EQ(out.data == &octet && out.length == 1, !success);
-        });
+    const auto payload = payloadData(0x41414141, {9}), presentPayload = payloadData(keyWCh0, {9});
+    const auto metadata = metadataString("new", "v"), presentMetadata = metadataString("0", "v");
+    const Lines ofAdd = {"_allocSysConfig3PayloadEntryInternal: malloc failed.",
+                         "_sysConfig3AddPayloadEntry: malloc failed."};
+    const Row rows[] = {
+        // The object, two manifests of three HMACs, sixteen entries and two indexes.
+        {"decode", 0x30003, 1 + 2 * 4 + 16 + 2, [&](const SysConfig3Ptr&) { return decode(blob) != nullptr; }},
+        {"new payload entry", 0x30003, 2, adding(payload), ofAdd},
+        {"payload entry of a present key", 0x30003, 2, adding(presentPayload), ofAdd},
+        {"new metadata entry", 0x30003, 2, adding(metadata)},
+        {"metadata entry of a present key", 0x30003, 2, adding(presentMetadata)},
+        // Three validations and two recomputations, each of which asks OpenSSL for memory.
+        {"entry of a keyed object", 0x30002, 2 * 5, adding(presentPayload)},
+        {"payload HMAC", 0x30002, 2, creating(sysConfig3CreatePayloadHMAC)},
+        {"metadata HMAC", 0x30002, 2, creating(sysConfig3CreateMetadataHMAC)},
+        {"full HMAC", 0x30002, 2, creating(sysConfig3CreateFullHMAC)},
+        {"key", 0x30003, 1, registerKey, {"sysConfig3SetHMACKey: malloc() returned NULL."}},
+        {"new object",
+         0x30003,
+         5,
+         [](const SysConfig3Ptr&) { return newObject() != nullptr; },
+         {"allocSysConfig3: malloc failed."}},
+        // The object, a manifest of three HMACs, the key, and the computed HMACs.
+        {"new keyed object", 0x30002, 1 + 4 + 1 + 3,
+         [](const SysConfig3Ptr&) {
+             return SysConfig3Ptr(allocSysConfig3WithHMACKey(bCfg, 0x30002, hmacKey)) != nullptr;
+         }},
+        {"encode", 0x30003, 1, encodeInto, {"encodeSysConfig3: malloc failed."}},
         // The blob itself, and what OpenSSL takes for three validations.
-        EXPECT_GE(failures, sysConfig3HMACIsSupported(version) ? 1 + 2 * 3 : 1);
-    }
-}
-
-TEST(AllocationFailure, isReportedByTheOperationThatMeetsIt) {
-    const auto firstLineWhen = [](int failing, auto operation) {
-        const Recorder recorder;
-        failAllocation(failing + 1);
-        operation();
-        failAllocation(0);
-        return Recorder::lines.empty() ? std::string() : Recorder::lines.front();
+        {"encode of a keyed object", 0x30002, 1 + 2 * 3, encodeInto},
     };
-    const SysConfig3Ptr object = filledObject(0x30003);
-    const auto entry = payloadData(0x41414141, {9});
-    const auto addEntry = [&] { return add(object, entry); };
-    EXPECT_EQ(firstLineWhen(0, addEntry), "_allocSysConfig3PayloadEntryInternal: malloc failed.");
-    EXPECT_EQ(firstLineWhen(1, addEntry), "_sysConfig3AddPayloadEntry: malloc failed.");
-    EXPECT_EQ(firstLineWhen(0, [&] { return sysConfig3SetHMACKey(object.get(), hmacKey); }),
-              "sysConfig3SetHMACKey: malloc() returned NULL.");
-    EXPECT_EQ(firstLineWhen(0, [] { return newObject(); }), "allocSysConfig3: malloc failed.");
-    EXPECT_EQ(firstLineWhen(0, [&] { return encode(object); }), "encodeSysConfig3: malloc failed.");
+    for (const Row& row : rows) {
+        int failures = 0;
+        for (run(row, 0); allocationHasFailed(); run(row, failures))
+            ++failures;
+        EXPECT_TRUE(failures == row.allocations || (row.asksOpenSSL && failures > row.allocations))
+            << row.name << ": " << failures;
+    }
 }
 
 } // namespace

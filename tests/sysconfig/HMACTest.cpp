@@ -89,8 +89,8 @@ TEST(HMAC, isMadeInABufferOfTheCaller) {
 }
 
 TEST(HMACKey, makesAnObjectThatIsNewStaleOrValid) {
-    const Lines noKey = {"Invalid HMAC key. sysconfig->hmacKey.data = (nil), sysconfig->hmacKey.length = 0. Did you "
-                         "register HMAC key?"};
+    const Lines noKey = {"Invalid HMAC key. sysconfig->hmacKey.data = %p<(nil)>, sysconfig->hmacKey.length = %d<0>. "
+                         "Did you register HMAC key?"};
     const Lines noMatch = {"sysConfig3IsValidHMAC: Payload HMAC does not match.",
                            "sysConfig3IsValidHMAC: Metadata HMAC does not match.",
                            "sysConfig3IsValidHMAC: Full HMAC does not match."};
@@ -160,23 +160,18 @@ TEST(HMAC, saysWhatIsMissing) {
     const Recorder recorder;
     const Refusal refusals[] = {
         {!allocSysConfig3WithHMACKey(bCfg, 0x30003, hmacKey),
-         "allocSysConfig3WithHMACKey: Requested version (0x%X) does not support HMAC.",
-         "allocSysConfig3WithHMACKey: Requested version (0x30003) does not support HMAC."},
+         "allocSysConfig3WithHMACKey: Requested version (0x%X<30003>) does not support HMAC."},
         {!sysConfig3SetHMACKey(nullptr, hmacKey), "sysConfig3SetHMACKey: sysconfig is NULL."},
         {!sysConfig3UpdateHMAC(nullptr), "sysConfig3UpdateHMAC: sysconfig is NULL."},
         {!sysConfig3UpdateHMAC(later.get()),
-         "sysConfig3UpdateHMAC: This SysConfig version (0x%X) does not support HMAC.",
-         "sysConfig3UpdateHMAC: This SysConfig version (0x30003) does not support HMAC."},
+         "sysConfig3UpdateHMAC: This SysConfig version (0x%X<30003>) does not support HMAC."},
         {!sysConfig3IsValidHMAC(nullptr), "sysConfig3IsValidHMAC: sysconfig is NULL."},
-        {!sysConfig3IsValidHMAC(keyless.get()),
-         "Invalid HMAC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %d. Did you register HMAC key?",
-         "Invalid HMAC key. sysconfig->hmacKey.data = (nil), sysconfig->hmacKey.length = 0. Did you register HMAC "
-         "key?"},
+        {!sysConfig3IsValidHMAC(keyless.get()), "Invalid HMAC key. sysconfig->hmacKey.data = %p<(nil)>, "
+                                                "sysconfig->hmacKey.length = %d<0>. Did you register HMAC key?"},
         {!sysConfig3CreateFullHMAC(nullptr, &out), "sysConfig3CreateFullHMAC: sysconfig is NULL."},
         {!sysConfig3CreatePayloadHMAC(keyless.get(), nullptr),
-         "sysConfig3CreatePayloadHMAC: Invalid HAMC key. sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u",
-         "sysConfig3CreatePayloadHMAC: Invalid HAMC key. sysconfig->hmacKey.data = (nil), sysconfig->hmacKey.length = "
-         "0"},
+         "sysConfig3CreatePayloadHMAC: Invalid HAMC key. sysconfig->hmacKey.data = %p<(nil)>, "
+         "sysconfig->hmacKey.length = %u<0>"},
         {!sysConfig3CreateMetadataHMAC(ready.get(), nullptr), "sysConfig3CreateMetadataHMAC: hmac is NULL"},
         {!sysConfig3CreateFullHMAC(ready.get(), nullptr), "sysConfig3CreateFullHMAC: hmac is NULL"},
     };
@@ -188,14 +183,14 @@ TEST(HMAC, saysWhatIsMissing) {
     EXPECT_EQ(Recorder::lines, Lines{});
     EXPECT_EQ(allocSysConfig3WithHMACKey(1, 0x30002, hmacKey), nullptr);
     EXPECT_EQ(allocSysConfig3WithHMACKey(bCfg, 0x30002, {keyBytes, 0}), nullptr);
-    const std::string noKey = "sysconfig->hmacKey.data = %p, sysconfig->hmacKey.length = %u";
-    const Lines expected = {"allocSysConfig3: invalid magic provided 0x%08X",
+    const std::string noKey = "sysconfig->hmacKey.data = %p<(nil)>, sysconfig->hmacKey.length = %u<0>";
+    const Lines expected = {"allocSysConfig3: invalid magic provided 0x%08X<00000001>",
                             "allocSysConfig3WithHMACKey: Failed to allocate sysconfig.",
                             "sysConfig3CreatePayloadHMAC: Invalid HAMC key. " + noKey,
                             "sysConfig3CreateMetadataHMAC: Invalid HAMC key. " + noKey,
                             "sysConfig3CreateFullHMAC: Invalid HMAC key. " + noKey,
                             "allocSysConfig3WithHMACKey: Failed to update HMAC."};
-    EXPECT_EQ(Recorder::formats, expected);
+    EXPECT_EQ(Recorder::lines, expected);
     EXPECT_EQ(out.data, nullptr);
 }
 

@@ -26,33 +26,26 @@ TEST(SysConfig3, saysWhatIsWrongWithItsArguments) {
     __SysConfig3* const object = owned.get();
     const Recorder recorder;
     const Refusal refusals[] = {
-        {!allocSysConfig3(0x62436600, 0x30004), "allocSysConfig3: invalid magic provided 0x%08X",
-         "allocSysConfig3: invalid magic provided 0x62436600"},
-        {!allocSysConfig3(bCfg, 0x30004), "allocSysConfig3: invalid version provided 0x%08X",
-         "allocSysConfig3: invalid version provided 0x00030004"},
+        {!allocSysConfig3(0x62436600, 0x30004), "allocSysConfig3: invalid magic provided 0x%08X<62436600>"},
+        {!allocSysConfig3(bCfg, 0x30004), "allocSysConfig3: invalid version provided 0x%08X<00030004>"},
         {!allocSysConfig3PayloadEntryWithData(0, "c", nullptr, 0),
          "_allocSysConfig3PayloadEntryInternal: key was invalid"},
         {!_allocSysConfig3PayloadEntryInternal(1, nullptr, oneByte, 1, nullptr, true),
          "_allocSysConfig3PayloadEntryInternal: data, string and deleted are mutually exclusive. Caller provided "
-         "parameters [%s%s%s ]",
-         "_allocSysConfig3PayloadEntryInternal: data, string and deleted are mutually exclusive. Caller provided "
-         "parameters [ data deleted ]"},
+         "parameters [%s< data>%s<>%s< deleted> ]"},
         {!allocSysConfig3MetadataEntry(nullptr, oneByte, 1, "s"), "allocSysConfig3MetadataEntry: key must be non-NULL"},
         {!allocSysConfig3Manifest(0x30003, nullptr, nullptr, nullptr),
-         "allocSysConfig3Manifest: one of the hmacs were NULL. payload ptr: %p metdata ptr: %p full ptr: %p",
-         "allocSysConfig3Manifest: one of the hmacs were NULL. payload ptr: (nil) metdata ptr: (nil) full ptr: (nil)"},
+         "allocSysConfig3Manifest: one of the hmacs were NULL. payload ptr: %p<(nil)> metdata ptr: %p<(nil)> full ptr: "
+         "%p<(nil)>"},
         {!_copySysConfigData(nullptr, nullptr), "_copySysConfigData: sourceData or destData was NULL"},
         {!_copySysConfigData(&none, &cleared), "_copySysConfigData: sourceData was 0 length"},
         {!_allocAndCopyData(oneByte, 0), "_allocAndCopyData: data was zero length"},
         {!_sysConfig3SetManifest(nullptr, nullptr),
-         "_sysConfig3SetManifest: sysconfig (0x%p) or manifest (0x%p) argument was null",
-         "_sysConfig3SetManifest: sysconfig (0x(nil)) or manifest (0x(nil)) argument was null"},
-        {!_sysConfig3SetManifest(object, manifest),
-         "_sysConfig3SetManifest: sysconfig version (0X%08X) did not match manifest version (0X%08X",
-         "_sysConfig3SetManifest: sysconfig version (0X00030003) did not match manifest version (0X00000007"},
+         "_sysConfig3SetManifest: sysconfig (0x%p<(nil)>) or manifest (0x%p<(nil)>) argument was null"},
+        {!_sysConfig3SetManifest(object, manifest), "_sysConfig3SetManifest: sysconfig version (0X%08X<00030003>) did "
+                                                    "not match manifest version (0X%08X<00000007>"},
         {!_sysConfig3HMACsAreEqual(0x30004, nullptr, nullptr),
-         "_sysConfig3HMACsAreEqual: Unsupported sysconfig version: 0x%X",
-         "_sysConfig3HMACsAreEqual: Unsupported sysconfig version: 0x30004"},
+         "_sysConfig3HMACsAreEqual: Unsupported sysconfig version: 0x%X<30004>"},
         {!_sysConfig3AddPayloadEntry(object, nullptr),
          "_sysConfig3AddPayloadEntry: invalid argument. sysconfig and etnry cannot be NULL"},
         {!_sysConfig3AddMetadataEntry(object, nullptr),
@@ -63,10 +56,8 @@ TEST(SysConfig3, saysWhatIsWrongWithItsArguments) {
          "_sysConfig3DeleteMetadataEntryForKey: invalid argument. sysconfig and key cannot be NULL"},
         {!sysConfig3AddPayloadEntry(object, nullptr),
          "sysConfig3AddPayloadEntry: invalid argument. sysconfig and entry cannot be NULL"},
-        {!add(keyed, payloadDeleted(keyWCh0)),
-         "sysConfig3AddPayloadEntry: Payloads with the deleted flag are only supported on version 0x%08X or higher.",
-         "sysConfig3AddPayloadEntry: Payloads with the deleted flag are only supported on version 0x00030003 or "
-         "higher."},
+        {!add(keyed, payloadDeleted(keyWCh0)), "sysConfig3AddPayloadEntry: Payloads with the deleted flag are only "
+                                               "supported on version 0x%08X<00030003> or higher."},
         {!sysConfig3AddMetadataEntry(nullptr, nullptr),
          "sysConfig3AddMetadataEntry: invalid argument. sysconfig and entry cannot be NULL"},
         {!sysConfig3DeletePayloadEntryForKey(nullptr, 1),

@@ -7,6 +7,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -15,11 +16,10 @@
 
 using Lines = std::vector<std::string>;
 
-// What a call that fails says: the format of its one message and, where it has arguments, the message.
+// A call that is to fail, and the one line that it is to say.
 struct Refusal {
     bool failed;
-    std::string format;
-    std::string line = format;
+    std::string line;
 };
 
 // While one lives it is registered with both hooks. One at a time.
@@ -37,25 +37,21 @@ public:
     Recorder(const Recorder&) = delete;
     Recorder& operator=(const Recorder&) = delete;
 
-    // The messages' formats, and the messages themselves. A "%s " that a format begins with, or the prototype that it
-    // stands for, is cut down to the operation's name and a colon. Exceptions have an exclamation mark before them, and
-    // a message of another level than 2 has its level.
-    static inline Lines formats, lines;
+    // The messages, each as its format with the text of an argument behind every conversion, as in "0x%X<30004>". A "%s
+    // " that a format begins with becomes the operation's name and a colon. Exceptions have an exclamation mark before
+    // them, and a message of another level than 2 has its level.
+    static inline Lines lines;
     // The prototype that the last message began with.
     static inline std::string prototype;
 
     // Takes the lines recorded so far.
-    static Lines take() {
-        formats.clear();
-        return std::exchange(lines, {});
-    }
+    static Lines take() { return std::exchange(lines, {}); }
 
     // Expects that the calls, all made since this began to record, failed with their messages.
     static void expect(std::span<const Refusal> refusals) {
         ASSERT_EQ(lines.size(), refusals.size());
         for (std::size_t i = 0; i < refusals.size(); ++i) {
             EXPECT_TRUE(refusals[i].failed) << refusals[i].line;
-            EXPECT_EQ(formats[i], refusals[i].format);
             EXPECT_EQ(lines[i], refusals[i].line);
         }
     }
@@ -83,22 +79,26 @@ private:
         va_end(arguments);
     }
 
-    static void record(const std::string& mark, std::string_view format, std::va_list arguments) {
-        char text[1024];
-        std::va_list again;
-        va_copy(again, arguments);
-        const int length = std::vsnprintf(text, sizeof text, format.data(), arguments);
-        std::string_view line = length < 0 ? "cannot be formatted" : text;
-        std::string name;
+    static void record(std::string line, std::string_view format, std::va_list arguments) {
         if (format.starts_with("%s ")) {
-            prototype = va_arg(again, const char*);
-            name = nameOf(prototype);
-            line.remove_prefix(prototype.size() + 1);
+            prototype = va_arg(arguments, const char*);
+            line += nameOf(prototype);
             format.remove_prefix(3);
         }
-        va_end(again);
-        formats.push_back(mark + name + std::string(format));
-        lines.push_back(mark + name + std::string(line));
+        for (std::size_t start; (start = format.find('%')) != std::string_view::npos;) {
+            const std::size_t end = format.find_first_of("duXsp", start) + 1;
+            const std::string conversion(format.substr(start, end - start));
+            char text[64] = "";
+            if (conversion.back() == 's' || conversion.back() == 'p')
+                std::snprintf(text, sizeof text, conversion.c_str(), va_arg(arguments, const char*));
+            else if (conversion.find("ll") != std::string::npos)
+                std::snprintf(text, sizeof text, conversion.c_str(), va_arg(arguments, unsigned long long));
+            else
+                std::snprintf(text, sizeof text, conversion.c_str(), va_arg(arguments, unsigned));
+            line.append(format.substr(0, start)).append(conversion + '<' + text + '>');
+            format.remove_prefix(end);
+        }
+        lines.push_back(line.append(format));
     }
 };
 
