@@ -1,47 +1,23 @@
 #include "der/DERDecode.h"
 
 #include <algorithm>
+#include <cstddef>
 #include <string>
 
 #include <gtest/gtest.h>
 
 #include "tests/der/Bytes.h"
+#include "tests/der/Headers.h"
 
 namespace {
 
-constexpr DERTag application = UINT64_C(1) << 62;
-constexpr DERTag privatePrimitive = UINT64_C(3) << 62;
-
 TEST(DERItem, isDecodedAlikeByAllThreeDecodersAndCutOffOnlyAsAPart) {
-    const struct {
-        const char* header;
-        std::uint64_t length;
-        DERTag tag;
-    } rows[] = {
-        {"05 00", 0, 0x05},
-        {"02 01", 1, DERTagInteger},
-        {"30 7F", 127, DERTagSequence},
-        {"04 81 80", 128, DERTagOctetString},
-        {"04 81 FF", 255, DERTagOctetString},
-        {"31 82 01 00", 256, DERTagSet},
-        {"04 83 01 00 00", 0x10000, DERTagOctetString},
-        {"9E 00", 0, DERTagContextPrimitive(30)},
-        {"A0 02", 2, DERTagContextConstructed(0)},
-        {"41 00", 0, application + 1},
-        {"1F 1F 00", 0, 31},
-        {"1F 7F 03", 3, 127},
-        {"1F 81 00 00", 0, 128},
-        {"FF 85 9A C1 82 59 02", 2, DERTagPrivateConstructed(0x53504159)},
-        {"DF 9F FF FF FF FF FF FF FF 7F 81 80", 128, privatePrimitive + DERTagNumberMask},
-        {"04 88 7F FF FF FF FF FF FF FF", INT64_MAX, DERTagOctetString},
-        {"04 88 80 00 00 00 00 00 00 00", UINT64_C(1) << 63, DERTagOctetString},
-        {"04 88 FF FF FF FF FF FF FF FF", UINT64_MAX, DERTagOctetString},
-    };
-    for (const auto& row : rows) {
-        const Bytes header = bytes(row.header);
+    for (const auto& row : headers) {
+        const std::string octets = std::string(row.identifier) + " " + row.lengthOctets;
+        const Bytes header = bytes(octets);
         const std::uint64_t most = std::min<std::uint64_t>(row.length, 0x10000);
         for (const std::uint64_t available : {most / 2, most, most + 3}) {
-            SCOPED_TRACE(std::string(row.header) + " and " + std::to_string(available) + " octets");
+            SCOPED_TRACE(octets + " and " + std::to_string(available) + " octets");
             Bytes input(header.size() + available, 0x1F);
             std::copy(header.begin(), header.end(), input.begin());
             const DERItem der = itemOf(input);
@@ -70,34 +46,42 @@ TEST(DERItem, isDecodedAlikeByAllThreeDecodersAndCutOffOnlyAsAPart) {
 }
 
 TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
-    const std::pair<const char*, const char*> rows[] = {
-        {"nothing", ""},
-        {"no length", "05"},
-        {"high tag without a digit and length", "1F 1F"},
-        {"high tag cut off in its digits", "1F FF FF"},
-        {"high tag without a length", "1F FF 7F"},
-        {"high tag for a low number", "1F 1E 00"},
-        {"high tag with a leading zero digit", "1F 80 01 00"},
-        {"tag number 2^61", "1F A0 80 80 80 80 80 80 80 00 00"},
-        {"tag number 2^63", "1F 81 80 80 80 80 80 80 80 80 00 00"},
-        {"tag number that is 5 in its low 64 bits", "1F 82 80 80 80 80 80 80 80 80 80 05 00"},
-        {"indefinite length", "30 80 00 00"},
-        {"reserved length octet", "04 FF 00 00"},
-        {"length that fits the short form", "02 81 05 00 00 00 00 00"},
-        {"length 127 in the long form", "02 81 7F"},
-        {"length with a leading zero", "04 82 00 90"},
-        {"nine length octets", "04 89 01 00 00 00 00 00 00 00 81"},
-        {"one length octet missing", "04 82 01"},
-        {"all length octets missing", "04 81"},
-        {"length octets missing after a high tag", "1F 1F 82 01"},
+    const struct {
+        const char* why;
+        const char* octets;
+        DERFault fault;
+        std::ptrdiff_t place;
+    } rows[] = {
+        {"nothing", "", DERFaultHeaderCutShort, 0},
+        {"no length", "05", DERFaultHeaderCutShort, 1},
+        {"high tag without a digit and length", "1F 1F", DERFaultHeaderCutShort, 2},
+        {"high tag cut off in its digits", "1F FF FF", DERFaultHeaderCutShort, 3},
+        {"high tag without a length", "1F FF 7F", DERFaultHeaderCutShort, 3},
+        {"high tag for a low number", "1F 1E 00", DERFaultTagForm, 1},
+        {"high tag with a leading zero digit", "1F 80 01 00", DERFaultTagLeadingZero, 1},
+        {"tag number 2^61", "1F A0 80 80 80 80 80 80 80 00 00", DERFaultTagNumber, 9},
+        {"tag number 2^63", "1F 81 80 80 80 80 80 80 80 80 00 00", DERFaultTagNumber, 10},
+        {"tag number that is 5 in its low 64 bits", "1F 82 80 80 80 80 80 80 80 80 80 05 00", DERFaultTagNumber, 10},
+        {"indefinite length", "30 80 00 00", DERFaultLengthIndefinite, 1},
+        {"reserved length octet", "04 FF 00 00", DERFaultLengthOctets, 1},
+        {"length that fits the short form", "02 81 05 00 00 00 00 00", DERFaultLengthForm, 1},
+        {"length 127 in the long form", "02 81 7F", DERFaultLengthForm, 1},
+        {"length with a leading zero", "04 82 00 90", DERFaultLengthForm, 1},
+        {"nine length octets", "04 89 01 00 00 00 00 00 00 00 81", DERFaultLengthOctets, 1},
+        {"one length octet missing", "04 82 01", DERFaultHeaderCutShort, 3},
+        {"all length octets missing", "04 81", DERFaultHeaderCutShort, 2},
+        {"length octets missing after a high tag", "1F 1F 82 01", DERFaultHeaderCutShort, 4},
     };
-    for (const auto& [why, octets] : rows) {
-        SCOPED_TRACE(why);
-        const Bytes input = bytes(octets);
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.why);
+        const Bytes input = bytes(row.octets);
         const DERItem der = itemOf(input);
         DERDecodedInfo decoded;
+        DERRefusal refusal;
         std::uint64_t declared = 0;
-        EXPECT_EQ(DERDecodeItem(&der, &decoded), DERDecodeError);
+        EXPECT_EQ(DERDecodeItemExplained(&der, &decoded, &refusal), DERDecodeError);
+        EXPECT_EQ(refusal.fault, row.fault);
+        EXPECT_EQ(refusal.place - input.data(), row.place);
         EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&der, &decoded, nullptr), DERDecodeError);
         EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&der, &decoded, &declared), DERDecodeError);
         EXPECT_EQ(DERDecodeItemPartialBuffer(&der, &decoded, false), DERDecodeError);

@@ -8,6 +8,7 @@
 
 #include "der/DEREncodeInternal.h"
 #include "tests/der/Bytes.h"
+#include "tests/der/Headers.h"
 
 namespace {
 
@@ -32,22 +33,7 @@ void expectEncoding(const std::string& expected, const Encode& encode) {
 }
 
 TEST(DEREncode, headersAreAsShortAsCanBe) {
-    const struct {
-        DERTag tag;
-        const char* identifier;
-        std::uint64_t length;
-        const char* lengthOctets;
-    } rows[] = {
-        {0x05, "05", 0, "00"},
-        {DERTagSet, "31", 127, "7F"},
-        {DERTagContextPrimitive(30), "9E", 128, "81 80"},
-        {31, "1F 1F", 255, "81 FF"},
-        {127, "1F 7F", 256, "82 01 00"},
-        {128, "1F 81 00", 0x010000, "83 01 00 00"},
-        {DERTagPrivateConstructed(0x53504159), "FF 85 9A C1 82 59", 4, "04"},
-        {UINT64_MAX, "FF 9F FF FF FF FF FF FF FF 7F", UINT64_MAX, "88 FF FF FF FF FF FF FF FF"},
-    };
-    for (const auto& row : rows) {
+    for (const auto& row : headers) {
         SCOPED_TRACE(row.identifier);
         expectEncoding(row.identifier, [&](std::uint8_t* buffer, std::uint64_t* length) {
             return DEREncodeTag(row.tag, buffer, length);
