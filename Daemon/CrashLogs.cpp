@@ -45,13 +45,6 @@ std::string joined(std::string_view directory, std::string_view name) {
     return path.append(name);
 }
 
-// File names come from whatever wrote the logs, and none of them is to begin a line of its own in ours.
-std::string shown(std::string_view path) {
-    std::string text;
-    utf8::appendOnOneLine(text, path);
-    return text;
-}
-
 bool hasLogSuffix(std::string_view path) {
     return std::ranges::any_of(suffixes, [path](std::string_view suffix) { return path.ends_with(suffix); });
 }
@@ -127,17 +120,18 @@ bool isOfRunningBuild(const FileDescriptor& report, std::string& problem) {
     return version && version->find(*build) != std::string::npos;
 }
 
+// Names come from whatever wrote the logs, and none of them is to begin a line of its own in ours.
 void visitEntry(const FileDescriptor& directory, const std::string& path, const std::string& name,
                 const CrashLogVisitor& visitor) try {
-    crashLog.info("File Name: %@", shown(path));
+    crashLog.info("File Name: %@", utf8::escaped(path));
     if (!hasLogSuffix(path)) {
-        crashLog.info("Suffix Mismatch . Skipping file : %@", shown(path));
+        crashLog.info("Suffix Mismatch . Skipping file : %@", utf8::escaped(path));
         return;
     }
     CrashLog log{path, name.starts_with(panicPrefix), {}, {}};
     if (::fstatat(directory.get(), name.c_str(), &log.status, AT_SYMLINK_NOFOLLOW) != 0) {
         const Error error = lastError();
-        crashLog.info("Failed to retrieve attributes for %@: (%@)", shown(path), error);
+        crashLog.info("Failed to retrieve attributes for %@: (%@)", utf8::escaped(path), error);
         visitor.missed(path, error.text);
         return;
     }
@@ -159,9 +153,9 @@ void visitEntry(const FileDescriptor& directory, const std::string& path, const 
     if (log.file)
         visitor.found(log);
     else
-        crashLog.info("Failed to load %@: %@", shown(path), error);
+        crashLog.info("Failed to load %@: %@", utf8::escaped(path), error);
 } catch (const std::bad_alloc& failure) {
-    crashLog.info("Failed to load %@: %@", shown(path), failure.what());
+    crashLog.info("Failed to load %@: %@", utf8::escaped(path), failure.what());
     visitor.missed(path, failure.what());
 }
 
@@ -198,7 +192,7 @@ int get_ramdisk_logs(Value* response) {
     const auto load = [&entries](const CrashLog& log) {
         std::optional<Value::Data> contents = readRegularFile(log.file, anySize);
         if (!contents) {
-            crashLog.info("Failed to load %@: %@", shown(log.path), lastError());
+            crashLog.info("Failed to load %@: %@", utf8::escaped(log.path), lastError());
             return;
         }
         Value::Dictionary entry{{"isPanic", log.isPanic ? "YES" : "NO"},

@@ -46,8 +46,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     const std::string logged = formatForLog(text, arguments);
     if (std::ranges::count(logged, '\n') > std::ranges::count(text, '\n') + 1)
         std::abort();
-    std::string line;
-    utf8::appendQuoted(line, out);
+    const std::string line = utf8::quoted(out);
     if (line.find('\n') != std::string::npos || !utf8::isValid(line) || !utf8::isValid(utf8::repaired(out)))
         std::abort();
     return 0;

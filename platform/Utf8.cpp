@@ -112,14 +112,14 @@ std::string_view beginning(std::string_view text, std::size_t limit) {
     return text.substr(0, limit);
 }
 
-void appendOnOneLine(std::string& out, std::string_view text) {
-    appendEscaped(out, text, Escaping::OneLine);
+std::string escaped(std::string_view text, Escaping how) {
+    std::string out;
+    appendEscaped(out, text, how);
+    return out;
 }
 
-void appendQuoted(std::string& out, std::string_view text) {
-    out += '"';
-    appendEscaped(out, text, Escaping::Quotes);
-    out += '"';
+std::string quoted(std::string_view text) {
+    return '"' + escaped(text, Escaping::Quotes) + '"';
 }
 
 } // namespace utf8

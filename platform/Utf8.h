@@ -44,10 +44,10 @@ enum class Escaping {
 // characters that turn the writing direction, and bad sequences are written as \n, \r, \t, \u followed by four or \x
 // followed by two hexadecimal digits.
 void appendEscaped(std::string& out, std::string_view text, Escaping how);
-void appendOnOneLine(std::string& out, std::string_view text);
 
-// The same in double quotes.
-void appendQuoted(std::string& out, std::string_view text);
+// The text so escaped, and in double quotes.
+std::string escaped(std::string_view text, Escaping how = Escaping::OneLine);
+std::string quoted(std::string_view text);
 
 } // namespace utf8
 

@@ -12,9 +12,7 @@ using nlohmann::ordered_json;
 
 // What is printed passes here, as text and as JSON, whose escapes these are too.
 void printText(std::ostream& out, std::string_view text, utf8::Escaping how) {
-    std::string shown;
-    utf8::appendEscaped(shown, text, how);
-    out << shown;
+    out << utf8::escaped(text, how);
 }
 
 std::string dump(const ordered_json& json) {
@@ -128,11 +126,7 @@ std::string valueText(const ordered_json& json, std::size_t longest, bool isQuot
         return dump(json);
     const auto& whole = json.get_ref<const std::string&>();
     const std::string text = shortened(whole, longest);
-    std::string shown;
-    if (isQuoted || whole.empty())
-        utf8::appendQuoted(shown, text);
-    else
-        shown = text;
+    const std::string shown = isQuoted || whole.empty() ? utf8::quoted(text) : text;
     return text.size() == whole.size() ? shown : shown + " (" + std::to_string(whole.size()) + " characters)";
 }
 

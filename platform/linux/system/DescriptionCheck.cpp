@@ -197,9 +197,7 @@ private:
     }
 
     static std::string shown(std::string_view name) {
-        std::string text;
-        utf8::appendOnOneLine(text, utf8::beginning(name, longestName));
-        return name.size() > longestName ? text + "..." : text;
+        return utf8::escaped(utf8::beginning(name, longestName)) + (name.size() > longestName ? "..." : "");
     }
 
     // Beyond the most that are said they are only counted.

@@ -68,9 +68,7 @@ void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message
 }
 
 void consoleLog(std::string_view line) try {
-    std::string text;
-    utf8::appendOnOneLine(text, line);
-    text += '\n';
+    const std::string text = utf8::escaped(line) + '\n';
     static_cast<void>(TEMP_FAILURE_RETRY(::write(STDERR_FILENO, text.data(), text.size())));
 } catch (const std::exception&) {
     return;

@@ -1,6 +1,5 @@
 #include "platform/VanterUpdater.h"
 
-#include <functional>
 #include <map>
 #include <mutex>
 #include <utility>
@@ -54,32 +53,23 @@ bool digestOf(const Value::Data& firmware, Value::Data& digest, std::optional<Er
 }
 
 // What this process has installed: by the path of the firmware, its digest.
-class Installed {
-public:
-    // Makes `firmware` the contents of the file at `path`; false, with everything as it was, when it cannot be written.
-    bool install(const std::string& path, const Value::Data& firmware, Value::Data digest) {
-        const std::lock_guard lock(mutex_);
-        if (!files::replace(path, firmware))
-            return false;
-        digests_.insert_or_assign(path, std::move(digest));
-        return true;
-    }
+std::mutex mutex;
+std::map<std::string, Value::Data> installed;
 
-    // What was installed at `path`, empty for nothing.
-    Value::Data digestAt(const std::string& path) const {
-        const std::lock_guard lock(mutex_);
-        const auto found = digests_.find(path);
-        return found == digests_.end() ? Value::Data{} : found->second;
-    }
+// Makes `firmware` the contents of the file at `path`; false, with everything as it was, when it cannot be written.
+bool install(const std::string& path, const Value::Data& firmware, Value::Data digest) {
+    const std::lock_guard lock(mutex);
+    if (!files::replace(path, firmware))
+        return false;
+    installed.insert_or_assign(path, std::move(digest));
+    return true;
+}
 
-private:
-    mutable std::mutex mutex_;
-    std::map<std::string, Value::Data, std::less<>> digests_;
-};
-
-Installed& installed() {
-    static Installed shared;
-    return shared;
+// What was installed at `path`, empty for nothing.
+Value::Data digestAt(const std::string& path) {
+    const std::lock_guard lock(mutex);
+    const auto found = installed.find(path);
+    return found == installed.end() ? Value::Data{} : found->second;
 }
 
 } // namespace
@@ -92,7 +82,7 @@ public:
     static bool isDone(const Value& chip, std::optional<Error>* error) {
         if (chip["done"].boolean().value_or(false))
             return true;
-        const Value::Data expected = installed().digestAt(firmwarePath(chip));
+        const Value::Data expected = digestAt(firmwarePath(chip));
         if (expected.empty())
             return false;
         Value::Data found;
@@ -121,7 +111,7 @@ public:
         Value::Data digest;
         if (!digestOf(*firmware, digest, error))
             return false;
-        if (!installed().install(firmwarePath(chip), *firmware, std::move(digest)))
+        if (!install(firmwarePath(chip), *firmware, std::move(digest)))
             return refuse(error, NotInstalled, "The firmware cannot be written to " + firmwarePath(chip));
         say(format("installed a firmware of %lu bytes", firmware->size()));
         if (output)

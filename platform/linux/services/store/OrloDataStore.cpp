@@ -37,12 +37,8 @@ constexpr struct {
 };
 
 void libraryLog(std::string_view text) {
-    const QDOrloLogHandler handler = logHandler;
-    if (!handler)
-        return;
-    std::string line;
-    utf8::appendOnOneLine(line, text);
-    handler(nullptr, line.c_str());
+    if (const QDOrloLogHandler handler = logHandler)
+        handler(nullptr, utf8::escaped(text).c_str());
 }
 
 bool isDataVersion(const Value& value) {

@@ -343,11 +343,9 @@ private:
     std::string inPath(std::string_view name, bool isClass) const {
         const bool isObject = settings_.objectStore.has_value();
         const bool isKept = !isObject || (canBeListed(name) && !(isClass && name.find('/') != name.npos));
-        if (!isKept || !staysBelow(name) || name.find('\0') != name.npos || name.size() > longestName) {
-            std::string quoted;
-            utf8::appendQuoted(quoted, utf8::beginning(name, longestQuoted));
-            throw OrloStoreFailure(QDOrloErrorStorage, "A server can keep no record under the name " + quoted);
-        }
+        if (!isKept || !staysBelow(name) || name.find('\0') != name.npos || name.size() > longestName)
+            throw OrloStoreFailure(QDOrloErrorStorage, "A server can keep no record under the name " +
+                                                           utf8::quoted(utf8::beginning(name, longestQuoted)));
         return percentEncoded(name, [&](char c) { return isUnreserved(c) || (isObject && c == '/'); });
     }
 
