@@ -18,6 +18,14 @@ struct HashSecret {
     std::uint64_t words[2];
 };
 
+// The halves of the product of 128 bits, one laid over the other. Not every machine has a type for the whole.
+inline std::uint64_t foldedProduct(std::uint64_t a, std::uint64_t b) {
+    const std::uint64_t aLow = a & UINT32_MAX, aHigh = a >> 32, bLow = b & UINT32_MAX, bHigh = b >> 32;
+    const std::uint64_t middle = aHigh * bLow + (aLow * bLow >> 32);
+    const std::uint64_t high = aHigh * bHigh + (middle >> 32) + ((aLow * bHigh + (middle & UINT32_MAX)) >> 32);
+    return (a * b) ^ high;
+}
+
 // The hash function of the index, over a message that comes as words. A step folds the product of state and secret, so
 // that without the secret nobody can tell which keys fall together, or steer any towards each other: an index needs no
 // more against floods, since it never shows a hash. The last step also breaks the even spacing that evenly spaced keys
@@ -26,11 +34,7 @@ struct Hash {
     const HashSecret& secret;
     std::uint64_t state = secret.words[0];
 
-    void absorb(std::uint64_t word) {
-        __extension__ using Product = unsigned __int128;
-        const Product product = Product{state ^ word} * (secret.words[1] | 1);
-        state = static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
-    }
+    void absorb(std::uint64_t word) { state = foldedProduct(state ^ word, secret.words[1] | 1); }
 };
 
 inline std::uint64_t hashOf(const HashSecret& secret, std::uint32_t key) {

@@ -52,12 +52,6 @@ constexpr std::array<DERItemSpec, 3> DERDecodeSysConfig3MetadataItemSpecs = {{
     {offsetof(MetadataItems, string), DERTagIA5String, DEROptionOptional},
 }};
 
-constexpr std::array<DERItemSpec, 3> DERDecodeSysConfig3ManifestItemSpecs = {{
-    {offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
-    {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
-    {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0},
-}};
-
 // Fills `items` from the content of a SEQUENCE.
 template <typename Items, std::size_t count>
 DERReturn parse(const DERItem& content, const std::array<DERItemSpec, count>& rows, Items* items) {
@@ -76,7 +70,10 @@ DERReturn append(Entry* entry, List* list) {
 
 // The value of four octets, least significant first. Content of any other length gives 0.
 std::uint32_t valueOf(const DERItem& item) {
-    return item.length == 4 ? valueOf(Octets4{{item.data[0], item.data[1], item.data[2], item.data[3]}}) : 0;
+    std::uint32_t value = 0;
+    for (std::uint64_t i = item.length; item.length == sizeof value && i-- > 0;)
+        value = value << 8 | item.data[i];
+    return value;
 }
 
 // The characters of a string item, up to its first NUL and at most `maximum` of them.
@@ -170,7 +167,7 @@ bool decodeManifest(const DERItem& element, __SysConfig3* object, SysConfig3Refu
     if (!openElement(element, manifestElement, &content, refusal))
         return false;
     ManifestItems items;
-    if (const DERReturn result = parse(content, DERDecodeSysConfig3ManifestItemSpecs, &items); result != DERSuccess) {
+    if (const DERReturn result = parse(content, manifestRows, &items); result != DERSuccess) {
         // A blob whose HMACs cannot be read is still worth having: the object keeps the manifest it was made with.
         logHook()(messageLevel, "Decode manifest sequence error: %d", static_cast<int>(result));
         return true;
@@ -212,7 +209,7 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedIn
     const PayloadContent content = {valueOf(items.key), textOf(items.comment, maximumStringLength), bytesOf(items.data),
                                     textOf(items.string, maximumStringLength), deleted};
     if (!isValidContent(content))
-        return reportNoPayloadEntry(), DERSuccess;
+        return _sysConfig3AddPayloadEntry(object, nullptr), DERSuccess;
     return append(makeEntry(content), &object->payload);
 }
 
@@ -229,7 +226,7 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
     const MetadataContent content = {textOf(items.key, maximumKeyLength), bytesOf(items.data),
                                      textOf(items.string, maximumStringLength)};
     if (!isValidContent(content))
-        return reportNoMetadataEntry(), DERSuccess;
+        return _sysConfig3AddMetadataEntry(object, nullptr), DERSuccess;
     return append(makeEntry(content), &object->metadata);
 }
 

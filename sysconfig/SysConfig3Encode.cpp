@@ -38,10 +38,6 @@ constexpr auto DEREncodeSysConfig3PayloadStringItemSpecs = payloadRows(DERTagIA5
 constexpr auto DEREncodeSysConfig3PayloadDeletedItemSpecs = payloadRows(DERTagBoolean);
 constexpr auto DEREncodeSysConfig3MetadataDataItemSpecs = metadataRows(DERTagOctetString);
 constexpr auto DEREncodeSysConfig3MetadataStringItemSpecs = metadataRows(DERTagIA5String);
-constexpr std::array<DERItemSpec, 3> DEREncodeSysConfig3ManifestItemSpecs = {
-    {{offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
-     {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
-     {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0}}};
 
 DERItem itemOf(std::string_view text) {
     return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
@@ -219,8 +215,7 @@ struct Sizes {
 bool measureBlob(const __SysConfig3& object, Sizes* sizes) {
     if (!measureEntries(object.payload.first, &sizes->payloadEntries) ||
         !measureEntries(object.metadata.first, &sizes->metadataEntries) ||
-        !succeeded(measure(itemsOf(*object.manifest), DEREncodeSysConfig3ManifestItemSpecs, &sizes->manifestSequence),
-                   manifestFailure))
+        !succeeded(measure(itemsOf(*object.manifest), manifestRows, &sizes->manifestSequence), manifestFailure))
         return false;
     sizes->payloadSet = DERLengthOfItem(DERTagSet, sizes->payloadEntries);
     sizes->metadataSet = DERLengthOfItem(DERTagSet, sizes->metadataEntries);
@@ -242,7 +237,7 @@ bool writeBlob(const __SysConfig3& object, const Sizes& sizes, Output* output) {
            writeHeader(DERTagSet, sizes.metadataEntries, output) == DERSuccess &&
            writeEntries(object.metadata.first, output) &&
            succeeded(writeHeader(manifestTag, sizes.manifestSequence, output), wholeFailure) &&
-           succeeded(write(itemsOf(*object.manifest), DEREncodeSysConfig3ManifestItemSpecs, output), manifestFailure);
+           succeeded(write(itemsOf(*object.manifest), manifestRows, output), manifestFailure);
 }
 
 } // namespace

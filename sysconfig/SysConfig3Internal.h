@@ -216,10 +216,6 @@ bool addTo(List* list, Entry* entry, const HashSecret& secret, const char* opera
     return false;
 }
 
-// Report that there is no entry to add.
-void reportNoPayloadEntry();
-void reportNoMetadataEntry();
-
 // Manifests
 
 // Gives the object a new manifest of its version with copies of the HMACs. False when memory is lacking.
@@ -244,7 +240,7 @@ __SysConfig3PayloadEntry* _allocSysConfig3PayloadEntryInternal(std::uint32_t key
                                                                const std::uint8_t* data, std::uint32_t dataLength,
                                                                const char* string, bool deleted);
 
-// The list changes without the rules on HMACs and on the deleted flag.
+// The list changes without the rules on HMACs and on the deleted flag. An add without an entry is reported.
 bool _sysConfig3AddPayloadEntry(__SysConfig3* object, const __SysConfig3PayloadEntry* entry);
 bool _sysConfig3AddMetadataEntry(__SysConfig3* object, const __SysConfig3MetadataEntry* entry);
 bool _sysConfig3DeletePayloadEntryForKey(__SysConfig3* object, std::uint32_t key);

@@ -72,13 +72,9 @@ const __SysConfig3MetadataEntry* sysConfig3MetadataEntryGetNextEntry(const __Sys
     return entry != nullptr ? entry->next : nullptr;
 }
 
-void sysconfig::reportNoMetadataEntry() {
-    logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", addition);
-}
-
 bool _sysConfig3AddMetadataEntry(__SysConfig3* object, const __SysConfig3MetadataEntry* entry) {
     if (object == nullptr || entry == nullptr)
-        return reportNoMetadataEntry(), false;
+        return logHook()(messageLevel, "%s invalid argument. sysconfig and entry cannot be NULL", addition), false;
     return addTo(&object->metadata, copySysConfig3MetadataEntry(entry), object->secret, addition);
 }
 

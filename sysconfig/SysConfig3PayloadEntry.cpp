@@ -109,13 +109,9 @@ bool sysConfig3PayloadEntryGetData(const __SysConfig3PayloadEntry* entry, SysCon
     return viewData(*entry, out);
 }
 
-void sysconfig::reportNoPayloadEntry() {
-    logHook()(messageLevel, "%s invalid argument. sysconfig and etnry cannot be NULL", addition);
-}
-
 bool _sysConfig3AddPayloadEntry(__SysConfig3* object, const __SysConfig3PayloadEntry* entry) {
     if (object == nullptr || entry == nullptr)
-        return reportNoPayloadEntry(), false;
+        return logHook()(messageLevel, "%s invalid argument. sysconfig and etnry cannot be NULL", addition), false;
     return addTo(&object->payload, copySysConfig3PayloadEntry(entry), object->secret, addition);
 }
 

@@ -2,6 +2,8 @@
 #ifndef VELTRA_SYSCONFIG_SYSCONFIG3WIRE_H
 #define VELTRA_SYSCONFIG_SYSCONFIG3WIRE_H
 
+#include <array>
+#include <cstddef>
 #include <cstdint>
 
 #include "der/DERTypes.h"
@@ -19,6 +21,10 @@ struct ManifestItems {
     DERItem fullHMAC;
 };
 
+constexpr std::array<DERItemSpec, 3> manifestRows = {{{offsetof(ManifestItems, payloadHMAC), DERTagOctetString, 0},
+                                                      {offsetof(ManifestItems, metadataHMAC), DERTagOctetString, 0},
+                                                      {offsetof(ManifestItems, fullHMAC), DERTagOctetString, 0}}};
+
 // A 32-bit value on the wire: an INTEGER of always four octets, the least significant first, whatever the order of the
 // machine.
 struct Octets4 {
@@ -28,11 +34,6 @@ struct Octets4 {
 constexpr Octets4 octetsOf(std::uint32_t value) {
     return {{static_cast<std::uint8_t>(value), static_cast<std::uint8_t>(value >> 8),
              static_cast<std::uint8_t>(value >> 16), static_cast<std::uint8_t>(value >> 24)}};
-}
-
-constexpr std::uint32_t valueOf(const Octets4& octets) {
-    return std::uint32_t{octets.octets[0]} | std::uint32_t{octets.octets[1]} << 8 |
-           std::uint32_t{octets.octets[2]} << 16 | std::uint32_t{octets.octets[3]} << 24;
 }
 
 } // namespace sysconfig
