@@ -7,7 +7,6 @@
 #include <cstring>
 #include <filesystem>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <fcntl.h>
@@ -423,22 +422,6 @@ TEST_F(HSPipeUtilTest, anyOutputBecomesText) {
         EXPECT_EQ(run({root_.host("/file")}), 0);
         EXPECT_EQ(output(), expected) << written.size();
     }
-}
-
-TEST_F(HSPipeUtilTest, callsOnSeveralThreadsDoNotHoldEachOthersPipes) {
-    script("cat");
-    std::vector<std::thread> threads;
-    for (char letter = 'a'; letter < 'e'; ++letter)
-        threads.emplace_back([letter] {
-            for (int round = 0; round < 25; ++round) {
-                const std::string data(5000, letter);
-                Value response;
-                EXPECT_EQ(HSPipeUtil::HSPipeUtilExecCommandWithData(program, {}, bytes(data), &response, nullptr), 0);
-                EXPECT_TRUE(*response["Output"].text() == data);
-            }
-        });
-    for (std::thread& thread : threads)
-        thread.join();
 }
 
 TEST_F(HSPipeUtilTest, aProcessWithoutStandardDescriptorsRunsProgramsAllTheSame) {
