@@ -248,22 +248,10 @@ Lines expand(const Lines& expected, const Lines& whole) {
     return lines;
 }
 
-// Both lists in one: " " before a line of both, "-" before one that is expected only, "+" before one that came only.
-std::string difference(const Lines& expected, const Lines& actual) {
-    std::vector common(expected.size() + 1, std::vector<std::size_t>(actual.size() + 1));
-    for (std::size_t i = expected.size(); i-- > 0;)
-        for (std::size_t j = actual.size(); j-- > 0;)
-            common[i][j] =
-                expected[i] == actual[j] ? common[i + 1][j + 1] + 1 : std::max(common[i + 1][j], common[i][j + 1]);
-    std::string text = "\n";
-    std::size_t i = 0, j = 0;
-    while (i < expected.size() || j < actual.size())
-        if (i < expected.size() && j < actual.size() && expected[i] == actual[j])
-            text += " " + expected[i++] + "\n", ++j;
-        else if (j == actual.size() || (i < expected.size() && common[i + 1][j] >= common[i][j + 1]))
-            text += "-" + expected[i++] + "\n";
-        else
-            text += "+" + actual[j++] + "\n";
+std::string joined(const Lines& lines) {
+    std::string text;
+    for (const std::string& line : lines)
+        text += line + "\n";
     return text;
 }
 
@@ -282,9 +270,8 @@ TEST_P(Transcripts, areWhatThePluginDoes) {
     Lines whole;
     for (const Case& played : readCases(GetParam())) {
         const Lines expected = expand(played.expected, whole);
-        const Lines actual = play(played);
-        if (actual != expected)
-            ADD_FAILURE_AT(GetParam().c_str(), played.line) << played.name << difference(expected, actual);
+        EXPECT_EQ(joined(expected), joined(play(played)))
+            << GetParam().string() << ":" << played.line << ": " << played.name;
         if (played.isWhole)
             whole = expected;
     }
