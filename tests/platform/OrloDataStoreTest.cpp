@@ -468,28 +468,21 @@ TEST_F(OrloDataStore, reportsAWriteThatFailsAndTakesTheNextOne) {
 }
 
 TEST_F(OrloDataStore, servesSeveralProcessesThatBeginWithANewStoreAtOnce) {
-    constexpr int processes = 6, records = 20;
-    std::vector<pid_t> children;
-    for (int child = 0; child < processes; ++child) {
-        const pid_t pid = ::fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
-            bool good = true;
-            for (int i = 0; i < records; ++i) {
-                const std::string instance = std::to_string(child) + "-" + std::to_string(i);
-                const Session session = openFor("psd2", instance);
-                good =
-                    good && put(session, "psd2", instance, {'r'}) == 0 && exportAll(session, {"psd2"}, {instance}) == 0;
+    inOwnProcess([] {
+        for (int child = 0; child < 6; ++child)
+            if (::fork() == 0) {
+                bool good = true;
+                for (int i = 0; i < 20; ++i) {
+                    const std::string instance = std::to_string(child) + "-" + std::to_string(i);
+                    const Session session = openFor("psd2", instance);
+                    good = put(session, "psd2", instance, {'r'}) == 0 &&
+                           exportAll(session, {"psd2"}, {instance}) == 0 && good;
+                }
+                std::_Exit(good && !HasFailure() ? 0 : 1);
             }
-            std::_Exit(good && !HasFailure() ? 0 : 1);
-        }
-        children.push_back(pid);
-    }
-    for (const pid_t pid : children) {
-        int status = -1;
-        EXPECT_EQ(::waitpid(pid, &status, 0), pid);
-        EXPECT_EQ(status, 0);
-    }
+        for (int status = 0; ::wait(&status) > 0;)
+            EXPECT_EQ(status, 0);
+    });
     EXPECT_EQ(sql("PRAGMA integrity_check; SELECT count(*) FROM records; SELECT count(*) FROM export_pairs"),
               (std::vector<std::string>{"ok", "120", "120"}));
     const std::filesystem::directory_iterator files(root_.host("/var/lib/orlo"));

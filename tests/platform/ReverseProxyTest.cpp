@@ -71,19 +71,9 @@ TEST_F(ReverseProxy, aDeviceWithoutOneRefusesRegistrationAndHasNoSettings) {
     EXPECT_EQ(registration(none), nullptr);
 }
 
-TEST_F(ReverseProxy, eventsComeInTheirOrderAndNotBeforeTheyAreDue) {
-    describe(R"({"events": [{"status": 7, "afterMs": 40}, {"status": 1, "afterMs": 10}, {"status": 3}]})");
-    Deliveries deliveries;
-    const RegistrationPtr proxy = registration(deliveries);
-    const Clock::time_point start = Clock::now();
-    ASSERT_NE(proxy, nullptr);
-    RPRegistrationResume(proxy.get());
-    EXPECT_EQ(deliveries.waitFor(3), (Statuses{7, 1, 3}));
-    EXPECT_GE(Clock::now() - start, 40ms);
-}
-
-TEST_F(ReverseProxy, malformedEventsAreLeftOutAndTimesAreBounded) {
+TEST_F(ReverseProxy, eventsComeInTheirOrderWhenTheyAreDueAndMalformedOnesAreLeftOut) {
     std::vector<std::pair<std::string, Statuses>> rows = {
+        {R"([{"status": 7, "afterMs": 40}, {"status": 1, "afterMs": 10}, {"status": 3}])", {7, 1, 3}},
         {R"([{"status": -2147483648}, {"status": 2147483647}])", {INT32_MIN, INT32_MAX}},
         {R"([{"status": 1, "afterMs": -5}, {"status": true, "afterMs": "soon"}])", {1, 1}},
         {R"([{"status": 1, "afterMs": -9223372036854775808}])", {1}},
@@ -100,8 +90,10 @@ TEST_F(ReverseProxy, malformedEventsAreLeftOutAndTimesAreBounded) {
         Deliveries deliveries;
         const RegistrationPtr proxy = registration(deliveries);
         ASSERT_NE(proxy, nullptr) << events;
+        const Clock::time_point start = Clock::now();
         RPRegistrationResume(proxy.get());
         EXPECT_EQ(deliveries.waitFor(statuses.size()), statuses) << events;
+        EXPECT_GE(Clock::now() - start, events == rows.front().first ? 40ms : 0ms);
     }
 }
 

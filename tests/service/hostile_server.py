@@ -74,11 +74,10 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.answer(*((200, b"in the end") if count > int(failures) else (503,)))
 
     def broken(self, count, failures):
-        self.body()
         if count > int(failures):
-            self.answer(200, b"in the end")
-        else:
-            self.drop()
+            return self.busy(count, failures)
+        self.body()
+        self.drop()
 
     def stall(self, count):
         while self.connection.recv(65536):  # until the client gives up
