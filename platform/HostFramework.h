@@ -73,16 +73,16 @@ public:
     VeltraPluginServer& operator=(const VeltraPluginServer&) = delete;
     ~VeltraPluginServer() override;
 
-    // Serves requests, one at a time and in order, on the calling thread. Ends the process with status 0 after the
-    // request in hand when SIGTERM or SIGINT arrives, and with status 1 and a line on standard error when the host is
-    // lost.
+    // Serves requests, one at a time and in order, on a thread of the framework's own, while the calling thread answers
+    // what the host asks about the service. Ends the process after the request in hand: with status 0 when SIGTERM or
+    // SIGINT arrives, and with status 1 and a line on standard error when the host is lost.
     void resume();
 
 protected:
-    // Registers the server with the host under `serviceName`, and sets up for its requests what they would otherwise
-    // set up at their first use. False, after a line on standard error, when there is no device root, no host to reach,
-    // the name is taken, or cryptography is not to be had.
-    bool initWithServiceName(std::string_view serviceName);
+    // Registers the server, of this version, with the host under `serviceName`, and sets up for its requests what they
+    // would otherwise set up at their first use. False, after a line on standard error, when there is no device root,
+    // no host to reach, the name is taken, or cryptography is not to be had.
+    bool initWithServiceName(std::string_view serviceName, std::string_view version);
 
 private:
     struct Connection;

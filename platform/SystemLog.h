@@ -26,6 +26,10 @@ bool systemLogTypeEnabled(const SystemLog* log, SystemLogType type);
 // Writes one message. Never fails outward; may be called from any thread.
 void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message);
 
+// Has `watcher` see each message that is written from here on, just before, on the thread that writes it.
+using SystemLogWatcher = void (*)(const SystemLog* log, SystemLogType type, std::string_view message) noexcept;
+void systemLogWatch(SystemLogWatcher watcher);
+
 // Writes one line to the system console log (standard error, which the service manager keeps).
 void consoleLog(std::string_view line);
 

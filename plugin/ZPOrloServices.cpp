@@ -60,7 +60,7 @@ void logRequest(const HSMessageRequest& request) try {
 
 std::unique_ptr<ZPOrloServices> ZPOrloServices::initWithServiceName(std::string_view serviceName) {
     auto server = std::make_unique<ZPOrloServices>();
-    if (!server->VeltraPluginServer::initWithServiceName(serviceName))
+    if (!server->VeltraPluginServer::initWithServiceName(serviceName, pluginVersion()))
         return nullptr;
     return server;
 }

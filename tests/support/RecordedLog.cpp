@@ -50,6 +50,8 @@ void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message
     append(level + handle + (log == &pluginLog ? withoutTimeAndNumber(message) : std::string(message)));
 }
 
+void systemLogWatch(SystemLogWatcher) {}
+
 // "<operation>:<number> - <message>" loses its number; every other line stays as it is.
 void consoleLog(std::string_view line) {
     const std::size_t end = line.find(" - ");

@@ -293,7 +293,7 @@ void VanterUpdaterRelease(VanterUpdater* updater) {
 
 VeltraPluginServer::~VeltraPluginServer() = default;
 
-bool VeltraPluginServer::initWithServiceName(std::string_view) {
+bool VeltraPluginServer::initWithServiceName(std::string_view, std::string_view) {
     return true;
 }
 

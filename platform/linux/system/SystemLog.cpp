@@ -1,5 +1,6 @@
 #include "platform/SystemLog.h"
 
+#include <atomic>
 #include <cstddef>
 #include <deque>
 #include <exception>
@@ -30,6 +31,8 @@ namespace {
 
 constexpr int priorities[] = {LOG_NOTICE, LOG_INFO, LOG_DEBUG, LOG_ERR}; // of the types, in their order
 
+std::atomic<SystemLogWatcher> watcher = nullptr;
+
 iovec field(const std::string& text) {
     return {const_cast<char*>(text.data()), text.size()};
 }
@@ -57,6 +60,8 @@ bool systemLogTypeEnabled(const SystemLog* log, SystemLogType) {
 void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message) try {
     if (!log)
         return;
+    if (const SystemLogWatcher watch = watcher)
+        watch(log, type, message);
     if (message.ends_with('\n'))
         message.remove_suffix(1); // an entry of the journal is a line already
     const std::string text = "MESSAGE=" + std::string(message);
@@ -65,6 +70,10 @@ void systemLogWrite(SystemLog* log, SystemLogType type, std::string_view message
     sd_journal_sendv(fields, static_cast<int>(std::size(fields))); // without a journal this does nothing
 } catch (const std::exception&) {
     return; // a line that memory does not suffice for is lost
+}
+
+void systemLogWatch(SystemLogWatcher newWatcher) {
+    watcher = newWatcher;
 }
 
 void consoleLog(std::string_view line) try {

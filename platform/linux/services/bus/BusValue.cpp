@@ -221,6 +221,20 @@ public:
         close();
     }
 
+    void text(std::string_view text) {
+        count(text.size());
+        const std::string repaired = utf8::repaired(text);
+        std::string carried;
+        for (std::size_t start = 0, end = 0; end < repaired.size(); start = end + 1) {
+            end = std::min(repaired.find('\0', start), repaired.size());
+            carried.append(repaired, start, end - start);
+            if (end < repaired.size())
+                carried += "\uFFFD";
+        }
+        count(carried.size() - text.size()); // what takes the place of a bad sequence is never shorter
+        check(sd_bus_message_append_basic(message_, SD_BUS_TYPE_STRING, carried.c_str()));
+    }
+
 private:
     void open(char type, const char* contents) {
         if (++containers_ > maximumContainers)
@@ -247,20 +261,6 @@ private:
         text(key);
         variant(value);
         close();
-    }
-
-    void text(std::string_view text) {
-        count(text.size());
-        const std::string repaired = utf8::repaired(text);
-        std::string carried;
-        for (std::size_t start = 0, end = 0; end < repaired.size(); start = end + 1) {
-            end = std::min(repaired.find('\0', start), repaired.size());
-            carried.append(repaired, start, end - start);
-            if (end < repaired.size())
-                carried += "\uFFFD";
-        }
-        count(carried.size() - text.size()); // what takes the place of a bad sequence is never shorter
-        check(sd_bus_message_append_basic(message_, SD_BUS_TYPE_STRING, carried.c_str()));
     }
 
     void bytes(const Value::Data& data) {
@@ -314,6 +314,10 @@ Value::Dictionary readDictionary(sd_bus_message* message, std::size_t* octets) {
     if (octets)
         *octets = reader.octets();
     return result;
+}
+
+void appendText(sd_bus_message* message, std::string_view text) {
+    Writer(message).text(text);
 }
 
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary) {

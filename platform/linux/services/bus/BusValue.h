@@ -44,9 +44,12 @@ std::string reasonOf(int result);
 // message, never less than its texts and data.
 Value::Dictionary readDictionary(sd_bus_message* message, std::size_t* octets = nullptr);
 
-// Appends `dictionary` as a{sv}. Texts that are not UTF-8 or hold a NUL get U+FFFD in place of what D-Bus cannot carry;
-// entries of nothing are left out. Raises Refusal for what nests deeper than a message can, and as check, which is for
-// -EMSGSIZE for more than a message holds.
+// Appends `text` as s, with U+FFFD in place of what is no UTF-8 and of each NUL, which D-Bus cannot carry. Raises as
+// check, for -EMSGSIZE for more than a message holds.
+void appendText(sd_bus_message* message, std::string_view text);
+
+// Appends `dictionary` as a{sv}, with its texts as above; entries of nothing are left out. Raises Refusal for what
+// nests deeper than a message can, and as appendText.
 void appendDictionary(sd_bus_message* message, const Value::Dictionary& dictionary);
 
 // The same with entries in their order, none of which is copied.

@@ -31,24 +31,37 @@ bool hasChanged(const Value::Data& contents) {
     return true;
 }
 
-} // namespace
-
-Value deviceDescription() {
-    const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
-    const bool isNew = hasChanged(contents.value_or(Value::Data()));
+// The description that the file holds. Nothing, and `problem`, when it is missing or malformed.
+Value described(const std::optional<Value::Data>& contents, std::string& problem) {
     if (!contents) {
-        report(" is missing or cannot be read");
+        problem = " is missing or cannot be read";
         return {};
     }
     std::string refusal = "it is no object";
     std::optional<Value> description =
         jsonToValue({reinterpret_cast<const char*>(contents->data()), contents->size()}, &refusal);
-    if (!description || !description->dictionary()) {
-        report(" is malformed: " + refusal);
-        return {};
-    }
-    if (isNew)
-        for (const std::string& fault : descriptionFaults(*description))
+    if (description && description->dictionary())
+        return std::move(*description);
+    problem = " is malformed: " + refusal;
+    return {};
+}
+
+} // namespace
+
+Value deviceDescription() {
+    const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
+    const bool isNew = hasChanged(contents.value_or(Value::Data()));
+    std::string problem;
+    Value description = described(contents, problem);
+    if (!problem.empty())
+        report(problem);
+    else if (isNew)
+        for (const std::string& fault : descriptionFaults(description))
             report(": " + fault);
-    return std::move(*description);
+    return description;
+}
+
+Value deviceDescriptionUnreported() {
+    std::string problem;
+    return described(files::readWhole(descriptionPath), problem);
 }

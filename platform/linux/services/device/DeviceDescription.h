@@ -15,4 +15,7 @@
 // the file has changed.
 Value deviceDescription();
 
+// The same, but what is wrong with it is said nowhere.
+Value deviceDescriptionUnreported();
+
 #endif

@@ -6,6 +6,8 @@
 #include <exception>
 #include <limits>
 #include <memory>
+#include <mutex>
+#include <string>
 #include <utility>
 #include <vector>
 
@@ -55,15 +57,48 @@ void requireOptions(const OrloOptions& options) {
         throw OrloStoreFailure(QDOrloErrorNotPermitted, "There is no data version");
 }
 
-std::unique_ptr<OrloStoreBackend> openBackend() {
-    const Value store = resolveDescribed(deviceDescription()["store"]);
-    const Value& chosen = store["backend"];
-    if (chosen.isNothing())
-        return backends[0].open(store);
+// The backend that the description names, the first one unless it names any.
+std::string backendName(const Value& chosen) {
+    return chosen.isNothing() ? std::string(backends[0].name) : chosen.description();
+}
+
+std::unique_ptr<OrloStoreBackend> openBackend(const Value& store) {
+    const std::string name = backendName(store["backend"]);
     for (const auto& backend : backends)
-        if (chosen == Value(backend.name))
+        if (name == backend.name)
             return backend.open(store);
-    throw OrloStoreFailure(QDOrloErrorStorage, "There is no backend " + chosen.description());
+    throw OrloStoreFailure(QDOrloErrorStorage, "There is no backend " + name);
+}
+
+// How the backend that a session was last to have could be opened.
+struct LastOpening {
+    std::mutex mutex; // guards what follows
+    std::string backend;
+    std::string outcome;
+};
+
+LastOpening& lastOpening() {
+    static auto* const last = new LastOpening; // never destroyed: threads may ask until the process is gone
+    return *last;
+}
+
+void noteOpening(const Value& store, std::string outcome) {
+    LastOpening& last = lastOpening();
+    const std::lock_guard lock(last.mutex);
+    last.backend = backendName(store["backend"]);
+    last.outcome = std::move(outcome);
+}
+
+std::unique_ptr<OrloStoreBackend> openDescribedBackend() {
+    const Value store = resolveDescribed(deviceDescription()["store"]);
+    try {
+        std::unique_ptr<OrloStoreBackend> backend = openBackend(store);
+        noteOpening(store, "opened");
+        return backend;
+    } catch (const std::exception& failure) {
+        noteOpening(store, std::string("could not be opened: ") + failure.what());
+        throw;
+    }
 }
 
 // The text of a class or an instance, or null when it names no record or would change the meaning of a grant.
@@ -128,6 +163,13 @@ bool perform(const char* operation, const __QDOrlo* session, std::optional<Error
 
 } // namespace
 
+std::string orloStoreState() {
+    const std::string name = backendName(resolveDescribed(deviceDescriptionUnreported()["store"]["backend"]));
+    LastOpening& last = lastOpening();
+    const std::lock_guard lock(last.mutex);
+    return name + ": " + (name == last.backend ? last.outcome : "not opened yet");
+}
+
 std::string ticketDigestOf(const OrloOptions& options) {
     const Value::Data& ticket = *options["APTicket"].data();
     std::uint8_t digest[crypto::sha256Size];
@@ -146,7 +188,7 @@ __QDOrlo* QDOrloCreateWithOptions(Value options) try {
         session->options = std::move(options);
     try {
         requireOptions(session->options);
-        session->backend = openBackend();
+        session->backend = openDescribedBackend();
     } catch (const OrloStoreFailure& failure) {
         libraryLog(format("Session: %s", failure.what()));
         return nullptr;

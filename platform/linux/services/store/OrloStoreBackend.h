@@ -59,6 +59,10 @@ inline std::int64_t dataVersionOf(const OrloOptions& options) {
 }
 std::string ticketDigestOf(const OrloOptions& options);
 
+// The backend that the description names and whether it could be opened when a session was last to have it, for people.
+// Opens nothing. Any thread.
+std::string orloStoreState();
+
 // A backend on the database that "path" of the description's "store" names.
 std::unique_ptr<OrloStoreBackend> openEmbeddedStore(const Value& store);
 
