@@ -55,10 +55,9 @@ Bytes digestOfMessage(const Img4TrustProfile& profile) {
 
 using Verifier = decltype(verify_signature_rsa)*;
 
-bool accepts(Verifier verify, const Img4TrustProfile& profile, const Bytes& key, const Bytes& signature,
-             const Bytes& digest) {
-    const DERItem keyView = viewOf(key);
-    const DERItem signatureView = viewOf(signature);
+bool accepts(Verifier verify, const Img4TrustProfile& profile, const Bytes& key, const Bytes& signature) {
+    const Bytes digest = digestOfMessage(profile);
+    const DERItem keyView = viewOf(key), signatureView = viewOf(signature);
     const DERReturn result = verify(&keyView, &signatureView, digest.data(), digest.size(), &profile);
     EXPECT_TRUE(result == DERSuccess || result == Img4Failure) << result;
     return result == DERSuccess;
@@ -112,18 +111,14 @@ std::vector<Case> blockCases(const Bytes& digest, const Bytes& oid, std::size_t 
     return {
         {"sound", sound, true},
         {"no NULL", with({sequence({oid}), octets(digest)})},
-        {"other parameters", with({sequence({oid, octets({})}), octets(digest)})},
         {"long length of the digest", with({algorithm, longDigest})},
         {"octets behind the digest", with({algorithm, octets(digest), null})},
         {"other digest algorithm", with({sequence({lastChanged(oid, 0x03), null}), octets(digest)})},
-        {"digest that lacks an octet", with({algorithm, octets(Bytes(digest.begin(), digest.end() - 1))})},
         {"digest alone", padded(digest, length)},
         {"other digest", lastChanged(sound)},
-        {"octet behind the DigestInfo", shortened(length - 4 - info.size())},
         {"short padding and octets behind", shortened(8)},
         {"padding of seven octets", shortened(7)},
         {"other octet in the padding", changedAt(sound, 2, 0xFE)},
-        {"zero in the padding", changedAt(sound, 12, 0x00)},
         {"no end of the padding", changedAt(sound, length - info.size() - 1, 0xFF)},
         {"padding of encryption", changedAt(sound, 1, 0x02)},
     };
@@ -143,24 +138,21 @@ Img4TrustProfile profileWith(const Img4TrustProfile& like, const Img4DigestInfo&
 const Img4DigestInfo* const digestInfos[] = {&kQDSupportDigestInfoSha1, &kQDSupportDigestInfoSha256,
                                              &kQDSupportDigestInfoSha384, &kQDSupportDigestInfoSha512};
 
-void checkBlocks(const Key& key, const Img4DigestInfo& info) {
-    const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, info);
-    const Bytes digest = digestOfMessage(profile);
-    const Bytes bits = publicKeyBits(key);
-    const std::size_t size = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
-    EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info.length, message), digest));
-    for (const Case& row : blockCases(digest, oid(*info.oid), size))
-        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, row.octets), digest), row.accepted)
-            << info.length << " at " << size << ", " << row.name;
-}
-
 const Bytes longExponent = {0x01, 0, 0, 0, 0, 0, 0, 0, 0x0D};
 
 TEST(Img4RSASignature, isOverTheExactBlock) {
     // OpenSSL itself does not verify with exponents of more than 64 bits under moduli of more than 3072.
-    for (const Key& key : {rsaKey(), makeRSAKey(3080, longExponent)})
-        for (const Img4DigestInfo* info : digestInfos)
-            checkBlocks(key, *info);
+    for (const Key& key : {rsaKey(), makeRSAKey(3080, longExponent)}) {
+        const Bytes bits = publicKeyBits(key);
+        const auto size = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
+        for (const Img4DigestInfo* info : digestInfos) {
+            const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, *info);
+            EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info->length, message)));
+            for (const Case& row : blockCases(digestOfMessage(profile), oid(*info->oid), size))
+                EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, row.octets)), row.accepted)
+                    << info->length << " at " << size << ", " << row.name;
+        }
+    }
 }
 
 TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
@@ -204,12 +196,11 @@ TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
         {"no signature", whole, {}},
     };
     for (const Row& row : rows)
-        EXPECT_EQ(accepts(verify_signature_rsa, profile, row.key, row.signature, digest), row.accepted) << row.name;
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, row.key, row.signature), row.accepted) << row.name;
 }
 
 TEST(Img4RSASignature, needsAModulusWithinTheVerifiersLimits) {
     const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
-    const Bytes digest = digestOfMessage(profile);
     struct Row {
         unsigned bits;
         bool accepted;
@@ -223,21 +214,13 @@ TEST(Img4RSASignature, needsAModulusWithinTheVerifiersLimits) {
           Row{3072, true, true, longExponent}, Row{4096, true, false, {0x03}}, Row{4096, true, false, longExponent}}) {
         const Key key = makeRSAKey(row.bits, row.exponent);
         const Bytes bits = publicKeyBits(key);
-        const Bytes signature = sign(key, digest.size(), message);
-        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature, digest), row.accepted) << row.bits;
-        EXPECT_EQ(accepts(verify_signature_rsa3k, profile, bits, signature, digest), row.acceptedBy3k) << row.bits;
+        const Bytes signature = sign(key, profile.digestInfo->length, message);
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signature), row.accepted) << row.bits;
+        EXPECT_EQ(accepts(verify_signature_rsa3k, profile, bits, signature), row.acceptedBy3k) << row.bits;
     }
 }
 
 // ECDSA
-
-struct CurveUnderTest {
-    const char* name;
-    const Img4TrustProfile* profile;
-};
-
-const CurveUnderTest curves[] = {{"P-256", &kImg4DecodeSecureBootEc256Sha256},
-                                 {"P-384", &kImg4DecodeSecureBootEc384Sha384}};
 
 Bytes pair(const Bytes& r, const Bytes& s) {
     return sequence({positiveInteger(r), positiveInteger(s)});
@@ -252,11 +235,9 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
         {"r and s swapped", pair(s, r)},
         {"r = 0", pair({}, s)},
         {"s = 0", pair(r, {})},
-        {"r = 0, s = 1", pair({}, {1})},
         {"r = order", pair(order, s)},
         {"s = order", pair(r, order)},
         {"r plus order", pair(sum(r, order), s)},
-        {"s plus order", pair(r, sum(s, order))},
         {"r negative", sequence({rawInteger(r), S})},
         {"s negative", sequence({R, rawInteger(s)})},
         {"zeros before r", sequence({rawInteger(join({Bytes{0, 0}, r})), S})},
@@ -265,7 +246,6 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
         {"s empty", sequence({R, rawInteger({})})},
         {"r of two octets for zero", sequence({rawInteger({0, 0}), S})},
         {"s missing", sequence({R})},
-        {"both missing", sequence({})},
         {"third number", sequence({R, S, positiveInteger({1})})},
         {"octets behind", join({whole, null})},
         {"cut short", Bytes(whole.begin(), whole.end() - 1)},
@@ -276,24 +256,6 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
         {"indefinite length", join({Bytes{0x30, 0x80}, R, S, Bytes{0x00, 0x00}})},
         {"none", {}},
     };
-}
-
-TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDER) {
-    for (const CurveUnderTest& curve : curves) {
-        const Key key = makeECKey(curve.name);
-        const Bytes digest = digestOfMessage(*curve.profile);
-        const std::size_t size = digest.size();
-        Bytes signature;
-        do
-            signature = sign(key, size, message);
-        while (signature.size() != 8 + 2 * size); // until both numbers need a zero in front
-        const Bytes r(signature.end() - static_cast<long>(2 * size + 3), signature.end() - static_cast<long>(size + 3));
-        const Bytes s(signature.end() - static_cast<long>(size), signature.end());
-        for (const Case& row : pairCases(r, s, parameter(key, OSSL_PKEY_PARAM_EC_ORDER)))
-            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, publicKeyBits(key), row.octets, digest),
-                      row.accepted)
-                << curve.name << ", " << row.name;
-    }
 }
 
 std::vector<Case> pointCases(const Key& key) {
@@ -319,27 +281,30 @@ std::vector<Case> pointCases(const Key& key) {
     };
 }
 
-TEST(Img4ECDSASignature, needsAnUncompressedPointOnItsCurve) {
-    for (const CurveUnderTest& curve : curves) {
-        const Key key = makeECKey(curve.name);
-        const Bytes digest = digestOfMessage(*curve.profile);
-        const Bytes signature = sign(key, digest.size(), message);
-        for (const Case& row : pointCases(key))
-            EXPECT_EQ(accepts(verify_signature_ecdsa, *curve.profile, row.octets, signature, digest), row.accepted)
-                << curve.name << ", " << row.name;
-    }
+void checkCurve(const char* name, const Img4TrustProfile& usual) {
+    SCOPED_TRACE(name);
+    const Key key = makeECKey(name);
+    const Bytes point = publicKeyBits(key);
+    const std::size_t size = usual.digestInfo->length;
+    Bytes signature;
+    do
+        signature = sign(key, size, message);
+    while (signature.size() != 8 + 2 * size); // until both numbers need a zero in front
+    const Bytes r(signature.end() - static_cast<long>(2 * size + 3), signature.end() - static_cast<long>(size + 3));
+    const Bytes s(signature.end() - static_cast<long>(size), signature.end());
+    for (const Case& row : pairCases(r, s, parameter(key, OSSL_PKEY_PARAM_EC_ORDER)))
+        EXPECT_EQ(accepts(verify_signature_ecdsa, usual, point, row.octets), row.accepted) << row.name;
+    for (const Case& row : pointCases(key))
+        EXPECT_EQ(accepts(verify_signature_ecdsa, usual, row.octets, signature), row.accepted) << row.name;
+    for (const Img4DigestInfo* info : digestInfos)
+        EXPECT_TRUE(accepts(verify_signature_ecdsa, profileWith(kImg4DecodeSecureBootEc384Sha384, *info), point,
+                            sign(key, info->length, message)))
+            << info->length;
 }
 
-TEST(Img4ECDSASignature, takesTheCurveFromThePointAndTheDigestFromTheProfile) {
-    for (const char* curve : {"P-256", "P-384"}) {
-        const Key key = makeECKey(curve);
-        for (const Img4DigestInfo* info : digestInfos) {
-            const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootEc384Sha384, *info);
-            EXPECT_TRUE(accepts(verify_signature_ecdsa, profile, publicKeyBits(key), sign(key, info->length, message),
-                                digestOfMessage(profile)))
-                << curve << ", " << info->length;
-        }
-    }
+TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDERUnderAnUncompressedPointWhichTellsTheCurve) {
+    checkCurve("P-256", kImg4DecodeSecureBootEc256Sha256);
+    checkCurve("P-384", kImg4DecodeSecureBootEc384Sha384);
 }
 
 TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
@@ -353,12 +318,11 @@ TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
                 {verify_signature_ecdsa, kImg4DecodeSecureBootEc384Sha384, ecKey}};
     const Img4DigestInfo bare = {48, nullptr, nullptr};
     for (const auto& [verify, profile, signer] : rows) {
-        const Bytes digest = digestOfMessage(profile);
-        const Bytes keyBits = publicKeyBits(signer);
-        const Bytes signatureOctets = sign(signer, 48, message);
-        const DERItem key = viewOf(keyBits), signature = viewOf(signatureOctets), none = {};
-        Img4TrustProfile withoutDigest = profile;
+        const Bytes digest = digestOfMessage(profile), bits = publicKeyBits(signer), octets = sign(signer, 48, message);
+        const DERItem key = viewOf(bits), signature = viewOf(octets), none = {};
+        Img4TrustProfile withoutDigest = profile, withoutKeyAlgorithm = profile;
         withoutDigest.digestInfo = nullptr;
+        withoutKeyAlgorithm.keyAlgorithmOid = nullptr;
         const Img4TrustProfile withoutImplementation = profileWith(profile, bare);
         ASSERT_EQ(verify(&key, &signature, digest.data(), 48, &profile), DERSuccess);
         expectNeedsAll(Img4Failure, verify, &key, &signature, digest.data(), 48, &profile);
@@ -367,11 +331,9 @@ TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
         EXPECT_EQ(verify(&key, &signature, digest.data(), 32, &profile), Img4Failure);
         EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutDigest), Img4Failure);
         EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutImplementation), Img4Failure);
+        EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutKeyAlgorithm),
+                  verify == verify_signature_ecdsa ? Img4Failure : DERSuccess);
     }
-    Img4TrustProfile withoutKeyAlgorithm = kImg4DecodeSecureBootEc384Sha384;
-    withoutKeyAlgorithm.keyAlgorithmOid = nullptr;
-    EXPECT_FALSE(accepts(verify_signature_ecdsa, withoutKeyAlgorithm, publicKeyBits(ecKey), sign(ecKey, 48, message),
-                         digestOfMessage(withoutKeyAlgorithm)));
 }
 
 } // namespace
