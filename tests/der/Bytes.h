@@ -42,4 +42,14 @@ inline DERItem itemOf(const Bytes& bytes) {
     return {bytes.data(), bytes.size()};
 }
 
+// Octets of a table, written as for `bytes`, and their view.
+struct Hex {
+    Hex(const char* hex) : text(hex), octets(bytes(hex)), item(itemOf(octets)) {}
+    Hex(Hex&&) = default; // leaves the octets where they are
+
+    const char* text;
+    Bytes octets;
+    DERItem item;
+};
+
 #endif

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cstddef>
 #include <string>
+#include <tuple>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -46,12 +48,7 @@ TEST(DERItem, isDecodedAlikeByAllThreeDecodersAndCutOffOnlyAsAPart) {
 }
 
 TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
-    const struct {
-        const char* why;
-        const char* octets;
-        DERFault fault;
-        std::ptrdiff_t place;
-    } rows[] = {
+    const std::tuple<const char*, Hex, DERFault, std::ptrdiff_t> rows[] = {
         {"nothing", "", DERFaultHeaderCutShort, 0},
         {"no length", "05", DERFaultHeaderCutShort, 1},
         {"high tag without a digit and length", "1F 1F", DERFaultHeaderCutShort, 2},
@@ -72,26 +69,24 @@ TEST(DERItem, withAHeaderThatIsNotStrictIsRefusedByAllThreeDecoders) {
         {"all length octets missing", "04 81", DERFaultHeaderCutShort, 2},
         {"length octets missing after a high tag", "1F 1F 82 01", DERFaultHeaderCutShort, 4},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.why);
-        const Bytes input = bytes(row.octets);
-        const DERItem der = itemOf(input);
+    for (const auto& [why, der, fault, place] : rows) {
+        SCOPED_TRACE(why);
         DERDecodedInfo decoded;
         DERRefusal refusal;
         std::uint64_t declared = 0;
-        EXPECT_EQ(DERDecodeItemExplained(&der, &decoded, &refusal), DERDecodeError);
-        EXPECT_EQ(refusal.fault, row.fault);
-        EXPECT_EQ(refusal.place - input.data(), row.place);
-        EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&der, &decoded, nullptr), DERDecodeError);
-        EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&der, &decoded, &declared), DERDecodeError);
-        EXPECT_EQ(DERDecodeItemPartialBuffer(&der, &decoded, false), DERDecodeError);
-        EXPECT_EQ(DERDecodeItemPartialBuffer(&der, &decoded, true), DERDecodeError);
+        EXPECT_EQ(DERDecodeItemExplained(&der.item, &decoded, &refusal), DERDecodeError);
+        EXPECT_EQ(refusal.fault, fault);
+        EXPECT_EQ(refusal.place - der.item.data, place);
+        EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&der.item, &decoded, nullptr), DERDecodeError);
+        EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&der.item, &decoded, &declared), DERDecodeError);
+        EXPECT_EQ(DERDecodeItemPartialBuffer(&der.item, &decoded, false), DERDecodeError);
+        EXPECT_EQ(DERDecodeItemPartialBuffer(&der.item, &decoded, true), DERDecodeError);
     }
 }
 
 TEST(DERItem, mayBeDecodedOntoTheItemItComesFrom) {
-    const Bytes input = bytes("30 04 A0 02 05 00");
-    DERDecodedInfo decoded = {0, itemOf(input)};
+    const Hex input = "30 04 A0 02 05 00";
+    DERDecodedInfo decoded = {0, input.item};
     EXPECT_EQ(DERDecodeItem(&decoded.content, &decoded), DERSuccess);
     std::uint64_t declared = 0;
     EXPECT_EQ(DERDecodeItemPartialBufferGetLength(&decoded.content, &decoded, &declared), DERSuccess);
@@ -104,11 +99,7 @@ DERReturn countItem(const DERDecodedInfo*, bool*, void* context) {
 }
 
 TEST(DERSequence, isWalkedWhenItIsAConstructedSequenceOrSet) {
-    const struct {
-        const char* der;
-        DERReturn code;
-        DERTag tag;
-    } rows[] = {
+    const std::tuple<Hex, DERReturn, DERTag> rows[] = {
         {"30 02 05 00 FF", DERSuccess, DERTagSequence},
         {"31 02 05 00", DERSuccess, DERTagSet},
         {"10 02 05 00", DERUnexpectedTag, 0x10},
@@ -116,29 +107,22 @@ TEST(DERSequence, isWalkedWhenItIsAConstructedSequenceOrSet) {
         {"B0 02 05 00", DERUnexpectedTag, DERTagContextConstructed(0x10)},
         {"30 03 05 00", DERDecodeError, 0},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.der);
-        const Bytes input = bytes(row.der);
-        const DERItem der = itemOf(input);
-        DERTag tag = 0;
+    for (const auto& [der, code, tag] : rows) {
+        SCOPED_TRACE(der.text);
+        DERTag found = 0;
         DERSequence sequence{};
-        EXPECT_EQ(DERDecodeSeqInit(&der, &tag, &sequence), row.code);
-        EXPECT_EQ(tag, row.tag);
-        EXPECT_EQ(sequence.next, row.code == DERSuccess ? input.data() + 2 : nullptr);
-        EXPECT_EQ(sequence.end, row.code == DERSuccess ? input.data() + 4 : nullptr);
+        EXPECT_EQ(DERDecodeSeqInit(&der.item, &found, &sequence), code);
+        EXPECT_EQ(found, tag);
+        EXPECT_EQ(sequence.next, code == DERSuccess ? der.item.data + 2 : nullptr);
+        EXPECT_EQ(sequence.end, code == DERSuccess ? der.item.data + 4 : nullptr);
         int calls = 0;
-        EXPECT_EQ(DERDecodeSequenceWithBlock(&der, countItem, &calls), row.code);
-        EXPECT_EQ(calls, row.code == DERSuccess ? 1 : 0);
+        EXPECT_EQ(DERDecodeSequenceWithBlock(&der.item, countItem, &calls), code);
+        EXPECT_EQ(calls, code == DERSuccess ? 1 : 0);
     }
 }
 
 TEST(DERSequence, walkStopsAtTheEndOrBeforeTheItemThatIsBad) {
-    const struct {
-        const char* content;
-        int items;
-        std::uint64_t consumed;
-        DERReturn end;
-    } rows[] = {
+    const std::tuple<const char*, int, std::uint64_t, DERReturn> rows[] = {
         {"", 0, 0, DEREndOfSequence},
         {"02 01 05 30 03 04 01 FF FF 1F 00", 3, 11, DEREndOfSequence},
         {"02 01 05 04", 1, 3, DERDecodeError},
@@ -146,10 +130,10 @@ TEST(DERSequence, walkStopsAtTheEndOrBeforeTheItemThatIsBad) {
         {"05 00 1F 1E 00", 1, 2, DERDecodeError},
         {"04 81 80", 0, 0, DERDecodeError},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.content);
+    for (const auto& [octets, expectedItems, consumed, end] : rows) {
+        SCOPED_TRACE(octets);
         // The octet behind the content would complete the cut-off item: it must not be looked at.
-        Bytes input = bytes(row.content);
+        Bytes input = bytes(octets);
         const std::uint64_t length = input.size();
         input.resize(length + 200);
         const DERItem content = {input.data(), length};
@@ -159,13 +143,13 @@ TEST(DERSequence, walkStopsAtTheEndOrBeforeTheItemThatIsBad) {
         int items = 0;
         while (DERDecodeSeqNext(&sequence, &decoded) == DERSuccess)
             ++items;
-        EXPECT_EQ(DERDecodeSeqNext(&sequence, &decoded), row.end);
-        EXPECT_EQ(items, row.items);
-        EXPECT_EQ(sequence.next, input.data() + row.consumed);
+        EXPECT_EQ(DERDecodeSeqNext(&sequence, &decoded), end);
+        EXPECT_EQ(items, expectedItems);
+        EXPECT_EQ(sequence.next, input.data() + consumed);
         int calls = 0;
         EXPECT_EQ(DERDecodeSequenceContentWithBlock(&content, countItem, &calls),
-                  row.end == DEREndOfSequence ? DERSuccess : row.end);
-        EXPECT_EQ(calls, row.items);
+                  end == DEREndOfSequence ? DERSuccess : end);
+        EXPECT_EQ(calls, expectedItems);
     }
 }
 
@@ -175,10 +159,7 @@ TEST(DERSequence, callbackDecidesWhenTheWalkEndsAndHow) {
         DERReturn result;
         bool stop;
     };
-    const struct {
-        Script script;
-        DERReturn code;
-    } rows[] = {
+    const std::pair<Script, DERReturn> rows[] = {
         {{2, DERSuccess, true}, DERSuccess},
         {{2, DEREndOfSequence, false}, DERSuccess},
         {{2, DERUnexpectedTag, false}, DERUnexpectedTag},
@@ -190,21 +171,16 @@ TEST(DERSequence, callbackDecidesWhenTheWalkEndsAndHow) {
         *stop = --script->calls == 0 && script->stop;
         return script->calls == 0 ? script->result : DERSuccess;
     };
-    const Bytes input = bytes("05 00 05 00 05");
-    const DERItem content = itemOf(input);
-    for (const auto& row : rows) {
-        Script script = row.script;
-        EXPECT_EQ(DERDecodeSequenceContentWithBlock(&content, callback, &script), row.code) << &row - rows;
-        EXPECT_EQ(script.calls, 0) << &row - rows;
+    const Hex content = "05 00 05 00 05";
+    for (auto [script, code] : rows) {
+        EXPECT_EQ(DERDecodeSequenceContentWithBlock(&content.item, callback, &script), code);
+        EXPECT_EQ(script.calls, 0);
     }
 }
 
 TEST(DERPrimitive, integersAreNonNegativeMinimalAndFit) {
-    const struct {
-        const char* content;
-        DERReturn code;
-        std::uint64_t value = 77; // as it was
-    } rows[] = {
+    constexpr std::uint64_t asItWas = 77;
+    const std::tuple<Hex, DERReturn, std::uint64_t> rows[] = {
         {"00", DERSuccess, 0},
         {"7F", DERSuccess, 0x7F},
         {"00 80", DERSuccess, 0x80},
@@ -214,93 +190,75 @@ TEST(DERPrimitive, integersAreNonNegativeMinimalAndFit) {
         {"7F FF FF FF FF FF FF FF", DERSuccess, INT64_MAX},
         {"00 80 00 00 00 00 00 00 00", DERSuccess, UINT64_C(1) << 63},
         {"00 FF FF FF FF FF FF FF FF", DERSuccess, UINT64_MAX},
-        {"01 00 00 00 00 00 00 00 00", DERBufferOverflow},
-        {"00 80 00 00 00 00 00 00 00 00", DERBufferOverflow},
-        {"", DERDecodeError},
-        {"80", DERDecodeError},
-        {"FF FF FF FF FF FF FF FF FF", DERDecodeError},
-        {"00 00", DERDecodeError},
-        {"00 7F", DERDecodeError},
-        {"00 7F 00 00 00 00 00 00 00 00", DERDecodeError},
+        {"01 00 00 00 00 00 00 00 00", DERBufferOverflow, asItWas},
+        {"00 80 00 00 00 00 00 00 00 00", DERBufferOverflow, asItWas},
+        {"", DERDecodeError, asItWas},
+        {"80", DERDecodeError, asItWas},
+        {"FF FF FF FF FF FF FF FF FF", DERDecodeError, asItWas},
+        {"00 00", DERDecodeError, asItWas},
+        {"00 7F", DERDecodeError, asItWas},
+        {"00 7F 00 00 00 00 00 00 00 00", DERDecodeError, asItWas},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.content);
-        const Bytes input = bytes(row.content);
-        const DERItem content = itemOf(input);
-        std::uint64_t value64 = 77;
-        EXPECT_EQ(DERParseInteger64(&content, &value64), row.code);
-        EXPECT_EQ(value64, row.value);
-        std::uint32_t value32 = 77;
-        const bool fits = row.value <= UINT32_MAX;
-        EXPECT_EQ(DERParseInteger(&content, &value32), fits ? row.code : DERBufferOverflow);
-        EXPECT_EQ(value32, fits ? row.value : 77);
+    for (const auto& [content, code, value] : rows) {
+        SCOPED_TRACE(content.text);
+        std::uint64_t value64 = asItWas;
+        EXPECT_EQ(DERParseInteger64(&content.item, &value64), code);
+        EXPECT_EQ(value64, value);
+        std::uint32_t value32 = asItWas;
+        const bool fits = value <= UINT32_MAX;
+        EXPECT_EQ(DERParseInteger(&content.item, &value32), fits ? code : DERBufferOverflow);
+        EXPECT_EQ(value32, fits ? value : asItWas);
     }
 }
 
 TEST(DERPrimitive, booleansAreOneOctetOfAllBitsAlike) {
-    const struct {
-        const char* content;
-        DERReturn code;
-        bool value;
-    } rows[] = {
+    const std::tuple<Hex, DERReturn, bool> rows[] = {
         {"00", DERSuccess, false},        {"FF", DERSuccess, true},    {"01", DERDecodeError, false},
         {"FF FF", DERDecodeError, false}, {"", DERDecodeError, false},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.content);
-        const Bytes input = bytes(row.content);
-        const DERItem content = itemOf(input);
-        bool value = !row.value;
-        EXPECT_EQ(DERParseBoolean(&content, &value), row.code);
-        EXPECT_EQ(value, row.code == DERSuccess ? row.value : !row.value);
+    for (const auto& [content, code, expected] : rows) {
+        SCOPED_TRACE(content.text);
+        bool value = !expected;
+        EXPECT_EQ(DERParseBoolean(&content.item, &value), code);
+        EXPECT_EQ(value, code == DERSuccess ? expected : !expected);
         for (const bool fallback : {false, true}) {
-            const bool usesFallback = input.empty();
+            const bool usesFallback = content.item.length == 0;
             value = !fallback;
-            EXPECT_EQ(DERParseBooleanWithDefault(&content, fallback, &value), usesFallback ? DERSuccess : row.code);
-            if (usesFallback || row.code == DERSuccess) {
-                EXPECT_EQ(value, usesFallback ? fallback : row.value);
+            EXPECT_EQ(DERParseBooleanWithDefault(&content.item, fallback, &value), usesFallback ? DERSuccess : code);
+            if (usesFallback || code == DERSuccess) {
+                EXPECT_EQ(value, usesFallback ? fallback : expected);
             }
         }
     }
 }
 
 TEST(DERPrimitive, bitStringsKeepTheirUnusedBitsZero) {
-    const struct {
-        const char* content;
-        DERReturn code;
-        const char* bits;
-        int unused;
-    } rows[] = {
+    const std::tuple<Hex, DERReturn, const char*, int> rows[] = {
         {"00", DERSuccess, "absent", 0},         {"00 FF", DERSuccess, "FF", 0},
         {"03 F8", DERSuccess, "F8", 3},          {"07 FF 80", DERSuccess, "FF 80", 7},
         {"", DERDecodeError, "absent", 0},       {"01", DERDecodeError, "absent", -1},
         {"03 F9", DERDecodeError, "absent", -1}, {"07 FF C0", DERDecodeError, "absent", -1},
         {"08 00", DERDecodeError, "absent", -1}, {"FF 00", DERDecodeError, "absent", -1},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.content);
-        const Bytes input = bytes(row.content);
-        const DERItem content = itemOf(input);
-        DERItem bits = content;
+    for (const auto& [content, code, expectedBits, expectedUnused] : rows) {
+        SCOPED_TRACE(content.text);
+        DERItem bits = content.item;
         std::uint8_t unused = 99;
-        EXPECT_EQ(DERParseBitString(&content, &bits, &unused), row.code);
-        EXPECT_EQ(hexOf(bits), row.bits);
-        if (row.unused >= 0) {
-            EXPECT_EQ(unused, row.unused);
+        EXPECT_EQ(DERParseBitString(&content.item, &bits, &unused), code);
+        EXPECT_EQ(hexOf(bits), expectedBits);
+        if (expectedUnused >= 0) {
+            EXPECT_EQ(unused, expectedUnused);
         }
     }
 }
 
 TEST(DERPrimitive, objectIdentifiersAreEqualOnlyWhenBothArePresentAndAlike) {
-    const Bytes octets = bytes("60 86 48 01 65 03 04 02 01");
-    const Bytes copy = bytes("60 86 48 01 65 03 04 02 01");
-    const Bytes otherOctets = bytes("60 86 48 01 65 03 04 02 02");
-    const DERItem oid = itemOf(octets), same = itemOf(copy), different = itemOf(otherOctets);
-    const DERItem shorter = {octets.data(), octets.size() - 1}, empty = {octets.data(), 0}, absent = {};
-    EXPECT_TRUE(DEROidCompare(&oid, &same));
+    const Hex same = "60 86 48", copy = "60 86 48", different = "60 86 49";
+    const DERItem oid = same.item, shorter = {oid.data, 2}, empty = {oid.data, 0}, absent = {};
+    EXPECT_TRUE(DEROidCompare(&oid, &copy.item));
     EXPECT_TRUE(DEROidCompare(&empty, &empty));
     EXPECT_FALSE(DEROidCompare(&oid, &shorter));
-    EXPECT_FALSE(DEROidCompare(&oid, &different));
+    EXPECT_FALSE(DEROidCompare(&oid, &different.item));
     EXPECT_FALSE(DEROidCompare(&absent, &absent));
     EXPECT_FALSE(DEROidCompare(&empty, &absent));
     EXPECT_FALSE(DEROidCompare(nullptr, &oid));

@@ -1,7 +1,7 @@
 #include "der/DEREncode.h"
 
-#include <memory>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -142,32 +142,27 @@ TEST(DEREncode, sequencesFollowTheirTable) {
 
 TEST(DEREncode, rowsOutsideTheRecordAreRefused) {
     const DERItem items[5] = {};
-    const struct {
-        std::uint64_t offset;
-        std::uint64_t objectSize;
-        DERReturn code;
-    } rows[] = {
+    const std::tuple<std::uint64_t, std::uint64_t, DERReturn> rows[] = {
         {0x40, 0x50, DERSuccess},
         {0x40, 0x48, DERBufferOverflow},
         {0, 8, DERBufferOverflow},
         {UINT64_MAX - 15, 0x50, DERBufferOverflow},
         {UINT64_MAX - 7, UINT64_MAX, DERBufferOverflow},
     };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.offset);
-        const DERItemSpec specs[] = {{0, DERTagOctetString, 0}, {row.offset, DERTagOctetString, 0}};
-        const bool good = row.code == DERSuccess;
+    for (const auto& [offset, objectSize, code] : rows) {
+        SCOPED_TRACE(offset);
+        const DERItemSpec specs[] = {{0, DERTagOctetString, 0}, {offset, DERTagOctetString, 0}};
+        const bool good = code == DERSuccess;
         std::uint64_t size = 7;
-        EXPECT_EQ(DERLengthOfSequenceContent(items, row.objectSize, 2, specs, &size), row.code);
+        EXPECT_EQ(DERLengthOfSequenceContent(items, objectSize, 2, specs, &size), code);
         EXPECT_EQ(size, good ? 4 : 0);
         size = 7;
-        EXPECT_EQ(DERLengthOfEncodedSequenceFromObject(DERTagSet, items, row.objectSize, 2, specs, &size), row.code);
+        EXPECT_EQ(DERLengthOfEncodedSequenceFromObject(DERTagSet, items, objectSize, 2, specs, &size), code);
         EXPECT_EQ(size, good ? 6 : 7);
         std::uint8_t buffer[64];
         std::uint64_t written = 7;
-        EXPECT_EQ(
-            DEREncodeSequenceFromObject(DERTagSet, items, row.objectSize, 2, specs, buffer, sizeof buffer, &written),
-            row.code);
+        EXPECT_EQ(DEREncodeSequenceFromObject(DERTagSet, items, objectSize, 2, specs, buffer, sizeof buffer, &written),
+                  code);
         EXPECT_EQ(written, good ? 6 : 7);
     }
 }

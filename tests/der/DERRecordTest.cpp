@@ -1,6 +1,7 @@
 // Records filled from item-spec tables.
 #include <cstring>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -54,7 +55,7 @@ TEST(DERRecord, isFilledRowByRow) {
     const struct {
         const char* what;
         const Table& table;
-        const char* content;
+        Hex content;
         DERReturn code;
         const char* record;
         DERFault fault = DERFaultNone;
@@ -98,8 +99,7 @@ TEST(DERRecord, isFilledRowByRow) {
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        const Bytes input = bytes(row.content);
-        const DERItem content = itemOf(input);
+        const auto& [text, input, content] = row.content;
         const auto count = static_cast<std::uint16_t>(row.table.size());
         Record record;
         DERRefusal refusal = {DERFaultNone, 0, input.data(), nullptr, 0, 0};
@@ -125,34 +125,23 @@ TEST(DERRecord, isFilledRowByRow) {
 }
 
 TEST(DERRecord, isZeroedAsFarAsAskedWhateverFollows) {
-    const Bytes input = bytes("02 01 05 04 01 BB");
-    const DERItem content = itemOf(input);
-    const DERItem bad = {input.data(), 1};
-    const struct {
-        DERItem content;
-        std::uint64_t sizeToZero;
-        DERReturn code;
-        const char* record;
-    } rows[] = {
+    const Hex whole = "02 01 05 04 01 BB";
+    const DERItem content = whole.item, bad = {content.data, 1};
+    const std::tuple<DERItem, std::uint64_t, DERReturn, const char*> rows[] = {
         {content, 0, DERSuccess, "05 | untouched | BB"},
         {content, place(2), DERSuccess, "05 | absent | BB"},
         {bad, 0, DERDecodeError, "untouched | untouched | untouched"},
         {bad, place(1), DERDecodeError, "absent | untouched | untouched"},
     };
-    for (const auto& row : rows) {
+    for (const auto& [from, sizeToZero, code, text] : rows) {
         Record record;
-        EXPECT_EQ(DERParseSequenceContent(&row.content, 3, plain.data(), &record, row.sizeToZero), row.code);
-        EXPECT_EQ(textOf(record), row.record);
+        EXPECT_EQ(DERParseSequenceContent(&from, 3, plain.data(), &record, sizeToZero), code);
+        EXPECT_EQ(textOf(record), text);
     }
 }
 
 TEST(DERRecord, isNeverWrittenBeyondItsSize) {
-    const struct {
-        std::uint64_t offset;
-        std::uint64_t destSize;
-        const char* content;
-        DERReturn code;
-    } rows[] = {
+    const std::tuple<std::uint64_t, std::uint64_t, Hex, DERReturn> rows[] = {
         {16, 32, "02 01 05", DERSuccess},
         {16, 31, "02 01 05", DERBufferOverflow},
         {17, 32, "02 01 05", DERBufferOverflow},
@@ -161,45 +150,36 @@ TEST(DERRecord, isNeverWrittenBeyondItsSize) {
         {UINT64_MAX - 7, UINT64_MAX, "02 01 05", DERBufferOverflow},
         {UINT64_MAX, 0, "", DERSuccess},
     };
-    for (const auto& row : rows) {
-        const DERItemSpec spec = {row.offset, DERTagInteger, DEROptionOptional};
-        const Bytes input = bytes(row.content);
-        const DERItem content = itemOf(input);
+    for (const auto& [offset, destSize, content, code] : rows) {
+        const DERItemSpec spec = {offset, DERTagInteger, DEROptionOptional};
         Record record;
-        EXPECT_EQ(DERParseSequenceContentToObject(&content, 1, &spec, &record, row.destSize, 0), row.code)
-            << row.offset << " in " << row.destSize;
-        EXPECT_EQ(textOf(record), row.offset == 16 && row.code == DERSuccess ? "untouched | 05 | untouched"
-                                                                             : "untouched | untouched | untouched");
+        EXPECT_EQ(DERParseSequenceContentToObject(&content.item, 1, &spec, &record, destSize, 0), code)
+            << offset << " in " << destSize;
+        EXPECT_EQ(textOf(record), offset == 16 && code == DERSuccess ? "untouched | 05 | untouched"
+                                                                     : "untouched | untouched | untouched");
     }
 }
 
 TEST(DERRecord, needNotBeAligned) {
     const DERItemSpec spec = {3, DERTagInteger, 0};
-    const Bytes input = bytes("02 01 05");
-    const DERItem content = itemOf(input);
+    const Hex content = "02 01 05";
     std::uint8_t record[3 + sizeof(DERItem)] = {};
-    ASSERT_EQ(DERParseSequenceContentToObject(&content, 1, &spec, record, sizeof record, 0), DERSuccess);
+    ASSERT_EQ(DERParseSequenceContentToObject(&content.item, 1, &spec, record, sizeof record, 0), DERSuccess);
     DERItem stored;
     std::memcpy(&stored, record + 3, sizeof stored);
     EXPECT_EQ(hexOf(stored), "05");
 }
 
 TEST(DERRecord, isLeftAloneUnlessTheItemIsASequence) {
-    const struct {
-        const char* der;
-        DERReturn code;
-        const char* record = "untouched | untouched | untouched";
-    } rows[] = {
+    const std::tuple<Hex, DERReturn, const char*> rows[] = {
         {"30 03 02 01 05 FF FF", DERSuccess, "05 | absent | absent"},
-        {"31 03 02 01 05", DERUnexpectedTag},
-        {"30 03 02 01", DERDecodeError},
+        {"31 03 02 01 05", DERUnexpectedTag, "untouched | untouched | untouched"},
+        {"30 03 02 01", DERDecodeError, "untouched | untouched | untouched"},
     };
-    for (const auto& row : rows) {
-        const Bytes input = bytes(row.der);
-        const DERItem der = itemOf(input);
+    for (const auto& [der, code, text] : rows) {
         Record record;
-        EXPECT_EQ(DERParseSequence(&der, 3, optionalEnd.data(), &record, sizeof record), row.code) << row.der;
-        EXPECT_EQ(textOf(record), row.record) << row.der;
+        EXPECT_EQ(DERParseSequence(&der.item, 3, optionalEnd.data(), &record, sizeof record), code) << der.text;
+        EXPECT_EQ(textOf(record), text) << der.text;
     }
 }
 
