@@ -2,6 +2,8 @@
 #include "tests/img4/TrustDomain.h"
 #include "tests/support/MissingArguments.h"
 
+#include <tuple>
+
 #include <gtest/gtest.h>
 
 namespace {
@@ -21,28 +23,23 @@ DERReturn count(DERTag tag, const Img4PropertyValue* value, std::uint32_t select
 
 TEST(Img4PropertyWalk, judgesEveryPropertyOrSaysWhichIsNone) {
     const Bytes content = sequence({ia5("ABCD"), integer(1)});
-    const struct {
-        const char* name;
-        Bytes dictionary;
-        DERReturn expected;
-        unsigned seen = 0;
-    } rows[] = {
-        {"nothing", {}, DERSuccess},
+    const std::tuple<const char*, Bytes, DERReturn, unsigned> rows[] = {
+        {"nothing", {}, DERSuccess, 0},
         {"the same property twice", join({good, good}), DERSuccess, 2},
         {"value that is a SET", join({good, property("ABCD", set({}))}), DERUnexpectedTag, 1},
-        {"value that is NULL", property("ABCD", {0x05, 0x00}), DERUnexpectedTag},
-        {"name that is another", item(propertyTag("ABCE"), content), DERUnexpectedTag},
-        {"property in a universal tag", item(DERTagSet, content), DERUnexpectedTag},
-        {"property in an application tag", item(0x6000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag},
-        {"property in a primitive tag", item(0xC000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag},
-        {"octets behind the property", item(propertyTag("ABCD"), join({content, content})), DERBufferOverflow},
+        {"value that is NULL", property("ABCD", {0x05, 0x00}), DERUnexpectedTag, 0},
+        {"name that is another", item(propertyTag("ABCE"), content), DERUnexpectedTag, 0},
+        {"property in a universal tag", item(DERTagSet, content), DERUnexpectedTag, 0},
+        {"property in an application tag", item(0x6000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag, 0},
+        {"property in a primitive tag", item(0xC000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag, 0},
+        {"octets behind the property", item(propertyTag("ABCD"), join({content, content})), DERBufferOverflow, 0},
         {"element cut short", join({good, Bytes{0xFF}}), DERDecodeError, 1},
     };
-    for (const auto& row : rows) {
-        const DERItem view = viewOf(row.dictionary);
+    for (const auto& [name, dictionary, expected, expectedSeen] : rows) {
+        const DERItem view = viewOf(dictionary);
         unsigned seen = 0;
-        EXPECT_EQ(Img4DecodeEvaluateDictionaryProperties(&view, 9, count, &seen), row.expected) << row.name;
-        EXPECT_EQ(seen, row.seen) << row.name;
+        EXPECT_EQ(Img4DecodeEvaluateDictionaryProperties(&view, 9, count, &seen), expected) << name;
+        EXPECT_EQ(seen, expectedSeen) << name;
     }
     const DERItem view = viewOf(good);
     const Img4Record record = {};
@@ -60,15 +57,9 @@ Bytes onObject(const List& constraints) {
     return set({object("OBJP", constraints)});
 }
 
-struct ConstraintCase {
-    const char* name;
-    Bytes certProperties;
-    DERReturn expected;
-};
-
 const Bytes data = filler(20);
 
-const ConstraintCase constraintCases[] = {
+const std::tuple<const char*, Bytes, DERReturn> constraintCases[] = {
     {"none", set({}), DERSuccess},
     {"empty ones", set({object("MANP", {}), object("OBJP", {})}), DERSuccess},
     {"BOOLEAN met", onManifest({property("FLAG", boolean(true))}), DERSuccess},
@@ -118,17 +109,17 @@ TEST(Img4Constraints, bindManifestAndObject) {
     const Bytes manp = join({property("FLAG", boolean(true)), property("NUMB", integer(0x1234)),
                              property("DATA", octets(data)), property("TEXT", ia5("text"))});
     const Bytes objp = property("SIZE", integer(5));
-    for (const ConstraintCase& row : constraintCases) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, certProperties, expected] : constraintCases) {
+        SCOPED_TRACE(name);
         Img4Record record = {};
         Img4Refusal refusal = {};
         record.manp = viewOf(manp);
         record.objp = viewOf(objp);
-        record.manifest.certProperties = viewOf(row.certProperties);
-        EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), row.expected);
-        EXPECT_EQ(Img4DecodeEvaluateCertificatePropertiesExplained(&record, keepRefusal, &refusal), row.expected);
-        EXPECT_EQ(refusal.status, row.expected);
-        EXPECT_EQ(refusal.fault == Img4FaultNone, row.expected == DERSuccess);
+        record.manifest.certProperties = viewOf(certProperties);
+        EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), expected);
+        EXPECT_EQ(Img4DecodeEvaluateCertificatePropertiesExplained(&record, keepRefusal, &refusal), expected);
+        EXPECT_EQ(refusal.status, expected);
+        EXPECT_EQ(refusal.fault == Img4FaultNone, expected == DERSuccess);
     }
 }
 

@@ -3,6 +3,7 @@
 
 #include <cstring>
 #include <string>
+#include <tuple>
 
 #include <gtest/gtest.h>
 
@@ -42,14 +43,7 @@ constexpr Initialise asPayload = Img4DecodeInitPayload;
 constexpr Initialise asManifest = Img4DecodeInitManifest;
 constexpr Initialise asUnsigned = Img4DecodeInitUnsignedManifest;
 
-struct Case {
-    const char* name;
-    Initialise initialise;
-    Bytes buffer;
-    DERReturn expected;
-};
-
-const Case cases[] = {
+const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
     {"payload only", asContainer, containerWith(soundPayload), DERSuccess},
     {"everything", asContainer, exampleContainer(), DERSuccess},
     {"restore information without manifest", asContainer, container(soundPayload, {}, soundRestoreInfo), DERSuccess},
@@ -117,20 +111,20 @@ const Case cases[] = {
 constexpr Initialise ofKind[] = {nullptr, asContainer, asPayload, asManifest, asUnsigned};
 
 TEST(Img4Init, reportsTheFirstCheckThatFails) {
-    for (const Case& row : cases) {
-        SCOPED_TRACE(row.name);
+    for (const auto& [name, initialise, octets, expected] : cases) {
+        SCOPED_TRACE(name);
         Img4Record record;
         Img4Kind kind;
         Img4Refusal refusal;
         // A vector's data may be null when it is empty; the buffer must not be.
         const std::uint8_t none = 0;
-        const std::uint8_t* buffer = row.buffer.empty() ? &none : row.buffer.data();
-        EXPECT_EQ(row.initialise(buffer, row.buffer.size(), &record), row.expected);
-        const DERReturn explained = Img4DecodeInitExplained(buffer, row.buffer.size(), &record, &kind, &refusal);
-        EXPECT_EQ(explained, ofKind[kind] == row.initialise ? row.expected : explained);
+        const std::uint8_t* buffer = octets.empty() ? &none : octets.data();
+        EXPECT_EQ(initialise(buffer, octets.size(), &record), expected);
+        const DERReturn explained = Img4DecodeInitExplained(buffer, octets.size(), &record, &kind, &refusal);
+        EXPECT_EQ(explained, ofKind[kind] == initialise ? expected : explained);
         EXPECT_EQ(refusal.status, explained);
         EXPECT_EQ(refusal.fault == Img4FaultNone, explained == DERSuccess);
-        EXPECT_EQ(refusal.place >= buffer && refusal.place <= buffer + row.buffer.size(), explained != DERSuccess);
+        EXPECT_EQ(refusal.place >= buffer && refusal.place <= buffer + octets.size(), explained != DERSuccess);
     }
 }
 

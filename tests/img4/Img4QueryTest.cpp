@@ -71,10 +71,7 @@ std::string askPayload(const Img4Record* record) {
 TEST(Img4Payload, givesItsFieldsOrClearsWhatItIsAskedFor) {
     const std::string nothing = "4294967295,4294967295";
     const Bytes emptyKeybag = sequence({ia5("IM4P"), ia5("sepi"), ia5("1"), octets({1}), octets({})});
-    const struct {
-        Bytes payload;
-        std::string answers;
-    } rows[] = {
+    const std::pair<Bytes, std::string> rows[] = {
         {payload({.type = "ABCD", .keybag = {9, 8, 7}, .compression = compression(1, 0xFFFFFFFE)}),
          "0:1 0:64 0:8 0:1094861636 0:1 0:3 0:1 0:1,4294967294"},
         {payload({}), "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:0 1:" + nothing},
@@ -83,9 +80,9 @@ TEST(Img4Payload, givesItsFieldsOrClearsWhatItIsAskedFor) {
         {payload({.compression = compression(0, 0x100000000)}), "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:1 7:" + nothing},
         {payload({.data = {}}), "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing},
     };
-    for (const auto& row : rows) {
-        const Img4Record record = recordOf(Img4DecodeInitPayload, row.payload);
-        EXPECT_EQ(askPayload(&record), row.answers);
+    for (const auto& [payload, expected] : rows) {
+        const Img4Record record = recordOf(Img4DecodeInitPayload, payload);
+        EXPECT_EQ(askPayload(&record), expected);
     }
     const Img4Record none = {};
     EXPECT_EQ(askPayload(&none), "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing);
@@ -198,12 +195,8 @@ TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
     const Bytes misnamed = item(propertyTag("sepi"), sequence({ia5("ipes"), set({})}));
     Bytes mixed = manifestWith(2, {manp, sep});
     mixed[10] = 1; // the version
-    const struct {
-        const char* name;
-        Bytes manifest;
-        DERReturn object;  // of the lookup of "eksp" in "sepi"
-        DERReturn section; // of the lookup of "brdI" in the manifest's own properties
-    } rows[] = {
+    // With what becomes of a lookup of "eksp" in "sepi", and of one of "brdI" in the manifest's own properties.
+    const std::tuple<const char*, Bytes, DERReturn, DERReturn> rows[] = {
         {"sound", manifestWith(0, {manp, sep}), DERSuccess, DERSuccess},
         {"MANP behind the object", manifestWith(1, {sep, manp}), DERSuccess, DERSuccess},
         {"version 2 with a SEQUENCE", manifestWith(2, {manp, sep}), DERSuccess, DERSuccess},
@@ -217,14 +210,14 @@ TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
         {"object under another name", manifestWith(0, {manp, misnamed}), DERUnexpectedTag, DERSuccess},
         {"broken element before the object", manifestWith(0, {manp, {0x05, 0x01}}), DERDecodeError, DERSuccess},
     };
-    for (const auto& row : rows) {
-        const Img4Record record = recordOf(Img4DecodeInitManifest, row.manifest);
+    for (const auto& [name, manifest, ofObject, ofSection] : rows) {
+        const Img4Record record = recordOf(Img4DecodeInitManifest, manifest);
         bool entitled = false;
         std::uint32_t board = 0;
-        EXPECT_EQ(Img4DecodeGetObjectPropertyBoolean(&record, sepi, eksp, &entitled), row.object) << row.name;
-        EXPECT_EQ(entitled, row.object == DERSuccess) << row.name;
-        EXPECT_EQ(Img4DecodeGetIntegerFromSection(&record, Img4SectionManifest, brdI, &board), row.section) << row.name;
-        EXPECT_EQ(board, row.section == DERSuccess ? 12U : 0U) << row.name;
+        EXPECT_EQ(Img4DecodeGetObjectPropertyBoolean(&record, sepi, eksp, &entitled), ofObject) << name;
+        EXPECT_EQ(entitled, ofObject == DERSuccess) << name;
+        EXPECT_EQ(Img4DecodeGetIntegerFromSection(&record, Img4SectionManifest, brdI, &board), ofSection) << name;
+        EXPECT_EQ(board, ofSection == DERSuccess ? 12U : 0U) << name;
     }
     const Bytes bare = unsignedManifest({.objects = {sep}});
     const Img4Record record = recordOf(Img4DecodeInitUnsignedManifest, bare);

@@ -309,13 +309,10 @@ TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDERUnderAnUncompressedPointWhic
 
 TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
     const Key ecKey = makeECKey("P-384");
-    const struct {
-        Verifier verify;
-        const Img4TrustProfile& profile;
-        const Key& key;
-    } rows[] = {{verify_signature_rsa, kImg4DecodeSecureBootRsa4kSha384, rsaKey()},
-                {verify_signature_rsa3k, kImg4DecodeSecureBootRsa3kSha384, rsaKey()},
-                {verify_signature_ecdsa, kImg4DecodeSecureBootEc384Sha384, ecKey}};
+    const std::tuple<Verifier, const Img4TrustProfile&, const Key&> rows[] = {
+        {verify_signature_rsa, kImg4DecodeSecureBootRsa4kSha384, rsaKey()},
+        {verify_signature_rsa3k, kImg4DecodeSecureBootRsa3kSha384, rsaKey()},
+        {verify_signature_ecdsa, kImg4DecodeSecureBootEc384Sha384, ecKey}};
     const Img4DigestInfo bare = {48, nullptr, nullptr};
     for (const auto& [verify, profile, signer] : rows) {
         const Bytes digest = digestOfMessage(profile), bits = publicKeyBits(signer), octets = sign(signer, 48, message);

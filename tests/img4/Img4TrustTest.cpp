@@ -302,31 +302,25 @@ TEST(Img4TrustSteps, endWhereTheDictionariesOrTheObjectAreMissing) {
     const auto withBody = [](std::uint64_t version, const Bytes& body) {
         return sequence({ia5("IM4M"), integer(version), body, octets({1}), sequence({})});
     };
-    const struct {
-        const char* name;
-        Bytes manifest;
-        std::uint32_t object;
-        DERReturn expected;
-        bool hasDictionaries;
-    } rows[] = {
+    const std::tuple<const char*, Bytes, std::uint32_t, DERReturn, bool> rows[] = {
         {"no object", scriptedManifest(), none, DEREndOfSequence, true},
         {"no dictionaries", withBody(0, set({object("MANX", {})})), sepi, DEREndOfSequence, false},
         {"dictionaries of another version", withBody(2, manifestBody({})), sepi, DERUnexpectedTag, false},
     };
-    for (const auto& row : rows) {
+    for (const auto& [name, manifest, object, expected, hasDictionaries] : rows) {
         for (const bool byParts : {false, true}) {
-            SCOPED_TRACE(row.name);
-            Decoded decoded(row.manifest);
+            SCOPED_TRACE(name);
+            Decoded decoded(manifest);
             Img4Record& record = decoded.record;
             record.objp = viewOf(foundObject);
             script = {"", {}, &record, {}};
-            EXPECT_EQ(byParts ? Img4DecodeEvaluateTrustWithCallbacks(row.object, &record, judge, verifyBoth,
+            EXPECT_EQ(byParts ? Img4DecodeEvaluateTrustWithCallbacks(object, &record, judge, verifyBoth,
                                                                      checkConstraints, hash, &script)
-                              : Img4DecodePerformTrustEvaluation(row.object, &record, judge, &scripted, &script),
-                      row.expected);
+                              : Img4DecodePerformTrustEvaluation(object, &record, judge, &scripted, &script),
+                      expected);
             EXPECT_EQ(script.calls,
                       byParts ? "digest body; chain; " : "digest manifest; chain; digest body; signature; ");
-            EXPECT_EQ(leftIn(record).count("dictionaries") != 0, row.hasDictionaries);
+            EXPECT_EQ(leftIn(record).count("dictionaries") != 0, hasDictionaries);
             EXPECT_EQ(record.objp.data, foundObject.data());
         }
     }
