@@ -1,5 +1,6 @@
 // Blobs made by hand, decoded.
 #include <string>
+#include <tuple>
 
 #include <gtest/gtest.h>
 
@@ -60,18 +61,11 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
     const auto payload = [](const Bytes& content) { return BlobParts{.payload = content}.whole(); };
     const auto metadata = [](const Bytes& content) { return BlobParts{.metadata = content}.whole(); };
     const auto manifest = [](const Bytes& content) { return BlobParts{.manifest = content}.whole(); };
-    const struct {
-        const char* what;
-        Bytes blob;
-        SysConfig3Subject subject;
-        std::ptrdiff_t offset;
-        DERFault fault;
-        std::string lines = "";
-    } rows[] = {
-        {"a sixth element", sixElements, SysConfig3SubjectBlob, 50, DERFaultExcess},
-        {"a SET around", set, SysConfig3SubjectBlob, 0, DERFaultNoSequence},
-        {"no element", item("30", {}), SysConfig3SubjectMagic, 2, DERFaultMissing},
-        {"another version element", item("30", bytes("02 01 00 04 00")), SysConfig3SubjectVersion, 5, DERFaultTag},
+    const std::tuple<const char*, Bytes, SysConfig3Subject, std::ptrdiff_t, DERFault, std::string> rows[] = {
+        {"a sixth element", sixElements, SysConfig3SubjectBlob, 50, DERFaultExcess, ""},
+        {"a SET around", set, SysConfig3SubjectBlob, 0, DERFaultNoSequence, ""},
+        {"no element", item("30", {}), SysConfig3SubjectMagic, 2, DERFaultMissing, ""},
+        {"another version element", item("30", bytes("02 01 00 04 00")), SysConfig3SubjectVersion, 5, DERFaultTag, ""},
         {"another magic", magic("67 66 43 00"), SysConfig3SubjectMagic, 4, DERFaultNone,
          "Sysconfig magic 0x%X<436667> is not valid"},
         {"three octets of magic", magic("67 66 43"), SysConfig3SubjectMagic, 4, DERFaultNone,
@@ -109,15 +103,15 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         {"values in the wrong order", metadata(setOf({metadataEntry("k", joined({someText, someData}))})),
          SysConfig3SubjectMetadataEntry, 32, DERFaultNone, "Decode sequence error: %d<3>"},
     };
-    for (const auto& row : rows) {
+    for (const auto& [what, blob, subject, offset, fault, lines] : rows) {
+        SCOPED_TRACE(what);
         const Recorder recorder;
         SysConfig3Refusal refused;
-        EXPECT_EQ(decodeSysConfig3Explained(row.blob.data(), static_cast<std::uint32_t>(row.blob.size()), &refused),
-                  nullptr);
-        EXPECT_EQ(refused.subject, row.subject) << row.what;
-        EXPECT_EQ(refused.place - row.blob.data(), row.offset) << row.what;
-        EXPECT_EQ(refused.encoding.fault, row.fault) << row.what;
-        EXPECT_EQ(joinedLines(), row.lines) << row.what;
+        EXPECT_EQ(decodeSysConfig3Explained(blob.data(), static_cast<std::uint32_t>(blob.size()), &refused), nullptr);
+        EXPECT_EQ(refused.subject, subject);
+        EXPECT_EQ(refused.place - blob.data(), offset);
+        EXPECT_EQ(refused.encoding.fault, fault);
+        EXPECT_EQ(joinedLines(), lines);
     }
 }
 
@@ -130,19 +124,15 @@ TEST(Decode, takesEachPayloadEntryOnItsMerits) {
     constexpr char noValue[] = "one of data, string, or deleted must be provided";
     Bytes mistagged = payloadEntry(someData);
     mistagged[0] = 0x04;
-    const struct {
-        const char* what;
-        Bytes entry;
-        std::string list; // ahead of the good entry that follows
-        const char* reason = nullptr;
-    } rows[] = {
-        {"data", payloadEntry(someData), "WCh0=data 01 02, "},
-        {"a string up to its NUL", payloadEntry(item("16", bytes("61 00 62"))), "WCh0=string a, "},
-        {"an empty string", payloadEntry(item("16", {})), "WCh0=string , "},
-        {"the deleted flag", payloadEntry(bytes("01 01 FF")), "WCh0=deleted, "},
-        {"data and a false flag", payloadEntry(joined({someData, bytes("01 01 00")})), "WCh0=data 01 02, "},
-        {"data and an empty flag", payloadEntry(joined({someData, bytes("01 00")})), "WCh0=data 01 02, "},
-        {"any tag for the entry itself", mistagged, "WCh0=data 01 02, "},
+    // With the list ahead of the good entry that follows, and the reason why there is none.
+    const std::tuple<const char*, Bytes, std::string, const char*> rows[] = {
+        {"data", payloadEntry(someData), "WCh0=data 01 02, ", nullptr},
+        {"a string up to its NUL", payloadEntry(item("16", bytes("61 00 62"))), "WCh0=string a, ", nullptr},
+        {"an empty string", payloadEntry(item("16", {})), "WCh0=string , ", nullptr},
+        {"the deleted flag", payloadEntry(bytes("01 01 FF")), "WCh0=deleted, ", nullptr},
+        {"data and a false flag", payloadEntry(joined({someData, bytes("01 01 00")})), "WCh0=data 01 02, ", nullptr},
+        {"data and an empty flag", payloadEntry(joined({someData, bytes("01 00")})), "WCh0=data 01 02, ", nullptr},
+        {"any tag for the entry itself", mistagged, "WCh0=data 01 02, ", nullptr},
         {"a key of two octets", payloadEntry(someData, "30 68"), "", "key was invalid"},
         {"a key of zeros", payloadEntry(someData, "00 00 00 00"), "", "key was invalid"},
         {"no value", payloadEntry({}), "", noValue},
@@ -154,43 +144,37 @@ TEST(Decode, takesEachPayloadEntryOnItsMerits) {
          "data, string and deleted are mutually exclusive. Caller provided parameters [%s< data>%s< string>%s< "
          "deleted> ]"},
     };
-    for (const auto& row : rows) {
+    for (const auto& [what, entry, list, reason] : rows) {
         const Recorder recorder;
-        EXPECT_EQ(payloadOf(decodeParts({.payload = setOf({row.entry, miGB})})), row.list + "MiGB=data 01 02")
-            << row.what;
+        EXPECT_EQ(payloadOf(decodeParts({.payload = setOf({entry, miGB})})), list + "MiGB=data 01 02") << what;
         EXPECT_EQ(Recorder::lines,
-                  refusal("_allocSysConfig3PayloadEntryInternal: ", row.reason,
+                  refusal("_allocSysConfig3PayloadEntryInternal: ", reason,
                           "_sysConfig3AddPayloadEntry: invalid argument. sysconfig and etnry cannot be NULL"))
-            << row.what;
+            << what;
     }
 }
 
 TEST(Decode, takesEachMetadataEntryOnItsMerits) {
     const std::string longKey(300, 'k');
     const std::string cutKey = longKey.substr(0, 256);
-    const struct {
-        const char* what;
-        Bytes entries;
-        std::string list;
-        const char* reason = nullptr;
-    } rows[] = {
-        {"data", metadataEntry("k", someData), "k=data 01 02"},
-        {"a string", metadataEntry("k", someText), "k=string text"},
-        {"an empty key", metadataEntry("", someText), "=string text"},
-        {"a key up to its NUL", metadataEntry(std::string_view("a\0b", 3), someText), "a=string text"},
+    const std::tuple<const char*, Bytes, std::string, const char*> rows[] = {
+        {"data", metadataEntry("k", someData), "k=data 01 02", nullptr},
+        {"a string", metadataEntry("k", someText), "k=string text", nullptr},
+        {"an empty key", metadataEntry("", someText), "=string text", nullptr},
+        {"a key up to its NUL", metadataEntry(std::string_view("a\0b", 3), someText), "a=string text", nullptr},
         {"a long key, twice", joined({metadataEntry(longKey, someText), metadataEntry(cutKey, someData)}),
-         cutKey + "=data 01 02"},
+         cutKey + "=data 01 02", nullptr},
         {"no value", metadataEntry("k", {}), "", "either data or string must be non-null"},
         {"empty data", metadataEntry("k", item("04", {})), "", "data cannot be length zero"},
         {"both", metadataEntry("k", joined({someData, someText})), "", "data and string are mutually exclusive"},
     };
-    for (const auto& row : rows) {
+    for (const auto& [what, entries, list, reason] : rows) {
         const Recorder recorder;
-        EXPECT_EQ(metadataOf(decodeParts({.metadata = item("31", row.entries)})), row.list) << row.what;
+        EXPECT_EQ(metadataOf(decodeParts({.metadata = item("31", entries)})), list) << what;
         EXPECT_EQ(Recorder::lines,
-                  refusal("allocSysConfig3MetadataEntry: ", row.reason,
+                  refusal("allocSysConfig3MetadataEntry: ", reason,
                           "_sysConfig3AddMetadataEntry: invalid argument. sysconfig and entry cannot be NULL"))
-            << row.what;
+            << what;
     }
 }
 
@@ -216,24 +200,19 @@ TEST(Decode, replacesAnEmptyCommentAndKeepsOthers) {
 }
 
 TEST(Decode, takesAManifestOfThreeHMACsOnly) {
-    const struct {
-        const char* content;
-        const char* manifest;
-        const char* error = nullptr;
-    } rows[] = {
-        {"04 02 01 02 04 00 04 01 03", "01 02 | absent | 03"},
-        {"04 00 04 00 04 00", "00 | 00 | 00"},
+    const std::tuple<const char*, const char*, const char*> rows[] = {
+        {"04 02 01 02 04 00 04 01 03", "01 02 | absent | 03", nullptr},
+        {"04 00 04 00 04 00", "00 | 00 | 00", nullptr},
         {"", "00 | 00 | 00", "%d<5>"},
         {"04 01 01 04 01 02", "00 | 00 | 00", "%d<5>"},
         {"04 01 01 04 01 02 04 01 03 04 01 04", "00 | 00 | 00", "%d<3>"},
         {"04 01 01 02 01 02 04 01 03", "00 | 00 | 00", "%d<2>"},
     };
-    for (const auto& row : rows) {
+    for (const auto& [content, manifest, error] : rows) {
         const Recorder recorder;
-        EXPECT_EQ(manifestOf(decodeParts({.manifest = item("30", bytes(row.content))})), row.manifest) << row.content;
-        EXPECT_EQ(Recorder::lines,
-                  row.error ? Lines{"Decode manifest sequence error: " + std::string(row.error)} : Lines{})
-            << row.content;
+        EXPECT_EQ(manifestOf(decodeParts({.manifest = item("30", bytes(content))})), manifest) << content;
+        EXPECT_EQ(Recorder::lines, error ? Lines{"Decode manifest sequence error: " + std::string(error)} : Lines{})
+            << content;
     }
 }
 

@@ -1,7 +1,7 @@
 // The index of the lists: what keys of an adversary do to it.
 #include <cstdint>
 #include <string>
-#include <vector>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -37,20 +37,17 @@ BlobParts withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint3
 
 TEST(Index, standsAMillionKeysOfAnAdversary) {
     constexpr std::uint32_t count = 1000000;
-    const struct {
-        const char* what;
-        std::uint32_t (*keyOf)(std::uint32_t);
-    } rows[] = {
+    const std::pair<const char*, std::uint32_t (*)(std::uint32_t)> rows[] = {
         {"consecutive", [](std::uint32_t i) { return i + 1; }},
         {"equal in the low bits", [](std::uint32_t i) { return (i + 1) << 12; }},
         {"evenly spaced", [](std::uint32_t i) { return (i + 1) * 4095; }},
         {"equal in the middle", [](std::uint32_t i) { return (i & 0xFFF) | (i >> 12 | 0x100) << 22; }},
     };
-    for (const auto& row : rows) {
-        const SysConfig3Ptr object = decodeParts(withPayloadKeys(count, row.keyOf));
-        ASSERT_EQ(sysConfig3GetPayloadEntryCount(object.get()), count) << row.what;
+    for (const auto& [what, keyOf] : rows) {
+        const SysConfig3Ptr object = decodeParts(withPayloadKeys(count, keyOf));
+        ASSERT_EQ(sysConfig3GetPayloadEntryCount(object.get()), count) << what;
         // An entry costs 1, and chance collisions add a half to that.
-        EXPECT_LT(costOfAllLookups(object->payload), 2 * count) << row.what;
+        EXPECT_LT(costOfAllLookups(object->payload), 2 * count) << what;
     }
 }
 

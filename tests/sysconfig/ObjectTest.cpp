@@ -1,6 +1,7 @@
 // Objects, their entries and manifests.
 #include <memory>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -255,12 +256,7 @@ TEST(Manifest, comparesHMACsByVersion) {
     std::uint8_t one[] = {1, 2};
     std::uint8_t other[] = {1, 3};
     const SysConfigData absent = {}, present = {one, 2}, shorter = {one, 1}, different = {other, 2};
-    const struct {
-        SysConfig3Version version;
-        const SysConfigData* a;
-        const SysConfigData* b;
-        bool equal;
-    } rows[] = {
+    const std::tuple<SysConfig3Version, const SysConfigData*, const SysConfigData*, bool> rows[] = {
         {0x30001, &absent, &absent, true},      {0x30001, &absent, &present, false},
         {0x30001, &present, &absent, false},    {0x30001, &present, &present, true},
         {0x30002, &absent, &absent, false},     {0x30003, &absent, &absent, false},
@@ -268,8 +264,8 @@ TEST(Manifest, comparesHMACsByVersion) {
         {0x30003, &present, nullptr, false},    {0x30003, &present, &shorter, false},
         {0x30003, &present, &different, false},
     };
-    for (const auto& row : rows)
-        EXPECT_EQ(_sysConfig3HMACsAreEqual(row.version, row.a, row.b), row.equal) << &row - rows;
+    for (const auto& [version, a, b, areEqual] : rows)
+        EXPECT_EQ(_sysConfig3HMACsAreEqual(version, a, b), areEqual) << version << a << b;
     EXPECT_FALSE(sysConfig3ManifestsAreEqual(nullptr, nullptr));
     EXPECT_EQ(sysConfig3ManifestGetVersion(sysConfig3GetManifest(newObject(0x30001).get())), 0x30001U);
 }
