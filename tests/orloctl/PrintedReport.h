@@ -6,13 +6,17 @@
 
 #include "tools/orloctl/Report.h"
 
+inline std::string linesOf(const Report& report) {
+    std::ostringstream lines;
+    writeText(lines, report);
+    return lines.str();
+}
+
 // A report as people and programs get it: its text, and its JSON with the lists in their places.
 struct PrintedReport : Report {
-    PrintedReport(Report report) : Report(std::move(report)) {
-        std::ostringstream lines, object;
-        writeText(lines, *this);
+    PrintedReport(Report report) : Report(std::move(report)), text(linesOf(*this)) {
+        std::ostringstream object;
         writeJson(object, *this);
-        text = lines.str();
         json = nlohmann::ordered_json::parse(object.str());
     }
 
