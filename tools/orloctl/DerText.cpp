@@ -31,6 +31,7 @@ constexpr std::uint32_t undefinedTypes = 1U << 0 | 1U << 15;
 constexpr std::uint32_t constructedTypes = 1U << 8 | 1U << 11 | 1U << 16 | 1U << 17 | 1U << 29;
 constexpr std::uint32_t textTypes =
     1U << 12 | 1U << 18 | 1U << 19 | 1U << 20 | 1U << 22 | 1U << 23 | 1U << 24 | 1U << 26;
+constexpr std::size_t mostInSentence = 512;
 constexpr DERTag null = 5, enumerated = 10, relativeOid = 13;
 
 bool isUniversal(DERTag tag) {
@@ -184,8 +185,11 @@ std::string escapedText(const DERItem& text) {
 }
 
 std::string quotedText(const std::string& text) {
-    constexpr std::size_t mostInSentence = 512;
     return "\"" + shortened(text, mostInSentence) + "\"";
+}
+
+std::string quotedText(const DERItem& text) {
+    return quotedText(escapedText({text.data, std::min<std::uint64_t>(text.length, mostInSentence + 1)}));
 }
 
 std::string hexText(const DERItem& data) {

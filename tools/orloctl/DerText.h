@@ -46,8 +46,9 @@ std::string codeText(std::uint64_t number, const char* quote = "");
 // The octets as text, those that are no printable ASCII and the backslash as \xNN.
 std::string escapedText(const DERItem& text);
 
-// The text, or the beginning of a long one, in quotes.
+// The text, or the beginning of a long one, in quotes; the second form escapes octets as above.
 std::string quotedText(const std::string& text);
+std::string quotedText(const DERItem& text);
 
 // The content of an OBJECT IDENTIFIER as numbers with dots or, where it has one, by its name; empty when it is
 // malformed or longer than 127 characters.

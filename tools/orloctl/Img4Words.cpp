@@ -30,7 +30,7 @@ std::string fileReason(const DERItem& file, const Img4Refusal& refusal) {
     if (file.length == 0)
         return "The file is empty";
     const Part& part = parts[refusal.subject - Img4SubjectFile];
-    const std::string found = quotedText(escapedText(refusal.found));
+    const std::string found = quotedText(refusal.found);
     const DERRefusal& encoding = refusal.encoding;
     std::uint32_t number = 0;
     switch (refusal.fault) {
@@ -76,7 +76,7 @@ std::string propertyReason(const Img4Refusal& refusal) {
     case Img4FaultTag:
         return "is no property";
     case Img4FaultName:
-        return refusal.found.length == 4 ? "is named " + quotedText(escapedText(refusal.found)) + " inside"
+        return refusal.found.length == 4 ? "is named " + quotedText(refusal.found) + " inside"
                                          : "has no four-character name inside";
     case Img4FaultValueType:
         return "is " + derTagName(encoding.tag) +

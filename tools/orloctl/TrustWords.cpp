@@ -124,9 +124,9 @@ std::string chainReason(const TrustEvaluation& evaluation, const Encodings& chai
     const std::uint32_t number = refusal.chain.certificate;
     const Certificate refused = certificateAt(chain, number);
     const DERTBSCert issuer = number != 0 ? certificateAt(chain, number - 1).tbs : DERTBSCert();
-    const std::string algorithm = algorithmText(refused.fields.signatureAlgorithm);
     const std::string demanded = algorithmName(*made.profile.signatureAlgorithmOid);
     DERDecodedInfo authority = {};
+    std::string algorithm;
     std::string subject = call(chain, number);
     subject[0] = static_cast<char>(subject[0] - 'a' + 'A');
     switch (refusal.chain.fault) {
@@ -149,6 +149,7 @@ std::string chainReason(const TrustEvaluation& evaluation, const Encodings& chai
                ", and the one before it is " + call(chain, number - 1) +
                (nameText(refused.tbs.issuer) == nameText(issuer.subject) ? " in another encoding" : "");
     case Img4ChainSignatureAlgorithm:
+        algorithm = algorithmText(refused.fields.signatureAlgorithm);
         return subject + " is signed with " + shortened(algorithm, 512) +
                (algorithm == demanded ? " and parameters, which it must not have"
                                       : ", and the profile demands " + demanded);
@@ -160,7 +161,7 @@ std::string chainReason(const TrustEvaluation& evaluation, const Encodings& chai
     case Img4ChainAuthority:
         DERDecodeItem(&made.domain.authorityName, &authority);
         return subject + " does not carry the common name of the secure-boot authority as a PrintableString: " +
-               quotedText(escapedText(authority.content));
+               quotedText(authority.content);
     default:
         return subject + " has a malformed or empty list of extensions, or constraints that are no SET";
     }
