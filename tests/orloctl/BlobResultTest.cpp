@@ -6,7 +6,7 @@
 
 #include <unistd.h>
 
-#include "sysconfig/SysConfig3Ptr.h"
+#include "tests/orloctl/Blob.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <gtest/gtest.h>
@@ -16,24 +16,12 @@ namespace {
 constexpr std::uint32_t wCh0 = 0x57436830;
 constexpr std::uint32_t miGB = 0x4D694742;
 
-std::string blob(std::initializer_list<std::uint32_t> keys, SysConfig3Version version = 0x30003) {
-    const sysconfig::SysConfig3Ptr object(allocSysConfig3(0x62436667, version));
-    for (const std::uint32_t key : keys) {
-        const std::uint8_t octet = 1;
-        const sysconfig::PayloadEntryPtr entry(allocSysConfig3PayloadEntryWithData(key, "", &octet, 1));
-        sysConfig3AddPayloadEntry(object.get(), entry.get());
-    }
-    SysConfigData encoded = {};
-    encodeSysConfig3(object.get(), &encoded);
-    const sysconfig::BytesPtr owner(encoded.data);
-    return {encoded.data, encoded.data + encoded.length};
-}
-
-// A blob of the version that has HMACs; the library encodes none without a key.
-std::string protectedBlob() {
-    std::string changed = blob({});
-    changed[changed.find(std::string("\x02\x04\x03\x00\x03\x00", 6)) + 2] = 0x02;
-    return changed;
+std::string holding(std::initializer_list<std::uint32_t> keys, std::uint32_t version = 0x30003) {
+    img4maker::List entries;
+    for (const std::uint32_t key : keys)
+        entries.push_back(img4maker::sequence({number(key), img4maker::ia5(""), img4maker::octets({1})}));
+    const auto encoded = blob(entries, {}, 0x62436667, version);
+    return {encoded.begin(), encoded.end()};
 }
 
 struct Case {
@@ -64,17 +52,17 @@ void replacedBy(const TemporaryRoot& root, const std::function<void(const std::f
     make(root.host(blobResultPath));
 }
 
-const std::string whole = blob({wCh0, miGB});
+const std::string whole = holding({wCh0, miGB});
 
 const Case cases[] = {
     {"new file", results(whole), ""},
-    {"model without WCh0", results(blob({miGB})), "", "Banana", "model Banana has no WCh0"},
-    {"no WCh0", results(blob({miGB})), "has no WCh0 entry, and model xM11 has one", "xM11"},
-    {"no MiGB", results(blob({wCh0})), "has no MiGB entry"},
+    {"model without WCh0", results(holding({miGB})), "", "Banana", "model Banana has no WCh0"},
+    {"no WCh0", results(holding({miGB})), "has no WCh0 entry, and model xM11 has one", "xM11"},
+    {"no MiGB", results(holding({wCh0})), "has no MiGB entry"},
     {"no blob", results("text"), "is no configuration blob."},
     {"no input", results(""), "is empty: /blob is missing on the device"},
     {"input of text", [](auto& root) { emptyAfter(root, "text"); }, "is empty: /blob is no configuration blob"},
-    {"protected input", [](auto& root) { emptyAfter(root, protectedBlob()); }, "is empty: /blob needs a key"},
+    {"protected input", [](auto& root) { emptyAfter(root, holding({}, 0x30002)); }, "is empty: /blob needs a key"},
     {"nothing done", [](auto&) {}, "is that of an earlier request"},
     {"removed", [](auto& root) { std::filesystem::remove(root.host(blobResultPath)); }, "is missing"},
     {"another user's", results(whole), "belongs to another user", "M12x", "", 1},

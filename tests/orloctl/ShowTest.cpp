@@ -4,6 +4,7 @@
 #include <cstdio>
 #include <sstream>
 
+#include "tests/orloctl/Blob.h"
 #include "tests/orloctl/PrintedReport.h"
 #include "tests/support/OpenSSLTool.h"
 #include "tools/makers/Img4Maker.h"
@@ -21,17 +22,6 @@ const std::string examples = TEST_EXAMPLES "/blobs/", printed = TEST_PRINTED "/"
 
 PrintedReport show(const Bytes& file, const char* format = "", const Key& key = std::nullopt) {
     return showFile(file, format, key);
-}
-
-Bytes number(std::uint32_t value) {
-    return item(DERTagInteger, {static_cast<std::uint8_t>(value), static_cast<std::uint8_t>(value >> 8),
-                                static_cast<std::uint8_t>(value >> 16), static_cast<std::uint8_t>(value >> 24)});
-}
-
-Bytes blob(const List& payload, const List& metadata = {}, std::uint32_t magic = 0x62436667) {
-    return sequence({number(magic), number(0x30003), item(DERTagPrivateConstructed(0x53504159), set(payload)),
-                     item(DERTagPrivateConstructed(0x4D455441), set(metadata)),
-                     item(DERTagPrivateConstructed(0x4D414E49), sequence({octets({}), octets({}), octets({})}))});
 }
 
 Bytes manifestOf(const Bytes& body, std::uint64_t version = 0, const List& chain = {}) {
