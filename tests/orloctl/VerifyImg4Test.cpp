@@ -1,11 +1,10 @@
 #include "tools/orloctl/VerifyImg4.h"
 
 #include "platform/Crypto.h"
+#include "tests/img4/TrustDomain.h"
 #include "tests/orloctl/PrintedReport.h"
-#include "tools/makers/SignedManifestMaker.h"
 
 #include <algorithm>
-#include <map>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -17,21 +16,13 @@ using namespace img4maker;
 using nlohmann::ordered_json;
 using Report = PrintedReport;
 
-constexpr const char* ec384 = "kImg4DecodeSecureBootEc384Sha384";
-constexpr const char* rsa1k = "kImg4DecodeSecureBootRsa1kSha1";
-constexpr const char* rsa3k = "kImg4DecodeSecureBootRsa3kSha384";
-constexpr const char* rsa4k = "kImg4DecodeSecureBootRsa4kSha384";
-constexpr const char* localPolicy = "kImg4DecodeLocalPolicyEc384Sha384";
+const Img4TrustProfileEntry& ec384 = entryOf(kImg4DecodeSecureBootEc384Sha384);
+const Img4TrustProfileEntry& rsa1k = entryOf(kImg4DecodeSecureBootRsa1kSha1);
+const Img4TrustProfileEntry& rsa3k = entryOf(kImg4DecodeSecureBootRsa3kSha384);
+const Img4TrustProfileEntry& rsa4k = entryOf(kImg4DecodeSecureBootRsa4kSha384);
+const Img4TrustProfileEntry& localPolicy = entryOf(kImg4DecodeLocalPolicyEc384Sha384);
 
-const Signer& signerOf(std::string_view profile) {
-    static std::map<std::string, Signer> signers;
-    for (unsigned i = 0; i < Img4NumTrustProfiles; ++i)
-        if (profile == Img4TrustProfiles[i].name)
-            return signers.try_emplace(std::string(profile), TEST_TRUST_DOMAIN, Img4TrustProfiles[i]).first->second;
-    std::abort();
-}
-
-Bytes soundManifest(const std::string& profile) {
+Bytes soundManifest(const Img4TrustProfileEntry& profile) {
     const Signer& signer = signerOf(profile);
     return signer.manifest(standardManifest(), signer.standardChain());
 }
@@ -55,7 +46,7 @@ struct RefusalCase {
     const char* step;
     const char* problem;
     Bytes bytes;
-    const char* profile = nullptr; // all of them
+    const Img4TrustProfileEntry* profile = nullptr; // all of them
     const char* object = "";
     const char* payloadDigest = "";
 };
@@ -79,23 +70,16 @@ Bytes withObject(const Bytes& encoding) {
 }
 
 // A sound manifest that this leaf of the profile has signed.
-Bytes signedBy(const Certificate& leaf, const char* profile = ec384) {
+Bytes signedBy(const Certificate& leaf, const Img4TrustProfileEntry& profile = ec384) {
     const Signer& signer = signerOf(profile);
     return signer.manifest(standardManifest(), signer.chainWith(signer.issue(leaf)));
 }
 
 // A sound manifest of `profile` whose leaf has this in a field.
-Bytes withLeaf(const char* profile, Bytes Certificate::*field, const Bytes& value) {
+Bytes withLeaf(const Img4TrustProfileEntry& profile, Bytes Certificate::*field, const Bytes& value) {
     Certificate leaf = signerOf(profile).leaf({});
     leaf.*field = value;
     return signedBy(leaf, profile);
-}
-
-// The key of the profile's leaf with its last octet changed.
-Bytes otherKey(const char* profile) {
-    Bytes key = signerOf(profile).leaf({}).publicKeyInfo;
-    key.back() ^= 1;
-    return key;
 }
 
 // `bytes` with the first octet of `text` in it changed.
@@ -107,7 +91,7 @@ Bytes changedAt(Bytes bytes, std::string_view text) {
     return bytes;
 }
 
-Bytes withChain(const char* profile, const List& chain) {
+Bytes withChain(const Img4TrustProfileEntry& profile, const List& chain) {
     return signerOf(profile).manifest(standardManifest(), chain);
 }
 
@@ -122,7 +106,7 @@ Bytes withoutAuthority() {
     return withChain(rsa1k, {issue(middle, signer.rootKey()), signer.issue(leaf)});
 }
 
-Bytes withSignature(const char* profile, const Bytes& signature) {
+Bytes withSignature(const Img4TrustProfileEntry& profile, const Bytes& signature) {
     Manifest fields = standardManifest();
     fields.certChain = join(signerOf(profile).standardChain());
     fields.signature = signature;
@@ -157,24 +141,24 @@ std::vector<RefusalCase> refusalCases() {
         {"file", "is a bare payload", payload({})},
         {"file", "The container has no manifest", container(payload({}), {}, {})},
 
-        {"chain", "The chain has 1 certificate, the root included", withChain(ec384, {}), ec384},
+        {"chain", "The chain has 1 certificate, the root included", withChain(ec384, {}), &ec384},
         {"chain", "The chain has 3 certificates", withChain(ec384, List(2, signerOf(ec384).standardChain().back()))},
         {"chain", "Certificate 1 is no certificate", withChain(ec384, {sequence({integer(1)})})},
         {"chain", "Certificate 1 is no strict DER: the length is indefinite", withChain(ec384, {{0x30, 0x80}})},
         {"chain", "Certificate 1 is longer than 131071 octets", withChain(ec384, {sequence({octets(filler(131071))})})},
         {"chain", "has the key RSA 4096 bits, and the profile demands EC on P-256 or P-384", soundManifest(rsa4k),
-         ec384},
-        {"chain", "has the key EC P-384, and the profile demands RSA without parameters", soundManifest(ec384), rsa4k},
+         &ec384},
+        {"chain", "has the key EC P-384, and the profile demands RSA without parameters", soundManifest(ec384), &rsa4k},
         {"chain", R"(CA,O=Tevari", and the one before it is the root ("CN=Tevari RSA 3072)", soundManifest(rsa4k),
-         rsa3k},
+         &rsa3k},
         {"chain", R"(issuer "CN=Nobody", and the one before it is certificate 1 ("CN=)",
          withLeaf(localPolicy, &Certificate::issuer, distinguishedName("Nobody"))},
         {"chain", "No known root has signed this chain",
          withLeaf(ec384, &Certificate::issuer, distinguishedName("Nobody"))},
         {"signature", "the key is no uncompressed point of its curve",
-         withLeaf(ec384, &Certificate::publicKeyInfo, otherKey(ec384))},
+         withLeaf(ec384, &Certificate::publicKeyInfo, lastChanged(signerOf(ec384).leaf().publicKeyInfo))},
         {"signature", "the key has an even modulus or an unsound exponent", // 65536
-         withLeaf(rsa3k, &Certificate::publicKeyInfo, otherKey(rsa3k))},
+         withLeaf(rsa3k, &Certificate::publicKeyInfo, lastChanged(signerOf(rsa3k).leaf().publicKeyInfo))},
         {"chain", "is signed with ecdsa-with-SHA256, and the profile demands ecdsa-with-SHA384",
          withLeaf(ec384, &Certificate::signatureAlgorithm, algorithm(oid(oidSha256Ecdsa)))},
         {"chain", "is signed with sha384WithRSAEncryption and parameters, which it must not have",
@@ -229,7 +213,7 @@ std::vector<RefusalCase> refusalCases() {
 
 TEST(VerifyImg4, saysWhyItRefusesAndWhere) {
     for (const RefusalCase& row : refusalCases()) {
-        const auto profile = row.profile != nullptr ? std::optional<std::string>(row.profile) : std::nullopt;
+        const auto profile = row.profile != nullptr ? std::optional<std::string>(row.profile->name) : std::nullopt;
         const Report report = verify(row.bytes, testDomain(profile), row.object, row.payloadDigest);
         EXPECT_FALSE(report.ok()) << row.problem;
         EXPECT_NE(report.problem.find(row.problem), std::string::npos) << row.problem << "\n" << report.problem;

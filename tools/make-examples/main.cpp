@@ -1,9 +1,9 @@
 // make-examples ROOT: writes the blobs, the boot ticket and the Img4 container of examples/device below a device root.
 // The same octets come out every time.
 #include <filesystem>
-#include <fstream>
 #include <initializer_list>
 #include <iostream>
+#include <stdexcept>
 #include <string>
 
 #include "sysconfig/SysConfig3Ptr.h"
@@ -13,6 +13,7 @@ namespace {
 
 using img4maker::Bytes;
 using img4maker::fourCC;
+using img4maker::writeFile;
 using std::filesystem::path;
 
 // The key of the examples' HMACs: the octets 00 to 1F. It protects nothing.
@@ -26,14 +27,6 @@ Bytes exampleKey() {
 void require(bool done) {
     if (!done)
         throw std::runtime_error("an example cannot be made");
-}
-
-void write(const path& file, const Bytes& bytes) {
-    create_directories(file.parent_path());
-    std::ofstream stream(file, std::ios::binary);
-    stream.exceptions(std::ios::failbit | std::ios::badbit);
-    stream.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
-    stream.close();
 }
 
 __SysConfig3PayloadEntry* data(std::string_view key, const char* comment, const Bytes& bytes) {
@@ -57,7 +50,7 @@ void writeBlob(const path& file, std::string_view magic, SysConfig3Version versi
     SysConfigData out = {};
     require(encodeSysConfig3(object.get(), &out));
     const sysconfig::BytesPtr owner(out.data);
-    write(file, {out.data, out.data + out.length});
+    writeFile(file, {out.data, out.data + out.length});
 }
 
 void writeExamples(const path& root) {
@@ -77,9 +70,9 @@ void writeExamples(const path& root) {
     // "WCh0" in first place and another key behind it, so that replacing it shows.
     writeBlob(blobs / "holds-WCh0.bin", "bCfg", 0x30003,
               {data("WCh0", nullptr, Bytes(152, 0x00)), data("ExDt", "example", {0x01, 0x02, 0x03, 0x04})}, {});
-    write(blobs / "hmac-key.bin", exampleKey());
-    write(root / "System/Library/Caches/apticket.der", img4maker::exampleTicket());
-    write(root / "images/container.img4", img4maker::exampleContainer());
+    writeFile(blobs / "hmac-key.bin", exampleKey());
+    writeFile(root / "System/Library/Caches/apticket.der", img4maker::exampleTicket());
+    writeFile(root / "images/container.img4", img4maker::exampleContainer());
 }
 
 } // namespace

@@ -2,8 +2,9 @@
 
 #include "der/DEREncode.h"
 
+#include <fstream>
+#include <iterator>
 #include <stdexcept>
-#include <string>
 
 namespace img4maker {
 
@@ -32,6 +33,21 @@ Bytes join(const List& parts) {
     for (const Bytes& part : parts)
         joined.insert(joined.end(), part.begin(), part.end());
     return joined;
+}
+
+Bytes readFile(const std::string& path) {
+    std::ifstream file(path, std::ios::binary);
+    if (!file)
+        throw std::runtime_error("cannot read " + path);
+    return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
+}
+
+void writeFile(const std::filesystem::path& path, const Bytes& contents) {
+    create_directories(path.parent_path());
+    std::ofstream file(path, std::ios::binary);
+    file.exceptions(std::ios::failbit | std::ios::badbit);
+    file.write(reinterpret_cast<const char*>(contents.data()), static_cast<std::streamsize>(contents.size()));
+    file.close();
 }
 
 Bytes item(DERTag tag, const Bytes& content) {

@@ -7,6 +7,7 @@
 #include "der/DERTypes.h"
 
 #include <cstdint>
+#include <filesystem>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -23,6 +24,10 @@ DERTag propertyTag(std::string_view text);
 // `count` octets that look like data and are the same each time.
 Bytes filler(std::size_t count, std::uint8_t seed = 0);
 Bytes join(const List& parts);
+
+// Whole files; the second makes the folders on the way too.
+Bytes readFile(const std::string& path);
+void writeFile(const std::filesystem::path& path, const Bytes& contents);
 
 Bytes item(DERTag tag, const Bytes& content);
 Bytes sequence(const List& elements);

@@ -1,19 +1,8 @@
 #include "tools/makers/SignedManifestMaker.h"
 
-#include <fstream>
-#include <iterator>
-#include <stdexcept>
-
 namespace signedmanifest {
 
 using namespace img4maker;
-
-Bytes readFile(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    if (!file)
-        throw std::runtime_error("cannot read " + path);
-    return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-}
 
 Bytes oid(const DERItem& content) {
     return item(DERTagObjectIdentifier, {content.data, content.data + content.length});

@@ -12,7 +12,6 @@ namespace signedmanifest {
 
 using namespace certificatemaker;
 
-Bytes readFile(const std::string& path);
 Bytes oid(const DERItem& content);
 
 // A constraint or property whose value only says that a property must, or must not, be there.

@@ -51,7 +51,8 @@ std::optional<DerFault> octetsFault(DERTag type, const DERItem& content) {
     std::uint8_t unused = 0;
     if ((type == DERTagBoolean && length != 1) || (type == null && length != 0) ||
         (length == 0 && (isNumber || isBits || isIdentifier)))
-        return DerFault{octets, std::string(typeNames[type]) + " never has " + std::to_string(length) + " octets"};
+        return DerFault{octets,
+                        std::string("the length of ") + typeNames[type] + " is never " + std::to_string(length)};
     if (type == DERTagBoolean && octets[0] != 0x00 && octets[0] != 0xFF)
         return DerFault{octets, "a BOOLEAN is 00 or FF, and this one is " + hexText(content)};
     if (isNumber && length > 1 && octets[0] == ((octets[1] & 0x80) != 0 ? 0xFF : 0x00))
@@ -87,7 +88,7 @@ std::string derFaultText(const DERRefusal& refusal) {
     std::uint64_t declared = 0;
     if (refusal.fault == DERFaultLengthOctets)
         return "the length takes " + std::to_string(*refusal.place & 0x7F) + " octets, and at most 8 are allowed";
-    if (refusal.fault != DERFaultContentCutShort)
+    if (refusal.fault < std::size(texts))
         return texts[refusal.fault];
     DERDecodeItemPartialBufferGetLength(&der, &there, &declared);
     return "the content is cut short: " + std::to_string(there.content.length) + " of " + std::to_string(declared) +
