@@ -149,21 +149,15 @@ bool isJudgedType(DERTag valueTag) {
 DERReturn judge(const DERDecodedInfo& element, const uint8_t* start, uint32_t selector,
                 Img4PropertyCallback evaluateProperty, void* context, Img4Refusal* refusal) {
     Img4Property property;
-    Img4Refusal why;
+    const Img4Subject subject = refusal != nullptr ? refusal->subject : Img4SubjectProperty;
     // Tags that are not private and constructed name no property, and are refused here.
-    if (const DERReturn result = DERImg4DecodePropertyExplained(&element.content, element.tag, &property,
-                                                                refusal != nullptr ? &why : nullptr);
-        result != DERSuccess) {
-        if (refusal != nullptr) {
-            why.subject = refusal->subject;
-            *refusal = why;
-        }
+    const DERReturn result = DERImg4DecodePropertyExplained(&element.content, element.tag, &property, refusal);
+    if (refusal != nullptr)
+        refusal->subject = subject;
+    if (result != DERSuccess)
         return result;
-    }
-    if (refusal != nullptr) {
-        refusal->tag = element.tag;
+    if (refusal != nullptr)
         refusal->encoding.tag = property.valueTag;
-    }
     if (!isJudgedType(property.valueTag))
         return refuse(refusal, DERUnexpectedTag, Img4FaultValueType, start);
     const Img4PropertyValue value = {property.value, property.valueTag};

@@ -5,6 +5,8 @@
 #include "tools/makers/Img4Maker.h"
 
 #include <algorithm>
+#include <tuple>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -199,37 +201,30 @@ TEST(Img4TrustDigests, areThoseOfOneDescriptionFromInitToReturnHash) {
     expectNeedsAll(DERParamError, sha1_digest, out, 1, out);
 }
 
-struct LengthCase {
-    const char* name;
-    Bytes prefix;
-    DERReturn expected;
-    std::uint64_t total = 0;
-};
-
 const Bytes magic = ia5("IMG4");
 
-const LengthCase lengthCases[] = {
+// The total is 0 on failure.
+const std::tuple<const char*, Bytes, DERReturn, std::uint64_t> lengthCases[] = {
     {"short length", join({{0x30, 0x10}, magic}), DERSuccess, 18},
     {"long length", join({{0x30, 0x83, 0x01, 0x00, 0x00}, magic}), DERSuccess, 0x10005},
     {"longest length that fits", join({{0x30, 0x88}, Bytes(7, 0xFF), {0xF5}, magic}), DERSuccess, UINT64_MAX},
-    {"length that wraps", join({{0x30, 0x88}, Bytes(7, 0xFF), {0xF6}, magic}), DERBufferOverflow},
-    {"other magic", join({{0x30, 0x10}, ia5("IM4P")}), DERUnexpectedTag},
-    {"magic of five characters", join({{0x30, 0x10}, ia5("IMG44")}), DERUnexpectedTag},
-    {"magic cut short", {0x30, 0x10, 0x16, 0x04, 'I', 'M', 'G'}, DERUnexpectedTag},
-    {"empty magic", {0x30, 0x10, 0x16, 0x00, 0x00, 0x00}, DERDecodeError},
-    {"SET", join({{0x31, 0x10}, magic}), DERUnexpectedTag},
-    {"empty SEQUENCE", join({{0x30, 0x00}, magic}), DERDecodeError},
-    {"indefinite length", join({{0x30, 0x80}, magic}), DERDecodeError},
-    {"nothing behind the header", {0x30, 0x10}, DERDecodeError},
-    {"one octet", {0x30}, DERDecodeError},
+    {"length that wraps", join({{0x30, 0x88}, Bytes(7, 0xFF), {0xF6}, magic}), DERBufferOverflow, 0},
+    {"other magic", join({{0x30, 0x10}, ia5("IM4P")}), DERUnexpectedTag, 0},
+    {"magic of five characters", join({{0x30, 0x10}, ia5("IMG44")}), DERUnexpectedTag, 0},
+    {"magic cut short", {0x30, 0x10, 0x16, 0x04, 'I', 'M', 'G'}, DERUnexpectedTag, 0},
+    {"empty magic", {0x30, 0x10, 0x16, 0x00, 0x00, 0x00}, DERDecodeError, 0},
+    {"SET", join({{0x31, 0x10}, magic}), DERUnexpectedTag, 0},
+    {"empty SEQUENCE", join({{0x30, 0x00}, magic}), DERDecodeError, 0},
+    {"indefinite length", join({{0x30, 0x80}, magic}), DERDecodeError, 0},
+    {"nothing behind the header", {0x30, 0x10}, DERDecodeError, 0},
+    {"one octet", {0x30}, DERDecodeError, 0},
 };
 
 TEST(Img4Length, isKnownFromTheFirstOctets) {
-    for (const LengthCase& row : lengthCases) {
+    for (const auto& [name, prefix, expected, expectedTotal] : lengthCases) {
         std::uint64_t total = 77;
-        EXPECT_EQ(Img4DecodeParseLengthFromBuffer(row.prefix.data(), row.prefix.size(), &total), row.expected)
-            << row.name;
-        EXPECT_EQ(total, row.total) << row.name;
+        EXPECT_EQ(Img4DecodeParseLengthFromBuffer(prefix.data(), prefix.size(), &total), expected) << name;
+        EXPECT_EQ(total, expectedTotal) << name;
     }
     const Bytes ticket = exampleTicket();
     const std::uint32_t magicOfTicket = fourCC("IM4M");

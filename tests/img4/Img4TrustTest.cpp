@@ -326,6 +326,26 @@ TEST(Img4TrustSteps, endWhereTheDictionariesOrTheObjectAreMissing) {
     }
 }
 
+TEST(Img4TrustSteps, sayWhichPropertyIsNone) {
+    const Bytes broken = item(propertyTag("BCDE"), {});
+    Manifest ofManifest, ofObject;
+    ofManifest.properties = {property("ABCD", integer(7)), broken};
+    ofManifest.objects = {object("sepi", {})};
+    ofObject.objects = {object("sepi", {property("EFGH", integer(7)), broken})};
+    const Img4TrustCallbacks callbacks = {judge, nullptr, nullptr};
+    for (const auto& [fields, subject] :
+         {std::pair(&ofManifest, Img4SubjectManifestProperties), std::pair(&ofObject, Img4SubjectObjectProperties)}) {
+        Decoded decoded(manifest(*fields));
+        script = {"", {}, &decoded.record, {}};
+        EXPECT_EQ(
+            Img4DecodePerformTrustEvaluationExplained(&sepi, &decoded.record, &callbacks, &scripted, &script, &refusal),
+            DERDecodeError);
+        EXPECT_EQ(refusal.refusal.subject, subject);
+        EXPECT_EQ(refusal.refusal.fault, Img4FaultEncoding);
+        EXPECT_EQ(refusal.refusal.tag, propertyTag("BCDE"));
+    }
+}
+
 TEST(Img4TrustSteps, needNoPayload) {
     const Bytes manifest = scriptedManifest();
     Img4Record record;

@@ -1,5 +1,5 @@
-// Every allocation of the library fails in turn. The linker leads the library's calls of malloc and calloc here;
-// OpenSSL, which computes the HMACs, is led by main.
+// Every allocation of the library fails in turn, and what it gives back is looked at. The linker leads the library's
+// calls of malloc, calloc and free here; OpenSSL, which computes the HMACs, is led by main.
 #include <cstdlib>
 #include <functional>
 #include <string>
@@ -15,6 +15,7 @@
 extern "C" {
 void* __real_malloc(std::size_t size);
 void* __real_calloc(std::size_t count, std::size_t size);
+void __real_free(void* memory);
 
 void* __wrap_malloc(std::size_t size) {
     return mayAllocate() ? __real_malloc(size) : nullptr;
@@ -22,6 +23,16 @@ void* __wrap_malloc(std::size_t size) {
 
 void* __wrap_calloc(std::size_t count, std::size_t size) {
     return mayAllocate() ? __real_calloc(count, size) : nullptr;
+}
+
+// What three octets of memory hold when they are given back.
+void* watched = nullptr;
+std::string given = "nothing";
+
+void __wrap_free(void* memory) {
+    if (memory != nullptr && memory == watched)
+        given = hexOf(static_cast<const std::uint8_t*>(memory), 3);
+    __real_free(memory);
 }
 }
 
@@ -153,6 +164,21 @@ TEST(AllocationFailure, isReportedAndLeavesEverythingAsItWas) {
             ++failures;
         EXPECT_TRUE(failures == row.allocations || (row.asksOpenSSL && failures > row.allocations))
             << row.name << ": " << failures;
+    }
+}
+
+TEST(HMACKey, isOverwrittenBeforeItsMemoryIsGivenBack) {
+    void (*const releases[])(SysConfig3Ptr&) = {
+        [](SysConfig3Ptr& object) { sysConfig3SetHMACKey(object.get(), {}); },
+        [](SysConfig3Ptr& object) { object.reset(); },
+    };
+    for (const auto release : releases) {
+        SysConfig3Ptr object(allocSysConfig3WithHMACKey(bCfg, 0x30002, hmacKey));
+        given = "nothing";
+        watched = object->hmacKey.data;
+        release(object);
+        watched = nullptr;
+        EXPECT_EQ(given, "00 00 00");
     }
 }
 
