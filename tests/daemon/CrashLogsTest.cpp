@@ -211,7 +211,7 @@ TEST_F(CrashLogs, aLargeLogIsCollectedWhole) {
 
 #ifdef VELTRA_MEMORY_CAN_BE_LIMITED
 TEST_F(CrashLogs, aPanicReportNeedsTheMemoryOfOneCopyAndShortageOnlyLeavesItOut) {
-    constexpr std::size_t size = std::size_t{128} << 20;
+    constexpr std::size_t size = std::size_t{32} << 20;
     runningBuild("21A55");
     root_.write(logs + "panic-1.ips", "{\"os_version\": \"21A55\"}\n");
     fs::resize_file(root_.host(logs + "panic-1.ips"), size);
