@@ -100,10 +100,16 @@ class Pairing(ServiceTest):
         self.assertEqual(self.server.posts, [("/plain/pair", b"", True), ("/plain/pair/result", b"0", True)] * 2)
 
     def test_pairing_fails_with_the_updater_and_the_server_hears_of_it(self):
-        for step in ("create", "isDone", "queryInfo", "performNextStage"):
+        command = "VanterUpdaterExecCommand failed:"
+        for step, reason in (("create", "Failed to create Vanter obj::error:"), ("isDone", command),
+                             ("queryInfo", command), ("performNextStage", command)):
             with self.subTest(step):
                 self.describe(fail=step)
-                self.assertEqual(self.fails("pair", self.url("plain"))[:2], ("BWCErrorDomain", -1))
+                answer = self.service.orloctl("pair", self.url("plain"))[1]
+                error, told = answer["response"]["error"], [message["text"] for message in answer["messages"]]
+                self.assertEqual((error["domain"], error["code"]), ("BWCErrorDomain", -1))
+                self.assertEqual((told[0].startswith(reason), told[-1], len(told)),
+                                 (True, "Corvo SC pairing failed!!!", 3), told)
         results = [body for path, body, _ in self.server.posts if path == "/plain/pair/result"]
         self.assertEqual(results, [b"-1"] * 4)
         self.assertEqual(self.fails("pair", self.url("deaf"))[:2], ("BWCErrorDomain", 500))

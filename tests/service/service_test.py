@@ -252,17 +252,6 @@ class Client(ServiceTest):
         lock.chmod(0o666)
         self.assertEqual(self.service.orloctl(*words)[0], 2)
 
-    def test_a_timeout_says_whether_the_service_goes_on_with_the_request(self):
-        for stopped, says in ((self.service.pid, "The service goes on with the request."),
-                              (self.service.bus.daemon.pid, "The request was not sent.")):
-            os.kill(stopped, signal.SIGSTOP)
-            try:
-                status, answer = self.service.orloctl("--timeout", "1", "call", "x")
-            finally:
-                os.kill(stopped, signal.SIGCONT)
-            self.assertEqual(status, 3)
-            self.assertTrue(answer["problem"].endswith(says), answer)
-
 
 if __name__ == "__main__":
     unittest.main()

@@ -3,29 +3,35 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
-#include <cstdio>
+#include <cstdlib>
+#include <functional>
+#include <iostream>
 #include <memory>
 #include <optional>
 #include <string_view>
 #include <system_error>
+#include <utility>
+#include <vector>
 
 #include <fcntl.h>
+#include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <systemd/sd-bus.h>
 #include <unistd.h>
 
 #include "platform/DeviceRoot.h"
 #include "platform/ShownText.h"
+#include "platform/Utf8.h"
 #include "platform/linux/services/bus/BusValue.h"
 #include "platform/linux/system/JsonReader.h"
 #include "tools/orloctl/Interruption.h"
+#include "tools/orloctl/LogTail.h"
 
 namespace {
 
 constexpr const char* serviceName = "com.tevari.VeltraOrloServices";
 constexpr const char* servicePath = "/com/tevari/VeltraOrloServices";
 constexpr const char* serviceInterface = "com.tevari.VeltraPluginServer";
-constexpr const char* logPath = "/private/var/log/com.tevari.VeltraOrloServices.log";
 constexpr const char* journal = "the journal (journalctl -u veltra-orlo-services)";
 
 using Clock = std::chrono::steady_clock;
@@ -40,24 +46,29 @@ int check(int result) {
     return result;
 }
 
-// The time since the request was sent, on a terminal's standard error and nowhere else.
-class ElapsedTime {
+// One line on a terminal's standard error, and nowhere else, that says what is going on.
+class LiveLine {
 public:
-    ~ElapsedTime() {
-        if (shown_)
-            (void)std::fputs("\r\033[K", stderr);
-    }
+    ~LiveLine() { clear(); }
 
-    void show() {
-        const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - start_).count();
-        if (seconds < 1 || !terminal_)
-            return;
-        (void)std::fprintf(stderr, "\r%lld s", static_cast<long long>(seconds));
+    bool isSeen() const { return terminal_; }
+
+    void show(const std::string& text) {
+        winsize size = {};
+        const std::size_t columns =
+            ::ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 8 ? size.ws_col : 80;
+        clear();
+        std::cerr << shortened(utf8::escaped(text), columns - 4)
+                  << std::flush; // the dots, and no wrap at the last column
         shown_ = true;
     }
 
+    void clear() {
+        if (std::exchange(shown_, false))
+            std::cerr << "\r\033[K" << std::flush;
+    }
+
 private:
-    const Clock::time_point start_ = Clock::now();
     const bool terminal_ = isatty(STDERR_FILENO) == 1;
     bool shown_ = false;
 };
@@ -67,7 +78,7 @@ MessagePtr requestMessage(sd_bus* connection, const std::string& command, const 
     check(sd_bus_message_new_method_call(connection, &message, serviceName, servicePath, serviceInterface,
                                          "HandleMessage"));
     MessagePtr owner(message, sd_bus_message_unref);
-    bus::appendDictionary(message, {{"messageStr", command}, {"messageDict", arguments}});
+    bus::appendDictionary(message, {{"messageStr", command}, {"messageDict", arguments}, {"messages", true}});
     return owner;
 }
 
@@ -99,13 +110,13 @@ void hideUserInfo(Value::Dictionary& response) {
                 value = withoutUserInfo(*text);
 }
 
-Answer failed(Outcome outcome, std::string why) {
-    Answer answer;
-    answer.report.fail(std::move(why), outcome);
-    return answer;
+Report failed(Outcome outcome, std::string why) {
+    Report report;
+    report.fail(std::move(why), outcome);
+    return report;
 }
 
-Answer unreachable(std::string why) {
+Report unreachable(std::string why) {
     return failed(Outcome::Unreachable, std::move(why));
 }
 
@@ -115,7 +126,7 @@ Answer answerFrom(sd_bus_message* reply, const std::string& command) {
     check(sd_bus_message_read_basic(reply, SD_BUS_TYPE_BOOLEAN, &completed));
     Value::Dictionary response = bus::readDictionary(reply);
     if (response.empty())
-        return failed(Outcome::UnknownCommand, "The plug-in does not know the command \"" + command + "\".");
+        return {failed(Outcome::UnknownCommand, "The plug-in does not know the command \"" + command + "\".")};
     hideUserInfo(response);
     Answer answer;
     answer.response = std::move(response);
@@ -125,18 +136,23 @@ Answer answerFrom(sd_bus_message* reply, const std::string& command) {
     return answer;
 }
 
-Answer answerFromError(const sd_bus_error& error, const ServiceAddress& address) {
+// What an error reply means, and what to do.
+Report reportOfError(const sd_bus_error& error, const ServiceAddress& address) {
     const std::string_view name = error.name;
     const std::string text = error.message ? error.message : error.name;
     const std::string where = " on the bus \"" + address.bus + "\"";
     if (name == SD_BUS_ERROR_INVALID_ARGS)
         return failed(Outcome::Usage, "The service refused the request: " + text);
     if (name == SD_BUS_ERROR_ACCESS_DENIED && geteuid() != 0)
-        return unreachable("Only root may call the service" + where + ".");
+        return unreachable("Only root may call the service" + where + ": use sudo.");
+    if (name == SD_BUS_ERROR_LIMITS_EXCEEDED)
+        return unreachable("The service" + where + " is busy, and as much waits for it as it takes: try again later; " +
+                           "orloctl status shows the request in hand.");
     if (name == SD_BUS_ERROR_NO_REPLY)
         return unreachable("The service" + where + " did not answer: " + text);
     if (name == SD_BUS_ERROR_SERVICE_UNKNOWN)
-        return unreachable("The service " + std::string(serviceName) + " is not running" + where + ".");
+        return unreachable("The service " + std::string(serviceName) + " is not running" + where +
+                           ": start VeltraOrloServices there, or name another bus with --bus.");
     return unreachable("The service" + where + " cannot be used: " + text);
 }
 
@@ -145,72 +161,286 @@ std::chrono::microseconds timeLeft(const ServiceAddress& address) {
                     std::chrono::microseconds(0));
 }
 
-std::optional<uid_t> userOf(sd_bus* connection, const char* name) {
-    sd_bus_creds* credentials = nullptr;
-    uid_t user = 0;
-    const int result = sd_bus_get_name_creds(connection, name, SD_BUS_CREDS_EUID, &credentials);
-    const CredentialsPtr owner(credentials, sd_bus_creds_unref);
-    return result >= 0 && sd_bus_creds_get_euid(credentials, &user) >= 0 ? std::optional(user) : std::nullopt;
-}
+struct BusError {
+    BusError() = default;
+    BusError(const BusError&) = delete;
+    BusError& operator=(const BusError&) = delete;
+    ~BusError() { sd_bus_error_free(&found); }
 
-// What becomes of a request whose answer is not awaited any longer. The service serves whatever has reached the bus.
-std::string fateOf(sd_bus* connection) {
-    std::uint64_t waiting = 0;
-    const bool isSent = sd_bus_get_n_queued_write(connection, &waiting) >= 0 && waiting == 0;
-    return isSent ? "The service goes on with the request." : "The request was not sent.";
-}
-
-struct Pending {
-    const ServiceAddress& address;
-    const std::string& command;
-    std::optional<Answer> answer;
-    std::string sender; // of the answer
+    sd_bus_error found = {};
 };
 
-int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
-    auto& pending = *static_cast<Pending*>(context);
-    try {
-        const sd_bus_error* error = sd_bus_message_get_error(reply);
-        pending.answer = error ? answerFromError(*error, pending.address) : answerFrom(reply, pending.command);
-        if (const char* sender = sd_bus_message_get_sender(reply); sender && !error)
-            pending.sender = sender;
-    } catch (const std::exception& failure) {
-        pending.answer = unreachable(std::string("The answer cannot be read: ") + failure.what());
-    }
-    return 0;
+// Who has the name on the bus: the user and the name of the connection. Null for nobody.
+CredentialsPtr ownerOf(sd_bus* connection, const char* name) {
+    sd_bus_creds* credentials = nullptr;
+    if (sd_bus_get_name_creds(connection, name, SD_BUS_CREDS_EUID | SD_BUS_CREDS_UNIQUE_NAME, &credentials) < 0)
+        credentials = nullptr;
+    return {credentials, sd_bus_creds_unref};
 }
 
-// The timeout counts also while the bus itself keeps the client waiting.
-Answer converse(sd_bus* connection, const ServiceAddress& address, const std::string& command,
-                const Value::Dictionary& arguments) {
-    constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
-    constexpr std::chrono::microseconds tick = std::chrono::seconds(1);
-    const MessagePtr message = requestMessage(connection, command, arguments);
-    const std::int64_t logSizeBefore = logSize();
-    Pending pending{address, command, {}, {}};
-    sd_bus_slot* slot = nullptr;
-    check(sd_bus_call_async(connection, &slot, message.get(), onReply, &pending, noTimeoutOfItsOwn));
-    const SlotPtr slotOwner(slot, sd_bus_slot_unref);
-    ElapsedTime elapsed;
-    while (!pending.answer) {
-        if (check(sd_bus_process(connection, nullptr)) > 0)
-            continue;
-        const auto left = timeLeft(address);
-        if (left.count() == 0 || Interruption::isRaised())
-            return unreachable(noAnswerReason(address) + " while the service on the bus \"" + address.bus +
-                               "\" was to answer. " + fateOf(connection));
-        const int waited = sd_bus_wait(connection, static_cast<std::uint64_t>(std::min(left, tick).count()));
-        if (waited != -EINTR)
-            check(waited);
-        elapsed.show();
+std::optional<uid_t> userOf(sd_bus* connection, const char* name) {
+    const CredentialsPtr owner = ownerOf(connection, name);
+    uid_t user = 0;
+    return owner && sd_bus_creds_get_euid(owner.get(), &user) >= 0 ? std::optional(user) : std::nullopt;
+}
+
+// The name of the service's connection, which no message to it starts; empty when the service does not run.
+std::string connectionOfService(sd_bus* connection) {
+    const CredentialsPtr owner = ownerOf(connection, serviceName);
+    const char* name = nullptr;
+    return owner && sd_bus_creds_get_unique_name(owner.get(), &name) >= 0 ? name : "";
+}
+
+// What the service says of itself; nothing, with *error set, when it does not.
+Value::Dictionary propertiesOf(sd_bus* connection, const std::string& service, sd_bus_error* error) {
+    sd_bus_message* reply = nullptr;
+    if (service.empty() ||
+        sd_bus_call_method(connection, service.c_str(), servicePath, "org.freedesktop.DBus.Properties", "GetAll", error,
+                           &reply, "s", serviceInterface) < 0)
+        return {};
+    const MessagePtr owner(reply, sd_bus_message_unref);
+    return bus::readDictionary(reply);
+}
+
+struct RequestInHand {
+    std::string command;
+    std::int64_t seconds; // since it was begun
+
+    std::string text() const { return command + ", in hand for " + std::to_string(seconds) + " s"; }
+};
+
+std::optional<RequestInHand> requestInHand(const Value& properties) {
+    const std::string* command = properties["RequestInHand"].text();
+    if (!command || command->empty())
+        return std::nullopt;
+    const auto now = std::chrono::system_clock::now().time_since_epoch();
+    const std::chrono::microseconds started(properties["RequestStarted"].integer().value_or(0));
+    return RequestInHand{*command, std::chrono::duration_cast<std::chrono::seconds>(now - started).count()};
+}
+
+// What the service tells of a request while it serves it.
+struct Message {
+    std::int32_t level;
+    std::string source; // the file that logs
+    std::string text;
+
+    nlohmann::ordered_json json() const { return {{"level", level}, {"source", source}, {"text", text}}; }
+    std::string line() const { return source + ": " + text; }
+};
+
+// Errors that tell of no failure.
+constexpr std::string_view harmlessErrors[] = {"updaterOptions created successfully",
+                                               "value of ticket is:", "added ticket"};
+
+bool tellsOfFailure(const Message& message) {
+    constexpr std::int32_t error = 4;
+    return message.level == error && std::ranges::none_of(harmlessErrors, [&message](std::string_view harmless) {
+               return message.text.starts_with(harmless);
+           });
+}
+
+// One request and what comes of it.
+class Conversation {
+public:
+    Conversation(sd_bus* connection, const ServiceAddress& address, const std::string& command)
+        : bus_(connection), address_(address), command_(command) {}
+
+    // The timeout counts also while the bus itself keeps the client waiting.
+    Answer send(const Value::Dictionary& arguments) {
+        constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
+        const MessagePtr message = requestMessage(bus_, command_, arguments);
+        const std::int64_t logSizeBefore = logSize();
+        sd_bus_slot *reply = nullptr, *filter = nullptr;
+        check(sd_bus_add_filter(bus_, &filter, onMessage, this));
+        const SlotPtr filterOwner(filter, sd_bus_slot_unref);
+        check(sd_bus_call_async(bus_, &reply, message.get(), onReply, this, noTimeoutOfItsOwn));
+        const SlotPtr replyOwner(reply, sd_bus_slot_unref);
+        check(sd_bus_set_method_call_timeout(bus_, static_cast<std::uint64_t>(tick.count())));
+        wait();
+        line_.clear();
+        answer_->reasons = whereReasonsAre(address_.bus, logSizeBefore);
+        if (answer_->report.outcome == Outcome::Failure)
+            answer_->report.problem += ' ' + answer_->reasons;
+        answer_->report.messages = messages();
+        return std::move(*answer_);
     }
-    sd_bus_set_method_call_timeout(connection, static_cast<std::uint64_t>(std::max(timeLeft(address), tick).count()));
-    if (!pending.sender.empty())
-        pending.answer->serviceUser = userOf(connection, pending.sender.c_str());
-    pending.answer->reasons = whereReasonsAre(address.bus, logSizeBefore);
-    if (pending.answer->report.outcome == Outcome::Failure)
-        pending.answer->report.problem += ' ' + pending.answer->reasons;
-    return std::move(*pending.answer);
+
+private:
+    static constexpr std::chrono::microseconds tick = std::chrono::seconds(1);
+
+    void wait() {
+        while (!answer_) {
+            if (check(sd_bus_process(bus_, nullptr)) > 0)
+                continue;
+            const auto left = timeLeft(address_);
+            if (left.count() == 0 || Interruption::isRaised())
+                return giveUp();
+            const int waited = sd_bus_wait(bus_, static_cast<std::uint64_t>(std::min(left, tick).count()));
+            if (waited != -EINTR)
+                check(waited);
+            showProgress(waited == 0);
+        }
+    }
+
+    void giveUp() {
+        const std::string fate = fateOfRequest();
+        if (!answer_)
+            answer_ = {unreachable(noAnswerReason(address_) + " while the service on the bus \"" + address_.bus +
+                                   "\" was to answer. " + fate)};
+    }
+
+    // What becomes of the request now. The service has begun with it when it has told anything; otherwise it drops it
+    // when this client leaves the bus, unless nothing else keeps it from beginning.
+    std::string fateOfRequest() {
+        std::uint64_t waiting = 0;
+        if (sd_bus_get_n_queued_write(bus_, &waiting) < 0 || waiting != 0)
+            return "The request was not sent.";
+        const std::string ahead = requestAhead();
+        while (!answer_ && check(sd_bus_process(bus_, nullptr)) > 0)
+            continue;
+        return !told_.empty() ? "The service goes on with the request."
+               : !ahead.empty()
+                   ? "The service has dropped the request, which was still waiting for another (" + ahead + ")."
+                   : "It is not known whether the service goes on with the request.";
+    }
+
+    // The request that keeps this one waiting, when nothing has been told yet.
+    std::string requestAhead() const {
+        const auto inHand =
+            told_.empty() ? requestInHand(propertiesOf(bus_, connectionOfService(bus_), nullptr)) : std::nullopt;
+        return inHand ? inHand->text() : "";
+    }
+
+    // A second that has passed without anything happening is the time to look what this request waits for.
+    void showProgress(bool isIdle) {
+        using std::chrono::seconds;
+        const auto passed = std::chrono::duration_cast<seconds>(Clock::now() - start_);
+        if (!line_.isSeen() || address_.json || passed < seconds(1))
+            return;
+        if (isIdle)
+            ahead_ = requestAhead();
+        line_.show(std::to_string(passed.count()) + " s  " +
+                   (!told_.empty()    ? told_.back().line()
+                    : !ahead_.empty() ? "waiting for another request: " + ahead_
+                                      : "waiting for the service"));
+    }
+
+    // With -v all that was told; otherwise what may be the reasons of a failure. Those of the two commands that log
+    // everything as progress are in the last line.
+    nlohmann::ordered_json messages() const {
+        const bool lastCounts = command_ == "putPSD2" || command_ == "getPSD2";
+        auto found = nlohmann::ordered_json::array();
+        for (const Message& message : told_)
+            if (address_.verbose || tellsOfFailure(message) || (lastCounts && &message == &told_.back()))
+                found.push_back(message.json());
+        return found;
+    }
+
+    // Whether the bus names `sender` as the service: others may send signals too.
+    bool isService(const char* sender) {
+        if (!sender || sender == service_)
+            return sender;
+        service_ = connectionOfService(bus_);
+        return sender == service_;
+    }
+
+    static int onMessage(sd_bus_message* signal, void* context, sd_bus_error*) {
+        auto& self = *static_cast<Conversation*>(context);
+        Message told;
+        const char *source = nullptr, *text = nullptr;
+        if (sd_bus_message_is_signal(signal, serviceInterface, "Message") <= 0 ||
+            !self.isService(sd_bus_message_get_sender(signal)) ||
+            sd_bus_message_read(signal, "iss", &told.level, &source, &text) < 0)
+            return 0;
+        told.source = source;
+        told.text = text;
+        if (self.address_.verbose && !self.address_.json) {
+            self.line_.clear();
+            print(std::cerr, told.line());
+        }
+        self.told_.push_back(std::move(told));
+        return 1;
+    }
+
+    static int onReply(sd_bus_message* reply, void* context, sd_bus_error*) {
+        auto& self = *static_cast<Conversation*>(context);
+        try {
+            const sd_bus_error* error = sd_bus_message_get_error(reply);
+            self.answer_ = error ? Answer{reportOfError(*error, self.address_)} : answerFrom(reply, self.command_);
+            if (const char* sender = sd_bus_message_get_sender(reply); sender && !error)
+                self.answer_->serviceUser = userOf(self.bus_, sender);
+        } catch (const std::exception& failure) {
+            self.answer_ = {unreachable(std::string("The answer cannot be read: ") + failure.what())};
+        }
+        return 0;
+    }
+
+    sd_bus* const bus_;
+    const ServiceAddress& address_;
+    const std::string& command_;
+    const Clock::time_point start_ = Clock::now();
+    std::optional<Answer> answer_;
+    std::vector<Message> told_;
+    std::string service_; // its unique name
+    std::string ahead_;
+    LiveLine line_;
+};
+
+// Does `work` with a connection to the bus. What keeps it from that becomes a report.
+template <class Result>
+Result onBus(const ServiceAddress& address, const std::function<Result(sd_bus*)>& work) {
+    sd_bus* opened = nullptr;
+    if (const int result = bus::open(address.bus, &opened); result < 0)
+        return {unreachable("Cannot reach the bus \"" + address.bus + "\": " + bus::reasonOf(result) +
+                            "; --bus or VELTRA_BUS names another.")};
+    const BusPtr connection(opened, sd_bus_close_unref);
+    try {
+        return work(connection.get());
+    } catch (const bus::Refusal& refusal) {
+        return {failed(Outcome::Usage, refusal.what())};
+    } catch (const std::system_error& failure) {
+        if (const int code = failure.code().value(); code == E2BIG || code == EMSGSIZE || code == ENOBUFS)
+            return {failed(Outcome::Usage, std::string("The request is too large for a message: ") + failure.what())};
+        return {unreachable("Lost the bus \"" + address.bus + "\": " + failure.what())};
+    }
+}
+
+// Whether the bus starts the service when a request comes.
+bool startsAtRequest(sd_bus* connection) {
+    char** names = nullptr;
+    if (sd_bus_list_names(connection, nullptr, &names) < 0)
+        return false;
+    bool isListed = false;
+    for (char** name = names; *name; ++name) {
+        isListed = isListed || *name == std::string_view(serviceName);
+        std::free(*name);
+    }
+    std::free(names);
+    return isListed;
+}
+
+Report statusOf(sd_bus* connection, const ServiceAddress& address) {
+    check(sd_bus_set_method_call_timeout(connection, static_cast<std::uint64_t>(timeLeft(address).count())));
+    const std::string service = connectionOfService(connection);
+    if (service.empty() && startsAtRequest(connection))
+        return {.json = {{"service", "not running; a request starts it"}, {"bus", address.bus}}};
+    BusError error;
+    if (service.empty())
+        sd_bus_error_set_const(&error.found, SD_BUS_ERROR_SERVICE_UNKNOWN, nullptr);
+    const Value properties = propertiesOf(connection, service, &error.found);
+    if (sd_bus_error_is_set(&error.found))
+        return reportOfError(error.found, address);
+    Report report;
+    report.json = {{"service", "running"}, {"bus", address.bus}};
+    for (const auto& [name, shown] : {std::pair("Version", "version"),
+                                      {"DeviceRoot", "deviceRoot"},
+                                      {"StoreState", "store"},
+                                      {"RequestsWaiting", "requestsWaiting"}})
+        report.json[shown] = jsonFromValue(properties[name]);
+    report.json["requestInHand"] = nlohmann::ordered_json::object();
+    if (const auto inHand = requestInHand(properties))
+        report.json["requestInHand"] = {{"command", inHand->command}, {"seconds", inHand->seconds}};
+    return report;
 }
 
 } // namespace
@@ -222,17 +452,10 @@ std::string noAnswerReason(const ServiceAddress& address) {
 
 Answer sendRequest(const ServiceAddress& address, const std::string& command, const Value::Dictionary& arguments) {
     const Interruption interruption;
-    sd_bus* opened = nullptr;
-    if (const int result = bus::open(address.bus, &opened); result < 0)
-        return unreachable("Cannot reach the bus \"" + address.bus + "\": " + bus::reasonOf(result));
-    const BusPtr connection(opened, sd_bus_close_unref);
-    try {
-        return converse(connection.get(), address, command, arguments);
-    } catch (const bus::Refusal& refusal) {
-        return failed(Outcome::Usage, refusal.what());
-    } catch (const std::system_error& failure) {
-        if (const int code = failure.code().value(); code == E2BIG || code == EMSGSIZE || code == ENOBUFS)
-            return failed(Outcome::Usage, std::string("The request is too large for a message: ") + failure.what());
-        return unreachable("Lost the bus \"" + address.bus + "\": " + failure.what());
-    }
+    return onBus<Answer>(
+        address, [&](sd_bus* connection) { return Conversation(connection, address, command).send(arguments); });
+}
+
+Report askStatus(const ServiceAddress& address) {
+    return onBus<Report>(address, [&](sd_bus* connection) { return statusOf(connection, address); });
 }

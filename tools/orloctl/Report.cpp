@@ -244,6 +244,8 @@ void writeJson(std::ostream& out, const Report& report) {
         json["problem"] = report.problem;
     if (!report.note.empty())
         json["note"] = report.note;
+    if (!report.messages.is_null())
+        json["messages"] = report.messages;
     writer.value(json, report.lists);
     out << '\n';
 }

@@ -61,8 +61,9 @@ struct Report { // NOLINT(bugprone-exception-escape): moving JSON asserts, which
     nlohmann::ordered_json json = nlohmann::ordered_json::object();
     Lists lists = {};
     Outcome outcome = Outcome::Success;
-    std::string problem = {}; // sentences that say what is wrong and where; empty on success
-    std::string note = {};    // what the JSON does not say and the user should know
+    std::string problem = {};             // sentences that say what is wrong and where; empty on success
+    std::string note = {};                // what the JSON does not say and the user should know
+    nlohmann::ordered_json messages = {}; // what the service told of the request, with "level", "source" and "text"
 
     bool ok() const { return outcome == Outcome::Success; }
     void fail(std::string why, Outcome how = Outcome::BadInput) {
@@ -76,7 +77,7 @@ struct Report { // NOLINT(bugprone-exception-escape): moving JSON asserts, which
 void writeJson(std::ostream& out, const Report& report);
 
 // Writes what the report found as indented lines: of a long list the beginning and the number of the others, of an
-// offline reader's long values the beginning. Problem and note are left out.
+// offline reader's long values the beginning. Problem, note and messages are left out.
 void writeText(std::ostream& out, const Report& report);
 
 // Writes a line, or several, of text for people. Wherever something is written, control characters and marks of the

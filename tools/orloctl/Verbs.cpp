@@ -1,6 +1,7 @@
 #include "tools/orloctl/Verbs.h"
 
 #include <charconv>
+#include <cstdlib>
 #include <iostream>
 #include <set>
 #include <utility>
@@ -144,6 +145,26 @@ Report crashLogs(const ServiceAddress&, const Words& words) {
     return collectCrashLogs(words["--output"]);
 }
 
+// The description is looked at below the device root that the service has.
+Report showStatus(const ServiceAddress& address, const Words&) {
+    Report report = askStatus(address);
+    if (!report.ok())
+        return report;
+    const std::string own = deviceRootPath();
+    const auto& root = report.json.value("deviceRoot", own);
+    if (root != own) {
+        report.note = "The device root of the service is not the one of this client, " + own;
+        ::setenv("VELTRA_DEVICE_ROOT", root.c_str(), 1);
+    }
+    try {
+        const Report description = checkDevice("");
+        report.json["description"] = description.ok() ? "sound" : description.json["faults"];
+    } catch (const UsageError& failure) {
+        report.json["description"] = failure.what();
+    }
+    return report;
+}
+
 Report showLog(const ServiceAddress& address, const Words& words) {
     const std::string count = words.find("--lines").value_or("10");
     std::size_t lines = 0;
@@ -269,6 +290,7 @@ const std::vector<Verb> verbs = {
      {{"DEVICE-FILE", "The file to write, a path on the device", "", MayBeLeftOut},
       {"-o,--output", "Write this local file instead, - for standard output", "FILE"}},
      getPsd2},
+    {"status", nullptr, "Say whether the service runs and what it does, without starting it", {}, showStatus},
     {"log",
      nullptr,
      "Print the end of the service's log",

@@ -46,6 +46,7 @@ public:
             ->check(CLI::Range(1LL, 1'000'000LL).description(""))
             ->capture_default_str();
         app_.add_flag("--json", address_.json, "Print exactly one JSON object");
+        app_.add_flag("-v,--verbose", address_.verbose, "Print each message of the request as it comes");
         app_.require_subcommand(1);
         app_.fallthrough();
         app_.footer(exitStatuses);
@@ -128,7 +129,9 @@ private:
     }
 
     // Its exit status is the report's.
-    int print(const Report& report) const {
+    int print(Report report) const {
+        if (report.ok() && !address_.verbose)
+            report.messages = nullptr;
         if (address_.json)
             writeJson(std::cout, report);
         else {
@@ -137,6 +140,10 @@ private:
             for (const std::string& sentence : {report.note, report.problem})
                 if (!sentence.empty())
                     ::print(std::cerr, "orloctl: " + sentence);
+            if (!address_.verbose) // they have been printed as they came
+                for (const auto& message : report.messages)
+                    ::print(std::cerr, "  " + message.at("source").get<std::string>() + ": " +
+                                           message.at("text").get<std::string>());
         }
         return static_cast<int>(report.outcome);
     }
