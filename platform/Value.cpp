@@ -83,9 +83,7 @@ std::optional<std::int64_t> Value::integer() const {
 
 std::optional<bool> Value::boolean() const {
     const std::optional<std::int64_t> number = integer();
-    if (!number)
-        return std::nullopt;
-    return *number != 0;
+    return number ? std::optional(*number != 0) : std::nullopt;
 }
 
 const Value& Value::operator[](std::string_view key) const {

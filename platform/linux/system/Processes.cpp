@@ -116,9 +116,7 @@ void killAndWait(pid_t child) {
 }
 
 void makeNonBlocking(int descriptor) {
-    const int flags = ::fcntl(descriptor, F_GETFL);
-    if (flags >= 0)
-        ::fcntl(descriptor, F_SETFL, flags | O_NONBLOCK);
+    ::fcntl(descriptor, F_SETFL, O_NONBLOCK); // a pipe has no other flag that can be set
 }
 
 FileDescriptor openEnding(pid_t child) {

@@ -108,16 +108,9 @@ const std::string* grantable(const Value& name, std::string_view separators) {
 }
 
 // Whether the option "Permissions" has exactly this grant.
-bool isGranted(const OrloOptions& options, std::string_view grant) {
+bool isGranted(const OrloOptions& options, const std::string& grant) {
     const std::string* permissions = options["Permissions"].text();
-    std::string_view rest = permissions ? *permissions : std::string_view();
-    while (!rest.empty()) {
-        const std::size_t end = std::min(rest.find(';'), rest.size());
-        if (rest.substr(0, end) == grant)
-            return true;
-        rest.remove_prefix(std::min(end + 1, rest.size()));
-    }
-    return false;
+    return permissions && (";" + *permissions + ";").find(";" + grant + ";") != std::string::npos;
 }
 
 // Holds the session to its permissions. What is returned are views of the arguments.
