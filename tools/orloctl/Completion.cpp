@@ -2,12 +2,12 @@
 
 #include <algorithm>
 #include <iostream>
-#include <sstream>
 #include <string_view>
 
 #include "img4/Img4Trust.h"
 #include "platform/DataClasses.h"
 #include "platform/Files.h"
+#include "tools/orloctl/Verbs.h"
 
 namespace {
 
@@ -59,15 +59,6 @@ void offerKind(std::string_view placeholder, const std::string& typed) {
             kind.offer(typed);
 }
 
-// What stands between the commas of a name or type that CLI11 has made.
-std::vector<std::string> partsOf(const std::string& list) {
-    std::vector<std::string> parts;
-    std::istringstream rest(list);
-    for (std::string part; std::getline(rest, part, ',');)
-        parts.push_back(part);
-    return parts;
-}
-
 // A verb takes the options of those above it too.
 const CLI::Option* optionNamed(const CLI::App* verb, const std::string& word) {
     const CLI::Option* option = nullptr;
@@ -79,28 +70,29 @@ const CLI::Option* optionNamed(const CLI::App* verb, const std::string& word) {
 void offerOptions(const CLI::App& verb, const std::string& typed) {
     for (const CLI::App* level = &verb; level; level = level->get_parent())
         for (const CLI::Option* option : level->get_options())
-            if (!option->get_positional() && (level == &verb || option != level->get_help_ptr()))
-                for (const std::string& name : partsOf(option->get_name(false, true)))
-                    offer(name, typed, option->get_description());
+            if (!option->get_positional() && (level == &verb || option != level->get_help_ptr())) {
+                for (const std::string& letter : option->get_snames())
+                    offer("-" + letter, typed, option->get_description());
+                for (const std::string& name : option->get_lnames())
+                    offer("--" + name, typed, option->get_description());
+            }
 }
 
-void offerOperands(const CLI::App& verb, std::size_t before, const std::string& typed) {
-    for (const CLI::App* next : verb.get_subcommands(nullptr))
-        offer(next->get_name(), typed, next->get_description());
+void offerVerbs(const std::string& typed) {
+    for (const Verb& verb : verbs)
+        offer(verb.name, typed, verb.says);
+}
+
+void offerOperands(const Verb& verb, std::size_t before, const std::string& typed) {
     std::size_t position = 0;
-    for (const CLI::Option* operand : verb.get_options()) {
-        if (!operand->get_positional())
+    for (const Argument& operand : verb.arguments) {
+        if (operand.name[0] == '-')
             continue;
-        const bool takesAllThatFollow = operand->get_expected_max() > 1;
-        if (position == before || (takesAllThatFollow && position < before)) {
-            // The words of an operand that takes no others stand in braces in the name of its type.
-            const std::string type = operand->get_type_name();
-            if (const std::size_t open = type.find('{'); open != std::string::npos)
-                for (const std::string& word : partsOf(type.substr(open + 1, type.find('}') - open - 1)))
-                    offer(word, typed);
-            offerKind(operand->get_name(true), typed);
-            // What may be left out may be left out now.
-            before += operand->get_required() || takesAllThatFollow ? 0 : 1;
+        if (position == before || (operand.number == Any && position < before)) {
+            for (const std::string& word : operand.members)
+                offer(word, typed);
+            offerKind(operand.name, typed);
+            before += operand.number == MayBeLeftOut ? 1 : 0; // it may be left out now
         }
         ++position;
     }
@@ -115,15 +107,15 @@ void printCompletions(const CLI::App& app, const std::vector<std::string>& words
     bool optionsHaveEnded = false;
     for (std::size_t i = 0; i + 1 < words.size(); ++i) {
         const std::string& word = words[i];
-        const auto verbs = verb->get_subcommands([&](const CLI::App* known) { return known->check_name(word); });
+        const auto called = verb->get_subcommands([&](const CLI::App* known) { return known->check_name(word); });
         if (waiting)
             waiting = nullptr;
         else if (!optionsHaveEnded && word.starts_with('-') && word.size() > 1) {
             optionsHaveEnded = word == "--";
             const CLI::Option* option = optionNamed(verb, word);
             waiting = option && option->get_items_expected_max() > 0 ? option : nullptr;
-        } else if (operands == 0 && !verbs.empty())
-            verb = verbs.front();
+        } else if (operands == 0 && !called.empty())
+            verb = called.front();
         else
             ++operands;
     }
@@ -132,6 +124,8 @@ void printCompletions(const CLI::App& app, const std::vector<std::string>& words
         offerKind(waiting->get_type_name(), typed);
     else if (!optionsHaveEnded && typed.starts_with('-'))
         offerOptions(*verb, typed);
+    else if (verb == &app)
+        offerVerbs(typed);
     else
-        offerOperands(*verb, operands, typed);
+        offerOperands(*std::ranges::find(verbs, verb->get_name(), &Verb::name), operands, typed);
 }

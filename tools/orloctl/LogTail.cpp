@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <deque>
 #include <optional>
 #include <string>
 #include <utility>
@@ -16,8 +17,6 @@
 #include "tools/orloctl/LocalFiles.h"
 
 namespace {
-
-constexpr off_t pieceSize = 65536;
 
 [[noreturn]] void refuse() {
     throw UsageError(std::string("Cannot read the log ") + logPath + " on the device: " + std::strerror(errno) +
@@ -46,34 +45,16 @@ private:
     FileDescriptor events_;
 };
 
-// Where the last `lines` lines of the file begin.
-off_t startOfLast(const FileDescriptor& file, std::size_t lines) {
-    const off_t end = ::lseek(file.get(), 0, SEEK_END);
-    for (off_t place = end; place > 0 && lines > 0;) {
-        std::string piece(static_cast<std::size_t>(std::min(place, pieceSize)), '\0');
-        place -= static_cast<off_t>(piece.size());
-        if (::pread(file.get(), piece.data(), piece.size(), place) < 0)
-            refuse();
-        for (std::size_t i = piece.size(); i-- > 0;)
-            if (const off_t next = place + static_cast<off_t>(i) + 1; piece[i] == '\n' && next != end && --lines == 0)
-                return next;
-    }
-    return lines == 0 ? end : 0;
-}
-
-// The log from a place on, line by line.
+// The log from its beginning on, line by line.
 class Reader {
 public:
-    explicit Reader(std::size_t lines) : file_(openInRoot(logPath, O_RDONLY)) {
-        if (file_)
-            place_ = startOfLast(file_, lines);
-    }
+    Reader() : file_(openInRoot(logPath, O_RDONLY)) {}
 
     explicit operator bool() const { return static_cast<bool>(file_); }
 
     // Hands on what there is up to the end; a line that has no end yet waits for it. False when `take` wants no more.
     bool readOn(const std::function<bool(std::string_view)>& take) {
-        std::string piece(static_cast<std::size_t>(pieceSize), '\0');
+        std::string piece(65536, '\0');
         while (file_) {
             const ssize_t count = ::pread(file_.get(), piece.data(), piece.size(), place_);
             if (count < 0)
@@ -115,10 +96,20 @@ private:
 
 void readLog(std::size_t lines, bool isFollowed, const std::function<bool(std::string_view line)>& take) {
     const std::optional<Watch> watch = isFollowed ? std::make_optional<Watch>() : std::nullopt;
-    Reader reader(lines);
+    Reader reader;
     if (!reader && !isFollowed)
         refuse();
-    while (reader.readOn(take) && isFollowed)
+    std::deque<std::string> last;
+    reader.readOn([&](std::string_view line) {
+        last.emplace_back(line);
+        if (last.size() > lines)
+            last.pop_front();
+        return true;
+    });
+    bool isWanted = std::ranges::all_of(last, take);
+    while (isWanted && isFollowed) {
         if (!reader.isReplaced())
             watch->wait();
+        isWanted = reader.readOn(take);
+    }
 }
