@@ -64,11 +64,9 @@ class Session:
 
     def put(self, instance, record=b"record"):
         (self.root / "record").write_bytes(record)
-        self.run("grant", "psd2", instance)
         return self.run("put", "psd2", instance, "/record")
 
     def get(self, instance):
-        self.run("grant", "psd2", instance)
         return self.run("get", "psd2", instance, "/got")
 
     def got(self):
@@ -233,7 +231,6 @@ class ObjectStore(RemoteTest, StoreCases):
         for data_class, instance in (("psd2", "a\nb"), ("psd2", "\x7f"), ("psd2", "a\x85"), ("psd2", "\uffff"),
                                      ("psd2", "a//b"), ("psd2", "c/.."), ("psd2", "/"), ("p/2", "S1"), ("..", "S1")):
             with self.subTest((data_class, instance)):
-                session.run("grant", data_class, instance)
                 self.assertEqual(session.run("get", data_class, instance, "/got")[0], STORAGE)
 
     def assert_refused(self, code, reason):

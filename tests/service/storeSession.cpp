@@ -1,9 +1,11 @@
 // A session of the data-store library for tests that choose its options: each line of standard input is a command, a
 // JSON array, and is answered by one line, the error's code (0 for none) and its text. The device root is the
 // environment's.
-//   ["open", OPTIONS]  ["trust", URL]  ["grant", CLASS, INSTANCE]  ["put", CLASS, INSTANCE, PATH]
-//   ["get", CLASS, INSTANCE, PATH]  ["export", [CLASS...], [INSTANCE...]]
+//   ["open", OPTIONS]  ["trust", URL]
+// with the permission for it
+//   ["put", CLASS, INSTANCE, PATH]  ["get", CLASS, INSTANCE, PATH]  ["export", [CLASS...], [INSTANCE...]]
 // and, to the pairing library, ["pair", URL, PATH], which puts the ticket into the file.
+#include <algorithm>
 #include <iostream>
 #include <optional>
 #include <string>
@@ -28,19 +30,18 @@ public:
         const auto word = [&](std::size_t index) { return index < words.size() ? words[index] : Value(); };
         const std::string verb = word(0).description();
         std::optional<Error> error;
-        bool done = true;
+        bool done = false;
+        grant(listOf(word(1)), listOf(word(2)));
         if (verb == "open")
             done = open(word(1));
         else if (verb == "trust")
             done = trust(word(1).description(), &error);
-        else if (verb == "grant")
-            grant({word(1)}, {word(2)});
         else if (verb == "put")
             done = QDOrloDataPut(session_, word(1), word(2), files::readWhole(word(3).description()).value(), &error);
         else if (verb == "get")
             done = get(word(1), word(2), word(3).description(), &error);
         else if (verb == "export")
-            done = exportAll(*word(1).array(), *word(2).array(), &error);
+            done = QDOrloDataMultiExport(session_, listOf(word(1)), listOf(word(2)), &error);
         else if (verb == "pair")
             done = pair(word(1).description(), word(2).description(), &error);
         else
@@ -49,6 +50,8 @@ public:
     }
 
 private:
+    static Value::Array listOf(const Value& names) { return names.array() ? *names.array() : Value::Array{names}; }
+
     bool open(const Value& options) {
         QDSupportSafeRelease(session_);
         session_ = QDOrloCreateWithOptions(resolveDescribed(options));
@@ -67,7 +70,7 @@ private:
 
     void grant(const Value::Array& classes, const Value::Array& instances) {
         std::string permissions;
-        for (std::size_t i = 0; i < classes.size(); ++i)
+        for (std::size_t i = 0; i < std::min(classes.size(), instances.size()); ++i)
             for (const OrloAction action : {OrloActionGet, OrloActionPut, OrloActionExport})
                 QDOrloAppendPermissionsString(action, classes[i], instances[i], permissions);
         QDOrloSetOption(session_, "Permissions", permissions);
@@ -83,12 +86,6 @@ private:
             return files::replace(path, {ticket, length}) ? 0 : 1;
         });
     }
-
-    bool exportAll(const Value::Array& classes, const Value::Array& instances, std::optional<Error>* error) {
-        grant(classes, instances);
-        return QDOrloDataMultiExport(session_, classes, instances, error);
-    }
-
     __QDOrlo* session_ = nullptr;
 };
 
