@@ -107,19 +107,15 @@ std::vector<Case> blockCases(const Bytes& digest, const Bytes& oid, std::size_t 
     const auto shortened = [&](std::size_t padding) {
         return join({padded(info, padding + 3 + info.size()), Bytes(length - padding - 3 - info.size(), 0xAA)});
     };
-    const Bytes longDigest = join({Bytes{0x04, 0x81, static_cast<std::uint8_t>(digest.size())}, digest});
     return {
         {"sound", sound, true},
         {"no NULL", with({sequence({oid}), octets(digest)})},
-        {"long length of the digest", with({algorithm, longDigest})},
         {"octets behind the digest", with({algorithm, octets(digest), null})},
-        {"other digest algorithm", with({sequence({lastChanged(oid, 0x03), null}), octets(digest)})},
         {"digest alone", padded(digest, length)},
         {"other digest", lastChanged(sound)},
         {"short padding and octets behind", shortened(8)},
         {"padding of seven octets", shortened(7)},
         {"other octet in the padding", changedAt(sound, 2, 0xFE)},
-        {"no end of the padding", changedAt(sound, length - info.size() - 1, 0xFF)},
         {"padding of encryption", changedAt(sound, 1, 0x02)},
     };
 }
@@ -191,8 +187,6 @@ TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
         {"signature with a zero in front", whole, join({Bytes{0}, sound})},
         {"signature that lacks an octet", whole, Bytes(sound.begin(), sound.end() - 1)},
         {"signature plus modulus", whole, sum(sound, n)},
-        {"signature of zero", whole, Bytes(n.size())},
-        {"modulus as signature", whole, n},
         {"no signature", whole, {}},
     };
     for (const Row& row : rows)
@@ -232,7 +226,6 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
     const Bytes longR = join({Bytes{0x02, 0x81}, Bytes(R.begin() + 1, R.end())});
     return {
         {"sound", whole, true},
-        {"r and s swapped", pair(s, r)},
         {"r = 0", pair({}, s)},
         {"s = 0", pair(r, {})},
         {"r = order", pair(order, s)},
@@ -241,10 +234,7 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
         {"r negative", sequence({rawInteger(r), S})},
         {"s negative", sequence({R, rawInteger(s)})},
         {"zeros before r", sequence({rawInteger(join({Bytes{0, 0}, r})), S})},
-        {"zeros before s", sequence({R, rawInteger(join({Bytes{0, 0}, s}))})},
         {"r empty", sequence({rawInteger({}), S})},
-        {"s empty", sequence({R, rawInteger({})})},
-        {"r of two octets for zero", sequence({rawInteger({0, 0}), S})},
         {"s missing", sequence({R})},
         {"third number", sequence({R, S, positiveInteger({1})})},
         {"octets behind", join({whole, null})},

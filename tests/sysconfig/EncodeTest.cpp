@@ -51,8 +51,7 @@ void expectRefusal(const SysConfig3Ptr& object, const Lines& lines) {
 TEST(Encode, needsAnObjectAndAPlaceForTheResult) {
     const Recorder recorder;
     const Refusal refusals[] = {
-        {!encodeSysConfig3(nullptr, nullptr),
-         "encodeSysConfig3: Invalid arguments. sysconfig = %p<(nil)>, sData = %p<(nil)>"},
+        REFUSAL(encodeSysConfig3(nullptr, nullptr), "Invalid arguments. sysconfig = %p<(nil)>, sData = %p<(nil)>"),
     };
     Recorder::expect(refusals);
     EXPECT_FALSE(encodeSysConfig3(newObject().get(), nullptr));

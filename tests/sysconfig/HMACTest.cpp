@@ -159,21 +159,19 @@ TEST(HMAC, saysWhatIsMissing) {
     SysConfigData out = {};
     const Recorder recorder;
     const Refusal refusals[] = {
-        {!allocSysConfig3WithHMACKey(bCfg, 0x30003, hmacKey),
-         "allocSysConfig3WithHMACKey: Requested version (0x%X<30003>) does not support HMAC."},
-        {!sysConfig3SetHMACKey(nullptr, hmacKey), "sysConfig3SetHMACKey: sysconfig is NULL."},
-        {!sysConfig3UpdateHMAC(nullptr), "sysConfig3UpdateHMAC: sysconfig is NULL."},
-        {!sysConfig3UpdateHMAC(later.get()),
-         "sysConfig3UpdateHMAC: This SysConfig version (0x%X<30003>) does not support HMAC."},
-        {!sysConfig3IsValidHMAC(nullptr), "sysConfig3IsValidHMAC: sysconfig is NULL."},
+        REFUSAL(allocSysConfig3WithHMACKey(bCfg, 0x30003, hmacKey),
+                "Requested version (0x%X<30003>) does not support HMAC."),
+        REFUSAL(sysConfig3SetHMACKey(nullptr, hmacKey), "sysconfig is NULL."),
+        REFUSAL(sysConfig3UpdateHMAC(nullptr), "sysconfig is NULL."),
+        REFUSAL(sysConfig3UpdateHMAC(later.get()), "This SysConfig version (0x%X<30003>) does not support HMAC."),
+        REFUSAL(sysConfig3IsValidHMAC(nullptr), "sysconfig is NULL."),
         {!sysConfig3IsValidHMAC(keyless.get()), "Invalid HMAC key. sysconfig->hmacKey.data = %p<(nil)>, "
                                                 "sysconfig->hmacKey.length = %d<0>. Did you register HMAC key?"},
-        {!sysConfig3CreateFullHMAC(nullptr, &out), "sysConfig3CreateFullHMAC: sysconfig is NULL."},
-        {!sysConfig3CreatePayloadHMAC(keyless.get(), nullptr),
-         "sysConfig3CreatePayloadHMAC: Invalid HAMC key. sysconfig->hmacKey.data = %p<(nil)>, "
-         "sysconfig->hmacKey.length = %u<0>"},
-        {!sysConfig3CreateMetadataHMAC(ready.get(), nullptr), "sysConfig3CreateMetadataHMAC: hmac is NULL"},
-        {!sysConfig3CreateFullHMAC(ready.get(), nullptr), "sysConfig3CreateFullHMAC: hmac is NULL"},
+        REFUSAL(sysConfig3CreateFullHMAC(nullptr, &out), "sysconfig is NULL."),
+        REFUSAL(sysConfig3CreatePayloadHMAC(keyless.get(), nullptr),
+                "Invalid HAMC key. sysconfig->hmacKey.data = %p<(nil)>, sysconfig->hmacKey.length = %u<0>"),
+        REFUSAL(sysConfig3CreateMetadataHMAC(ready.get(), nullptr), "hmac is NULL"),
+        REFUSAL(sysConfig3CreateFullHMAC(ready.get(), nullptr), "hmac is NULL"),
     };
     Recorder::expect(refusals);
 

@@ -22,6 +22,12 @@ struct Refusal {
     std::string line;
 };
 
+// A call that is to fail and to say this of itself.
+#define REFUSAL(call, said)                                                                                            \
+    Refusal {                                                                                                          \
+        !(call), std::string(#call).substr(0, std::string_view(#call).find('(')) + ": " + (said)                       \
+    }
+
 // While one lives it is registered with both hooks. One at a time.
 class Recorder {
 public:
