@@ -37,38 +37,49 @@ TEST(SysConfig3, saysWhatIsWrongWithItsArguments) {
         REFUSAL(allocSysConfig3MetadataEntry(nullptr, oneByte, 1, "s"), "key must be non-NULL"),
         REFUSAL(allocSysConfig3Manifest(0x30003, nullptr, nullptr, nullptr),
                 "one of the hmacs were NULL. payload ptr: %p<(nil)> metdata ptr: %p<(nil)> full ptr: %p<(nil)>"),
-        REFUSAL(_copySysConfigData(nullptr, nullptr), "sourceData or destData was NULL"),
         REFUSAL(_copySysConfigData(&none, &cleared), "sourceData was 0 length"),
         REFUSAL(_allocAndCopyData(oneByte, 0), "data was zero length"),
+        REFUSAL(sysConfig3GetMetadataEntryForKey(nullptr, "k"), "invalid argument. sysconfig cannot be NULL"),
         REFUSAL(_sysConfig3SetManifest(nullptr, nullptr),
                 "sysconfig (0x%p<(nil)>) or manifest (0x%p<(nil)>) argument was null"),
         REFUSAL(_sysConfig3SetManifest(object, manifest),
                 "sysconfig version (0X%08X<00030003>) did not match manifest version (0X%08X<00000007>"),
         REFUSAL(_sysConfig3HMACsAreEqual(0x30004, nullptr, nullptr), "Unsupported sysconfig version: 0x%X<30004>"),
-        REFUSAL(_sysConfig3AddPayloadEntry(object, nullptr), "invalid argument. sysconfig and etnry cannot be NULL"),
-        REFUSAL(_sysConfig3AddMetadataEntry(object, nullptr), "invalid argument. sysconfig and entry cannot be NULL"),
-        REFUSAL(_sysConfig3DeletePayloadEntryForKey(nullptr, 1), "invalid argument. sysconfig cannot be NULL"),
-        REFUSAL(_sysConfig3DeleteMetadataEntryForKey(object, nullptr),
-                "invalid argument. sysconfig and key cannot be NULL"),
-        REFUSAL(sysConfig3AddPayloadEntry(object, nullptr), "invalid argument. sysconfig and entry cannot be NULL"),
         {!add(keyed, payloadDeleted(keyWCh0)), "sysConfig3AddPayloadEntry: Payloads with the deleted flag are only "
                                                "supported on version 0x%08X<00030003> or higher."},
-        REFUSAL(sysConfig3AddMetadataEntry(nullptr, nullptr), "invalid argument. sysconfig and entry cannot be NULL"),
-        REFUSAL(sysConfig3DeletePayloadEntryForKey(nullptr, 1), "invalid argument. sysconfig cannot be NULL"),
-        REFUSAL(sysConfig3DeleteMetadataEntryForKey(object, nullptr),
-                "invalid argument. sysconfig and key cannot be NULL"),
-        REFUSAL(sysConfig3GetPayloadEntryForKey(nullptr, 1), "invalid argument. sysconfig cannot be NULL"),
-        REFUSAL(sysConfig3GetMetadataEntryForKey(nullptr, "k"), "invalid argument. sysconfig cannot be NULL"),
-        REFUSAL(sysConfig3PayloadEntryGetData(nullptr, nullptr), "invalid arguments. Either entry or data was NULL"),
-        REFUSAL(sysConfig3ManifestGetPayloadHMAC(nullptr, nullptr), "invalid arguments. entry and data cannot be null"),
-        REFUSAL(sysConfig3ManifestGetMetadataHMAC(manifest, nullptr),
-                "invalid arguments. entry and data cannot be null"),
-        REFUSAL(sysConfig3ManifestGetFullHMAC(manifest, nullptr), "invalid arguments. entry and data cannot be null"),
     };
     Recorder::expect(refusals);
     EXPECT_EQ(cleared.data, nullptr);
     EXPECT_EQ(cleared.length, 0U);
     EXPECT_EQ(payloadOf(keyed), "");
+}
+
+TEST(SysConfig3, saysThatAnArgumentIsMissing) {
+    const PayloadEntryPtr payloadOwner = payloadString(keyWCh0, "text");
+    const MetadataEntryPtr metadataOwner = metadataString("k", "v");
+    const SysConfig3Ptr objectOwner = newObject();
+    __SysConfig3* const object = objectOwner.get();
+    const auto* const payload = payloadOwner.get();
+    const auto* const metadata = metadataOwner.get();
+    const auto* const manifest = sysConfig3GetManifest(object);
+    SysConfigData out = {};
+    const Recorder recorder;
+    EXPECT_NEEDS("sourceData or destData was NULL", _copySysConfigData, &out, &out);
+    EXPECT_NEEDS("invalid argument. sysconfig and etnry cannot be NULL", _sysConfig3AddPayloadEntry, object, payload);
+    EXPECT_NEEDS("invalid argument. sysconfig and entry cannot be NULL", _sysConfig3AddMetadataEntry, object, metadata);
+    EXPECT_NEEDS("invalid argument. sysconfig and entry cannot be NULL", sysConfig3AddPayloadEntry, object, payload);
+    EXPECT_NEEDS("invalid argument. sysconfig and entry cannot be NULL", sysConfig3AddMetadataEntry, object, metadata);
+    EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", _sysConfig3DeletePayloadEntryForKey, object, 1);
+    EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", sysConfig3DeletePayloadEntryForKey, object, 1);
+    EXPECT_NEEDS("invalid argument. sysconfig and key cannot be NULL", _sysConfig3DeleteMetadataEntryForKey, object,
+                 "k");
+    EXPECT_NEEDS("invalid argument. sysconfig and key cannot be NULL", sysConfig3DeleteMetadataEntryForKey, object,
+                 "k");
+    EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", sysConfig3GetPayloadEntryForKey, object, 1);
+    EXPECT_NEEDS("invalid arguments. Either entry or data was NULL", sysConfig3PayloadEntryGetData, payload, &out);
+    EXPECT_NEEDS("invalid arguments. entry and data cannot be null", sysConfig3ManifestGetPayloadHMAC, manifest, &out);
+    EXPECT_NEEDS("invalid arguments. entry and data cannot be null", sysConfig3ManifestGetMetadataHMAC, manifest, &out);
+    EXPECT_NEEDS("invalid arguments. entry and data cannot be null", sysConfig3ManifestGetFullHMAC, manifest, &out);
 }
 
 TEST(SysConfig3, namesTheReportingOperationByItsPrototypeToAHookThatMayBeAbsent) {

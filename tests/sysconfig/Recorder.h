@@ -7,12 +7,14 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <type_traits>
 #include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 #include "sysconfig/SysConfig3.h"
+#include "tests/support/MissingArguments.h"
 
 using Lines = std::vector<std::string>;
 
@@ -107,5 +109,14 @@ private:
         lines.push_back(line.append(format));
     }
 };
+
+// Expects that the operation, whichever pointer it lacks, fails and says this of itself.
+#define EXPECT_NEEDS(said, operation, ...) expectNeeds(#operation ": " said, operation, __VA_ARGS__)
+
+template <typename Result, typename... Parameters>
+void expectNeeds(const char* line, Result (*operation)(Parameters...), std::type_identity_t<Parameters>... arguments) {
+    expectNeedsAll(Result{}, operation, arguments...);
+    EXPECT_EQ(Recorder::take(), Lines((std::size_t{std::is_pointer_v<Parameters>} + ...), line));
+}
 
 #endif
