@@ -42,6 +42,10 @@ inline DERItem itemOf(const Bytes& bytes) {
     return {bytes.data(), bytes.size()};
 }
 
+inline Bytes bytesOf(const DERItem& item) {
+    return {item.data, item.data + item.length};
+}
+
 // Octets of a table, written as for `bytes`, and their view.
 struct Hex {
     Hex(const char* hex) : text(hex), octets(bytes(hex)), item(itemOf(octets)) {}

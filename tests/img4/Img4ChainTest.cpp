@@ -25,7 +25,7 @@ struct Verdict {
 };
 
 Verdict verify(const Img4TrustProfileEntry& entry, const Bytes& chain) {
-    const DERItem view = viewOf(chain);
+    const DERItem view = itemOf(chain);
     Verdict verdict = {};
     Img4DomainProfile domainProfile;
     EXPECT_EQ(Img4DecodeMakeDomainProfile(&entry, entry.root, &Img4BuiltInTrustDomain, &domainProfile), DERSuccess);
@@ -157,7 +157,7 @@ TEST(Img4Chain, leavesAreJudgedByTheirFields) {
             EXPECT_EQ(verdict.status, isSound ? DERSuccess : Img4Failure);
             EXPECT_EQ(verdict.refusal.fault, row.fault);
             EXPECT_EQ(verdict.refusal.certificate, entry->chainLength - 1);
-            const Bytes key(verdict.leafKey.data, verdict.leafKey.data + verdict.leafKey.length);
+            const Bytes key = bytesOf(verdict.leafKey);
             const Bytes info = bitString(key);
             EXPECT_EQ(!key.empty() && std::equal(info.rbegin(), info.rend() - 4, leaf.publicKeyInfo.rbegin()), isSound);
             EXPECT_EQ(verdict.certProperties.length, isSound && !leaf.extensions.empty() ? set({}).size() : 0U);
@@ -272,7 +272,7 @@ TEST(Img4Chain, middleCertificateOfTheRSAChainBelongsToTheAuthority) {
         if (entry->chainLength != 3)
             continue;
         const Signer& signer = signerOf(*entry);
-        const Bytes root(entry->root->data, entry->root->data + entry->root->length);
+        const Bytes root = bytesOf(*entry->root);
         for (const MiddleCase& row : middleCases) {
             SCOPED_TRACE(std::string(entry->name) + ", " + row.name);
             Certificate middle = signer.leaf();
@@ -295,9 +295,9 @@ TEST(Img4Chain, endsInTheRootOfADomainGivenAtRunTime) {
     const Img4TrustProfileEntry& first = entryOf(kImg4DecodeSecureBootEc384Sha384);
     const Img4TrustProfileEntry& other = entryOf(kImg4DecodeLocalPolicyEc384Sha384);
     const Bytes chain = join(signerOf(first).standardChain());
-    const DERItem view = viewOf(chain);
+    const DERItem view = itemOf(chain);
     const Bytes otherOidContent(otherOid.begin() + 2, otherOid.end());
-    const Img4TrustDomain otherDomain = {{}, viewOf(otherOidContent)};
+    const Img4TrustDomain otherDomain = {{}, itemOf(otherOidContent)};
     DERItem leafKey;
     DERItem certProperties;
     Img4ChainRefusal refusal;
@@ -323,7 +323,7 @@ TEST(Img4Chain, endsInTheRootOfADomainGivenAtRunTime) {
 TEST(Img4Chain, needsItsArguments) {
     const Img4TrustProfileEntry& entry = entryOf(kImg4DecodeSecureBootEc256Sha256);
     const Bytes chain = join(signerOf(entry).standardChain());
-    const DERItem view = viewOf(chain);
+    const DERItem view = itemOf(chain);
     const DERItem none = {};
     DERItem item;
     Img4DomainProfile made;

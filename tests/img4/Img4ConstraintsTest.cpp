@@ -1,4 +1,5 @@
 // The walk over a dictionary's properties, and the constraints that a leaf certificate carries.
+#include "der/DERDecode.h"
 #include "tests/img4/TrustDomain.h"
 #include "tests/support/MissingArguments.h"
 
@@ -15,7 +16,7 @@ const Bytes good = property("GOOD", integer(1));
 
 DERReturn count(DERTag tag, const Img4PropertyValue* value, std::uint32_t selector, void* context) {
     EXPECT_EQ(tag, propertyTag("GOOD"));
-    EXPECT_EQ(Bytes(value->content.data, value->content.data + value->content.length), Bytes{1});
+    EXPECT_EQ(bytesOf(value->content), Bytes{1});
     EXPECT_EQ(selector, 9U);
     ++*static_cast<unsigned*>(context);
     return DERSuccess;
@@ -36,12 +37,12 @@ TEST(Img4PropertyWalk, judgesEveryPropertyOrSaysWhichIsNone) {
         {"element cut short", join({good, Bytes{0xFF}}), DERDecodeError, 1},
     };
     for (const auto& [name, dictionary, expected, expectedSeen] : rows) {
-        const DERItem view = viewOf(dictionary);
+        const DERItem view = itemOf(dictionary);
         unsigned seen = 0;
         EXPECT_EQ(Img4DecodeEvaluateDictionaryProperties(&view, 9, count, &seen), expected) << name;
         EXPECT_EQ(seen, expectedSeen) << name;
     }
-    const DERItem view = viewOf(good);
+    const DERItem view = itemOf(good);
     const Img4Record record = {};
     expectNeedsAll(DERParamError, Img4DecodeEvaluateDictionaryProperties, &view, 9, count, nullptr);
     expectNeedsAll(DERParamError, Img4DecodeEvaluateManifestProperties, &record, count, nullptr);
@@ -98,9 +99,14 @@ const std::tuple<const char*, Bytes, DERReturn> constraintCases[] = {
     {"no DER", {0x31}, DERDecodeError},
 };
 
-// Keeps the first refusal of a constraint.
+// Keeps the first refusal of a constraint. What was found for one is a property of its name.
 void keepRefusal(const Img4Constraint* constraint, void* context) {
     Img4Refusal& first = *static_cast<Img4Refusal*>(context);
+    DERDecodedInfo binding, bound;
+    if (constraint->found.data != nullptr && DERDecodeItem(&constraint->encoding, &binding) == DERSuccess) {
+        EXPECT_EQ(DERDecodeItem(&constraint->found, &bound), DERSuccess);
+        EXPECT_EQ(bound.tag, binding.tag);
+    }
     if (first.fault == Img4FaultNone && constraint->isChecked)
         first = constraint->refusal;
 }
@@ -113,9 +119,9 @@ TEST(Img4Constraints, bindManifestAndObject) {
         SCOPED_TRACE(name);
         Img4Record record = {};
         Img4Refusal refusal = {};
-        record.manp = viewOf(manp);
-        record.objp = viewOf(objp);
-        record.manifest.certProperties = viewOf(certProperties);
+        record.manp = itemOf(manp);
+        record.objp = itemOf(objp);
+        record.manifest.certProperties = itemOf(certProperties);
         EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), expected);
         EXPECT_EQ(Img4DecodeEvaluateCertificatePropertiesExplained(&record, keepRefusal, &refusal), expected);
         EXPECT_EQ(refusal.status, expected);
@@ -132,13 +138,13 @@ TEST(Img4Constraints, needPropertiesToBind) {
     expectNeedsAll(DERParamError, Img4DecodeEvaluateCertificateProperties, &record);
     expectNeedsAll(DERParamError, Img4DecodeEvaluateCertificatePropertiesExplained, &record, keepRefusal, nullptr);
 
-    record.manifest.certProperties = viewOf(ofObject);
+    record.manifest.certProperties = itemOf(ofObject);
     EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "no object was evaluated";
     record.objp = {broken.data(), 0};
     EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "an object without properties";
 
-    record.manifest.certProperties = viewOf(ofManifest);
-    record.manp = viewOf(broken);
+    record.manifest.certProperties = itemOf(ofManifest);
+    record.manp = itemOf(broken);
     EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERDecodeError) << "a search that fails finds nothing";
 }
 

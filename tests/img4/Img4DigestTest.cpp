@@ -1,6 +1,7 @@
 // Digests of a record's parts, digests of a trust profile, and the length of a whole container.
 #include "img4/Img4Trust.h"
 #include "platform/Crypto.h"
+#include "tests/der/Bytes.h"
 #include "tests/support/MissingArguments.h"
 #include "tools/makers/Img4Maker.h"
 
@@ -13,10 +14,6 @@
 namespace {
 
 using namespace img4maker;
-
-DERItem viewOf(const Bytes& bytes) {
-    return {bytes.data(), bytes.size()};
-}
 
 // What a digest operation was called with last. The operations fill what they are given, and fail.
 struct Call {
@@ -137,7 +134,7 @@ TEST_F(Img4Digests, refuseLengthsThatDoNotFitAndMissingArguments) {
 TEST(Img4TrustDigests, areThoseOfFIPS180) {
     // FIPS 180-4's own example: "abc".
     const Bytes abc = {'a', 'b', 'c'};
-    const DERItem view = viewOf(abc);
+    const DERItem view = itemOf(abc);
     const std::pair<const Img4DigestInfo*, Bytes> rows[] = {
         {&kQDSupportDigestInfoSha1, {0xa9, 0x99, 0x3e, 0x36}},
         {&kQDSupportDigestInfoSha256, {0xba, 0x78, 0x16, 0xbf}},

@@ -1,4 +1,5 @@
 #include "img4/Img4.h"
+#include "tests/der/Bytes.h"
 #include "tools/makers/Img4Maker.h"
 
 #include <cstring>
@@ -140,10 +141,6 @@ TEST(Img4Init, missingArgumentsAreRefusedAndTheRecordIsZeroedAllTheSame) {
                   0);
         EXPECT_EQ(initialise(soundPayload.data(), soundPayload.size(), nullptr), DERParamError);
     }
-}
-
-Bytes bytesOf(const DERItem& item) {
-    return {item.data, item.data + item.length};
 }
 
 TEST(Img4Init, fieldsLieWhereTheyWereWritten) {

@@ -1,6 +1,7 @@
 // The properties of one dictionary, read through every family of getters for every type of value. The families look up
 // alike and differ in what a failure does to the out-value.
 #include "img4/Img4.h"
+#include "tests/der/Bytes.h"
 #include "tests/support/MissingArguments.h"
 #include "tools/makers/Img4Maker.h"
 
@@ -98,7 +99,7 @@ enum class OnFailure {
 };
 
 Bytes shown(const DERItem& value) {
-    return {value.data, value.data + value.length};
+    return bytesOf(value);
 }
 
 Bytes shown(std::uint64_t value) {
@@ -124,7 +125,7 @@ void checkFamily(const char* family, const Img4Record& record, OnFailure onFailu
         const auto keepsNumber = [&](char answer) {
             return keeps || (onFailure == OnFailure::KeepsNumbersNotFound && std::islower(answer) != 0);
         };
-        const DERItem before = {row.content.data(), row.content.size()};
+        const DERItem before = itemOf(row.content);
         check(answers[0], true, shown(row.number), row.number == 0,
               [&](bool* out) { return call(getBoolean, from, row, out); });
         check(answers[1], keepsNumber(answers[1]), shown(row.number), std::uint32_t{77},
@@ -181,7 +182,7 @@ TEST_F(Img4Properties, areFoundByEveryFamilyAlike) {
     checkFamily(
         "single", record, OnFailure::Clears, true,
         [](auto get, auto* from, const Row& row, auto* out) {
-            const DERItem content = {row.content.data(), row.content.size()};
+            const DERItem content = itemOf(row.content);
             return get(from != nullptr ? &content : nullptr, fourCC(row.name), out);
         },
         Img4DecodeGetPropertyBoolean, Img4DecodeGetPropertyInteger, Img4DecodeGetPropertyInteger64,
@@ -226,7 +227,7 @@ TEST_F(Img4Properties, areRecordsWithNameTagsAndValue) {
         EXPECT_EQ(family.get(&record, fourCC("data"), DERTagOctetString, &found), DEREndOfSequence);
     }
     const Bytes content = named("data", octets(data));
-    const DERItem view = {content.data(), content.size()};
+    const DERItem view = itemOf(content);
     Img4Property single;
     expectNeedsAll(DERParamError, DERImg4DecodeProperty, &view, tag, &single);
     EXPECT_EQ(DERImg4DecodeProperty(&view, fourCC("data"), &single), DERUnexpectedTag) << "no property tag";
@@ -239,7 +240,7 @@ TEST_F(Img4Properties, areRecordsWithNameTagsAndValue) {
 TEST(Img4Property, needsAPrivateTag) {
     const DERTag tag = DERTagContextConstructed(1);
     const Bytes content = item(tag, named(std::string_view("\0\0\0\1", 4), integer(1)));
-    const DERItem elements = {content.data(), content.size()};
+    const DERItem elements = itemOf(content);
     Img4Property found;
     EXPECT_EQ(DERImg4DecodeFindProperty(&elements, tag, DERTagInteger, &found), DERUnexpectedTag);
 }

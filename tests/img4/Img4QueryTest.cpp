@@ -1,5 +1,6 @@
 // What a record says of its parts: of the payload and its properties, of the manifest and its sections.
 #include "img4/Img4.h"
+#include "tests/der/Bytes.h"
 #include "tests/support/MissingArguments.h"
 #include "tools/makers/Img4Maker.h"
 
@@ -16,14 +17,6 @@ constexpr std::uint32_t sepi = Img4FourCC('s', 'e', 'p', 'i');
 constexpr std::uint32_t eksp = Img4FourCC('e', 'k', 's', 'p');
 constexpr std::uint32_t brdI = Img4FourCC('b', 'r', 'd', 'I');
 const std::uint8_t octet = 0;
-
-Bytes bytesOf(const DERItem& item) {
-    return {item.data, item.data + item.length};
-}
-
-DERItem viewOf(const Bytes& bytes) {
-    return {bytes.data(), bytes.size()};
-}
 
 using Initialise = DERReturn (*)(const std::uint8_t*, std::uint64_t, Img4Record*);
 
@@ -124,7 +117,7 @@ struct FindCase {
 template <typename Key>
 void checkFinds(DERReturn (*find)(const DERItem*, Key, DERItem*), Key key, std::span<const FindCase> rows) {
     for (const FindCase& row : rows) {
-        const DERItem properties = viewOf(row.properties);
+        const DERItem properties = itemOf(row.properties);
         DERItem value = {&octet, 1};
         EXPECT_EQ(find(&properties, key, &value), row.expected) << row.name;
         EXPECT_EQ(bytesOf(value), row.expected == DERSuccess ? row.value : Bytes{octet}) << row.name;

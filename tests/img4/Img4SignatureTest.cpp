@@ -48,7 +48,7 @@ const Bytes message = filler(100);
 
 Bytes digestOfMessage(const Img4TrustProfile& profile) {
     Bytes digest(profile.digestInfo->length);
-    const DERItem view = viewOf(message);
+    const DERItem view = itemOf(message);
     EXPECT_EQ(Img4DecodeComputeDigest(&view, digest.data(), digest.size(), &profile), DERSuccess);
     return digest;
 }
@@ -57,7 +57,7 @@ using Verifier = decltype(verify_signature_rsa)*;
 
 bool accepts(Verifier verify, const Img4TrustProfile& profile, const Bytes& key, const Bytes& signature) {
     const Bytes digest = digestOfMessage(profile);
-    const DERItem keyView = viewOf(key), signatureView = viewOf(signature);
+    const DERItem keyView = itemOf(key), signatureView = itemOf(signature);
     const DERReturn result = verify(&keyView, &signatureView, digest.data(), digest.size(), &profile);
     EXPECT_TRUE(result == DERSuccess || result == Img4Failure) << result;
     return result == DERSuccess;
@@ -306,7 +306,7 @@ TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
     const Img4DigestInfo bare = {48, nullptr, nullptr};
     for (const auto& [verify, profile, signer] : rows) {
         const Bytes digest = digestOfMessage(profile), bits = publicKeyBits(signer), octets = sign(signer, 48, message);
-        const DERItem key = viewOf(bits), signature = viewOf(octets), none = {};
+        const DERItem key = itemOf(bits), signature = itemOf(octets), none = {};
         Img4TrustProfile withoutDigest = profile, withoutKeyAlgorithm = profile;
         withoutDigest.digestInfo = nullptr;
         withoutKeyAlgorithm.keyAlgorithmOid = nullptr;

@@ -13,10 +13,6 @@ namespace {
 using namespace img4maker;
 using namespace signedmanifest;
 
-Bytes bytesOf(const DERItem& item) {
-    return {item.data, item.data + item.length};
-}
-
 // A container with a payload, decoded.
 struct Decoded {
     Bytes bytes;
@@ -102,7 +98,7 @@ DERReturn findObject(const DERItem* manb, DERTag tag, DERTag valueType, Img4Prop
     EXPECT_EQ(manb->data, script.record->manb.data);
     EXPECT_EQ(tag, propertyTag("none"));
     EXPECT_EQ(valueType, DERTagSet);
-    property->value = viewOf(foundObject);
+    property->value = itemOf(foundObject);
     return script.step("object");
 }
 
@@ -312,7 +308,7 @@ TEST(Img4TrustSteps, endWhereTheDictionariesOrTheObjectAreMissing) {
             SCOPED_TRACE(name);
             Decoded decoded(manifest);
             Img4Record& record = decoded.record;
-            record.objp = viewOf(foundObject);
+            record.objp = itemOf(foundObject);
             script = {"", {}, &record, {}};
             EXPECT_EQ(byParts ? Img4DecodeEvaluateTrustWithCallbacks(object, &record, judge, verifyBoth,
                                                                      checkConstraints, hash, &script)
@@ -342,6 +338,7 @@ TEST(Img4TrustSteps, sayWhichPropertyIsNone) {
             DERDecodeError);
         EXPECT_EQ(refusal.refusal.subject, subject);
         EXPECT_EQ(refusal.refusal.fault, Img4FaultEncoding);
+        EXPECT_EQ(refusal.refusal.encoding.fault, DERFaultHeaderCutShort);
         EXPECT_EQ(refusal.refusal.tag, propertyTag("BCDE"));
     }
 }
@@ -436,7 +433,7 @@ TEST(Img4Trust, isInWhatTheKeysOfAProfileSignAndInNothingElse) {
         const Signer& signer = signerOf(entry);
         const Bytes chain = join(signer.standardChain());
         const Certificate demanding = signer.leaf({object("MANP", {property("ABCD", integer(8))})});
-        const DERItem view = viewOf(chain);
+        const DERItem view = itemOf(chain);
         expectEvaluation(DERSuccess, signer.manifest(standardManifest(), signer.standardChain()), entry.profile);
         expectEvaluation(Img4Failure, signer.manifest(standardManifest(), signer.chainWith(signer.issue(demanding))),
                          entry.profile);

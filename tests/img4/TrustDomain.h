@@ -2,6 +2,7 @@
 #ifndef VELTRA_TESTS_IMG4_TRUST_DOMAIN_H
 #define VELTRA_TESTS_IMG4_TRUST_DOMAIN_H
 
+#include "tests/der/Bytes.h"
 #include "tools/makers/SignedManifestMaker.h"
 
 #include <cstring>
@@ -34,10 +35,6 @@ inline std::vector<const Img4TrustProfileEntry*> kindsOfProfile() {
 
 inline bool isEC(const Img4TrustProfileEntry& entry) {
     return entry.profile->verifySignature == verify_signature_ecdsa;
-}
-
-inline DERItem viewOf(const img4maker::Bytes& bytes) {
-    return {bytes.data(), bytes.size()};
 }
 
 // `bytes` with bits of the last octet changed.
