@@ -184,7 +184,7 @@ const ProblemCase problemCases[] = {
     {"der", "the length of BIT STRING is never 0, at offset 2.", {0x03, 0x00}},
     {"der", "the length of OBJECT IDENTIFIER is never 0, at offset 2.", {0x06, 0x00}},
     {"der", "a component is not in its shortest form, at offset 3.", {0x06, 0x03, 0x2A, 0x80, 0x01}},
-    {"der", "the last component is cut short, at offset 3.", {0x06, 0x02, 0x2A, 0x86}},
+    {"der", "the last component is cut short, at offset 3.", {0x06, 0x02, 0xAA, 0x80}},
     {"der", "DER has OCTET STRING in primitive form only", {0x24, 0x02, 0x04, 0x00}},
     {"der", "DER has SEQUENCE in constructed form only", {0x10, 0x00}},
     {"der", "no universal type with the number 0", {0x00, 0x00}},
@@ -244,10 +244,14 @@ TEST(Show, saysWhatIsWrongAndWhere) {
 
 // The first fault is the problem.
 TEST(Show, showsWhatStandsAroundAFault) {
-    const PrintedReport report = show(sequence({integer(7), item(DERTagBoolean, {0x01}), {0x04, 0x80}}));
-    EXPECT_EQ(report.json["problemOffset"], 7);
-    EXPECT_TRUE(report.says("       2    2        1    INTEGER 7\n       5    2        1    BOOLEAN true  not DER: a "
-                            "BOOLEAN is 00 or FF, and this one is 01\n       8  not DER: the length is indefinite"));
+    const PrintedReport report =
+        show(sequence({item(DERTagInteger, {0x00, 0x07}), item(DERTagBoolean, {0x01}), {0x04, 0x80}}));
+    EXPECT_EQ(report.json["problemOffset"], 4);
+    EXPECT_TRUE(
+        report.says("       2    2        2    INTEGER 7  not DER: the number is not in its shortest form\n"
+                    "       6    2        1    BOOLEAN true  not DER: a BOOLEAN is 00 or FF, and this one is 01\n"
+                    "       9  not DER: the length is indefinite"))
+        << report.text;
     const PrintedReport behind = show(join({payload({}), {1, 2, 3}}));
     EXPECT_TRUE(behind.ok());
     EXPECT_TRUE(behind.says("followed by octets that belong to nothing, 3 of them, at offset "));

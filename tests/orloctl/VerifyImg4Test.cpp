@@ -28,7 +28,7 @@ Bytes soundManifest(const Img4TrustProfileEntry& profile) {
 }
 
 TrustDomain testDomain(const std::optional<std::string>& profile = std::nullopt) {
-    return readTrustDomain(TEST_TRUST_DOMAIN, profile);
+    return trustDomain(TEST_TRUST_DOMAIN, profile);
 }
 
 Report verify(const Bytes& bytes, const TrustDomain& domain = testDomain(), const std::string& object = "",

@@ -62,9 +62,9 @@ class Verify(unittest.TestCase):
                 self.assertEqual([{key: shown[key] for key in said[0]} for shown in found["chain"]], said)
                 roles = ["root", "intermediate", "leaf"] if len(said) == 3 else ["root", "leaf"]
                 self.assertEqual([shown["role"] for shown in found["chain"]], roles)
-                digests = found["digests"]
-                self.assertIn(digests["algorithm"].replace("SHA-", "Sha"), chain.name)
-                self.assertEqual(len(digests["body"]), {"SHA-1": 40, "SHA-256": 64, "SHA-384": 96}[digests["algorithm"]])
+                algorithm = found["digests"]["algorithm"]
+                self.assertIn(algorithm.replace("SHA-", "Sha"), chain.name)
+                self.assertEqual(len(found["digests"]["body"]), {"SHA-1": 40, "SHA-256": 64, "SHA-384": 96}[algorithm])
                 # A root that is built in has the name of the tests' root, and another key.
                 status, found = verify(manifest)
                 self.assertEqual((status, found["profile"]), (5, chain.name))

@@ -30,6 +30,10 @@ Report showImg4(const DERItem& file);
 // SysConfig3 library's log hook while it runs, so it must not run on two threads at once.
 Report showBcfg(const Value::Data& blob, const Value::Data& hmacKey);
 
+// The properties in the content of a SET or SEQUENCE, which `where` names in the words of a fault. A value that holds
+// properties itself is a dictionary too, to a depth that nobody exceeds. What is wrong goes into `findings` at once.
+Elements readProperties(const DERItem& content, const std::string& where, Findings& findings);
+
 // Whether the file is text around DER (RFC 7468), which is a fault.
 bool isPem(Findings& findings);
 

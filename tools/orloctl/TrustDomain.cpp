@@ -24,12 +24,6 @@ std::vector<const Img4TrustProfileEntry*> entriesNamed(const std::optional<std::
     return entries;
 }
 
-DomainProfile makeProfile(const Img4TrustProfileEntry& entry, const DERItem& root, const Img4TrustDomain& domain) {
-    DomainProfile profile = {&entry, {}};
-    Img4DecodeMakeDomainProfile(&entry, &root, &domain, &profile.made);
-    return profile;
-}
-
 // Reads the file of a domain, which keeps it, and the content of the one item with the tag `tag` that fills it.
 DERItem readItem(TrustDomain& domain, const std::string& path, DERTag tag, const char* what, DERItem* content) {
     domain.files.push_back(std::make_unique<const Value::Data>(readLocalFile(path)));
@@ -44,30 +38,27 @@ DERItem readItem(TrustDomain& domain, const std::string& path, DERTag tag, const
 
 } // namespace
 
-TrustDomain builtInTrustDomain(const std::optional<std::string>& profile) {
-    TrustDomain domain = {"built in", {}, {}};
-    for (const Img4TrustProfileEntry* entry : entriesNamed(profile))
-        domain.profiles.push_back(makeProfile(*entry, *entry->root, Img4BuiltInTrustDomain));
-    return domain;
-}
-
-TrustDomain readTrustDomain(const std::string& folder, const std::optional<std::string>& profile) {
-    TrustDomain domain = {folder, {}, {}};
-    Img4TrustDomain names = {};
+TrustDomain trustDomain(const std::optional<std::string>& folder, const std::optional<std::string>& profile) {
+    TrustDomain domain = {folder.value_or("built in"), {}, {}};
+    Img4TrustDomain names = Img4BuiltInTrustDomain;
     DERItem content;
     const auto entries = entriesNamed(profile);
-    names.authorityName =
-        readItem(domain, folder + "/authority-name.der", printableString, "PrintableString", &content);
-    readItem(domain, folder + "/manifest-cert-spec-oid.der", DERTagObjectIdentifier, "OBJECT IDENTIFIER",
-             &names.manifestCertSpecOid);
+    if (folder) {
+        names.authorityName =
+            readItem(domain, *folder + "/authority-name.der", printableString, "PrintableString", &content);
+        readItem(domain, *folder + "/manifest-cert-spec-oid.der", DERTagObjectIdentifier, "OBJECT IDENTIFIER",
+                 &names.manifestCertSpecOid);
+    }
     for (const Img4TrustProfileEntry* entry : entries) {
-        const std::string path = folder + "/" + entry->rootName + ".der";
+        const std::string path = domain.name + "/" + entry->rootName + ".der";
         std::error_code problem; // a root that is there and cannot be looked at is not passed over
-        if (profile || std::filesystem::exists(path, problem) || problem)
-            domain.profiles.push_back(
-                makeProfile(*entry, readItem(domain, path, DERTagSequence, "certificate", &content), names));
+        if (folder && !profile && !std::filesystem::exists(path, problem) && !problem)
+            continue;
+        const DERItem root = folder ? readItem(domain, path, DERTagSequence, "certificate", &content) : *entry->root;
+        domain.profiles.push_back({entry, {}});
+        Img4DecodeMakeDomainProfile(entry, &root, &names, &domain.profiles.back().made);
     }
     if (domain.profiles.empty())
-        throw UsageError(folder + " has no root of any profile");
+        throw UsageError(domain.name + " has no root of any profile");
     return domain;
 }

@@ -22,12 +22,9 @@ struct TrustDomain {
     std::vector<std::unique_ptr<const Value::Data>> files; // what the profiles view
 };
 
-// The built-in domain, with the one profile of that name, or with all of them without a name. Raises UsageError for a
-// name that no profile has.
-TrustDomain builtInTrustDomain(const std::optional<std::string>& profile);
-
-// The same for the domain in `folder`. Without a name it has the profiles whose roots are in the folder. Raises
-// UsageError when there is none, and when a file that is needed is missing, unreadable or not what its name says.
-TrustDomain readTrustDomain(const std::string& folder, const std::optional<std::string>& profile);
+// The domain in `folder`, or the built-in one without a folder, with the one profile of that name; without a name with
+// all of them, or those whose roots are in the folder. Raises UsageError for a name that no profile has, when there is
+// no root, and when a file that is needed is missing, unreadable or not what its name says.
+TrustDomain trustDomain(const std::optional<std::string>& folder, const std::optional<std::string>& profile);
 
 #endif

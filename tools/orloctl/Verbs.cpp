@@ -226,9 +226,7 @@ Report verify(const ServiceAddress&, const Words& words) {
     request.payloadDigest = codeOf("--payload-digest");
     if (request.payloadDigest && !request.object)
         throw UsageError("--payload-digest requires --object");
-    const auto folder = words.find("--trust-dir");
-    const auto profile = words.find("--profile");
-    const TrustDomain domain = folder ? readTrustDomain(*folder, profile) : builtInTrustDomain(profile);
+    const TrustDomain domain = trustDomain(words.find("--trust-dir"), words.find("--profile"));
     const Value::Data& file = readJudgedFile(words["FILE"]);
     return verifyImg4({file.data(), file.size()}, domain, request);
 }

@@ -5,7 +5,6 @@
 #include "tools/orloctl/CertificateText.h"
 #include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/DerText.h"
-#include "tools/orloctl/Img4Properties.h"
 #include "tools/orloctl/Img4Words.h"
 #include "tools/orloctl/LocalFiles.h"
 #include "tools/orloctl/ShowFile.h"
