@@ -1,5 +1,5 @@
-// flood ADDRESS CLIENTS CALLS COMMAND: sends CALLS requests in all from CLIENTS connections at once, each keeping many
-// in flight, and prints how many were completed. Exits with 0 when every one was.
+// flood ADDRESS CLIENTS CALLS COMMAND [MIB]: sends CALLS requests in all, of so many MiB, from CLIENTS connections at
+// once, each keeping many in flight, and prints how many were completed. Exits with 0 when every one was.
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
@@ -33,12 +33,12 @@ void check(int result) {
     std::exit(2);
 }
 
-void send(sd_bus* bus, const char* command, Flood& flood) {
+void send(sd_bus* bus, const char* command, const Value& filler, Flood& flood) {
     sd_bus_message* message = nullptr;
     check(sd_bus_message_new_method_call(bus, &message, "com.tevari.VeltraOrloServices",
                                          "/com/tevari/VeltraOrloServices", "com.tevari.VeltraPluginServer",
                                          "HandleMessage"));
-    bus::appendDictionary(message, {{"messageStr", command}});
+    bus::appendDictionary(message, {{"messageStr", command}, {"messageDict", filler}});
     check(sd_bus_call_async(bus, nullptr, message, onReply, &flood, UINT64_MAX));
     sd_bus_message_unref(message);
     ++flood.open;
@@ -47,10 +47,13 @@ void send(sd_bus* bus, const char* command, Flood& flood) {
 } // namespace
 
 int main(int count, char** arguments) {
-    if (count != 5)
+    if (count < 5)
         return 2;
     const int clients = std::atoi(arguments[2]);
     const int calls = std::atoi(arguments[3]);
+    Value filler;
+    if (count > 5)
+        filler = Value::Dictionary{{"filler", Value::Data(std::strtoul(arguments[5], nullptr, 10) << 20)}};
     Flood flood;
     check(sd_event_default(&flood.event));
     std::vector<sd_bus*> buses(static_cast<std::size_t>(clients));
@@ -59,7 +62,7 @@ int main(int count, char** arguments) {
         check(sd_bus_attach_event(bus, flood.event, SD_EVENT_PRIORITY_NORMAL));
     }
     for (int i = 0; i < calls; ++i)
-        send(buses[static_cast<std::size_t>(i % clients)], arguments[4], flood);
+        send(buses[static_cast<std::size_t>(i % clients)], arguments[4], filler, flood);
     check(sd_event_loop(flood.event));
     std::printf("%d completed, %d failed\n", flood.completed, flood.failed);
     for (sd_bus* bus : buses)

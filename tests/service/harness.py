@@ -15,6 +15,7 @@ import unittest
 SOURCE = pathlib.Path(__file__).resolve().parents[2]
 BIN = pathlib.Path(os.environ["VELTRA_BIN"])
 NAME = "com.tevari.VeltraOrloServices"
+PATH, INTERFACE = "/" + NAME.replace(".", "/"), "com.tevari.VeltraPluginServer"
 # The sanitizer keeps freed memory aside, which would hide what a test of memory looks for.
 HONEST_MEMORY = {"ASAN_OPTIONS": "detect_leaks=1:quarantine_size_mb=1:thread_local_quarantine_size_kb=64"}
 LOG = f"private/var/log/{NAME}.log"
@@ -40,9 +41,9 @@ def at_once(*works):
 
 
 class PrivateBus:
-    def __init__(self):
+    def __init__(self, configuration="--session"):
         self.daemon = subprocess.Popen(
-            ["dbus-daemon", "--session", "--nofork", "--print-address=1"], stdout=subprocess.PIPE,
+            ["dbus-daemon", configuration, "--nofork", "--print-address=1"], stdout=subprocess.PIPE,
             stderr=subprocess.DEVNULL, text=True,
         )
         self.address = self.daemon.stdout.readline().strip()
@@ -60,7 +61,11 @@ class Service:
     def __init__(self, root=None):
         self.owns_root = root is None
         self.root = root or self.make_root()
-        self.bus = PrivateBus()
+        self.begin(PrivateBus())
+
+    def begin(self, bus):
+        """Starts the service on this bus."""
+        self.bus = bus
         self.environment = {
             **os.environ,
             "VELTRA_DEVICE_ROOT": str(self.root),
@@ -146,11 +151,22 @@ class Service:
     def get(self, path="/tmp/out"):
         return self.answer("get-psd2", path)
 
+    def call(self, interface, method, *arguments):
+        """What busctl prints of a call."""
+        return self.run("busctl", "--user", "call", NAME, PATH, interface, method, *arguments,
+                        stderr=subprocess.STDOUT).stdout.strip()
+
     def busctl(self, *body):
-        return self.run(
-            "busctl", "--user", "call", NAME, "/" + NAME.replace(".", "/"), "com.tevari.VeltraPluginServer",
-            "HandleMessage", "a{sv}", *body, stderr=subprocess.STDOUT,
-        ).stdout.strip()
+        return self.call(INTERFACE, "HandleMessage", "a{sv}", *body)
+
+    def properties(self):
+        got, = json.loads(self.call("org.freedesktop.DBus.Properties", "GetAll", "s", INTERFACE, "--json=short"))["data"]
+        return {name: value["data"] for name, value in got.items()}
+
+    def await_property(self, name, value):
+        """Waits until the property has this value."""
+        while self.properties()[name] != value:
+            pass
 
     def log(self):
         path = self.root / LOG
@@ -193,3 +209,7 @@ class ServiceTest(Case):
     def setUp(self):
         self.service = self.closing(Service())
         self.root = self.service.root
+
+    def popen(self, program, *words, **options):
+        """Starts a program, of the build unless its name is a path, that talks to the service."""
+        return subprocess.Popen([BIN / program, *words], env=self.service.environment, **{"text": True, **options})

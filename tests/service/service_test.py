@@ -19,10 +19,6 @@ class ServiceTest(harness.ServiceTest):
         """Exit status of the request, which does not look at the result."""
         return self.service.orloctl("call", "setGlobalbCfg", f"bcfgDataPath={path}", *words)[0]
 
-    def start(self, *command, **options):
-        """Starts a program of the build that talks to the service."""
-        return subprocess.Popen([BIN / command[0], *command[1:]], env=self.service.environment, **options)
-
 
 class Frame(ServiceTest):
     def test_busctl_is_answered_as_orloctl_is(self):
@@ -79,21 +75,6 @@ class Survival(ServiceTest):
             held.append(kilobytes("VmRSS", self.service.pid))
         # Wide enough for what an allocator keeps; half a kilobyte lost at each request would be beyond it.
         self.assertLess(held[2] - held[0], 4 * 1024)
-
-    def test_clients_that_die_leave_the_service_serving_and_sigterm_ends_it_after_the_request_in_hand(self):
-        for goes_on in (True, False):
-            logged = self.service.log_size()
-            floods = [self.start("flood", self.service.bus.address, "2", "3000", "setGlobalbCfg", **QUIET)
-                      for _ in range(3)]
-            self.service.await_request(logged)
-            if not goes_on:
-                os.kill(self.service.pid, signal.SIGTERM)
-                self.assertEqual(self.service.wait_end(), 0)
-            for flood in floods:
-                flood.kill()
-                flood.wait()
-            self.assertEqual(self.set_bcfg("/blobs/every-kind.bin"), 0 if goes_on else 3)
-        self.assertTrue(self.service.log()[-1].endswith("Writting new data to file"), self.service.log()[-1])
 
     def test_a_start_that_cannot_serve_says_why_and_has_its_exit_status(self):
         for status, says, arguments, environment in (
@@ -159,7 +140,7 @@ class Client(ServiceTest):
             for words in (["check-entitlement"], ["show", "img4", self.root / "images/container.img4"], ["--help"]):
                 for form, output in itertools.product(([], ["--json"]), (closed, full, None)):
                     with self.subTest(words=words, form=form, output=output):
-                        lost = self.start("orloctl", *form, *words, stdout=output, stderr=subprocess.PIPE, text=True,
+                        lost = self.popen("orloctl", *form, *words, stdout=output, stderr=subprocess.PIPE,
                                           preexec_fn=None if output else lambda: os.close(1))
                         self.assertIn("Cannot write to standard output", lost.communicate()[1])
                         self.assertEqual(lost.returncode, 2)
@@ -195,8 +176,8 @@ class Client(ServiceTest):
         self.assertEqual(self.service.orloctl("set-bcfg", "/blobs/every-kind.bin", "-o", copy)[0], 0)
         self.assertEqual(copy.read_bytes(), self.service.read(RESULT))
         self.assertEqual(copy.stat().st_mode & 0o7777, 0o600)
-        output, errors = self.start("orloctl", "set-bcfg", "/blobs/holds-WCh0.bin", "-o", "-", stdout=subprocess.PIPE,
-                                    stderr=subprocess.PIPE).communicate()
+        output, errors = self.popen("orloctl", "set-bcfg", "/blobs/holds-WCh0.bin", "-o", "-", text=False,
+                                    stdout=subprocess.PIPE, stderr=subprocess.PIPE).communicate()
         self.assertEqual(output, self.service.read(RESULT))
         self.assertTrue(errors.startswith(b"response:\n  name: setGlobalbCfg\n  statusCode: 0\n"))
         (self.root / "link").symlink_to(copy)
@@ -225,7 +206,7 @@ class Client(ServiceTest):
         for blob in blobs:
             self.set_bcfg(blob)
             expected.append(self.service.read(RESULT))
-        clients = [self.start("orloctl", "set-bcfg", blobs[number % 2], "-o", self.root / f"copy{number}", **QUIET)
+        clients = [self.popen("orloctl", "set-bcfg", blobs[number % 2], "-o", self.root / f"copy{number}", **QUIET)
                    for number in range(20)]
         for number, client in enumerate(clients):
             self.assertEqual(client.wait(), 0)
@@ -241,8 +222,8 @@ class Client(ServiceTest):
                                        ("60", lambda client: client.send_signal(signal.SIGINT), "Interrupted"),
                                        ("60", lambda client: fcntl.flock(held, fcntl.LOCK_UN), None)):
                 with self.subTest(says):
-                    client = self.start("orloctl", "--json", "--timeout", seconds, *words, stdout=subprocess.PIPE,
-                                        stderr=subprocess.PIPE, text=True)
+                    client = self.popen("orloctl", "--json", "--timeout", seconds, *words, stdout=subprocess.PIPE,
+                                        stderr=subprocess.PIPE)
                     self.assertIn("waiting for another orloctl", client.stderr.readline())
                     end(client)
                     output, _ = client.communicate()
