@@ -59,12 +59,10 @@ Key readKey(const Value& path) {
 // does not sign.
 std::optional<Value::Data> sign(EVP_PKEY* key, const Value::Data& challenge) {
     const DigestContext context(EVP_MD_CTX_new());
-    std::size_t length = 0;
+    Value::Data signature(static_cast<std::size_t>(EVP_PKEY_get_size(key))); // of the longest
+    std::size_t length = signature.size();
     if (!context || EVP_DigestSignInit_ex(context.get(), nullptr, nullptr, nullptr, nullptr, key, nullptr) != 1 ||
-        EVP_DigestSign(context.get(), nullptr, &length, challenge.data(), challenge.size()) != 1)
-        return std::nullopt;
-    Value::Data signature(length);
-    if (EVP_DigestSign(context.get(), signature.data(), &length, challenge.data(), challenge.size()) != 1)
+        EVP_DigestSign(context.get(), signature.data(), &length, challenge.data(), challenge.size()) != 1)
         return std::nullopt;
     signature.resize(length);
     return signature;
