@@ -90,7 +90,8 @@ class Waiting(ServiceTest):
         self.connection = self.closing(server.accept()[0])
 
     def start(self, *words, **options):
-        client = subprocess.Popen([BIN / "orloctl", *words], env=self.service.environment, **options)
+        client = subprocess.Popen([BIN / "orloctl", *words], env=self.service.environment, stdout=subprocess.DEVNULL,
+                                  **options)
         self.addCleanup(client.wait)
         return client
 
