@@ -218,7 +218,7 @@ const ProblemCase problemCases[] = {
     {"img4", "has a content that holds an item behind", holding(sequence({ia5("test"), integer(1), integer(2)}))},
     {"img4", "goes on behind the SEQUENCE of name and", holding(join({sequence({ia5("test"), integer(1)}), {0}}))},
     {"img4", "\"the rest\" of the restore information is no strict DER: the header", inRestoreInfo({0x30})},
-    {"img4", "\"tes2\" of \"test\" has a value that is", withValue(set({property("tes2", item(0x01, {2}))}))},
+    {"img4", "\"tes2\" of \"test\" has a value that is", withValue(sequence({property("tes2", item(0x01, {2}))}))},
     {"img4", "is no non-negative INTEGER in its shortest form", withValue(item(DERTagInteger, {0x80}))},
     {"img4", "does not fit 64 bits", withValue(item(DERTagInteger, filler(9, 1)))},
 
@@ -268,7 +268,9 @@ TEST(Show, boundsDepthAndNumberForPeople) {
     }
     EXPECT_TRUE(show(nested).ok());
     EXPECT_NE(show(sequence({nested})).problem.find("deeper than 64 levels"), std::string::npos);
-    EXPECT_TRUE(show(inRestoreInfo(properties)).ok());
+    const PrintedReport deep = show(inRestoreInfo(properties));
+    EXPECT_TRUE(deep.ok());
+    EXPECT_TRUE(deep.says("\n" + std::string(4 + 2 * 8, ' ') + "test  SET, ")) << "whole at the eighth level";
 
     for (int i = 0; i < 10002; ++i)
         items.insert(items.end(), {0x05, 0x00});
