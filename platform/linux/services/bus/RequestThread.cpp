@@ -25,14 +25,16 @@ void RequestThread::end() {
     {
         const std::lock_guard lock(mutex_);
         isOver_ = true;
-        changed_.notify_all();
     }
+    changed_.notify_all();
     thread_.join();
 }
 
 void RequestThread::serve(HSMessageRequest request, bool wantsMessages) {
-    const std::lock_guard lock(mutex_);
-    next_.emplace(Request{std::move(request), wantsMessages});
+    {
+        const std::lock_guard lock(mutex_);
+        next_.emplace(Request{std::move(request), wantsMessages});
+    }
     changed_.notify_all();
 }
 
@@ -60,6 +62,7 @@ void RequestThread::take(RequestReceiver& receiver) {
     }
     refusal_ = refusal;
     ending_ = nullptr;
+    lock.unlock();
     changed_.notify_all();
 }
 
@@ -110,7 +113,9 @@ void RequestThread::serveOne(const HSMessageRequest& request) {
 void RequestThread::complete(const RequestEnding& ending) {
     std::unique_lock lock(mutex_);
     ending_ = &ending;
+    lock.unlock(); // the thread of the bus, which wakes up at once, is not to wait for it
     wake();
+    lock.lock();
     changed_.wait(lock, [this] { return !ending_; });
     if (refusal_)
         std::rethrow_exception(std::exchange(refusal_, {}));

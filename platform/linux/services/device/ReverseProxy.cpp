@@ -17,7 +17,8 @@ public:
     // An event whose status is missing or fits no 32 bits is left out.
     void resume() try {
         constexpr std::int64_t longest = 3'600'000;
-        const Value events = std::exchange(events_, {});
+        const Value events = std::move(events_);
+        events_ = Value();
         const auto start = DelayedCalls::Clock::now();
         auto due = start;
         for (const Value& event : events.array() ? *events.array() : Value::Array()) {
