@@ -225,7 +225,7 @@ struct Message {
     std::string text;
 
     nlohmann::ordered_json json() const { return {{"level", level}, {"source", source}, {"text", text}}; }
-    std::string line() const { return source + ": " + text; }
+    std::string line() const { return source + ": " + text.substr(0, text.find_last_not_of('\n') + 1); }
 };
 
 // Errors that tell of no failure.
