@@ -289,6 +289,7 @@ TEST(Show, boundsDepthAndNumberForPeople) {
     EXPECT_EQ(report.json["payload"].size(), 1005U);
     EXPECT_EQ(report.json["payload"].back()["data"].get<std::string>().size(), 200U);
     EXPECT_EQ(report.json["messages"].size(), 100U);
+    EXPECT_EQ(report.json["messages"][0], "either data or string must be non-null");
     EXPECT_GE(report.json["messagesLeftOut"], 50);
     EXPECT_TRUE(report.says("  ... and 5 more\n"));
     EXPECT_TRUE(report.says("\noctetsBehind: 3\n"));
