@@ -147,9 +147,9 @@ inline std::string manifestOf(const sysconfig::SysConfig3Ptr& object) {
     for (const auto get :
          {sysConfig3ManifestGetPayloadHMAC, sysConfig3ManifestGetMetadataHMAC, sysConfig3ManifestGetFullHMAC}) {
         SysConfigData hmac = {};
-        get(sysConfig3GetManifest(object.get()), &hmac);
+        const bool isAnswered = get(sysConfig3GetManifest(object.get()), &hmac);
         list += list.empty() ? "" : " | ";
-        list += hmac.data == nullptr ? "absent" : hexOf(hmac.data, hmac.length);
+        list += !isAnswered ? "none" : hmac.data == nullptr ? "absent" : hexOf(hmac.data, hmac.length);
     }
     return list;
 }

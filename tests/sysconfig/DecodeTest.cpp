@@ -56,6 +56,9 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
     sixElements.insert(sixElements.end(), {0x05, 0x00});
     Bytes set = smallest;
     set[0] = 0x31;
+    const auto firstOctets = [](long count) {
+        return item("30", {smallest.begin() + 2, smallest.begin() + 2 + count});
+    };
     const auto magic = [](const char* octets) { return BlobParts{.magic = bytes(octets)}.whole(); };
     const auto version = [](const char* octets) { return BlobParts{.version = bytes(octets)}.whole(); };
     const auto payload = [](const Bytes& content) { return BlobParts{.payload = content}.whole(); };
@@ -65,6 +68,9 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         {"a sixth element", sixElements, SysConfig3SubjectBlob, 50, DERFaultExcess, ""},
         {"a SET around", set, SysConfig3SubjectBlob, 0, DERFaultNoSequence, ""},
         {"no element", item("30", {}), SysConfig3SubjectMagic, 2, DERFaultMissing, ""},
+        {"no payload element", firstOctets(12), SysConfig3SubjectPayload, 14, DERFaultMissing, ""},
+        {"no metadata element", firstOctets(21), SysConfig3SubjectMetadata, 23, DERFaultMissing, ""},
+        {"no manifest element", firstOctets(30), SysConfig3SubjectManifest, 32, DERFaultMissing, ""},
         {"another version element", item("30", bytes("02 01 00 04 00")), SysConfig3SubjectVersion, 5, DERFaultTag, ""},
         {"another magic", magic("67 66 43 00"), SysConfig3SubjectMagic, 4, DERFaultNone,
          "Sysconfig magic 0x%X<436667> is not valid"},
