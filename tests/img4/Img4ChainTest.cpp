@@ -1,3 +1,4 @@
+#include "der/DERDecode.h"
 #include "tests/img4/TrustDomain.h"
 #include "tests/support/MissingArguments.h"
 
@@ -16,7 +17,7 @@ using namespace signedmanifest;
 
 constexpr std::size_t largestCertificate = 131071;
 
-// What chain verification said: through the profile and through a domain profile made of it, which tells why.
+// What the profile said of a chain, and why it is refused.
 struct Verdict {
     DERReturn status;
     Img4ChainRefusal refusal;
@@ -24,18 +25,36 @@ struct Verdict {
     DERItem certProperties;
 };
 
+// Where the certificate of that number begins. The root, which is the first, is not in the chain.
+const std::uint8_t* startOf(const DERItem& chain, std::uint32_t certificate) {
+    DERSequence rest;
+    DERDecodedInfo item;
+    DERDecodeSeqContentInit(&chain, &rest);
+    for (std::uint32_t i = 1; i < certificate; ++i)
+        DERDecodeSeqNext(&rest, &item);
+    return rest.next;
+}
+
 Verdict verify(const Img4TrustProfileEntry& entry, const Bytes& chain) {
+    const Img4TrustCallbacks callbacks = {[](auto...) { return DERSuccess; }, nullptr, nullptr};
     const DERItem view = itemOf(chain);
-    Verdict verdict = {};
-    Img4DomainProfile domainProfile;
-    EXPECT_EQ(Img4DecodeMakeDomainProfile(&entry, entry.root, &Img4BuiltInTrustDomain, &domainProfile), DERSuccess);
-    domainProfile.refusal = &verdict.refusal;
-    const DERReturn withReason =
-        domainProfile.profile.verifyChain(&view, &verdict.leafKey, &verdict.certProperties, &domainProfile.profile);
     const std::uint8_t stale = 0;
-    verdict.leafKey = verdict.certProperties = {&stale, 1};
+    Img4Record record = {};
+    Img4TrustRefusal why;
+    record.manifestRaw = {&stale, 1};
+    record.manifest.certChain = view;
+    Img4DecodePerformTrustEvaluationExplained(nullptr, &record, &callbacks, entry.profile, nullptr, &why);
+    Verdict verdict = {DERSuccess, why.chain, {&stale, 1}, {&stale, 1}};
     verdict.status = entry.profile->verifyChain(&view, &verdict.leafKey, &verdict.certProperties, entry.profile);
-    EXPECT_EQ(verdict.status, withReason);
+    EXPECT_EQ(verdict.status == DERSuccess, why.chain.fault == Img4ChainSound);
+    EXPECT_EQ(why.signature.fault != Img4SignatureSound, why.chain.fault == Img4ChainSignature);
+    if (why.chain.fault != Img4ChainSound) {
+        const DERRefusal& encoding = why.refusal.encoding;
+        const std::uint8_t* const start = startOf(view, why.chain.certificate);
+        EXPECT_EQ(why.refusal.subject, Img4SubjectChain);
+        EXPECT_EQ(encoding.fault == DERFaultNone ? why.refusal.place : encoding.item, start);
+        EXPECT_EQ(encoding.fault == DERFaultNone ? start : encoding.place, why.refusal.place);
+    }
     return verdict;
 }
 
@@ -156,7 +175,7 @@ TEST(Img4Chain, leavesAreJudgedByTheirFields) {
             const bool isSound = row.fault == Img4ChainSound;
             EXPECT_EQ(verdict.status, isSound ? DERSuccess : Img4Failure);
             EXPECT_EQ(verdict.refusal.fault, row.fault);
-            EXPECT_EQ(verdict.refusal.certificate, entry->chainLength - 1);
+            EXPECT_EQ(verdict.refusal.certificate, isSound ? 0 : entry->chainLength - 1);
             const Bytes key = bytesOf(verdict.leafKey);
             const Bytes info = bitString(key);
             EXPECT_EQ(!key.empty() && std::equal(info.rbegin(), info.rend() - 4, leaf.publicKeyInfo.rbegin()), isSound);
@@ -232,7 +251,8 @@ TEST(Img4Chain, holdsTogetherOrIsRefused) {
             const Verdict verdict = verify(*entry, row.chain);
             EXPECT_EQ(verdict.status, row.fault == Img4ChainSound ? DERSuccess : Img4Failure);
             EXPECT_EQ(verdict.refusal.fault, row.fault);
-            EXPECT_EQ(verdict.refusal.certificate, entry->chainLength - row.certificate);
+            EXPECT_EQ(verdict.refusal.certificate,
+                      row.fault == Img4ChainSound ? 0 : entry->chainLength - row.certificate);
             EXPECT_EQ(verdict.leafKey.data != nullptr, row.fault == Img4ChainSound);
         }
     }
@@ -285,7 +305,7 @@ TEST(Img4Chain, middleCertificateOfTheRSAChainBelongsToTheAuthority) {
             const Verdict verdict = verify(*entry, join({issued, signer.issue(leaf)}));
             const Img4ChainFault fault = isEC(*entry) ? row.ofEC : row.ofRSA;
             EXPECT_EQ(verdict.refusal.fault, fault);
-            EXPECT_EQ(verdict.refusal.certificate, fault == Img4ChainSound || row.keyChange != 0 ? 2U : 1U);
+            EXPECT_EQ(verdict.refusal.certificate, fault == Img4ChainSound ? 0U : row.keyChange != 0 ? 2U : 1U);
             EXPECT_EQ(verdict.status, fault == Img4ChainSound ? DERSuccess : Img4Failure);
         }
     }
@@ -311,6 +331,14 @@ TEST(Img4Chain, endsInTheRootOfADomainGivenAtRunTime) {
     ASSERT_EQ(Img4DecodeMakeDomainProfile(&first, first.root, &otherDomain, &made), DERSuccess);
     EXPECT_EQ(made.profile.verifyChain(&view, &leafKey, &certProperties, &made.profile), DERSuccess);
     EXPECT_EQ(certProperties.data, nullptr) << "constraints under another object identifier";
+
+    Certificate leaf = signerOf(first).leaf();
+    leaf.digestLength = made.profile.digestInfo->length + 16;
+    const Bytes longChain = signerOf(first).issue(leaf);
+    const DERItem longView = itemOf(longChain);
+    made.profile.digestInfo = &kQDSupportDigestInfoSha512;
+    EXPECT_EQ(made.profile.verifyChain(&longView, &leafKey, &certProperties, &made.profile), DERSuccess)
+        << "the longest digest there is";
 
     const DERItem none = {};
     ASSERT_EQ(Img4DecodeMakeDomainProfile(&first, &none, &Img4BuiltInTrustDomain, &made), DERSuccess);

@@ -182,6 +182,10 @@ Bytes manifestWith(std::uint64_t version, const List& manb, const char* name = "
                      sequence({})});
 }
 
+DERReturn findDictionaries(const Img4Record* record, DERItem* manb, DERItem* manp) {
+    return Img4DecodeFindDictionariesExplained(record, manb, manp, nullptr);
+}
+
 TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
     const Bytes manp = object("MANP", {property("brdI", integer(12))});
     const Bytes sep = object("sepi", {property("eksp", boolean(true))});
@@ -211,6 +215,11 @@ TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
         EXPECT_EQ(entitled, ofObject == DERSuccess) << name;
         EXPECT_EQ(Img4DecodeGetIntegerFromSection(&record, Img4SectionManifest, brdI, &board), ofSection) << name;
         EXPECT_EQ(board, ofSection == DERSuccess ? 12U : 0U) << name;
+        DERItem body, own;
+        Img4Refusal refusal;
+        EXPECT_EQ(Img4DecodeFindDictionariesExplained(&record, &body, &own, &refusal), ofSection) << name;
+        EXPECT_EQ(refusal.status, ofSection) << name;
+        expectNeedsAll(DERParamError, findDictionaries, &record, &body, &own);
     }
     const Bytes bare = unsignedManifest({.objects = {sep}});
     const Img4Record record = recordOf(Img4DecodeInitUnsignedManifest, bare);
