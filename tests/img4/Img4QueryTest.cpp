@@ -289,8 +289,8 @@ TEST(Img4Queries, needTheirArguments) {
                Img4DecodeManifestExists, Img4DecodePayloadCompressionInfoExists, Img4DecodePayloadPropertiesExists,
                Img4DecodeRestoreInfoExists, Img4DecodeGetPayload, Img4DecodeGetPayloadVersion,
                Img4DecodeGetPayloadKeybag, Img4DecodeGetPayloadProperties, Img4DecodeGetPayloadType);
-    expectNeed(DERParamError, std::tuple(&record, 0), Img4DecodePayloadPropertyExistsByTag, Img4DecodeSectionExists);
-    expectNeed(DERParamError, std::tuple(&record.payloadRaw, 0), Img4DecodePayloadPropertiesFindItemWithTag,
+    expectNeed(DERParamError, std::tuple(&record, 0U), Img4DecodePayloadPropertyExistsByTag, Img4DecodeSectionExists);
+    expectNeed(DERParamError, std::tuple(&record.payloadRaw, 0U), Img4DecodePayloadPropertiesFindItemWithTag,
                Img4DecodeGetPayloadVersionPropertyString);
     expectNeedsAll(DERParamError, Img4DecodeGetPayloadCompressionInfo, &record, &number, &number);
 }
