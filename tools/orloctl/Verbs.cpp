@@ -22,19 +22,22 @@
 
 namespace {
 
+std::string placeOf(const std::string& path, const Value::Data& contents) {
+    return path + ", " + std::to_string(contents.size()) + " bytes";
+}
+
 // Copies a result to the file that -o names, if any. A copy that fails does not take the answer along.
 void copyResult(Report& report, const Words& words, const Value::Data& result) {
+    const auto path = words.find("--output");
+    if (!path)
+        return;
     try {
-        if (const auto path = words.find("--output"))
-            writeLocalFile(*path, result);
+        writeLocalFile(*path, result);
+        report.json["result"] = placeOf(*path, result);
     } catch (const UsageError& failure) {
         report.note = failure.what();
         report.fail("The request was carried out, but its result was not copied.", Outcome::Usage);
     }
-}
-
-std::string placeOf(const std::string& path, const Value::Data& contents) {
-    return path + ", " + std::to_string(contents.size()) + " bytes";
 }
 
 // A request with no arguments, or the operand under a key.
@@ -81,8 +84,6 @@ Report getTcrt(const ServiceAddress& address, const Words& words) {
     }
     const Value::Data certificate = hexString2Binary(*text);
     copyResult(report, words, certificate);
-    if (const auto path = words.find("--output"))
-        report.json["result"] = placeOf(*path, certificate);
     if (report.note.empty() && response["response"]["CertSerialNumber"] == Value("DummyCertificateSerialNumber"))
         report.note = "the serial number cannot be read: the hardware registry holds no certificate but other bytes";
     return std::move(report);
@@ -115,15 +116,12 @@ Report getPsd2(const ServiceAddress& address, const Words& words) {
     Report report = sendRequest(address, "getPSD2", {{"psd2V4DataPath", passed.path()}}).report;
     if (!report.ok())
         return report;
-    const std::optional<Value::Data> record = passed.read();
-    if (record) {
+    if (const std::optional<Value::Data> record = passed.read())
         copyResult(report, words, *record);
-        report.json["result"] = placeOf(words["--output"], *record);
-    } else {
+    else
         report.fail("The record is not below the device root " + deviceRootPath() +
-                        ": the service has another (orloctl status)",
+                        ", so that the service has to have another (orloctl status).",
                     Outcome::Failure);
-    }
     return report;
 }
 
