@@ -2,13 +2,9 @@
 
 #include <filesystem>
 
-#include "tools/orloctl/CertificateText.h"
-#include "tools/orloctl/DerItems.h"
 #include "tools/orloctl/LocalFiles.h"
 
 namespace {
-
-constexpr DERTag printableString = 19;
 
 std::vector<const Img4TrustProfileEntry*> entriesNamed(const std::optional<std::string>& profile) {
     std::vector<const Img4TrustProfileEntry*> entries;
@@ -24,41 +20,31 @@ std::vector<const Img4TrustProfileEntry*> entriesNamed(const std::optional<std::
     return entries;
 }
 
-// Reads the file of a domain, which keeps it, and the content of the one item with the tag `tag` that fills it.
-DERItem readItem(TrustDomain& domain, const std::string& path, DERTag tag, const char* what, DERItem* content) {
+// Reads a file for a domain, which keeps it and has the folder's name.
+DERReturn readFile(const char* name, bool mayBeMissing, DERItem* contents, void* context) {
+    TrustDomain& domain = *static_cast<TrustDomain*>(context);
+    const std::string path = domain.name + "/" + name;
+    std::error_code problem; // a root that is there and cannot be looked at is not passed over
+    if (mayBeMissing && !std::filesystem::exists(path, problem) && !problem)
+        return DEREndOfSequence;
     domain.files.push_back(std::make_unique<const Value::Data>(readLocalFile(path)));
-    const DERItem file = {domain.files.back()->data(), domain.files.back()->size()};
-    DerItems items(file);
-    if (!items.next() || items.item().tag != tag || items.encoding().length != file.length ||
-        (tag == DERTagSequence && !readCertificate(file)))
-        throw UsageError(path + " is not one " + what + " in DER");
-    *content = items.item().content;
-    return file;
+    *contents = {domain.files.back()->data(), domain.files.back()->size()};
+    return DERSuccess;
 }
 
 } // namespace
 
 TrustDomain trustDomain(const std::optional<std::string>& folder, const std::optional<std::string>& profile) {
     TrustDomain domain = {folder.value_or("built in"), {}, {}};
-    Img4TrustDomain names = Img4BuiltInTrustDomain;
-    DERItem content;
-    const auto entries = entriesNamed(profile);
-    if (folder) {
-        names.authorityName =
-            readItem(domain, *folder + "/authority-name.der", printableString, "PrintableString", &content);
-        readItem(domain, *folder + "/manifest-cert-spec-oid.der", DERTagObjectIdentifier, "OBJECT IDENTIFIER",
-                 &names.manifestCertSpecOid);
-    }
-    for (const Img4TrustProfileEntry* entry : entries) {
-        const std::string path = domain.name + "/" + entry->rootName + ".der";
-        std::error_code problem; // a root that is there and cannot be looked at is not passed over
-        if (folder && !profile && !std::filesystem::exists(path, problem) && !problem)
-            continue;
-        const DERItem root = folder ? readItem(domain, path, DERTagSequence, "certificate", &content) : *entry->root;
-        domain.profiles.push_back({entry, {}});
-        Img4DecodeMakeDomainProfile(entry, &root, &names, &domain.profiles.back().made);
-    }
-    if (domain.profiles.empty())
+    Img4DomainFile file;
+    std::uint16_t count = 0;
+    domain.profiles.resize(entriesNamed(profile).size());
+    const DERReturn status = Img4ReadDomainFolder(profile ? profile->c_str() : nullptr, folder ? readFile : nullptr,
+                                                  &domain, domain.profiles.data(), &count, &file);
+    if (status == DEREndOfSequence)
         throw UsageError(domain.name + " has no root of any profile");
+    if (status != DERSuccess)
+        throw UsageError(domain.name + "/" + file.name + " is not one " + file.kind + " in DER");
+    domain.profiles.resize(count);
     return domain;
 }

@@ -7,14 +7,11 @@
 #include <string>
 #include <vector>
 
-#include "img4/Img4Trust.h"
+#include "img4/Img4DomainFolder.h"
 #include "platform/Value.h"
 
 // A trust profile with the root of one domain.
-struct DomainProfile {
-    const Img4TrustProfileEntry* entry;
-    Img4DomainProfile made;
-};
+using DomainProfile = Img4FolderProfile;
 
 struct TrustDomain {
     std::string name; // "built in", or the folder
