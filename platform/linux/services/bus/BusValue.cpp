@@ -113,6 +113,7 @@ private:
         const std::string type = contents ? contents : "";
         if (!isValueType(type))
             refuse("has the D-Bus type \"" + type + "\", which a request cannot carry");
+        octets_ += type.size();
         check(sd_bus_message_enter_container(message_, SD_BUS_TYPE_VARIANT, type.c_str()));
         Value content = value(type);
         check(sd_bus_message_exit_container(message_));
@@ -187,7 +188,7 @@ private:
     std::vector<std::string> path_;
     int nesting_ = 0;
     std::size_t values_ = 0;
-    std::size_t octets_ = 0; // of texts and data
+    std::size_t octets_ = 0; // of texts, data and types
 };
 
 const char* signatureOf(const Value& value) {

@@ -151,11 +151,13 @@ public:
             return refuseAtStop(message);
         if (!inHand_)
             return serve(message, std::move(request));
-        std::size_t& octetsOfSender = octetsOfSenders_[sd_bus_message_get_sender(message)];
+        const std::string sender = sd_bus_message_get_sender(message);
+        const auto held = octetsOfSenders_.find(sender);
         if (request.octets > maximumWaiting - waitingOctets_ ||
-            request.octets > maximumWaitingOfSender - octetsOfSender)
+            request.octets > maximumWaitingOfSender - (held == octetsOfSenders_.end() ? 0 : held->second))
             return sd_bus_reply_method_errorf(message, SD_BUS_ERROR_LIMITS_EXCEEDED,
                                               "The requests that wait hold too much already.");
+        std::size_t& octetsOfSender = octetsOfSenders_[sender];
         waiting_.push_back({referenceTo(message), request.octets});
         octetsOfSender += request.octets;
         waitingOctets_ += request.octets;
@@ -166,8 +168,7 @@ public:
 
     // Drops what waits for a reply that nobody can get, since its sender has left the bus.
     void dropOf(const std::string& sender) {
-        const auto octets = octetsOfSenders_.find(sender);
-        if (octets == octetsOfSenders_.end())
+        if (!octetsOfSenders_.contains(sender))
             return;
         std::erase_if(waiting_, [&](const Waiting& request) {
             if (sd_bus_message_get_sender(request.message.get()) != sender ||
@@ -176,15 +177,13 @@ public:
             release(request);
             return true;
         });
-        if (octets->second == 0)
-            octetsOfSenders_.erase(octets);
     }
 
     // Refuses what waits and what comes, and ends the loop once the request in hand has been served.
     void stop() {
         isStopping_ = true;
-        for (const Waiting& request : std::exchange(waiting_, {}))
-            refuseAtStop(request.message.get());
+        for (; !waiting_.empty(); waiting_.pop_front())
+            refuseAtStop(waiting_.front().message.get());
         if (!inHand_)
             sd_event_exit(event_, EXIT_SUCCESS);
     }
@@ -274,7 +273,10 @@ private:
 
     void release(const Waiting& request) {
         waitingOctets_ -= request.octets;
-        octetsOfSenders_[sd_bus_message_get_sender(request.message.get())] -= request.octets;
+        const auto octets = octetsOfSenders_.find(sd_bus_message_get_sender(request.message.get()));
+        octets->second -= request.octets;
+        if (octets->second == 0)
+            octetsOfSenders_.erase(octets);
     }
 
     sd_event* const event_;
@@ -288,7 +290,7 @@ private:
 
     std::deque<Waiting> waiting_;
     std::size_t waitingOctets_ = 0;
-    std::map<std::string, std::size_t> octetsOfSenders_; // until they leave
+    std::map<std::string, std::size_t> octetsOfSenders_; // of those that have any
 
     RequestThread thread_;
 };
@@ -365,8 +367,8 @@ constexpr const char* departures =
     "type='signal',sender='org.freedesktop.DBus',path='/org/freedesktop/DBus',interface='org.freedesktop.DBus',"
     "member='NameOwnerChanged',arg2=''";
 
-// From here on SIGTERM and SIGINT arrive through the event loop. The mask is inherited by every thread that is made
-// later.
+// From here on SIGTERM and SIGINT arrive through the event loop, before whatever else has come: no request begins after
+// one. The mask is inherited by every thread that is made later.
 int watchSignals(Host& host) {
     sigset_t signals;
     sigemptyset(&signals);
@@ -374,9 +376,17 @@ int watchSignals(Host& host) {
     sigaddset(&signals, SIGINT);
     if (pthread_sigmask(SIG_BLOCK, &signals, nullptr) != 0)
         return -errno;
-    for (const int signal : {SIGTERM, SIGINT})
-        if (const int result = sd_event_add_signal(host.event, nullptr, signal, onStop, &host); result < 0)
+    for (const int signal : {SIGTERM, SIGINT}) {
+        sd_event_source* source = nullptr;
+        int result = sd_event_add_signal(host.event, &source, signal, onStop, &host);
+        if (result >= 0)
+            result = sd_event_source_set_priority(source, SD_EVENT_PRIORITY_IMPORTANT);
+        if (result >= 0)
+            result = sd_event_source_set_floating(source, 1);
+        sd_event_source_unref(source);
+        if (result < 0)
             return result;
+    }
     return 0;
 }
 

@@ -82,11 +82,14 @@ LastOpening& lastOpening() {
     return *last;
 }
 
-void noteOpening(const Value& store, std::string outcome) {
+// Leaves an older note where memory does not suffice for the new one.
+void noteOpening(const Value& store, const char* outcome, const char* reason = "") noexcept try {
     LastOpening& last = lastOpening();
     const std::lock_guard lock(last.mutex);
     last.backend = backendName(store["backend"]);
-    last.outcome = std::move(outcome);
+    last.outcome = std::string(outcome) + reason;
+} catch (const std::exception&) {
+    return;
 }
 
 std::unique_ptr<OrloStoreBackend> openDescribedBackend() {
@@ -96,7 +99,7 @@ std::unique_ptr<OrloStoreBackend> openDescribedBackend() {
         noteOpening(store, "opened");
         return backend;
     } catch (const std::exception& failure) {
-        noteOpening(store, std::string("could not be opened: ") + failure.what());
+        noteOpening(store, "could not be opened: ", failure.what());
         throw;
     }
 }
