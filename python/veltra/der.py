@@ -75,7 +75,10 @@ class Buffer:
         self.address = int(ffi.cast("uintptr_t", self.start))
 
     def item(self, start: int = 0, end: int | None = None) -> Any:
-        return ffi.new("DERItem *", (self.start + start, (len(self.view) if end is None else end) - start))
+        end = len(self.view) if end is None else end
+        if not 0 <= start <= end <= len(self.view):
+            raise IndexError("the buffer has no such octets")
+        return ffi.new("DERItem *", (self.start + start, end - start))
 
     def offset(self, pointer: Any) -> int | None:
         offset = int(ffi.cast("uintptr_t", pointer)) - self.address
@@ -157,6 +160,7 @@ class Item:
 
 def decode_range(buffer: Buffer, start: int, end: int) -> Iterator[Item]:
     """The items from one offset of a buffer to another."""
+    buffer.item(start, end)
     most = 4
     count = ffi.new("uint16_t *")
     refusal = ffi.new("DERRefusal *")

@@ -118,6 +118,7 @@ class Der(unittest.TestCase):
             (OverflowError, lambda: der.fill(b"\x30\0", rows * 65536)),
             (TypeError, lambda: der.fill(b"\x30\0", [Row("n", "tag")])),
             (TypeError, lambda: der.encode_sequence(rows, {"n": 5})),
+            (IndexError, lambda: der.Item(der.Buffer(b""), der.INTEGER, 0, 0, 1 << 62).integer()),
         ):
             with self.subTest(str(call.__code__.co_firstlineno)), self.assertRaises(error):
                 call()
