@@ -133,7 +133,14 @@ TEST(AllocationFailure, isReportedAndLeavesEverythingAsItWas) {
                          "_sysConfig3AddPayloadEntry: malloc failed."};
     const Row rows[] = {
         // The object, two manifests of three HMACs, sixteen entries and two indexes.
-        {"decode", 0x30003, 1 + 2 * 4 + 16 + 2, [&](const SysConfig3Ptr&) { return decode(blob) != nullptr; }},
+        {"decode", 0x30003, 1 + 2 * 4 + 16 + 2,
+         [&](const SysConfig3Ptr&) {
+             SysConfig3Refusal why;
+             const SysConfig3Ptr decoded(
+                 decodeSysConfig3Explained(blob.data(), static_cast<std::uint32_t>(blob.size()), &why));
+             EXPECT_EQ(why.status, decoded != nullptr ? DERSuccess : DERBufferOverflow);
+             return decoded != nullptr;
+         }},
         {"new payload entry", 0x30003, 2, adding(payload), ofAdd},
         {"payload entry of a present key", 0x30003, 2, adding(presentPayload), ofAdd},
         {"new metadata entry", 0x30003, 2, adding(metadata)},
