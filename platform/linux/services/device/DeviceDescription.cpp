@@ -20,17 +20,6 @@ void report(const std::string& what) {
     systemLogWrite(getLogHandle(1), SystemLogType::Error, line);
 }
 
-// Whether the description was another when this was last asked. One that is missing is empty.
-bool hasChanged(const Value::Data& contents) {
-    static std::mutex mutex;
-    static auto* const last = new Value::Data; // never destroyed: threads may ask until the process is gone
-    const std::lock_guard lock(mutex);
-    if (*last == contents)
-        return false;
-    *last = contents;
-    return true;
-}
-
 // The description that the file holds. Nothing, and `problem`, when it is missing or malformed.
 Value described(const std::optional<Value::Data>& contents, std::string& problem) {
     if (!contents) {
@@ -46,13 +35,38 @@ Value described(const std::optional<Value::Data>& contents, std::string& problem
     return {};
 }
 
+// The description as it was last read, which is parsed anew only when the file has changed.
+struct LastDescription {
+    std::mutex mutex; // guards what follows
+    std::optional<Value::Data> contents;
+    Value description;
+    std::string problem;
+};
+
+// What is wrong with it, and a description that is new.
+struct Reading {
+    Value description;
+    std::string problem;
+    bool isNew;
+};
+
+Reading readDescription() {
+    static auto* const last = new LastDescription; // never destroyed: threads may ask until the process is gone
+    std::optional<Value::Data> contents = files::readWhole(descriptionPath);
+    const std::lock_guard lock(last->mutex);
+    const bool isNew = !contents || contents != last->contents;
+    if (isNew) {
+        last->problem.clear();
+        last->description = described(contents, last->problem);
+        last->contents = std::move(contents);
+    }
+    return {last->description, last->problem, isNew};
+}
+
 } // namespace
 
 Value deviceDescription() {
-    const std::optional<Value::Data> contents = files::readWhole(descriptionPath);
-    const bool isNew = hasChanged(contents.value_or(Value::Data()));
-    std::string problem;
-    Value description = described(contents, problem);
+    auto [description, problem, isNew] = readDescription();
     if (!problem.empty())
         report(problem);
     else if (isNew)
