@@ -22,8 +22,9 @@ class Device(unittest.TestCase):
         shutil.copytree(SOURCE / "examples/device", self.root, dirs_exist_ok=True)
 
     def start(self, *words):
-        return subprocess.Popen([ORLOCTL, *words], env={**os.environ, "VELTRA_DEVICE_ROOT": str(self.root)},
-                                stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True)
+        # One that does not print what is awaited is ended, which ends what it prints.
+        return subprocess.Popen(["timeout", "60", ORLOCTL, *words], stdout=subprocess.PIPE, stderr=subprocess.PIPE,
+                                text=True, env={**os.environ, "VELTRA_DEVICE_ROOT": str(self.root)})
 
     def run_orloctl(self, *words):
         """Exit status, standard output and standard error."""
