@@ -73,12 +73,16 @@ private:
     bool shown_ = false;
 };
 
-MessagePtr requestMessage(sd_bus* connection, const std::string& command, const Value::Dictionary& arguments) {
+MessagePtr requestMessage(sd_bus* connection, const std::string& command, const Value::Dictionary& arguments,
+                          bool wantsMessages) {
     sd_bus_message* message = nullptr;
     check(sd_bus_message_new_method_call(connection, &message, serviceName, servicePath, serviceInterface,
                                          "HandleMessage"));
     MessagePtr owner(message, sd_bus_message_unref);
-    bus::appendDictionary(message, {{"messageStr", command}, {"messageDict", arguments}, {"messages", true}});
+    Value::Dictionary request = {{"messageStr", command}, {"messageDict", arguments}};
+    if (wantsMessages)
+        request["messages"] = true;
+    bus::appendDictionary(message, request);
     return owner;
 }
 
@@ -170,12 +174,15 @@ struct BusError {
     sd_bus_error found = {};
 };
 
-// Who has the name on the bus: the user and the name of the connection. Null for nobody.
-CredentialsPtr ownerOf(sd_bus* connection, const char* name) {
+// Who has the name on the bus: the user and the name of the connection. Null for nobody, and where the bus does not
+// tell, which sets *problem.
+CredentialsPtr ownerOf(sd_bus* connection, const char* name, int* problem = nullptr) {
     sd_bus_creds* credentials = nullptr;
-    if (sd_bus_get_name_creds(connection, name, SD_BUS_CREDS_EUID | SD_BUS_CREDS_UNIQUE_NAME, &credentials) < 0)
-        credentials = nullptr;
-    return {credentials, sd_bus_creds_unref};
+    const int result =
+        sd_bus_get_name_creds(connection, name, SD_BUS_CREDS_EUID | SD_BUS_CREDS_UNIQUE_NAME, &credentials);
+    if (problem && result != -ENXIO)
+        *problem = result;
+    return {result < 0 ? nullptr : credentials, sd_bus_creds_unref};
 }
 
 std::optional<uid_t> userOf(sd_bus* connection, const char* name) {
@@ -185,8 +192,8 @@ std::optional<uid_t> userOf(sd_bus* connection, const char* name) {
 }
 
 // The name of the service's connection, which no message to it starts; empty when the service does not run.
-std::string connectionOfService(sd_bus* connection) {
-    const CredentialsPtr owner = ownerOf(connection, serviceName);
+std::string connectionOfService(sd_bus* connection, int* problem = nullptr) {
+    const CredentialsPtr owner = ownerOf(connection, serviceName, problem);
     const char* name = nullptr;
     return owner && sd_bus_creds_get_unique_name(owner.get(), &name) >= 0 ? name : "";
 }
@@ -213,9 +220,11 @@ std::optional<RequestInHand> requestInHand(const Value& properties) {
     const std::string* command = properties["RequestInHand"].text();
     if (!command || command->empty())
         return std::nullopt;
-    const auto now = std::chrono::system_clock::now().time_since_epoch();
-    const std::chrono::microseconds started(properties["RequestStarted"].integer().value_or(0));
-    return RequestInHand{*command, std::chrono::duration_cast<std::chrono::seconds>(now - started).count()};
+    const std::int64_t now =
+        std::chrono::duration_cast<std::chrono::microseconds>(std::chrono::system_clock::now().time_since_epoch())
+            .count();
+    const std::int64_t started = properties["RequestStarted"].integer().value_or(0);
+    return RequestInHand{*command, (now - std::clamp(started, std::int64_t{0}, now)) / 1'000'000};
 }
 
 // What the service tells of a request while it serves it.
@@ -225,7 +234,7 @@ struct Message {
     std::string text;
 
     nlohmann::ordered_json json() const { return {{"level", level}, {"source", source}, {"text", text}}; }
-    std::string line() const { return source + ": " + text.substr(0, text.find_last_not_of('\n') + 1); }
+    std::string line() const { return messageLine(source, text); }
 };
 
 // Errors that tell of no failure.
@@ -247,16 +256,16 @@ public:
 
     // The timeout counts also while the bus itself keeps the client waiting.
     Answer send(const Value::Dictionary& arguments) {
-        constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
-        const MessagePtr message = requestMessage(bus_, command_, arguments);
         const std::int64_t logSizeBefore = logSize();
-        sd_bus_slot *reply = nullptr, *filter = nullptr;
+        sd_bus_slot* filter = nullptr;
         check(sd_bus_add_filter(bus_, &filter, onMessage, this));
         const SlotPtr filterOwner(filter, sd_bus_slot_unref);
-        check(sd_bus_call_async(bus_, &reply, message.get(), onReply, this, noTimeoutOfItsOwn));
-        const SlotPtr replyOwner(reply, sd_bus_slot_unref);
-        check(sd_bus_set_method_call_timeout(bus_, static_cast<std::uint64_t>(tick.count())));
+        call(arguments, true);
         wait();
+        if (isTooOldForMessages_) { // an upgrade lets the program that runs go on
+            call(arguments, false);
+            wait();
+        }
         line_.clear();
         answer_->reasons = whereReasonsAre(address_.bus, logSizeBefore);
         if (answer_->report.outcome == Outcome::Failure)
@@ -268,13 +277,28 @@ public:
 private:
     static constexpr std::chrono::microseconds tick = std::chrono::seconds(1);
 
+    void call(const Value::Dictionary& arguments, bool wantsMessages) {
+        constexpr std::uint64_t noTimeoutOfItsOwn = UINT64_MAX;
+        const MessagePtr message = requestMessage(bus_, command_, arguments, wantsMessages);
+        sd_bus_slot* reply = nullptr;
+        answer_.reset();
+        check(sd_bus_call_async(bus_, &reply, message.get(), onReply, this, noTimeoutOfItsOwn));
+        reply_.reset(reply);
+        boundCalls(std::max(timeLeft(address_), tick));
+    }
+
+    // How long the bus itself may take for what is asked of it meanwhile.
+    void boundCalls(std::chrono::microseconds time) const {
+        check(sd_bus_set_method_call_timeout(bus_, static_cast<std::uint64_t>(time.count())));
+    }
+
     void wait() {
         while (!answer_) {
-            if (check(sd_bus_process(bus_, nullptr)) > 0)
-                continue;
             const auto left = timeLeft(address_);
             if (left.count() == 0 || Interruption::isRaised())
                 return giveUp();
+            if (check(sd_bus_process(bus_, nullptr)) > 0)
+                continue;
             const int waited = sd_bus_wait(bus_, static_cast<std::uint64_t>(std::min(left, tick).count()));
             if (waited != -EINTR)
                 check(waited);
@@ -296,7 +320,8 @@ private:
         if (sd_bus_get_n_queued_write(bus_, &waiting) < 0 || waiting != 0)
             return "The request was not sent.";
         const std::string ahead = requestAhead();
-        while (!answer_ && check(sd_bus_process(bus_, nullptr)) > 0)
+        // What has come already; more than that only comes from somebody who floods this client.
+        for (int turn = 0; turn < 10000 && !answer_ && check(sd_bus_process(bus_, nullptr)) > 0; ++turn)
             continue;
         return !told_.empty() ? "The service goes on with the request."
                : !ahead.empty()
@@ -304,18 +329,23 @@ private:
                    : "It is not known whether the service goes on with the request.";
     }
 
-    // The request that keeps this one waiting, when nothing has been told yet.
-    std::string requestAhead() const {
-        const auto inHand =
-            told_.empty() ? requestInHand(propertiesOf(bus_, connectionOfService(bus_), nullptr)) : std::nullopt;
+    // The request that keeps this one waiting, when nothing has been told yet and the service says so in time.
+    std::string requestAhead() const try {
+        if (!told_.empty())
+            return "";
+        boundCalls(tick);
+        const auto inHand = requestInHand(propertiesOf(bus_, connectionOfService(bus_), nullptr));
+        boundCalls(std::max(timeLeft(address_), tick));
         return inHand ? inHand->text() : "";
+    } catch (const std::exception&) {
+        return "";
     }
 
     // A second that has passed without anything happening is the time to look what this request waits for.
     void showProgress(bool isIdle) {
         using std::chrono::seconds;
         const auto passed = std::chrono::duration_cast<seconds>(Clock::now() - start_);
-        if (!line_.isSeen() || address_.json || passed < seconds(1))
+        if (!line_.isSeen() || passed < seconds(1))
             return;
         if (isIdle)
             ahead_ = requestAhead();
@@ -328,7 +358,7 @@ private:
     // With -v all that was told; otherwise what may be the reasons of a failure. Those of the two commands that log
     // everything as progress are in the last line.
     nlohmann::ordered_json messages() const {
-        const bool lastCounts = command_ == "putPSD2" || command_ == "getPSD2";
+        const bool lastCounts = !answer_->report.ok() && (command_ == "putPSD2" || command_ == "getPSD2");
         auto found = nlohmann::ordered_json::array();
         for (const Message& message : told_)
             if (address_.verbose || tellsOfFailure(message) || (lastCounts && &message == &told_.back()))
@@ -338,10 +368,13 @@ private:
 
     // Whether the bus names `sender` as the service: others may send signals too.
     bool isService(const char* sender) {
-        if (!sender || sender == service_)
-            return sender;
+        if (!sender || sender == service_ || sender == stranger_)
+            return sender && sender == service_;
         service_ = connectionOfService(bus_);
-        return sender == service_;
+        if (sender == service_)
+            return true;
+        stranger_ = sender; // its next message costs no question
+        return false;
     }
 
     static int onMessage(sd_bus_message* signal, void* context, sd_bus_error*) {
@@ -366,6 +399,10 @@ private:
         auto& self = *static_cast<Conversation*>(context);
         try {
             const sd_bus_error* error = sd_bus_message_get_error(reply);
+            self.isTooOldForMessages_ =
+                error && error->message && !self.isTooOldForMessages_ &&
+                error->name == std::string_view(SD_BUS_ERROR_INVALID_ARGS) &&
+                std::string_view(error->message).find("no key \"messages\"") != std::string::npos;
             self.answer_ = error ? Answer{reportOfError(*error, self.address_)} : answerFrom(reply, self.command_);
             if (const char* sender = sd_bus_message_get_sender(reply); sender && !error)
                 self.answer_->serviceUser = userOf(self.bus_, sender);
@@ -381,7 +418,10 @@ private:
     const Clock::time_point start_ = Clock::now();
     std::optional<Answer> answer_;
     std::vector<Message> told_;
-    std::string service_; // its unique name
+    SlotPtr reply_{nullptr, sd_bus_slot_unref};
+    bool isTooOldForMessages_ = false;
+    std::string service_;  // its unique name
+    std::string stranger_; // that of the last other sender
     std::string ahead_;
     LiveLine line_;
 };
@@ -421,7 +461,9 @@ bool startsAtRequest(sd_bus* connection) {
 
 Report statusOf(sd_bus* connection, const ServiceAddress& address) {
     check(sd_bus_set_method_call_timeout(connection, static_cast<std::uint64_t>(timeLeft(address).count())));
-    const std::string service = connectionOfService(connection);
+    int problem = 0;
+    const std::string service = connectionOfService(connection, &problem);
+    check(problem);
     if (service.empty() && startsAtRequest(connection))
         return {.json = {{"service", "not running; a request starts it"}, {"bus", address.bus}}};
     BusError error;
@@ -430,6 +472,8 @@ Report statusOf(sd_bus* connection, const ServiceAddress& address) {
     const Value properties = propertiesOf(connection, service, &error.found);
     if (sd_bus_error_is_set(&error.found))
         return reportOfError(error.found, address);
+    if (!properties["DeviceRoot"].text())
+        return {.json = {{"service", "running; it says nothing of itself"}, {"bus", address.bus}}};
     Report report;
     report.json = {{"service", "running"}, {"bus", address.bus}};
     for (const auto& [name, shown] : {std::pair("Version", "version"),
@@ -444,6 +488,13 @@ Report statusOf(sd_bus* connection, const ServiceAddress& address) {
 }
 
 } // namespace
+
+std::string messageLine(const std::string& source, const std::string& text) {
+    std::string line = source + ": " + text.substr(0, text.find_last_not_of('\n') + 1);
+    for (std::size_t end = 0; (end = line.find('\n', end)) != line.npos; end += 1)
+        line.insert(end + 1, "    ");
+    return line;
+}
 
 std::string noAnswerReason(const ServiceAddress& address) {
     return Interruption::isRaised() ? "Interrupted"

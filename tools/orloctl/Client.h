@@ -29,6 +29,10 @@ struct ServiceAddress {
     std::chrono::steady_clock::time_point deadline() const { return start + timeout; }
 };
 
+// A message of a request as a line; what the text has of line ends is indented, so that it cannot pass for another
+// line.
+std::string messageLine(const std::string& source, const std::string& text);
+
 // Why a wait ended without an answer, the beginning of a sentence: an interruption, or else that time is up.
 std::string noAnswerReason(const ServiceAddress& address);
 

@@ -5,8 +5,8 @@
 #include <csignal>
 #include <map>
 
-// While it lives, the first SIGINT or SIGTERM interrupts a system call that waits and is remembered; the second ends
-// the program as ever. A signal that was ignored stays ignored.
+// While it lives, the first SIGINT, SIGTERM or SIGHUP interrupts a system call that waits and is remembered; the second
+// ends the program as ever. A signal that was ignored stays ignored.
 class Interruption {
 public:
     Interruption() {
@@ -30,7 +30,7 @@ public:
 
 private:
     static inline volatile std::sig_atomic_t raised_ = 0;
-    std::map<int, struct sigaction> earlier_{{SIGINT, {}}, {SIGTERM, {}}};
+    std::map<int, struct sigaction> earlier_{{SIGINT, {}}, {SIGTERM, {}}, {SIGHUP, {}}};
 };
 
 #endif

@@ -72,18 +72,22 @@ public:
         return true;
     }
 
-    // Goes to the beginning of the file that has taken the place of this one; false when there is none.
-    bool isReplaced() {
+    // The file that has taken the place of this one, if any.
+    FileDescriptor replacement() const {
         FileDescriptor now = openInRoot(logPath, O_RDONLY);
         struct stat here = {}, there = {};
         if (!now || ::fstat(now.get(), &there) != 0)
-            return false;
+            return {};
         if (file_ && ::fstat(file_.get(), &here) == 0 && here.st_dev == there.st_dev && here.st_ino == there.st_ino &&
             there.st_size >= place_)
-            return false;
-        file_ = std::move(now);
+            return {};
+        return now;
+    }
+
+    void goTo(FileDescriptor file) {
+        file_ = std::move(file);
         place_ = 0;
-        return true;
+        pending_.clear();
     }
 
 private:
@@ -108,8 +112,13 @@ void readLog(std::size_t lines, bool isFollowed, const std::function<bool(std::s
     });
     bool isWanted = std::ranges::all_of(last, take);
     while (isWanted && isFollowed) {
-        if (!reader.isReplaced())
+        FileDescriptor next = reader.replacement();
+        if (!next)
             watch->wait();
         isWanted = reader.readOn(take);
+        if (!next)
+            continue;
+        reader.goTo(std::move(next));
+        isWanted = isWanted && reader.readOn(take);
     }
 }

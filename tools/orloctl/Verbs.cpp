@@ -13,6 +13,7 @@
 #include "tools/orloctl/Arguments.h"
 #include "tools/orloctl/CrashLogReport.h"
 #include "tools/orloctl/DeviceCheck.h"
+#include "tools/orloctl/Interruption.h"
 #include "tools/orloctl/LocalFiles.h"
 #include "tools/orloctl/LogTail.h"
 #include "tools/orloctl/PassedFile.h"
@@ -95,16 +96,28 @@ void takeOneOf(const Words& words, const char* operand, const char* option) {
         throw UsageError(std::string("Either ") + operand + " or " + option + " has to be given");
 }
 
+// What the service says of itself, with a note when its device is not the one that this client sees.
+Report statusOfService(const ServiceAddress& address) {
+    Report report = askStatus(address);
+    const std::string own = deviceRootPath();
+    if (report.ok() && report.json.value("deviceRoot", own) != own)
+        report.note = "The device root of the service is not the one of this client, " + own;
+    return report;
+}
+
 Report putPsd2(const ServiceAddress& address, const Words& words) {
     takeOneOf(words, "DEVICE-FILE", "--local");
     if (!words.has("--local"))
         return request("putPSD2", "psd2DataPath", "DEVICE-FILE")(address, words);
     const Value::Data record = readLocalFile(words["--local"]);
+    const Interruption interruption; // leaves no record behind
     const PassedFile passed;
     passed.write(record);
     Report report = sendRequest(address, "putPSD2", {{"psd2DataPath", passed.path()}}).report;
     if (report.ok())
         report.json["result"] = placeOf(words["--local"], record);
+    else if (report.outcome == Outcome::Failure)
+        report.note = statusOfService(address).note;
     return report;
 }
 
@@ -112,16 +125,16 @@ Report getPsd2(const ServiceAddress& address, const Words& words) {
     takeOneOf(words, "DEVICE-FILE", "--output");
     if (!words.has("--output"))
         return request("getPSD2", "psd2V4DataPath", "DEVICE-FILE")(address, words);
+    const Interruption interruption; // leaves no record behind
     const PassedFile passed;
     Report report = sendRequest(address, "getPSD2", {{"psd2V4DataPath", passed.path()}}).report;
-    if (!report.ok())
-        return report;
-    if (const std::optional<Value::Data> record = passed.read())
+    const auto record = report.ok() ? passed.read() : std::nullopt;
+    if (record)
         copyResult(report, words, *record);
-    else
-        report.fail("The record is not below the device root " + deviceRootPath() +
-                        ", so that the service has to have another (orloctl status).",
-                    Outcome::Failure);
+    else if (report.ok())
+        report.fail("The record, " + passed.path() + " on the device, cannot be read.", Outcome::Failure);
+    if (!record && report.outcome == Outcome::Failure)
+        report.note = statusOfService(address).note;
     return report;
 }
 
@@ -145,15 +158,10 @@ Report crashLogs(const ServiceAddress&, const Words& words) {
 
 // The description is looked at below the device root that the service has.
 Report showStatus(const ServiceAddress& address, const Words&) {
-    Report report = askStatus(address);
+    Report report = statusOfService(address);
     if (!report.ok())
         return report;
-    const std::string own = deviceRootPath();
-    const auto& root = report.json.value("deviceRoot", own);
-    if (root != own) {
-        report.note = "The device root of the service is not the one of this client, " + own;
-        ::setenv("VELTRA_DEVICE_ROOT", root.c_str(), 1);
-    }
+    ::setenv("VELTRA_DEVICE_ROOT", report.json.value("deviceRoot", deviceRootPath()).c_str(), 1);
     try {
         const Report description = checkDevice("");
         report.json["description"] = description.ok() ? "sound" : description.json["faults"];

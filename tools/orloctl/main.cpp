@@ -71,7 +71,7 @@ public:
             return app_.exit(printed);
         } catch (const CLI::ParseError& wrong) {
             const auto words = app_.remaining();
-            const bool isUnknown = app_.get_subcommands().empty() && !words.empty();
+            const bool isUnknown = app_.get_subcommands().empty() && !words.empty() && words.front()[0] != '-';
             return print(
                 wrongUsage((isUnknown ? noVerb(words.front()) : wrong.what()) + " (orloctl --help says more)"));
         } catch (const std::exception& failure) {
@@ -142,8 +142,8 @@ private:
                     ::print(std::cerr, "orloctl: " + sentence);
             if (!address_.verbose) // they have been printed as they came
                 for (const auto& message : report.messages)
-                    ::print(std::cerr, "  " + message.at("source").get<std::string>() + ": " +
-                                           message.at("text").get<std::string>());
+                    ::print(std::cerr, "  " + messageLine(message.at("source").get<std::string>(),
+                                                          message.at("text").get<std::string>()));
         }
         return static_cast<int>(report.outcome);
     }
