@@ -6,6 +6,7 @@
 #include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -21,7 +22,8 @@ protected:
     ~RequestThreadTest() override { thread.end(); }
 
     void handleMessage(const HSMessageRequest& request, const HSCompletion& completion) override {
-        work(request.messageStr.description(), completion);
+        const auto serving = std::move(work); // the next request may come before this one is left
+        serving(request.messageStr.description(), completion);
     }
 
     void receive(const RequestMessage& message) override {
