@@ -70,7 +70,16 @@ public:
                 passed_.pop_back();
             if (name_ == "." || name_ == "..")
                 continue;
-            FileDescriptor next(::openat(passed_.back().get(), name_.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+            constexpr int asItIs = O_PATH | O_NOFOLLOW | O_CLOEXEC;
+            // Most names on the way are those of directories, which need no look at what they are.
+            if (!rest_.empty() && passed_.size() <= deepest) {
+                FileDescriptor directory(::openat(passed_.back().get(), name_.c_str(), asItIs | O_DIRECTORY));
+                if (directory) {
+                    passed_.push_back(std::move(directory));
+                    continue;
+                }
+            }
+            FileDescriptor next(::openat(passed_.back().get(), name_.c_str(), asItIs));
             if (!next || ::fstat(next.get(), &status_) != 0)
                 return {};
             const bool isLast = rest_.empty();
