@@ -8,11 +8,11 @@ import threading
 import unittest
 
 import budget  # noqa: F401
+import veltra
 from cryptography import x509
 from cryptography.exceptions import InvalidSignature
 from cryptography.hazmat.primitives.asymmetric import ec, padding, rsa
 from cryptography.hazmat.primitives.hashes import SHA1, SHA256, SHA384
-import veltra
 from hypothesis import given, strategies
 from veltra import der, img4
 from veltra.img4 import Image, Img4Error, TrustDomain, TrustError
