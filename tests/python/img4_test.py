@@ -112,7 +112,7 @@ class Img4(unittest.TestCase):
             self.assertEqual(seen.count(expected), len(threads))
         self.assertEqual({name: type(value) for name, value in manifest.items()},
                          {"ABCD": int, "BOOL": bool, "DATA": memoryview, "TEXT": str})
-        self.assertEqual((entries["COUN"], list(image.manifest.objects)), (300, ["boot", "sepi"]))
+        self.assertEqual((entries["COUN"], len(image.manifest.objects), list(image.manifest.objects)), (300, 2, ["boot", "sepi"]))
         self.assertEqual((image.kind, img4.length(DATA[:40])), ("Container", len(DATA)))
 
     def test_refusals_of_trust_name_the_step_and_the_place(self):
