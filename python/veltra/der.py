@@ -145,7 +145,12 @@ class Item:
         return bool(self._parsed("BOOLEAN", lib.DERParseBoolean, "bool *")[0])
 
     def bits(self) -> tuple[memoryview, int]:
-        """The content as a BIT STRING: its octets, and how many bits of the last one do not belong to it."""
+        """The content as a BIT STRING: its octets, and how many bits of the last one do not belong to it.
+
+        >>> octets, unused = decode(bytes.fromhex("0302 04f0")).bits()
+        >>> octets.hex(), unused
+        ('f0', 4)
+        """
         unused = ffi.new("uint8_t *")
         bits = self._parsed("BIT STRING", lambda item, out: lib.DERParseBitString(item, out, unused), "DERItem *")
         return self._buffer.slice(bits) or memoryview(b""), unused[0]

@@ -57,7 +57,8 @@ class Img4(unittest.TestCase):
         image = Image(sequence(b"IMG4", payload, restore_info))
         self.assertEqual((image.payload.keybag, image.payload.compression, image.manifest), (b"keys", (1, 16), None))
         for found in (image.payload.properties, image.restore_info):
-            self.assertEqual((list(found), found["numb"], dict(found["dict"])), (["numb", "dict", "less"], 16, {"flag": True}))
+            self.assertEqual((list(found), len(found)), (["numb", "dict", "less"], 3))
+            self.assertEqual((found["numb"], dict(found["dict"])), (16, {"flag": True}))
             self.assertRaises(der.DerError, found.__getitem__, "less")
         with self.assertRaises(Img4Error) as raised:
             Image(payload.replace(b"PAYP", b"PAYX"))
