@@ -214,16 +214,18 @@ struct Rows {
     const DERItemSpec* end;
 };
 
-// Passes `status` on. `row` is the first that was not matched, `item` the one at hand.
+// Passes `status` on. `row` is the first that was not matched, or the one that the record has no place for, `item` the
+// one at hand.
 DERReturn refuse(DERReturn status, DERFault fault, const Rows& rows, const DERItemSpec* row, const uint8_t* item,
                  DERTag tag, DERRefusal* refusal) {
     if (refusal == nullptr)
         return status;
-    while (row != rows.end && hasOption(*row, DEROptionOptional))
+    while (fault != DERFaultRecord && row != rows.end && hasOption(*row, DEROptionOptional))
         ++row;
     if (fault == DERFaultTag && row == rows.end)
         fault = DERFaultExcess;
-    *refusal = {fault, static_cast<uint16_t>(row - rows.first), item, item, tag, row != rows.end ? row->tag : 0};
+    const bool isOfOneTag = row != rows.end && !hasOption(*row, DEROptionAnyTag);
+    *refusal = {fault, static_cast<uint16_t>(row - rows.first), item, item, tag, isOfOneTag ? row->tag : 0};
     return status;
 }
 

@@ -128,7 +128,7 @@ typedef enum DERFault {
 // What an operation refused, and where. `place` and `item` point into the input, or one past its end.
 typedef struct DERRefusal {
     DERFault fault;
-    uint16_t row;         // of the table: the first that is not optional and was not matched
+    uint16_t row;         // of the table: the first that is not optional and was not matched, or that has no place
     const uint8_t* place; // the octet at fault
     const uint8_t* item;  // the start of the item that it belongs to
     DERTag tag;           // of that item, when it is its tag that is refused

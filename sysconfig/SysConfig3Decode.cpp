@@ -54,8 +54,8 @@ constexpr std::array<DERItemSpec, 3> DERDecodeSysConfig3MetadataItemSpecs = {{
 
 // Fills `items` from the content of a SEQUENCE.
 template <typename Items, std::size_t count>
-DERReturn parse(const DERItem& content, const std::array<DERItemSpec, count>& rows, Items* items) {
-    return DERParseSequenceContentToObject(&content, count, rows.data(), items, sizeof *items, sizeof *items);
+DERReturn parse(const DERItem& content, const std::array<DERItemSpec, count>& rows, Items* items, DERRefusal* refusal) {
+    return DERParseSequenceContentExplained(&content, count, rows.data(), items, sizeof *items, sizeof *items, refusal);
 }
 
 // Appends an entry, null when memory is lacking, so that it is not silently left out. The codec has no code of its own
@@ -143,12 +143,13 @@ bool decodeList(const DERItem& element, const Element& expected, DERDecodeSequen
     if (!openElement(element, expected, &rest, refusal))
         return false;
     const std::uint8_t* const end = rest.data + rest.length;
+    Decoding decoding = {object, &refusal->encoding};
     while (rest.data != end) {
         DERDecodedInfo entry;
         bool stop = false;
         DERReturn result = DERDecodeItemExplained(&rest, &entry, &refusal->encoding);
         if (result == DERSuccess)
-            result = addEntry(&entry, &stop, object);
+            result = addEntry(&entry, &stop, &decoding);
         if (result != DERSuccess) {
             logHook()(messageLevel, "Decode sequence error: %d", static_cast<int>(result));
             return refuse(refusal, expected.entry, result, rest.data);
@@ -167,7 +168,7 @@ bool decodeManifest(const DERItem& element, __SysConfig3* object, SysConfig3Refu
     if (!openElement(element, manifestElement, &content, refusal))
         return false;
     ManifestItems items;
-    if (const DERReturn result = parse(content, manifestRows, &items); result != DERSuccess) {
+    if (const DERReturn result = parse(content, manifestRows, &items, nullptr); result != DERSuccess) {
         // A blob whose HMACs cannot be read is still worth having: the object keeps the manifest it was made with.
         logHook()(messageLevel, "Decode manifest sequence error: %d", static_cast<int>(result));
         return true;
@@ -196,12 +197,13 @@ bool parseBlob(const DERItem& blob, BlobItems* items, SysConfig3Refusal* refusal
 } // namespace
 
 DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedInfo* decoded, bool*, void* context) {
-    auto* const object = static_cast<__SysConfig3*>(context);
-    if (object == nullptr)
+    const auto* const decoding = static_cast<const Decoding*>(context);
+    if (decoding == nullptr)
         return DERParamError;
+    __SysConfig3* const object = decoding->object;
     PayloadItems items;
     bool deleted = false;
-    DERReturn result = parse(decoded->content, DERDecodeSysConfig3PayloadItemSpecs, &items);
+    DERReturn result = parse(decoded->content, DERDecodeSysConfig3PayloadItemSpecs, &items, decoding->refusal);
     if (result == DERSuccess)
         result = DERParseBooleanWithDefault(&items.deleted, false, &deleted);
     if (result != DERSuccess)
@@ -216,11 +218,13 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedIn
 DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo* decoded, bool*, void* context) {
     constexpr char operation[] = "DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo "
                                  "*__single, bool *__single, void *__single)";
-    auto* const object = static_cast<__SysConfig3*>(context);
-    if (object == nullptr)
+    const auto* const decoding = static_cast<const Decoding*>(context);
+    if (decoding == nullptr)
         return logHook()(messageLevel, "%s the refcon arg was NULL", operation), DERParamError;
+    __SysConfig3* const object = decoding->object;
     MetadataItems items;
-    if (const DERReturn result = parse(decoded->content, DERDecodeSysConfig3MetadataItemSpecs, &items);
+    if (const DERReturn result =
+            parse(decoded->content, DERDecodeSysConfig3MetadataItemSpecs, &items, decoding->refusal);
         result != DERSuccess)
         return result;
     const MetadataContent content = {textOf(items.key, maximumKeyLength), bytesOf(items.data),

@@ -263,7 +263,17 @@ bool _copySysConfigData(const SysConfigData* source, SysConfigData* destination)
 void _updatePayloadHMAC(const __SysConfig3PayloadEntry* first, crypto::HMACSHA256* context);
 void _updateMetadataHMAC(const __SysConfig3MetadataEntry* first, crypto::HMACSHA256* context);
 
-// The walk's callbacks: each parses one entry of a SET and appends it to its list of the object `context`. An entry
+namespace sysconfig {
+
+// What a walk over a SET of entries fills: the context of its callbacks.
+struct Decoding {
+    __SysConfig3* object;
+    DERRefusal* refusal; // why an entry's items were refused
+};
+
+} // namespace sysconfig
+
+// The walk's callbacks: each parses one entry of a SET and appends it to its list of the `context`'s object. An entry
 // that no record can hold is reported and left out. They do not index what they append: no look-up finds it before the
 // walk's caller has called the list's indexAll.
 DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedInfo* decoded, bool* stop, void* context);

@@ -153,8 +153,10 @@ TEST(DERRecord, isNeverWrittenBeyondItsSize) {
     for (const auto& [offset, destSize, content, code] : rows) {
         const DERItemSpec spec = {offset, DERTagInteger, DEROptionOptional};
         Record record;
-        EXPECT_EQ(DERParseSequenceContentToObject(&content.item, 1, &spec, &record, destSize, 0), code)
+        DERRefusal why = {};
+        EXPECT_EQ(DERParseSequenceContentExplained(&content.item, 1, &spec, &record, destSize, 0, &why), code)
             << offset << " in " << destSize;
+        EXPECT_EQ(why.fault == DERFaultRecord && why.row == 0 && why.expected == DERTagInteger, code != DERSuccess);
         EXPECT_EQ(textOf(record), offset == 16 && code == DERSuccess ? "untouched | 05 | untouched"
                                                                      : "untouched | untouched | untouched");
     }

@@ -228,8 +228,10 @@ const ProblemCase problemCases[] = {
     {"bcfg", "The blob has IA5String instead of INTEGER as its version", sequence({number(1), ia5("x")})},
     {"bcfg", "Sysconfig magic 0x1 is not valid, at offset 4.", blob({}, {}, 1)},
     {"bcfg", "The payload entry is no strict DER in the item at offset 23: the header", blob({{0x30}})},
-    {"bcfg", "The payload entry lacks a field, at offset 23.", blob({sequence({number(1)})})},
-    {"bcfg", "The payload entry has a field that does not belong there, at offset 36.",
+    {"bcfg", "The payload entry ends before its comment, at offset 23.", blob({sequence({number(1)})})},
+    {"bcfg", "The payload entry has a deleted flag that is no DER BOOLEAN, at offset 23.",
+     blob({sequence({number(1), ia5(""), item(DERTagBoolean, {1})})})},
+    {"bcfg", "The payload entry has SET instead of INTEGER as its key, at offset 36.",
      blob({sequence({number(1), ia5(""), octets({1})}), sequence({set({})})})},
 };
 

@@ -97,17 +97,17 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         {"a SET as manifest", manifest(bytes("31 09 04 01 00 04 01 00 04 01 00")), SysConfig3SubjectManifest, 39,
          DERFaultTag, "Tag was not the expected manifest tag %llX<2000000000000011>"},
         {"a fourth item in an entry", payload(setOf({payloadEntry(joined({someData, item("05", {})}))})),
-         SysConfig3SubjectPayloadEntry, 23, DERFaultNone, "Decode sequence error: %d<2>"},
-        {"an empty entry", payload(setOf({bytes("30 00")})), SysConfig3SubjectPayloadEntry, 23, DERFaultNone,
+         SysConfig3SubjectPayloadEntry, 23, DERFaultExcess, "Decode sequence error: %d<2>"},
+        {"an empty entry", payload(setOf({bytes("30 00")})), SysConfig3SubjectPayloadEntry, 23, DERFaultMissing,
          "Decode sequence error: %d<5>"},
         {"a deleted flag of 1", payload(setOf({payloadEntry(bytes("01 01 01"))})), SysConfig3SubjectPayloadEntry, 23,
          DERFaultNone, "Decode sequence error: %d<3>"},
         {"a cut-off entry after a good one", payload(setOf({miGB, bytes("30 7F")})), SysConfig3SubjectPayloadEntry, 38,
          DERFaultContentCutShort, "Decode sequence error: %d<3>"},
         {"a metadata entry without a key", metadata(setOf({item("30", someData)})), SysConfig3SubjectMetadataEntry, 32,
-         DERFaultNone, "Decode sequence error: %d<2>"},
+         DERFaultTag, "Decode sequence error: %d<2>"},
         {"values in the wrong order", metadata(setOf({metadataEntry("k", joined({someText, someData}))})),
-         SysConfig3SubjectMetadataEntry, 32, DERFaultNone, "Decode sequence error: %d<3>"},
+         SysConfig3SubjectMetadataEntry, 32, DERFaultExcess, "Decode sequence error: %d<3>"},
     };
     for (const auto& [what, blob, subject, offset, fault, lines] : rows) {
         SCOPED_TRACE(what);

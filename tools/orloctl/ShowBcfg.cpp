@@ -121,21 +121,17 @@ std::string hmacState(__SysConfig3* object, const Value::Data& key) {
 std::string reason(const SysConfig3Refusal& refusal, const std::uint8_t* blob) {
     constexpr const char* names[] = {"",         "blob",           "magic",   "version", "payload", "payload entry",
                                      "metadata", "metadata entry", "manifest"};
-    const DERFault fault = refusal.encoding.fault;
+    constexpr const char* payloadFields[] = {"key", "comment", "data", "string", "deleted flag", ""};
+    constexpr const char* metadataFields[] = {"key", "data", "string", ""};
+    const auto& [fault, row, place, item, tag, expected] = refusal.encoding;
+    const bool isPayloadEntry = refusal.subject == SysConfig3SubjectPayloadEntry;
+    const bool isEntry = isPayloadEntry || refusal.subject == SysConfig3SubjectMetadataEntry;
     const std::string name = names[refusal.subject];
-    if (fault != DERFaultNone)
-        return "The " + (fault >= DERFaultNoSequence ? "blob" : name) + " " +
-               derRefusalText(refusal.encoding, name.c_str(), blob);
-    switch (refusal.status) {
-    case DERUnexpectedTag:
-        return "The " + name + " has a field that does not belong there";
-    case DERIncompleteSequence:
-        return "The " + name + " lacks a field";
-    case DERDecodeError:
-        return "The " + name + " has a field that is no DER, or more fields than there are";
-    default:
-        return "";
-    }
+    if (fault == DERFaultNone)
+        return refusal.status == DERDecodeError ? "The " + name + " has a deleted flag that is no DER BOOLEAN" : "";
+    const std::string field = !isEntry ? name : isPayloadEntry ? payloadFields[row] : metadataFields[row];
+    return "The " + (fault >= DERFaultNoSequence && !isEntry ? "blob" : name) + " " +
+           derRefusalText(refusal.encoding, field.c_str(), blob);
 }
 
 } // namespace
