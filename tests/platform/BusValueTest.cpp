@@ -57,7 +57,8 @@ TEST(BusValue, everyTypeThatAHostMaySendBecomesItsValue) {
         {"dictionary of arrays of texts", entry("a{sas}", 2, "a", 1, "b", "c", 0),
          Dictionary{{"a", Value::Array{"b"}}, {"c", Value::Array{}}}},
         {"array of dictionaries", entry("aa{sv}", 1, 1, "a", "b", 1), Value::Array{Dictionary{{"a", true}}}},
-        {"arrays of data", entry("aaay", 1, 2, 0, 1, 255), Value::Array{Value::Array{Value::Data{}, Value::Data{255}}}},
+        {"arrays of data", entry("aaay", 1, 2, 0, 1, 255),
+         Value::Array{Value(Value::Array{Value::Data{}, Value::Data{255}})}},
         {"dictionary", entry("a{sv}", 1, "a", "av", 0), Dictionary{{"a", Value::Array{}}}},
     };
     LooseBus bus;
