@@ -39,7 +39,7 @@ std::string noAnswerReason(const ServiceAddress& address);
 // Sends `command` with `arguments` and waits for the answer. The report has the messages of the request that may be the
 // reasons of a failure, or all with `verbose`, which has them printed on standard error as they come. On a terminal,
 // standard error shows the last one and the time that has passed, or which request is still ahead. When the time is up,
-// and at SIGINT or SIGTERM, the problem says whether the service goes on with the request.
+// and at SIGINT, SIGTERM or SIGHUP, the problem says whether the service goes on with the request.
 Answer sendRequest(const ServiceAddress& address, const std::string& command, const Value::Dictionary& arguments);
 
 // Whether the service runs, and what it says of itself. It is not started for that.

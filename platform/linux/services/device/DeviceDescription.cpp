@@ -56,8 +56,9 @@ Reading readDescription() {
     const std::lock_guard lock(last->mutex);
     const bool isNew = !contents || contents != last->contents;
     if (isNew) {
-        last->problem.clear();
-        last->description = described(contents, last->problem);
+        std::string problem;
+        last->description = described(contents, problem);
+        last->problem = std::move(problem);
         last->contents = std::move(contents);
     }
     return {last->description, last->problem, isNew};
