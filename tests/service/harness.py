@@ -1,5 +1,4 @@
 """The real service on a bus and a device root of its own, driven by orloctl and busctl."""
-import concurrent.futures
 import ctypes
 import json
 import os
@@ -7,6 +6,7 @@ import pathlib
 import select
 import shutil
 import signal
+import socket
 import subprocess
 import tempfile
 import time
@@ -21,6 +21,7 @@ HONEST_MEMORY = {"ASAN_OPTIONS": "detect_leaks=1:quarantine_size_mb=1:thread_loc
 LOG = f"private/var/log/{NAME}.log"
 DESCRIPTION = "etc/veltra/device.json"
 SUCCESS = (0, None, None)  # of answer()
+PIPES = {"stdout": subprocess.PIPE, "stderr": subprocess.PIPE}
 
 # A service that start-service leaves behind becomes a child of the tests, which can then tell how it ended.
 PR_SET_CHILD_SUBREAPER = 36
@@ -31,13 +32,6 @@ def kilobytes(figure, pid):
     """What the kernel tells of the memory of a process, "VmRSS" now or "VmHWM" at most."""
     status = pathlib.Path(f"/proc/{pid}/status").read_text()
     return int(status.split(figure + ":")[1].split()[0])
-
-
-def at_once(*works):
-    """Does all of `works` at the same time, until they are done."""
-    with concurrent.futures.ThreadPoolExecutor(len(works)) as pool:
-        for work in [pool.submit(work) for work in works]:
-            work.result()
 
 
 class PrivateBus:
@@ -55,12 +49,14 @@ class PrivateBus:
 
 
 class Service:
-    """A running service on a bus and an example device of its own. With the `root` of another service it shares that
-    one's device. At the end it must end cleanly, with nothing that the sanitizer finds leaked."""
+    """A running service on a bus and an example device of its own. At the end it must end cleanly, with nothing that the
+    sanitizer finds leaked."""
 
-    def __init__(self, root=None):
-        self.owns_root = root is None
-        self.root = root or self.make_root()
+    def __init__(self):
+        self.root = pathlib.Path(tempfile.mkdtemp(prefix="veltra-"))
+        shutil.copytree(SOURCE / "examples/device", self.root, dirs_exist_ok=True)
+        for folder in ("tmp", "private/var/log"):
+            (self.root / folder).mkdir(parents=True)
         self.begin(PrivateBus())
 
     def begin(self, bus):
@@ -74,14 +70,6 @@ class Service:
             **HONEST_MEMORY,
         }
         self.start()
-
-    @staticmethod
-    def make_root():
-        root = pathlib.Path(tempfile.mkdtemp(prefix="veltra-"))
-        shutil.copytree(SOURCE / "examples/device", root, dirs_exist_ok=True)
-        for folder in ("tmp", "private/var/log"):
-            (root / folder).mkdir(parents=True)
-        return root
 
     def start(self, *starter):
         """Starts the service, through a program that ends as it when one is named."""
@@ -107,8 +95,7 @@ class Service:
             self.stop()
         finally:
             self.bus.close()
-            if self.owns_root:
-                shutil.rmtree(self.root)
+            shutil.rmtree(self.root)
 
     def describe(self, **sections):
         """Replaces sections of the device's description, but for "answers", of which the named ones are replaced; None
@@ -134,9 +121,9 @@ class Service:
             [str(word) for word in command], env=self.environment, stdout=subprocess.PIPE, text=True, **options
         )
 
-    def orloctl(self, *words):
+    def orloctl(self, *words, **options):
         """Exit status and the one JSON object that orloctl prints."""
-        done = self.run(BIN / "orloctl", "--json", *words)
+        done = self.run(BIN / "orloctl", "--json", *words, **options)
         return done.returncode, json.loads(done.stdout)
 
     def answer(self, *words):
@@ -172,14 +159,6 @@ class Service:
         path = self.root / LOG
         return path.read_text().splitlines() if path.exists() else []
 
-    def log_size(self):
-        return (self.root / LOG).stat().st_size
-
-    def await_request(self, logged):
-        """Waits until the log is longer than `logged` octets, as it is once a request is in hand."""
-        while self.log_size() == logged:
-            time.sleep(0)
-
     def messages_of(self, act):
         """The messages, without time and line number, that the log gains while `act` runs. A message may end in a line
         break; the empty line that follows is left out."""
@@ -212,4 +191,29 @@ class ServiceTest(Case):
 
     def popen(self, program, *words, **options):
         """Starts a program, of the build unless its name is a path, that talks to the service."""
-        return subprocess.Popen([BIN / program, *words], env=self.service.environment, **{"text": True, **options})
+        client = subprocess.Popen([BIN / program, *words], env=self.service.environment, **{"text": True, **options})
+        self.enterContext(client)
+        self.addCleanup(client.kill)
+        return client
+
+
+class HeldTest(ServiceTest):
+    """A case with a server that keeps a request in hand for as long as it likes."""
+
+    def setUp(self):
+        super().setUp()
+        self.server = self.closing(socket.create_server(("127.0.0.1", 0)))
+        self.url = f"http://127.0.0.1:{self.server.getsockname()[1]}/"
+        self.service.describe(reverseProxy=None)
+
+    def hold(self, *client, **options):
+        """A client whose request is in hand, and the connection that ends it when it is closed."""
+        client = self.popen(*client or ("orloctl", "--json", "provision"), self.url, **PIPES | options)
+        return client, self.closing(self.server.accept()[0])
+
+    def wait_in_line(self, *client):
+        """A client whose request waits."""
+        waiting = self.service.properties()["RequestsWaiting"]
+        client = self.popen(*client, **PIPES)
+        self.service.await_property("RequestsWaiting", waiting + 1)
+        return client
