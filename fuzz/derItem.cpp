@@ -31,6 +31,8 @@ void checkDecodersAgree(const DERItem& der) {
     DERDecodedInfo other = {};
     const DERReturn result = DERDecodeItem(&der, &whole);
     FUZZ_REQUIRE(result == DERSuccess || result == DERDecodeError);
+    DERDecodedInfo onto = {0, der}; // an item may be decoded onto the one it comes from
+    FUZZ_REQUIRE(DERDecodeItem(&onto.content, &onto) == result && (result != DERSuccess || isSame(whole, onto)));
     FUZZ_REQUIRE(DERDecodeItemPartialBufferGetLength(&der, &other, nullptr) == result);
     FUZZ_REQUIRE(result != DERSuccess || isSame(whole, other));
     FUZZ_REQUIRE((DERDecodeItemPartialBuffer(&der, &other, false) == DERSuccess) == (result == DERSuccess));

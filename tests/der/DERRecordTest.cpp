@@ -1,5 +1,4 @@
 // Records filled from item-spec tables.
-#include <cstring>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -109,41 +108,14 @@ TEST(DERRecord, isFilledRowByRow) {
         EXPECT_EQ(refusal.fault, row.fault);
         EXPECT_EQ(refusal.row, row.refusedRow);
         EXPECT_EQ(refusal.place - input.data(), row.place);
-        EXPECT_EQ(
-            DERParseSequenceContentToObject(&content, count, row.table.data(), &record, sizeof record, sizeof record),
-            row.code);
         EXPECT_EQ(textOf(record), row.record);
-
-        Bytes sequence = {0x30, static_cast<std::uint8_t>(input.size())};
-        sequence.insert(sequence.end(), input.begin(), input.end());
-        const DERItem der = itemOf(sequence);
-        Record again;
-        EXPECT_EQ(DERParseSequenceToObject(&der, count, row.table.data(), &again, sizeof again, sizeof again),
-                  row.code);
-        EXPECT_EQ(textOf(again), row.record);
-    }
-}
-
-TEST(DERRecord, isZeroedAsFarAsAskedWhateverFollows) {
-    const Hex whole = "02 01 05 04 01 BB";
-    const DERItem content = whole.item, bad = {content.data, 1};
-    const std::tuple<DERItem, std::uint64_t, DERReturn, const char*> rows[] = {
-        {content, 0, DERSuccess, "05 | untouched | BB"},
-        {content, place(2), DERSuccess, "05 | absent | BB"},
-        {bad, 0, DERDecodeError, "untouched | untouched | untouched"},
-        {bad, place(1), DERDecodeError, "absent | untouched | untouched"},
-    };
-    for (const auto& [from, sizeToZero, code, text] : rows) {
-        Record record;
-        EXPECT_EQ(DERParseSequenceContent(&from, 3, plain.data(), &record, sizeToZero), code);
-        EXPECT_EQ(textOf(record), text);
     }
 }
 
 TEST(DERRecord, isNeverWrittenBeyondItsSize) {
     const std::tuple<std::uint64_t, std::uint64_t, Hex, DERReturn> rows[] = {
+        {0, 16, "02 01 05", DERSuccess},
         {16, 32, "02 01 05", DERSuccess},
-        {16, 31, "02 01 05", DERBufferOverflow},
         {17, 32, "02 01 05", DERBufferOverflow},
         {0, 15, "02 01 05", DERBufferOverflow},
         {UINT64_MAX - 15, 48, "02 01 05", DERBufferOverflow},
@@ -157,30 +129,23 @@ TEST(DERRecord, isNeverWrittenBeyondItsSize) {
         EXPECT_EQ(DERParseSequenceContentExplained(&content.item, 1, &spec, &record, destSize, 0, &why), code)
             << offset << " in " << destSize;
         EXPECT_EQ(why.fault == DERFaultRecord && why.row == 0 && why.expected == DERTagInteger, code != DERSuccess);
-        EXPECT_EQ(textOf(record), offset == 16 && code == DERSuccess ? "untouched | 05 | untouched"
-                                                                     : "untouched | untouched | untouched");
+        for (std::uint64_t i = 0; i < 3; ++i)
+            EXPECT_EQ(record.items[i].data != &Record::mark, code == DERSuccess && offset == place(i));
     }
 }
 
-TEST(DERRecord, needNotBeAligned) {
-    const DERItemSpec spec = {3, DERTagInteger, 0};
-    const Hex content = "02 01 05";
-    std::uint8_t record[3 + sizeof(DERItem)] = {};
-    ASSERT_EQ(DERParseSequenceContentToObject(&content.item, 1, &spec, record, sizeof record, 0), DERSuccess);
-    DERItem stored;
-    std::memcpy(&stored, record + 3, sizeof stored);
-    EXPECT_EQ(hexOf(stored), "05");
-}
-
-TEST(DERRecord, isLeftAloneUnlessTheItemIsASequence) {
-    const std::tuple<Hex, DERReturn, const char*> rows[] = {
-        {"30 03 02 01 05 FF FF", DERSuccess, "05 | absent | absent"},
-        {"31 03 02 01 05", DERUnexpectedTag, "untouched | untouched | untouched"},
-        {"30 03 02 01", DERDecodeError, "untouched | untouched | untouched"},
+TEST(DERRecord, isLeftAloneUnlessTheItemIsASequenceAndZeroedAsFarAsAsked) {
+    const std::tuple<Hex, std::uint64_t, DERReturn, const char*> rows[] = {
+        {"30 03 02 01 05 FF FF", sizeof(Record), DERSuccess, "05 | absent | absent"},
+        {"30 03 02 01 05", place(2), DERSuccess, "05 | absent | untouched"},
+        {"30 03 02 01 05", 0, DERSuccess, "05 | untouched | untouched"},
+        {"30 01 02", place(1), DERDecodeError, "absent | untouched | untouched"},
+        {"31 03 02 01 05", sizeof(Record), DERUnexpectedTag, "untouched | untouched | untouched"},
+        {"30 03 02 01", sizeof(Record), DERDecodeError, "untouched | untouched | untouched"},
     };
-    for (const auto& [der, code, text] : rows) {
+    for (const auto& [der, sizeToZero, code, text] : rows) {
         Record record;
-        EXPECT_EQ(DERParseSequence(&der.item, 3, optionalEnd.data(), &record, sizeof record), code) << der.text;
+        EXPECT_EQ(DERParseSequence(&der.item, 3, optionalEnd.data(), &record, sizeToZero), code) << der.text;
         EXPECT_EQ(textOf(record), text) << der.text;
     }
 }
