@@ -21,7 +21,7 @@ constexpr char description[] = R"({"registry": [
 class HardwareRegistryTest : public testing::Test {
 protected:
     HardwareRegistryTest() {
-        root_.write("/etc/veltra/device.json", description);
+        root_.describe(description);
         root_.write("/name", "Second\n");
     }
     ~HardwareRegistryTest() override { EXPECT_EQ(heldServices(), 0U); }
@@ -67,7 +67,7 @@ TEST_F(HardwareRegistryTest, handlesAreCountedAndKeepTheirServiceUntilTheyAreRel
     const Service second = getMatchingService(serviceMatching("Relay"));
     EXPECT_NE(first, second);
     EXPECT_EQ(heldServices(), 2U);
-    root_.write("/etc/veltra/device.json", R"({"registry": {"class": "Relay"}})");
+    root_.describe(R"({"registry": {"class": "Relay"}})");
     EXPECT_EQ(getMatchingService(serviceMatching("Relay")), 0U);
     EXPECT_EQ(searchProperty(first, servicePlane, "Own", 0), Value(1));
     releaseService(first);

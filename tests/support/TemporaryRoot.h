@@ -45,6 +45,9 @@ public:
         std::ofstream(host(path), std::ios::binary) << contents;
     }
 
+    // Writes the device description.
+    void describe(std::string_view json) const { write("/etc/veltra/device.json", json); }
+
     // The contents of a file; of a missing one the text "(missing)".
     std::string read(std::string_view path) const {
         std::ifstream file(host(path), std::ios::binary);
