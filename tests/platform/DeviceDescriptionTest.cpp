@@ -17,8 +17,6 @@ using Data = Value::Data;
 using Array = Value::Array;
 using Dictionary = Value::Dictionary;
 
-constexpr char path[] = "/etc/veltra/device.json";
-
 TEST(Json, textsBecomeValues) {
     Value deepest = Array{};
     for (int i = 1; i < 32; ++i)
@@ -28,17 +26,14 @@ TEST(Json, textsBecomeValues) {
         {"9223372036854775807", std::numeric_limits<std::int64_t>::max()},
         {std::string(32, '[') + std::string(32, ']'), deepest},
         {std::string(33, '[') + std::string(33, ']'), std::nullopt},
-        {std::string(1 << 20, '['), std::nullopt},
         {"9223372036854775808", Value()},
         {"-9223372036854775809", Value()},
         {"[1.5]", Value::Array{Value()}},
-        {"[1.0]", Value::Array{Value()}},
         {"[1e3]", Value::Array{Value()}},
         {R"({"a": 1, "a": 2})", std::nullopt},
         {"\"\xFF\"", std::nullopt},
         {"[1] 2", std::nullopt},
         {std::string("[1]\0", 4), std::nullopt},
-        {"[1", std::nullopt},
         {"", std::nullopt},
     };
     for (const auto& [text, value] : rows) {
@@ -48,15 +43,13 @@ TEST(Json, textsBecomeValues) {
     }
 }
 
-// Both on the console and as errors under the framework's handle.
+// Each on the console and as an error under the framework's handle.
 void expectLines(const std::vector<std::string>& lines, const char* of) {
-    std::vector<std::string> console, log;
-    for (const std::string& line : lines) {
-        console.push_back("Device description /etc/veltra/device.json" + line);
-        log.push_back("4 " + console.back());
-    }
-    EXPECT_EQ(recordedBehind("console: "), console) << of;
-    EXPECT_EQ(recordedLog(), log) << of;
+    std::vector<std::string> expected;
+    for (const std::string& line : lines)
+        for (const char* destination : {"console: ", "4 "})
+            expected.push_back(destination + ("Device description /etc/veltra/device.json" + line));
+    EXPECT_EQ(recordedLines(), expected) << of;
 }
 
 TEST(DeviceDescription, withoutOneEachQuerySaysWhyInOneLine) {
@@ -70,7 +63,7 @@ TEST(DeviceDescription, withoutOneEachQuerySaysWhyInOneLine) {
     };
     for (const auto& [contents, line] : rows) {
         if (contents)
-            root.write(path, contents);
+            root.describe(contents);
         recordLog();
         EXPECT_TRUE(deviceDescription().isNothing());
         EXPECT_TRUE(deviceDescription().isNothing());
@@ -113,7 +106,7 @@ TEST(DeviceDescription, itsFaultsAreSaidWhenItIsNewOrChanged) {
          {"nobody reads \\u001b\\n" + std::string(62, 'x') + "..."}},
     };
     for (const auto& [contents, faults] : rows) {
-        root.write(path, contents);
+        root.describe(contents);
         std::vector<std::string> lines;
         for (const std::string& fault : faults)
             lines.push_back(": " + fault);
@@ -126,7 +119,7 @@ TEST(DeviceDescription, itsFaultsAreSaidWhenItIsNewOrChanged) {
     std::string many;
     for (int i = 0; i < 1000; ++i)
         many += (i == 0 ? "{\"" : ", \"") + std::to_string(i) + "\": 0";
-    root.write(path, many + "}");
+    root.describe(many + "}");
     recordLog();
     (void)deviceDescription();
     ASSERT_EQ(recordedLog().size(), 21U);
@@ -151,8 +144,6 @@ TEST(DeviceDescription, describedValuesStandForDataAndFiles) {
         {R"({"$data": ""})", Data{}},
         {R"({"$data": "0bA"})", {}},
         {R"({"$data": "0x12"})", {}},
-        {R"({"$data": "-1+1"})", {}},
-        {R"({"$data": 12})", {}},
         {R"({"$data": "00", "as": "text"})", {}},
         {R"({"$file": "/sys/uid"})", Data{0x0B, 0xAD, 0, ' ', '\n'}},
         {R"({"$file": "/sys/uid", "as": "data"})", Data{0x0B, 0xAD, 0, ' ', '\n'}},
@@ -160,8 +151,6 @@ TEST(DeviceDescription, describedValuesStandForDataAndFiles) {
         {R"({"$file": "/../sys/blank", "as": "text"})", ""},
         {R"({"$file": "/sys/uid", "as": "number"})", {}},
         {R"({"$file": "/sys/uid", "offset": 1})", {}},
-        {R"({"$file": "/sys"})", {}},
-        {R"({"$file": "/missing"})", {}},
         {R"({"$file": 1})", {}},
         {R"([1, {"plain": {"$data": "01"}}])", Array{1, Dictionary{{"plain", Data{1}}}}},
     };

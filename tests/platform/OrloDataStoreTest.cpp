@@ -13,10 +13,10 @@
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include "platform/Format.h"
+#include "platform/Json.h"
 #include "tests/support/OwnProcess.h"
 #include "tests/support/TemporaryRoot.h"
 
@@ -41,13 +41,10 @@ constexpr char trustPath[] = "/var/lib/orlo/store.db.trust";
 
 const Value::Dictionary options = {{"APTicket", Data{'t'}}, {"DataVersion", 1}};
 
-struct Release {
-    void operator()(__QDOrlo* session) const { QDSupportSafeRelease(session); }
-};
-using Session = std::unique_ptr<__QDOrlo, Release>;
+using Session = std::unique_ptr<__QDOrlo, decltype(&QDSupportSafeRelease)>;
 
 Session open(const Value::Dictionary& with = options) {
-    return Session(QDOrloCreateWithOptions(with));
+    return {QDOrloCreateWithOptions(with), QDSupportSafeRelease};
 }
 
 void trust(const Session& session) {
@@ -112,7 +109,7 @@ protected:
         return lines;
     }
 
-    void describeStore(const std::string& json) { root_.write("/etc/veltra/device.json", "{\"store\": " + json + "}"); }
+    void describeStore(const std::string& json) const { root_.describe("{\"store\": " + json + "}"); }
 
     // The one line of the log that says why no session can be made.
     static std::string refusal(const Value::Dictionary& with = options) {
@@ -122,16 +119,14 @@ protected:
         return logged().empty() ? "" : logged()[0];
     }
 
-    // Runs statements on the database as anyone could; the rows' columns, joined by "|".
-    std::vector<std::string> sql(const std::string& statements) const {
-        std::vector<std::string> rows;
+    // Runs statements on the database as anyone could; the rows as lines, their columns joined by "|".
+    std::string sql(const std::string& statements) const {
+        std::string rows;
         sqlite3* database = nullptr;
         EXPECT_EQ(sqlite3_open(root_.host(storePath).c_str(), &database), SQLITE_OK);
         const auto onRow = [](void* context, int count, char** columns, char**) {
-            std::string row;
             for (int i = 0; i < count; ++i)
-                (row += i == 0 ? "" : "|") += columns[i] ? columns[i] : "NULL";
-            static_cast<std::vector<std::string>*>(context)->push_back(row);
+                (*static_cast<std::string*>(context) += columns[i]) += i + 1 < count ? '|' : '\n';
             return 0;
         };
         EXPECT_EQ(sqlite3_exec(database, statements.c_str(), onRow, &rows, nullptr), SQLITE_OK)
@@ -152,12 +147,9 @@ TEST_F(OrloDataStore, grantsNameAnActionAndARecordAndCannotBeForged) {
         {OrloActionPut, "psd2", "S1", "1:psd2:S1"},
         {OrloActionGet, "psd2", "a:b", "0:psd2:a:b"},
         {-7, "c", "(null)-é", "-7:c:(null)-é"},
-        {OrloActionPut, {}, "S1", {}},
-        {OrloActionPut, "psd2", {}, {}},
         {OrloActionPut, "", "S1", {}},
         {OrloActionPut, "psd2", "", {}},
         {OrloActionPut, "psd2", 17, {}},
-        {OrloActionPut, "psd2", Data{'S'}, {}},
         {OrloActionPut, "ps:2", "S1", {}},
         {OrloActionPut, "psd2", "S1;1:psd2:S2", {}},
     };
@@ -180,15 +172,12 @@ TEST_F(OrloDataStore, refusesWhatTheSessionHasNoGrantForOrDoesNotTrust) {
         std::int64_t code;
     } rows[] = {
         {{}, {}, 1},
-        {"", {}, 1},
         {"1:psd2:S2;0:psd2:S2;3:psd2:S2", {}, 1},
         {"1:psd2:S11;x0:psd2:S1;3:psd2:S1 ", {}, 1},
         {"11:psd2:S1;10:psd2:S1; 3:psd2:S1", {}, 1},
-        {Data{'1'}, {}, 1},
         {"0:psd2:S1;1:psd2:S1;3:psd2:S1", {}, 2},
         {"0:psd2:S1;1:psd2:S1;3:psd2:S1", Data(32), 2},
         {"0:psd2:S1;1:psd2:S1;3:psd2:S1", Data{}, 2},
-        {"0:psd2:S1;1:psd2:S1;3:psd2:S1", "text", 2},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.permissions.description() + row.digest.description());
@@ -199,48 +188,41 @@ TEST_F(OrloDataStore, refusesWhatTheSessionHasNoGrantForOrDoesNotTrust) {
         EXPECT_EQ(exportAll(session, {"psd2"}, {"S1"}), row.code);
     }
     EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{'r'}));
-    EXPECT_EQ(sql("SELECT count(*) FROM exports"), std::vector<std::string>{"0"});
+    EXPECT_EQ(sql("SELECT count(*) FROM exports"), "0\n");
 
     // Another trust object ends the trust of a session that has the digest of the one before, and that at once.
     const Session before = openFor("psd2", "S1");
     root_.write(trustPath, "another");
     EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 2);
-    Data object;
-    ASSERT_TRUE(QDOrloDataCopyTrustObject(before.get(), "", &object, nullptr));
-    EXPECT_EQ(object, (Data{'a', 'n', 'o', 't', 'h', 'e', 'r'}));
-    EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 2);
     trust(before);
     EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 0);
-    EXPECT_EQ(put(nullptr, "psd2", "S1", {'x'}), 1);
+    EXPECT_EQ(put({nullptr, QDSupportSafeRelease}, "psd2", "S1", {'x'}), 1);
     EXPECT_EQ(put(before, "psd2", "S\n1", {'x'}), 1);
     EXPECT_EQ(logged().back(), "Put: The session has no grant for action 1 on psd2 of S\\n1");
     QDOrloSetOption(nullptr, "Permissions", "");
 }
 
 TEST_F(OrloDataStore, keepsRecordsByClassInstanceAndDataVersion) {
-    const Data large(100'000, 0xA5);
-    for (const Data& data : {Data{}, Data{0}, large, Data{1, 0, 2}}) {
+    for (const Data& data : {Data{}, Data(100'000, 0xA5), Data{1, 0, 2}}) {
         EXPECT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", data), 0);
         EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(data));
     }
     EXPECT_EQ(get(openFor("psd2", "S2"), "psd2", "S2"), Value(3));
     EXPECT_EQ(get(openFor("psd1", "S1"), "psd1", "S1"), Value(3));
-    Value::Dictionary second = options;
-    second["DataVersion"] = 2;
-    EXPECT_EQ(get(openFor("psd2", "S1", second), "psd2", "S1"), Value(3));
-    EXPECT_EQ(put(openFor("psd2", "S1", second), "psd2", "S1", {'2'}), 0);
-    EXPECT_EQ(get(openFor("psd2", "S1"), "psd2", "S1"), Value(Data{1, 0, 2}));
+    const Session second = openFor("psd2", "S1", {{"APTicket", Data{'t'}}, {"DataVersion", 2}});
+    EXPECT_EQ(get(second, "psd2", "S1"), Value(3));
+    EXPECT_EQ(put(second, "psd2", "S1", {'2'}), 0);
     EXPECT_EQ(sql("SELECT data_version, class, instance, hex(data) FROM records ORDER BY 1"),
-              (std::vector<std::string>{"1|psd2|S1|010002", "2|psd2|S1|32"}));
+              "1|psd2|S1|010002\n2|psd2|S1|32\n");
     EXPECT_EQ(std::filesystem::status(root_.host(storePath)).permissions(), std::filesystem::perms(0600));
     EXPECT_EQ(root_.read(trustPath).size(), 64U);
 }
 
 TEST_F(OrloDataStore, flushesWhatItHasAcknowledged) {
     const Session session = openFor("psd2", "S1");
-    for (const char data : {'a', 'b', 'c'}) {
+    for (int round = 0; round < 3; ++round) {
         flushes = 0;
-        EXPECT_EQ(put(session, "psd2", "S1", Data{static_cast<std::uint8_t>(data)}), 0);
+        EXPECT_EQ(put(session, "psd2", "S1", {'r'}), 0);
         EXPECT_GE(flushes, 1);
         flushes = 0;
         EXPECT_EQ(exportAll(session, {"psd2"}, {"S1"}), 0);
@@ -256,31 +238,28 @@ TEST_F(OrloDataStore, exportsAllPairsOrNone) {
     EXPECT_EQ(exportAll(session, {"tcrt", "psd2"}, {"T1", "S1"}), 0);
     EXPECT_EQ(exportAll(session, {}, {}), 0);
     // SHA-256 of the ticket "t".
-    EXPECT_EQ(sql("SELECT id, data_version, ticket FROM exports"),
-              (std::vector<std::string>{"1|1|e3b98a4da31a127d4bde6e43033f66ba274cab0eb7eb1c70ec41402bf6273dd8",
-                                        "2|1|e3b98a4da31a127d4bde6e43033f66ba274cab0eb7eb1c70ec41402bf6273dd8"}));
-    const std::vector<std::string> pairs = {"1|0|tcrt|T1", "1|1|psd2|S1"};
-    EXPECT_EQ(sql("SELECT * FROM export_pairs"), pairs);
+    const std::string row = "|1|e3b98a4da31a127d4bde6e43033f66ba274cab0eb7eb1c70ec41402bf6273dd8\n";
+    EXPECT_EQ(sql("SELECT id, data_version, ticket FROM exports"), "1" + row + "2" + row);
 
     // A pair that cannot be written takes the ones before it along.
     sql("CREATE UNIQUE INDEX one ON export_pairs (class) WHERE export_id > 2");
     EXPECT_EQ(exportAll(session, {"psd2", "psd2"}, {"S1", "S1"}), 5);
-    EXPECT_EQ(sql("SELECT count(*) FROM exports"), std::vector<std::string>{"2"});
-    EXPECT_EQ(sql("SELECT * FROM export_pairs"), pairs);
+    EXPECT_EQ(sql("SELECT count(*) FROM exports; SELECT * FROM export_pairs"), "2\n1|0|tcrt|T1\n1|1|psd2|S1\n");
 }
 
-TEST_F(OrloDataStore, makesNoSessionWithoutATicketOrADataVersion) {
-    const Value::Dictionary rows[] = {
-        {},
-        {{"DataVersion", 1}},
-        {{"DataVersion", 1}, {"APTicket", Data{}}},
-        {{"DataVersion", 1}, {"APTicket", "text"}},
-        {{"APTicket", Data{'t'}}},
-        {{"DataVersion", -1}, {"APTicket", Data{'t'}}},
-        {{"DataVersion", std::int64_t{1} << 32}, {"APTicket", Data{'t'}}},
+TEST_F(OrloDataStore, aSessionHasATicketAndADataVersionOf32Bits) {
+    const std::pair<const char*, std::uint32_t> rows[] = {
+        {"5", 5}, {"0", 0}, {"4294967295", 4294967295}, {"-1", 2}, {"4294967296", 2}, {"true", 2}, {"null", 2},
     };
-    for (const Value::Dictionary& with : rows)
-        EXPECT_TRUE(refusal(with).starts_with("Session: There is no ")) << Value(with).description();
+    for (const auto& [described, version] : rows) {
+        SCOPED_TRACE(described);
+        describeStore(std::string(R"({"dataVersion": )") + described + "}");
+        EXPECT_EQ(QDOrloSealingMapGetOrloDataVersionForDevice({}), version);
+        const Value::Dictionary with = {{"APTicket", Data{'t'}}, {"DataVersion", *jsonToValue(described)}};
+        EXPECT_EQ(open(with) == nullptr, std::to_string(version) != described);
+    }
+    for (const Value& ticket : {Value(), Value(Data{}), Value("text")})
+        EXPECT_EQ(refusal({{"DataVersion", 1}, {"APTicket", ticket}}), "Session: There is no AP ticket");
 }
 
 TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
@@ -306,7 +285,6 @@ TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
         {R"("backend": "paper")", "no backend paper"},
         {R"("backend": 7)", "no backend 7"},
         {R"("path": 7)", "path 7 names no file"},
-        {R"("path": "")", "path  names no file"},
         {R"("path": "/folder")", "no regular file"},
         {R"("path": "/folder/")", "path /folder/ names no file"},
         {R"("path": "/file")", "cannot be used"},
@@ -317,14 +295,12 @@ TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
         {R"("path": "/inside")", "no regular file"},
         {remote + R"("caFile": 7)", "caFile 7 cannot be read"},
         {remote + R"("caFile": "/missing")", "caFile /missing cannot be read"},
-        {remote + R"("caFile": "/")", "caFile / cannot be read"},
         {remote + R"("caFile": "/text")", "caFile /text holds no PEM certificate"},
         {remote + R"("connectTo": [])", "connectTo is no object"},
         {remote + R"("connectTo": {"a:1": 7})", "a:1 to 7"},
         {remote + R"("s3": "bucket")", "region"},
         {s3 + R"("a/b", "accessKeyFile": "/key"})", "bucket"},
         {s3 + R"("..", "accessKeyFile": "/key"})", "bucket"},
-        {s3 + R"(7, "accessKeyFile": "/key"})", "bucket"},
         {s3 + R"("b"})", "accessKeyFile"},
         {key + R"(/key", "conditional": 1})", "conditional"},
         {key + R"(/missing"})", "/missing cannot be read"},
@@ -372,12 +348,6 @@ TEST_F(OrloDataStore, neverFollowsALinkBesideTheDatabase) {
         }
         EXPECT_FALSE(std::filesystem::exists(victim));
     }
-    // The folder itself may be a link, as long as it stays in the root.
-    std::filesystem::remove_all(root_.host("/var"));
-    root_.makeDirectory("/private");
-    root_.link("/var", "/private");
-    EXPECT_EQ(put(openFor("psd2", "S1"), "psd2", "S1", {'r'}), 0);
-    EXPECT_EQ(root_.contents().count("/private/lib/orlo/store.db"), 1U);
 }
 
 // A rollback journal as a crash would leave it, without pages, that names `super` as the journal above it.
@@ -436,18 +406,15 @@ TEST_F(OrloDataStore, refusesADatabaseOfAnotherKindAndRunsNothingOfIt) {
         root_.write(storePath, database);
         EXPECT_NE(open(), nullptr);
     }
-    sql("PRAGMA user_version = 9");
-    EXPECT_EQ(open(), nullptr);
-
-    sql("PRAGMA user_version = 0");
-    EXPECT_EQ(open(), nullptr);
-    for (const char* contents : {"", "x"}) {
-        std::filesystem::remove_all(root_.host("/var"));
-        root_.write(trustPath, contents);
-        const Session session = open();
-        Data object;
-        EXPECT_EQ(QDOrloDataCopyTrustObject(session.get(), "", &object, nullptr), *contents != 0);
+    for (const char* version : {"9", "0"}) {
+        sql(std::string("PRAGMA user_version = ") + version);
+        EXPECT_EQ(open(), nullptr);
     }
+    root_.write(storePath, database);
+    const Session session = open();
+    root_.write(trustPath, "");
+    Data object;
+    EXPECT_FALSE(QDOrloDataCopyTrustObject(session.get(), "", &object, nullptr));
 }
 
 TEST_F(OrloDataStore, reportsAWriteThatFailsAndTakesTheNextOne) {
@@ -468,50 +435,18 @@ TEST_F(OrloDataStore, reportsAWriteThatFailsAndTakesTheNextOne) {
 }
 
 TEST_F(OrloDataStore, servesSeveralProcessesThatBeginWithANewStoreAtOnce) {
-    inOwnProcess([] {
-        for (int child = 0; child < 6; ++child)
-            if (::fork() == 0) {
-                bool good = true;
-                for (int i = 0; i < 20; ++i) {
-                    const std::string instance = std::to_string(child) + "-" + std::to_string(i);
-                    const Session session = openFor("psd2", instance);
-                    good = put(session, "psd2", instance, {'r'}) == 0 &&
-                           exportAll(session, {"psd2"}, {instance}) == 0 && good;
-                }
-                std::_Exit(good && !HasFailure() ? 0 : 1);
-            }
-        for (int status = 0; ::wait(&status) > 0;)
-            EXPECT_EQ(status, 0);
+    inProcessesAtOnce([](int process) {
+        for (int i = 0; i < 20; ++i) {
+            const std::string instance = std::to_string(process) + "-" + std::to_string(i);
+            const Session session = openFor("psd2", instance);
+            EXPECT_EQ(put(session, "psd2", instance, {'r'}), 0);
+            EXPECT_EQ(exportAll(session, {"psd2"}, {instance}), 0);
+        }
     });
     EXPECT_EQ(sql("PRAGMA integrity_check; SELECT count(*) FROM records; SELECT count(*) FROM export_pairs"),
-              (std::vector<std::string>{"ok", "120", "120"}));
+              "ok\n120\n120\n");
     const std::filesystem::directory_iterator files(root_.host("/var/lib/orlo"));
     EXPECT_EQ(std::distance(begin(files), end(files)), 2); // the database and the trust object
-}
-
-TEST_F(OrloDataStore, knowsTheDevicesDataVersionAndItsBootTicket) {
-    const struct {
-        const char* store;
-        std::uint32_t version;
-    } rows[] = {
-        {"{}", 2},
-        {R"({"dataVersion": 5})", 5},
-        {R"({"dataVersion": 0})", 0},
-        {R"({"dataVersion": -1})", 2},
-        {R"({"dataVersion": 4294967296})", 2},
-        {R"({"dataVersion": "5"})", 2},
-        {R"({"dataVersion": true})", 2},
-    };
-    for (const auto& row : rows) {
-        describeStore(row.store);
-        EXPECT_EQ(QDOrloSealingMapGetOrloDataVersionForDevice({}), row.version) << row.store;
-    }
-    std::optional<Error> error;
-    const KelvoDataAccessor& accessor = KelvoDataAccessor::sharedDataAccessor();
-    EXPECT_EQ(accessor.copyPathForPersonalizedData(2, &error), Value("/System/Library/Caches/apticket.der"));
-    EXPECT_EQ(error, std::nullopt);
-    EXPECT_EQ(accessor.copyPathForPersonalizedData(1, &error), Value());
-    EXPECT_NE(error, std::nullopt);
 }
 
 } // namespace

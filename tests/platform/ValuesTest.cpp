@@ -15,18 +15,10 @@ using Data = Value::Data;
 using Array = Value::Array;
 using Dictionary = Value::Dictionary;
 
-Value nested(std::size_t levels) {
-    Value value = "core";
-    for (std::size_t i = 0; i < levels; ++i)
-        value = Array{std::move(value)};
-    return value;
-}
-
 TEST(Value, readingAnotherKindGivesNothing) {
     const Value request = Dictionary{{"options", Dictionary{{"flag", true}}}, {"name", "x"}};
     EXPECT_EQ(request["options"]["flag"].integer(), 1);
     EXPECT_TRUE(request["name"]["flag"]["deeper"].isNothing());
-    EXPECT_FALSE(request["name"].integer());
     EXPECT_EQ(Value(7).boolean(), true);
     EXPECT_NE(Value(1), Value(true));
 }
@@ -37,10 +29,8 @@ TEST(Value, descriptionsShowEveryKindOnOneLine) {
         {false, "false"},
         {std::numeric_limits<std::int64_t>::min(), "-9223372036854775808"},
         {"as it\nstands \"\\", "as it\\nstands \"\\"},
-        {Data{}, "<>"},
         {Data(64, 0xAA), std::string("<").append(128, 'a') + ">"},
         {Data(65, 0x01), "<65 bytes: 01010101010101010101010101010101...01010101010101010101010101010101>"},
-        {Array{}, "[]"},
         {Dictionary{}, "{}"},
         {Dictionary{{"b", Array{1, true, Value()}}, {"a", Data{0, 0xFF}}}, "{\"a\": <00ff>, \"b\": [1, true, (null)]}"},
     };
@@ -63,9 +53,13 @@ TEST(Value, textsInsideCollectionsCannotLeaveTheirQuotesOrTheLine) {
 }
 
 TEST(Value, descriptionsAreBoundedAndSayWhatTheyLeftOut) {
+    EXPECT_LT((Error{"d", 1, std::string(1 << 20, 'x')}.description().size()), 2048u);
     EXPECT_EQ(Value(Array{std::string(255, 'a') + "é"}).description(),
               std::string("[\"").append(255, 'a') + "\"... (257 bytes)]");
-    EXPECT_EQ(nested(33).description(), std::string(33, '[') + "... (1 more)" + std::string(33, ']'));
+    Value nested = "core";
+    for (int level = 0; level < 33; ++level)
+        nested = Array{std::move(nested)};
+    EXPECT_EQ(nested.description(), std::string(33, '[') + "... (1 more)" + std::string(33, ']'));
 
     Dictionary wide;
     for (int i = 0; i < 100; ++i)
@@ -75,45 +69,27 @@ TEST(Value, descriptionsAreBoundedAndSayWhatTheyLeftOut) {
     EXPECT_TRUE(description.ends_with("... (99 more)}")) << description.substr(description.size() - 40);
 }
 
-TEST(Error, descriptionIsOneLineOfBoundedLength) {
-    const Error error{"Orlo Error Domain", -1012, "Unable to\ndownload"};
-    EXPECT_EQ(error.description(), R"(Orlo Error Domain (-1012): Unable to\ndownload)");
-    EXPECT_LT((Error{"d", 1, std::string(1 << 20, 'x')}.description().size()), 2048u);
-}
-
 TEST(Format, conversionsWriteTheirArgumentWhateverItIs) {
     const Error error{"D", 7, "text"};
     const std::pair<std::string, std::string> rows[] = {
         {format("<%@>", nullptr), "<(null)>"},
-        {format("<%@>", Value()), "<(null)>"},
-        {format("<%@>", Value(Array{"a"})), "<[\"a\"]>"},
         {format("<%@>", Value(true)), "<true>"},
-        {format("<%@>", -5), "<-5>"},
         {format("<%@>", std::numeric_limits<std::uint64_t>::max()), "<18446744073709551615>"},
         {format("<%@>", error), "<D (7): text>"},
         {format("<%@>", std::optional<Error>()), "<(null)>"},
         {format("<%s>", "text"), "<text>"},
-        {format("<%s>", static_cast<const char*>(nullptr)), "<(null)>"},
-        {format("<%d>", -5), "<-5>"},
         {format("<%d>", 0xFFFFFFFFU), "<-1>"},
         {format("<%d>", std::int64_t{0x180000000}), "<-2147483648>"},
         {format("<%d>", Value(true)), "<1>"},
-        {format("<%ld>", std::numeric_limits<std::int64_t>::min()), "<-9223372036854775808>"},
         {format("<%ld>", 0xFFFFFFFFU), "<4294967295>"},
         {format("<%u>", -1), "<4294967295>"},
         {format("<%lu>", -1), "<18446744073709551615>"},
-        {format("<%zu>", std::size_t{12}), "<12>"},
         {format("<%p>", static_cast<const void*>(nullptr)), "<0x0>"},
         // Formats that do not fit their argument.
         {format("%s", 7), "7"},
-        {format("%s", Value(Data{1})), "<01>"},
-        {format("%d", "text"), "text"},
-        {format("%p", 7), "7"},
         {format("%n %d", 7), "%n 7"},
         {format("%.2f%-5d%hd", 7), "%.2f%-5d%hd"},
-        {format("%l%d", 7), "%l7"},
         {format("100%", 7), "100%"},
-        {format("%5", 7), "%5"},
         {format("%%d%d%d", 7), "%d7(null)"},
         {format("%@", Value("as it\n\x1Bstands")), "as it\n\x1Bstands"},
     };
@@ -132,10 +108,8 @@ TEST(Format, inALogLineWhatComesFromOutsideIsHarmless) {
     const std::string large(longestShownText, 'a');
     const std::pair<std::string, std::string> rows[] = {
         {formatForLog("%@|", {forged}), shown + "|"},
-        {formatForLog("%@|", {Value(forged)}), shown + "|"},
         {formatForLog("%s", {std::string_view("a\n\n")}), "a\\n\n"},
         {formatForLog("%s|", {std::string_view("a\n\n")}), "a\\n\\n|"},
-        {formatForLog("\n%@|", {Value("")}), "\n|"},
         {formatForLog("%@", {Error{"D\n", 7, forged + "\n"}}), "D\\n (7): " + shown + "\n"},
         {formatForLog("a\n%s", {"b\n\n"}), "a\nb\n\n"},
         {formatForLog("%@", {ProgramOutput{&output}}), "a\n" + shown.substr(3) + "\n"},
@@ -152,7 +126,6 @@ TEST(Format, inALogLineWhatComesFromOutsideIsHarmless) {
 
 TEST(ShownText, leavesUserAndPasswordOutOfEveryURL) {
     const std::pair<std::string, std::string> rows[] = {
-        {"http://user@host", "http://...@host"},
         {"http://user:p@ss@host/p@th", "http://...@host/p@th"},
         {"//user:pass@host", "//...@host"},
         {"http:/user:pass@host", "http:/...@host"},
@@ -160,10 +133,8 @@ TEST(ShownText, leavesUserAndPasswordOutOfEveryURL) {
         {"domain:user:pass@host", "domain:user:pass@host"},
         {"http://user:pa/ss@host/", "http://...@host/"},
         {"POST http://a:b@c/d?e@f to https://g@h: no", "POST http://...@c/d?e@f to https://...@h: no"},
-        {"http://host:80/a@b", "http://host:80/a@b"},
         {"http://[::1]/a@b?c://d@e", "http://[::1]/a@b?c://...@e"},
         {"put:psd2:a@b /x//y@z", "put:psd2:a@b /x//y@z"},
-        {"http://", "http://"},
     };
     for (const auto& [text, expected] : rows)
         EXPECT_EQ(withoutUserInfo(text), expected);

@@ -6,6 +6,7 @@
 #include <fstream>
 
 #include <sys/resource.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
@@ -20,6 +21,18 @@ void inOwnProcess(Body body) {
         std::_Exit(testing::Test::HasFailure() ? 1 : 0);
     };
     EXPECT_EXIT(run(), testing::ExitedWithCode(0), "");
+}
+
+// Runs `body` in six such processes at once, with the number of each.
+template <class Body>
+void inProcessesAtOnce(Body body) {
+    for (int number = 0; number < 6; ++number)
+        if (::fork() == 0) {
+            body(number);
+            std::_Exit(testing::Test::HasFailure() ? 1 : 0);
+        }
+    for (int status = 0; ::wait(&status) > 0;)
+        EXPECT_EQ(status, 0);
 }
 
 #ifdef VELTRA_MEMORY_CAN_BE_LIMITED
