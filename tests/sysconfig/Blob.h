@@ -63,9 +63,9 @@ inline sysconfig::SysConfig3Ptr decodeParts(const BlobParts& parts) {
 }
 
 // The encoded object, empty when it cannot be encoded.
-inline Bytes encode(const sysconfig::SysConfig3Ptr& object) {
+inline Bytes encode(const __SysConfig3* object) {
     SysConfigData out = {};
-    if (!encodeSysConfig3(object.get(), &out))
+    if (!encodeSysConfig3(object, &out))
         return {};
     const sysconfig::BytesPtr owner(out.data);
     return {out.data, out.data + out.length};
@@ -105,52 +105,58 @@ inline bool add(const sysconfig::SysConfig3Ptr& object, const sysconfig::Metadat
     return sysConfig3AddMetadataEntry(object.get(), entry.get());
 }
 
-// What a list shows of an entry's value, "=data 01 02" or "=string text".
-inline std::string valueText(bool hasData, const SysConfigData& data, const char* string) {
-    return (hasData ? "=data " + hexOf(data.data, data.length) : "") +
-           (string != nullptr ? std::string("=string ") + string : "");
+// What a list shows of an entry, "key=data 01 02", "key=string text" or "key=deleted".
+inline std::string textOf(const std::string& key, bool hasData, const SysConfigData& data, const char* string,
+                          bool isDeleted = false) {
+    return key + (hasData ? "=data " + hexOf(data.data, data.length) : "") +
+           (string != nullptr ? std::string("=string ") + string : "") + (isDeleted ? "=deleted" : "");
 }
 
-// The payload list in order, "WCh0=data 01 02, MiGB=string text, ABCD=deleted".
+inline std::string textOf(const __SysConfig3PayloadEntry* entry) {
+    SysConfigData data = {};
+    const bool hasData = sysConfig3PayloadEntryGetData(entry, &data);
+    std::string key, comment = sysConfig3PayloadEntryGetComment(entry);
+    for (int shift = 24; shift >= 0; shift -= 8)
+        key += static_cast<char>(sysConfig3PayloadEntryGetKey(entry) >> shift);
+    return textOf(key + (comment == "." ? "" : " (" + comment + ")"), hasData, data,
+                  sysConfig3PayloadEntryGetString(entry), sysConfig3PayloadEntryGetDeleted(entry));
+}
+
+inline std::string textOf(const __SysConfig3MetadataEntry* entry) {
+    SysConfigData data = {};
+    const bool hasData = sysConfig3MetadataEntryGetData(entry, &data);
+    return textOf(sysConfig3MetadataEntryGetKey(entry), hasData, data, sysConfig3MetadataEntryGetString(entry));
+}
+
+// The entries from this one on.
+template <typename Entry>
+std::string listOf(const Entry* entry, const Entry* (*next)(const Entry*)) {
+    std::string list;
+    for (; entry != nullptr; entry = next(entry))
+        list += (list.empty() ? "" : ", ") + textOf(entry);
+    return list;
+}
+
+// The payload list in order, "WCh0=data 01 02, MiGB (comment)=string text".
 inline std::string payloadOf(const sysconfig::SysConfig3Ptr& object) {
-    std::string list;
-    for (const auto* entry = sysConfig3GetHeadPayloadEntry(object.get()); entry != nullptr;
-         entry = sysConfig3PayloadEntryGetNextEntry(entry)) {
-        SysConfigData data = {};
-        const bool hasData = sysConfig3PayloadEntryGetData(entry, &data);
-        list += list.empty() ? "" : ", ";
-        for (int shift = 24; shift >= 0; shift -= 8)
-            list += static_cast<char>(sysConfig3PayloadEntryGetKey(entry) >> shift);
-        list += valueText(hasData, data, sysConfig3PayloadEntryGetString(entry));
-        list += sysConfig3PayloadEntryGetDeleted(entry) ? "=deleted" : "";
-    }
-    return list;
+    return listOf(sysConfig3GetHeadPayloadEntry(object.get()), sysConfig3PayloadEntryGetNextEntry);
 }
 
-// The metadata list in order, "key=data 01 02, other=string text".
 inline std::string metadataOf(const sysconfig::SysConfig3Ptr& object) {
-    std::string list;
-    for (const auto* entry = sysConfig3GetHeadMetadataEntry(object.get()); entry != nullptr;
-         entry = sysConfig3MetadataEntryGetNextEntry(entry)) {
-        SysConfigData data = {};
-        const bool hasData = sysConfig3MetadataEntryGetData(entry, &data);
-        list += list.empty() ? "" : ", ";
-        list += sysConfig3MetadataEntryGetKey(entry);
-        list += valueText(hasData, data, sysConfig3MetadataEntryGetString(entry));
-    }
-    return list;
+    return listOf(sysConfig3GetHeadMetadataEntry(object.get()), sysConfig3MetadataEntryGetNextEntry);
 }
 
-// The manifest, "00 | 00 | absent".
+// The manifest, "00|00|absent".
 inline std::string manifestOf(const sysconfig::SysConfig3Ptr& object) {
     std::string list;
     for (const auto get :
          {sysConfig3ManifestGetPayloadHMAC, sysConfig3ManifestGetMetadataHMAC, sysConfig3ManifestGetFullHMAC}) {
         SysConfigData hmac = {};
         const bool isAnswered = get(sysConfig3GetManifest(object.get()), &hmac);
-        list += list.empty() ? "" : " | ";
+        list += list.empty() ? "" : "|";
         list += !isAnswered ? "none" : hmac.data == nullptr ? "absent" : hexOf(hmac.data, hmac.length);
     }
+    std::erase(list, ' ');
     return list;
 }
 
