@@ -170,16 +170,16 @@ TEST_F(ZPDeviceTest, availabilityThatComesAfterTheCallIsHarmless) {
     EXPECT_FALSE(device_.setupReverseProxy(url).isNothing());
     std::vector<std::thread> late;
     for (const std::int32_t status : {1, 3, 2})
-        late.emplace_back([status, callback = availabilityCallback()] { callback(status); });
+        late.emplace_back([status, callback = availabilityCallback] { callback(status); });
     for (std::thread& thread : late)
         thread.join();
     // Nor does it make the next call's proxy available.
-    outcomes()["RPRegistrationResume"].output = Value::Array{3};
+    outcomes["RPRegistrationResume"].output = Value::Array{3};
     EXPECT_TRUE(device_.setupReverseProxy(url).isNothing());
 }
 
 TEST_F(ZPDeviceTest, availabilityThatComesWhileTheCallEndsCountsOrDoesNot) {
-    outcomes()["RPRegistrationResume"].output = Value::Array{3, 1};
+    outcomes["RPRegistrationResume"].output = Value::Array{3, 1};
     for (int round = 0; round < 50; ++round) {
         recordLog();
         const bool isAvailable = !device_.setupReverseProxy(url).isNothing();

@@ -46,7 +46,7 @@ protected:
             }
             hasFailed = allocationHasFailed();
             failAllocation(0);
-            EXPECT_EQ(liveSessions(), 0) << count;
+            EXPECT_EQ(liveSessions, 0) << count;
             const Lines lines = recordedLog();
             if (!said.empty())
                 met.insert(said + (!lines.empty() && lines.back().starts_with('4') ? lines.back() : ""));
@@ -75,7 +75,7 @@ TEST_F(Orlo, theOptionsThatAreGivenStandInPlaceOfEqualDefaultsOrBesideThem) {
         Value::Dictionary expected = first;
         for (const auto& [key, value] : row.differences)
             expected[key] = value;
-        EXPECT_EQ(Value(sessionOptions()), Value(expected)) << row.given.description();
+        EXPECT_EQ(Value(sessionOptions), Value(expected)) << row.given.description();
     }
     Value::Dictionary local = first;
     local["DataStore"] = "Local";

@@ -120,7 +120,7 @@ TEST(Show, agreesWithOpenSSLOnEveryItem) {
         EXPECT_TRUE(report.ok()) << report.problem;
         std::ostringstream items;
         listItems(report.json["items"], 0, items);
-        EXPECT_EQ(items.str(), listOfOpenSSL(asn1parse(file)));
+        EXPECT_EQ(items.str(), listOfOpenSSL(asn1parse({reinterpret_cast<const char*>(file.data()), file.size()})));
     }
 }
 

@@ -103,7 +103,7 @@ public:
         if (verb == "device")
             changeDevice(nlohmann::json::json_pointer(name), line);
         else if (verb == "script")
-            script(outcomes()[name], json(line));
+            script(outcomes[name], json(line));
         else if (verb == "remove")
             fs::remove_all(root_.host(name));
         else if (verb == "folder")
@@ -217,13 +217,13 @@ Lines play(const Case& played) {
         request, [&](bool completed, const auto& response) { answers.push_back(shown(request, completed, response)); });
     failAllocation(0);
     Lines lines = recordedLines();
-    for (const auto& [key, value] : sessionOptions())
+    for (const auto& [key, value] : sessionOptions)
         lines.push_back("option " + key + " " + value.description());
     lines.insert(lines.end(), answers.begin(), answers.end());
     compareFiles(arrangement.root(), before, lines);
-    if (liveSessions() != 0 || HardwareRegistry::heldServices() != 0)
+    if (liveSessions != 0 || HardwareRegistry::heldServices() != 0)
         lines.push_back(
-            format("not released: %d sessions, %lu services", liveSessions(), HardwareRegistry::heldServices()));
+            format("not released: %d sessions, %lu services", liveSessions, HardwareRegistry::heldServices()));
     for (std::string& line : lines)
         line = shown(line, request);
     return lines;

@@ -87,7 +87,7 @@ TEST_F(ZPOrloServicesTest, aRequestIsCompletedOnceWhereverMemoryEnds) {
             server.handleMessage(message, completion);
             ASSERT_EQ(completions, 1) << row.command << count;
             ASSERT_EQ(answer.has_value(), row.status < 1) << row.command << count;
-            EXPECT_EQ(liveSessions(), 0);
+            EXPECT_EQ(liveSessions, 0);
             if (!answer)
                 continue;
             EXPECT_EQ(answer->name(), Value(row.command));
@@ -106,7 +106,7 @@ TEST_F(ZPOrloServicesTest, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlie
     inOwnProcess([this] {
         root_.write("/tmp/new_bCfg", "earlier");
         root_.write("/out", "before");
-        outcomes()["QDOrloDataCopy"].output = Value::Data(1 << 20);
+        outcomes["QDOrloDataCopy"].output = Value::Data(1 << 20);
         std::signal(SIGXFSZ, SIG_IGN);
         const rlimit full = {64, 64};
         ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &full), 0);
@@ -124,8 +124,8 @@ TEST_F(ZPOrloServicesTest, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlie
 #ifdef VELTRA_MEMORY_CAN_BE_LIMITED
 TEST_F(ZPOrloServicesTest, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
     constexpr std::size_t size = std::size_t{64} << 20;
-    outcomes()["BWCPairCorvoWithProxy"].output = Value::Array{std::string(size, 't')};
-    outcomes()["VanterUpdaterIsDone"].result = true;
+    outcomes["BWCPairCorvoWithProxy"].output = Value::Array{std::string(size, 't')};
+    outcomes["VanterUpdaterIsDone"].result = true;
     const struct {
         std::size_t memory;
         bool created;

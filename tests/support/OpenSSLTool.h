@@ -2,11 +2,18 @@
 #ifndef VELTRA_TESTS_SUPPORT_OPENSSLTOOL_H
 #define VELTRA_TESTS_SUPPORT_OPENSSLTOOL_H
 
-#include <cstdint>
+#include <cstdlib>
 #include <string>
-#include <vector>
+
+#include "tests/support/TemporaryRoot.h"
 
 // What `openssl asn1parse` prints about the DER in `bytes`; empty when it fails.
-std::string asn1parse(const std::vector<std::uint8_t>& bytes);
+inline std::string asn1parse(std::string_view bytes) {
+    const TemporaryRoot root;
+    root.write("/input", bytes);
+    const std::string command =
+        "cd '" + root.host("/").string() + "'; '" OPENSSL_TOOL "' asn1parse -inform DER -in input > output";
+    return std::system(command.c_str()) == 0 ? root.read("/output") : "";
+}
 
 #endif

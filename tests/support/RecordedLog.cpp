@@ -15,8 +15,6 @@ SystemLog pluginLog, frameworkLog, defaultLog;
 std::mutex mutex;
 std::vector<std::string> lines; // of every destination, in order
 
-constexpr std::string_view consoleMark = "console: ", callMark = "> ";
-
 // "<time>-[<file>:<number>] <message>\n" as "[<file>] <message>".
 std::string withoutTimeAndNumber(std::string_view line) {
     line.remove_prefix(line.find('['));
@@ -59,7 +57,7 @@ void consoleLog(std::string_view line) {
     std::string kept(line);
     if (end != std::string_view::npos && number != std::string_view::npos)
         kept.erase(number, end - number);
-    append(std::string(consoleMark) + kept);
+    append("console: " + kept);
 }
 
 void recordLog() {
@@ -69,7 +67,7 @@ void recordLog() {
 }
 
 void recordCall(std::string_view call) {
-    append(std::string(callMark) + std::string(call));
+    append("> " + std::string(call));
 }
 
 std::vector<std::string> recordedLines() {
@@ -87,7 +85,6 @@ std::vector<std::string> recordedBehind(std::string_view mark) {
 
 std::vector<std::string> recordedLog() {
     std::vector<std::string> log = recordedLines();
-    std::erase_if(log,
-                  [](const std::string& line) { return line.starts_with(consoleMark) || line.starts_with(callMark); });
+    std::erase_if(log, [](const std::string& line) { return line.starts_with("console: ") || line.starts_with("> "); });
     return log;
 }

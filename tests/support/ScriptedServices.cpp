@@ -19,17 +19,19 @@ struct __QDOrlo {};
 class VanterUpdater {};
 struct VeltraPluginServer::Connection {};
 
+std::map<std::string, Outcome, std::less<>> outcomes;
+Value::Dictionary sessionOptions;
+int liveSessions = 0;
+RPAvailabilityCallback availabilityCallback;
+
 namespace {
 
-Value::Dictionary options;
-int sessions = 0;
 QDOrloLogHandler logHandler = nullptr;
-RPAvailabilityCallback callback;
 
 const Outcome& outcomeOf(std::string_view operation) {
     static const Outcome usual;
-    const auto found = outcomes().find(operation);
-    return found == outcomes().end() ? usual : found->second;
+    const auto found = outcomes.find(operation);
+    return found == outcomes.end() ? usual : found->second;
 }
 
 // Records a call, with its arguments, and says what it does.
@@ -64,14 +66,9 @@ std::string grant(std::int32_t action, const Value& dataClass, const Value& inst
 
 } // namespace
 
-std::map<std::string, Outcome, std::less<>>& outcomes() {
-    static std::map<std::string, Outcome, std::less<>> instance;
-    return instance;
-}
-
 void arrangeServices() {
-    options.clear();
-    outcomes() = {
+    sessionOptions.clear();
+    outcomes = {
         {"QDOrloDataCopyTrustObject", {.output = "trust"}},
         {"QDOrloDataCopy", {.output = "record"}},
         {"QDOrloSealingMapGetOrloDataVersionForDevice", {.output = 7}},
@@ -85,36 +82,22 @@ void arrangeServices() {
     };
 }
 
-const Value::Dictionary& sessionOptions() {
-    return options;
-}
-
-int liveSessions() {
-    return sessions;
-}
-
-const RPAvailabilityCallback& availabilityCallback() {
-    return callback;
-}
-
 void QDOrloLogSetHandler(QDOrloLogHandler handler) {
     logHandler = handler;
 }
 
 __QDOrlo* QDOrloCreateWithOptions(Value given) {
-    const Outcome& outcome = called("QDOrloCreateWithOptions");
+    const bool result = called("QDOrloCreateWithOptions").result;
     logHandler(nullptr, "from the library");
-    options = *given.dictionary();
-    if (!outcome.result)
-        return nullptr;
-    auto* const session = new __QDOrlo;
-    ++sessions;
+    sessionOptions = *given.dictionary();
+    auto* const session = result ? new __QDOrlo : nullptr;
+    liveSessions += result;
     return session;
 }
 
 void QDOrloSetOption(__QDOrlo*, std::string_view key, Value value) {
     called("QDOrloSetOption", " %@", key);
-    options.insert_or_assign(std::string(key), std::move(value));
+    sessionOptions.insert_or_assign(std::string(key), std::move(value));
 }
 
 Value QDOrloDataCreatePermissionsString(__QDOrlo* session, std::int32_t action, const Value& dataClass,
@@ -169,7 +152,7 @@ void QDSupportSafeRelease(__QDOrlo* session) {
     if (!session)
         return;
     released("QDSupportSafeRelease");
-    --sessions;
+    --liveSessions;
     delete session;
 }
 
@@ -184,56 +167,37 @@ Value KelvoDataAccessor::copyPathForPersonalizedData(std::int64_t kind, std::opt
     return path;
 }
 
+// Allocates nothing, since nobody would catch what a thread raises.
+static void deliver(const Value& output) {
+    if (const Value::Array* statuses = output.array())
+        for (const Value& status : *statuses)
+            availabilityCallback(static_cast<std::int32_t>(*status.integer()));
+}
+
 // Delivers the statuses of a resume on a thread of its own, those of an invalidation while it is invalidated.
 class RPRegistration {
 public:
-    ~RPRegistration() {
-        if (deliverer_.joinable())
-            deliverer_.join();
-    }
-
-    void resume(const Value& output) {
-        resumed_ = std::chrono::steady_clock::now();
-        // The thread allocates nothing, since nobody would catch what it raises.
-        deliverer_ = std::thread([statuses = statusesOf(output), own = callback] {
-            for (const std::int32_t status : statuses)
-                own(status);
-        });
-    }
-
-    // After how many seconds, in steps of five, since on a busy machine a thread may be late.
-    std::string invalidate(const Value& output) {
-        const auto waited = std::chrono::steady_clock::now() - resumed_;
-        for (const std::int32_t status : statusesOf(output))
-            callback(status);
-        return format(" after %ld s", waited / std::chrono::seconds(5) * 5);
-    }
-
-private:
-    static std::vector<std::int32_t> statusesOf(const Value& output) {
-        std::vector<std::int32_t> statuses;
-        if (const Value::Array* given = output.array())
-            for (const Value& status : *given)
-                statuses.push_back(static_cast<std::int32_t>(*status.integer()));
-        return statuses;
-    }
-
-    std::chrono::steady_clock::time_point resumed_;
-    std::thread deliverer_;
+    std::chrono::steady_clock::time_point resumed;
+    std::jthread deliverer;
 };
 
 RPRegistration* RPRegisterForAvailability(RPAvailabilityCallback given) {
-    callback = std::move(given);
+    availabilityCallback = std::move(given);
     return called("RPRegisterForAvailability").result ? new RPRegistration : nullptr;
 }
 
 void RPRegistrationResume(RPRegistration* registration) {
-    registration->resume(called("RPRegistrationResume").output);
+    const Value output = called("RPRegistrationResume").output;
+    registration->resumed = std::chrono::steady_clock::now();
+    registration->deliverer = std::jthread([output] { deliver(output); });
 }
 
+// Says after how many seconds, in steps of five, since on a busy machine a thread may be late.
 void RPRegistrationInvalidate(RPRegistration* registration) {
-    const std::string waited = registration->invalidate(outcomeOf("RPRegistrationInvalidate").output);
-    called("RPRegistrationInvalidate", waited.c_str());
+    const auto waited = std::chrono::steady_clock::now() - registration->resumed;
+    deliver(outcomeOf("RPRegistrationInvalidate").output);
+    const std::string shown = format(" after %ld s", waited / std::chrono::seconds(5) * 5);
+    called("RPRegistrationInvalidate", shown.c_str());
 }
 
 void RPRelease(RPRegistration* registration) {

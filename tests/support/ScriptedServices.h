@@ -24,18 +24,16 @@ struct Outcome {
 
 // What each operation does; "queryInfo" and "performNextStage" are those of the updater. One that is missing succeeds
 // and hands out nothing.
-std::map<std::string, Outcome, std::less<>>& outcomes();
+extern std::map<std::string, Outcome, std::less<>> outcomes;
 
 // Begins anew, with outcomes with which every command succeeds.
 void arrangeServices();
 
-// The options of the session that was made last, as they are now.
-const Value::Dictionary& sessionOptions();
-
-// How many sessions are not released.
-int liveSessions();
+// The options of the session that was made last, as they are now, and how many sessions are not released.
+extern Value::Dictionary sessionOptions;
+extern int liveSessions;
 
 // The callback that was registered last, to be called at any later time.
-const RPAvailabilityCallback& availabilityCallback();
+extern RPAvailabilityCallback availabilityCallback;
 
 #endif

@@ -68,12 +68,10 @@ public:
         std::map<std::string, std::string> found;
         for (const fs::directory_entry& entry : fs::recursive_directory_iterator(host("/"))) {
             const std::string path = "/" + entry.path().lexically_relative(host("/")).string();
-            if (entry.is_symlink())
-                found[path] = "link to " + fs::read_symlink(entry.path()).string();
-            else if (entry.is_regular_file())
-                found[path] = read(path);
-            else
-                found[path] = entry.is_directory() ? "directory" : "special";
+            found[path] = entry.is_symlink()        ? "link to " + fs::read_symlink(entry.path()).string()
+                          : entry.is_regular_file() ? read(path)
+                          : entry.is_directory()    ? "directory"
+                                                    : "special";
         }
         return found;
     }
