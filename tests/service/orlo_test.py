@@ -135,7 +135,7 @@ class Store(OrloTest):
             if record:
                 self.assertEqual(self.service.put(record), SUCCESS)
                 self.service.write("tmp/in", os.urandom(2 << 20))
-                self.assertIn("full", str(self.service.orloctl("put-psd2", "/tmp/in")))
+                self.assertIn("full", str(self.service.orloctl("-v", "put-psd2", "/tmp/in")))
             self.fill()
             self.check_refused()
             os.remove(self.root / "var/lib/orlo/filler")
