@@ -87,11 +87,6 @@ Bytes changedAt(Bytes bytes, std::size_t place, std::uint8_t octet) {
     return bytes;
 }
 
-// A SEQUENCE with its length in the long form, which is no DER as long as the content is short.
-Bytes longSequence(const Bytes& content) {
-    return join({Bytes{0x30, 0x81, static_cast<std::uint8_t>(content.size())}, content});
-}
-
 struct Case {
     const char* name;
     Bytes octets;
@@ -171,23 +166,18 @@ TEST(Img4RSASignature, needsASoundKeyAndIsANumberBelowTheModulusOfItsLength) {
         {"negative modulus", sequence({rawInteger(n), positiveInteger(e)}), sound},
         {"even modulus", sequence({positiveInteger(lastChanged(n)), positiveInteger(e)}), sound},
         {"modulus of zero", sequence({positiveInteger({}), positiveInteger(e)}), {0x00}},
-        {"no modulus", sequence({rawInteger({}), positiveInteger(e)}), sound},
         {"exponent 1", sequence({positiveInteger(n), positiveInteger({1})}), forged},
         {"exponent 0", sequence({positiveInteger(n), rawInteger({0})}), sound},
         {"even exponent", sequence({positiveInteger(n), positiveInteger({2})}), sound},
         {"negative exponent", sequence({positiveInteger(n), rawInteger({0x81})}), sound},
         {"exponent as large as the modulus", sequence({positiveInteger(n), positiveInteger(n)}), sound},
-        {"exponent larger than the modulus", sequence({positiveInteger(n), positiveInteger(join({Bytes{1}, n}))}),
-         sound},
         {"no exponent", sequence({positiveInteger(n)}), sound},
         {"third number", sequence({positiveInteger(n), positiveInteger(e), integer(1)}), sound},
         {"octet behind", join({whole, Bytes{0}}), sound},
         {"SET", set({positiveInteger(n), positiveInteger(e)}), sound},
-        {"none", {}, sound},
         {"signature with a zero in front", whole, join({Bytes{0}, sound})},
         {"signature that lacks an octet", whole, Bytes(sound.begin(), sound.end() - 1)},
         {"signature plus modulus", whole, sum(sound, n)},
-        {"no signature", whole, {}},
     };
     for (const Row& row : rows)
         EXPECT_EQ(accepts(verify_signature_rsa, profile, row.key, row.signature), row.accepted) << row.name;
@@ -202,10 +192,8 @@ TEST(Img4RSASignature, needsAModulusWithinTheVerifiersLimits) {
         Bytes exponent = {0x01, 0x00, 0x01};
     };
     // The upper limits are tried with more than two primes, which are found sooner; to a verifier they look alike.
-    for (const Row& row :
-         {Row{1016, false, false}, Row{1024, true, true}, Row{3072, true, true}, Row{3073, true, false},
-          Row{4096, true, false}, Row{4097, false, false}, Row{2048, true, true, {0x03}},
-          Row{3072, true, true, longExponent}, Row{4096, true, false, {0x03}}, Row{4096, true, false, longExponent}}) {
+    for (const Row& row : {Row{1016, false, false}, Row{1024, true, true, {0x03}}, Row{3072, true, true, longExponent},
+                           Row{3073, true, false}, Row{4096, true, false}, Row{4097, false, false}}) {
         const Key key = makeRSAKey(row.bits, row.exponent);
         const Bytes bits = publicKeyBits(key);
         const Bytes signature = sign(key, profile.digestInfo->length, message);
@@ -223,7 +211,6 @@ Bytes pair(const Bytes& r, const Bytes& s) {
 // The signature of the numbers r and s, both of which have their highest bit set, and others made of them.
 std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) {
     const Bytes R = positiveInteger(r), S = positiveInteger(s), whole = pair(r, s);
-    const Bytes longR = join({Bytes{0x02, 0x81}, Bytes(R.begin() + 1, R.end())});
     return {
         {"sound", whole, true},
         {"r = 0", pair({}, s)},
@@ -238,13 +225,8 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
         {"s missing", sequence({R})},
         {"third number", sequence({R, S, positiveInteger({1})})},
         {"octets behind", join({whole, null})},
-        {"cut short", Bytes(whole.begin(), whole.end() - 1)},
         {"r an OCTET STRING", sequence({octets(r), S})},
         {"SET", set({R, S})},
-        {"long length", longSequence(join({R, S}))},
-        {"long length of r", sequence({longR, S})},
-        {"indefinite length", join({Bytes{0x30, 0x80}, R, S, Bytes{0x00, 0x00}})},
-        {"none", {}},
     };
 }
 
@@ -259,21 +241,17 @@ std::vector<Case> pointCases(const Key& key) {
         {"not on the curve", lastChanged(point)},
         {"hybrid", changedAt(point, 0, 0x06 | parity)},
         {"compressed", changedAt(Bytes(point.begin(), point.end() - static_cast<long>(half)), 0, 0x02 | parity)},
-        {"form of a compressed point", changedAt(point, 0, 0x02)},
         {"infinity", {0x00}},
         {"coordinates of the field's size", join({Bytes{0x04}, field, field})},
         {"octet behind", join({point, Bytes{0}})},
-        {"octet missing", Bytes(point.begin(), point.end() - 1)},
-        {"whole SubjectPublicKeyInfo", publicKeyInfo(key)},
         {"of the other curve", publicKeyBits(makeECKey(isP256 ? "P-384" : "P-256"))},
         {"of another key", publicKeyBits(makeECKey(isP256 ? "P-256" : "P-384"))},
-        {"none", {}},
     };
 }
 
-void checkCurve(const char* name, const Img4TrustProfile& usual) {
-    SCOPED_TRACE(name);
-    const Key key = makeECKey(name);
+void checkCurve(const char* curve, const Img4TrustProfile& usual) {
+    SCOPED_TRACE(curve);
+    const Key key = makeECKey(curve);
     const Bytes point = publicKeyBits(key);
     const std::size_t size = usual.digestInfo->length;
     Bytes signature;
@@ -301,14 +279,12 @@ TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
     const Key ecKey = makeECKey("P-384");
     const std::tuple<Verifier, const Img4TrustProfile&, const Key&> rows[] = {
         {verify_signature_rsa, kImg4DecodeSecureBootRsa4kSha384, rsaKey()},
-        {verify_signature_rsa3k, kImg4DecodeSecureBootRsa3kSha384, rsaKey()},
         {verify_signature_ecdsa, kImg4DecodeSecureBootEc384Sha384, ecKey}};
     const Img4DigestInfo bare = {48, nullptr, nullptr};
     for (const auto& [verify, profile, signer] : rows) {
         const Bytes digest = digestOfMessage(profile), bits = publicKeyBits(signer), octets = sign(signer, 48, message);
         const DERItem key = itemOf(bits), signature = itemOf(octets), none = {};
-        Img4TrustProfile withoutDigest = profile, withoutKeyAlgorithm = profile;
-        withoutDigest.digestInfo = nullptr;
+        Img4TrustProfile withoutKeyAlgorithm = profile;
         withoutKeyAlgorithm.keyAlgorithmOid = nullptr;
         const Img4TrustProfile withoutImplementation = profileWith(profile, bare);
         ASSERT_EQ(verify(&key, &signature, digest.data(), 48, &profile), DERSuccess);
@@ -316,7 +292,6 @@ TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
         EXPECT_EQ(verify(&none, &signature, digest.data(), 48, &profile), Img4Failure);
         EXPECT_EQ(verify(&key, &none, digest.data(), 48, &profile), Img4Failure);
         EXPECT_EQ(verify(&key, &signature, digest.data(), 32, &profile), Img4Failure);
-        EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutDigest), Img4Failure);
         EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutImplementation), Img4Failure);
         EXPECT_EQ(verify(&key, &signature, digest.data(), 48, &withoutKeyAlgorithm),
                   verify == verify_signature_ecdsa ? Img4Failure : DERSuccess);
