@@ -14,7 +14,7 @@
 
 namespace {
 
-using Response = std::optional<HSMessageResponse>;
+using Lines = std::vector<std::string>;
 
 // A plug-in server that does as the test says, and what the thread of the bus takes from it, as lines.
 class RequestThreadTest : public testing::Test, protected VeltraPluginServerInterface, protected RequestReceiver {
@@ -27,26 +27,25 @@ protected:
     }
 
     void receive(const RequestMessage& message) override {
-        taken.push_back(std::to_string(message.level) + " " + message.source + ": " + message.text);
+        taken.push_back(std::to_string(message.level) + " " + message.source + ": " + message.text.substr(0, 20));
     }
 
     void receive(const RequestEnding& ending) override {
         if (refuses && ending.response && ending.response->value().statusCode() == 0)
             throw std::bad_alloc();
-        std::string how = ending.completed ? "completed" : "not completed";
         try {
             if (ending.failure)
                 std::rethrow_exception(ending.failure);
-            how += " " + std::to_string(ending.response->value().statusCode());
+            const std::string status = std::to_string(ending.response->value().statusCode());
+            taken.push_back((ending.completed ? "completed " : "not completed ") + status);
         } catch (const std::exception& failure) {
-            how = failure.what();
+            taken.push_back(failure.what());
         }
-        taken.push_back(how);
         hasEnded = true;
     }
 
     // What comes of one request.
-    std::vector<std::string> serve(bool wantsMessages, std::function<void(std::string, const HSCompletion&)> serving) {
+    Lines serve(bool wantsMessages, std::function<void(std::string, const HSCompletion&)> serving) {
         work = std::move(serving);
         taken.clear();
         hasEnded = false;
@@ -59,40 +58,32 @@ protected:
         return taken;
     }
 
-    static Response response(std::int64_t status) { return HSMessageResponse::initWithName("name", status); }
+    static std::optional<HSMessageResponse> response(std::int64_t status) {
+        return HSMessageResponse::initWithName("name", status);
+    }
 
     std::function<void(std::string, const HSCompletion&)> work;
-    std::vector<std::string> taken;
+    Lines taken;
     bool hasEnded = false;
     bool refuses = false;
     RequestThread thread{*this};
 };
 
-using Lines = std::vector<std::string>;
-
-TEST_F(RequestThreadTest, messagesComeBeforeTheEndingAndNoneBehindIt) {
+TEST_F(RequestThreadTest, messagesAreBoundedAndComeBeforeTheEndingAndNoneBehindIt) {
+    const std::string filling(RequestThread::maximumMessageOctets - std::string("ZPOrlofirstframeworkname").size(),
+                              'x');
     const auto talk = [&](const std::string& name, const HSCompletion& completion) {
         thread.addMessage(2, "ZPOrlo", "first");
         std::thread([&] { thread.addMessage(4, "framework", name); }).join(); // as a callback of a service does
+        thread.addMessage(2, "", filling);
+        thread.addMessage(2, "", "x");
         completion(true, response(0));
         thread.addMessage(2, "ZPOrlo", "late");
     };
-    const Lines all = {"2 ZPOrlo: first", "4 framework: name", "completed 0"};
+    const Lines all = {"2 ZPOrlo: first", "4 framework: name", "2 : " + filling.substr(0, 20), "completed 0"};
     EXPECT_EQ(serve(true, talk), all);
     EXPECT_EQ(serve(false, talk), Lines{"completed 0"});
     EXPECT_EQ(serve(true, talk), all);
-}
-
-TEST_F(RequestThreadTest, messagesAreBoundedForEachRequest) {
-    for (int i = 0; i < 2; ++i) {
-        serve(true, [&](const std::string&, const HSCompletion& completion) {
-            const std::string half(RequestThread::maximumMessageOctets / 2, 'x');
-            for (int line = 0; line < 3; ++line)
-                thread.addMessage(2, "", half);
-            completion(true, response(0));
-        });
-        EXPECT_EQ(taken.size(), 3u); // two messages, and the ending
-    }
 }
 
 TEST_F(RequestThreadTest, everyRequestEndsOnceHoweverItsServingGoes) {
