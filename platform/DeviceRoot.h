@@ -4,7 +4,8 @@
 //
 // A path is walked name by name, each looked up in a directory that is held open, so that neither "..", nor an absolute
 // symbolic link, nor anything that is renamed or swapped in meanwhile leads out of the root; a link of /proc counts as
-// the path that it shows. This needs nothing of the kernel that an old one, a system-call filter or an emulator lacks.
+// the path that it shows. The kernel is asked for a path without links in one call (openat2); an old kernel, a
+// system-call filter or an emulator that lacks it costs time and nothing else.
 // Code that needs more than one operation on a place opens the directory once and goes on with the *at system calls.
 #ifndef VELTRA_PLATFORM_DEVICE_ROOT_H
 #define VELTRA_PLATFORM_DEVICE_ROOT_H

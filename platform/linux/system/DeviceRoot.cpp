@@ -12,7 +12,10 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <linux/openat2.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
 namespace {
 
@@ -52,6 +55,15 @@ FileDescriptor openFound(const FileDescriptor& found, const struct stat& status,
     return file && ::fstat(file.get(), &opened) == 0 && isSame(opened, status) ? std::move(file) : none(EAGAIN);
 }
 
+// What `path` names in `directory` when no link lies on the way and the way does not leave the directory, looked up by
+// the kernel in one call. None for every other path, and where the kernel or a filter has no such call.
+FileDescriptor findBeneath(const FileDescriptor& directory, const std::string& path) {
+    open_how how = {};
+    how.flags = O_PATH | O_CLOEXEC;
+    how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
+    return FileDescriptor(static_cast<int>(::syscall(SYS_openat2, directory.get(), path.c_str(), &how, sizeof how)));
+}
+
 // The way from the device root to what a path names, one name at a time. No name is looked up but in a directory that
 // is held open, links are read and never followed by the kernel, and ".." goes back to the directory that was passed on
 // the way here, wherever that has been moved to meanwhile.
@@ -64,6 +76,12 @@ public:
         passed_.push_back(openDeviceRoot());
         if (!passed_.back())
             return {};
+        if (path.size() <= deepest) { // most paths are short and lead through no link
+            name_ = path.substr(std::min(path.find_first_not_of('/'), path.size()));
+            FileDescriptor found = findBeneath(passed_.back(), name_);
+            if (found && ::fstat(found.get(), &status_) == 0)
+                return found;
+        }
         rest_ = path;
         for (int linksLeft = links == Links::Followed ? mostLinks : 0; takeName();) {
             if (name_ == ".." && passed_.size() > 1)

@@ -101,8 +101,8 @@ std::optional<Value> propertyListToValue(const Value::Data& xml) {
 Value bundleInformationList() {
     constexpr std::size_t maximumSize = std::size_t{1} << 20;
     std::error_code error;
-    const std::filesystem::path executable = std::filesystem::read_symlink("/proc/self/exe", error);
-    if (error)
+    static const std::filesystem::path executable = std::filesystem::read_symlink("/proc/self/exe", error);
+    if (executable.empty())
         return {};
     // The list comes with the program and not with the device, so it does not lie below the device root.
     const std::filesystem::path list = executable.parent_path() / "Info.plist";
