@@ -1,6 +1,5 @@
 #include "platform/Crypto.h"
 
-#include <span>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -64,21 +63,11 @@ TEST(Crypto, anHmacIsRightOrRefusedWhereverMemoryEnds) {
 
 // The short message of the FIPS 180-4 examples.
 TEST(Crypto, digestsAgreeWithThePublishedExamples) {
-    const struct {
-        bool (*compute)(const void* data, std::size_t length, std::uint8_t* out) noexcept;
-        std::size_t size;
-        const char* digest;
-    } rows[] = {
-        {crypto::sha1, crypto::sha1Size, "a9993e364706816aba3e25717850c26c9cd0d89d"},
-        {crypto::sha256, crypto::sha256Size, "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
-        {crypto::sha384, crypto::sha384Size,
-         "cb00753f45a35e8bb5a03d699ac65007272c32ab0eded1631a8b605a43ff5bed8086072ba1e7cc2358baeca134c825a7"},
-    };
-    for (const auto& row : rows) {
-        std::uint8_t out[crypto::sha384Size];
-        ASSERT_TRUE(row.compute("abc", 3, out));
-        EXPECT_EQ(hexadecimal(std::span(out, row.size)), row.digest);
-    }
+    std::uint8_t one[crypto::sha1Size], other[crypto::sha384Size];
+    EXPECT_TRUE(crypto::sha1("abc", 3, one) && crypto::sha384("abc", 3, other));
+    EXPECT_EQ(hexadecimal(one), "a9993e364706816aba3e25717850c26c9cd0d89d");
+    EXPECT_EQ(hexadecimal(other),
+              "cb00753f45a35e8bb5a03d699ac65007272c32ab0eded1631a8b605a43ff5bed8086072ba1e7cc2358baeca134c825a7");
 }
 
 TEST(Crypto, anHmacNeedsAKeyAndCanBeUsedAgain) {
