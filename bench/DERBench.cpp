@@ -53,18 +53,11 @@ Bytes sequenceOf(std::uint64_t entries) {
     return der;
 }
 
-bool walkVeltra(const DERItem& content, std::uint64_t* seen) {
+DERReturn takeItem(const DERDecodedInfo* item, bool*, void* seen) {
     constexpr DERTag constructed = UINT64_C(1) << 61;
-    DERSequence sequence;
-    DERDecodeSeqContentInit(&content, &sequence);
-    DERDecodedInfo item;
-    DERReturn result = DERDecodeSeqNext(&sequence, &item);
-    for (; result == DERSuccess; result = DERDecodeSeqNext(&sequence, &item)) {
-        *seen += 1 + item.content.length;
-        if ((item.tag & constructed) != 0 && !walkVeltra(item.content, seen))
-            return false;
-    }
-    return result == DEREndOfSequence;
+    *static_cast<std::uint64_t*>(seen) += 1 + item->content.length;
+    return (item->tag & constructed) != 0 ? DERDecodeSequenceContentWithBlock(&item->content, takeItem, seen)
+                                          : DERSuccess;
 }
 
 bool walkOpenSSL(const unsigned char* next, const unsigned char* end, std::uint64_t* seen) {
@@ -126,7 +119,8 @@ struct Contender {
 constexpr Contender contenders[] = {
     {"veltra",
      [](Bytes& der, std::uint64_t* seen) {
-         return walkVeltra({der.data(), der.size()}, seen);
+         const DERItem content = {der.data(), der.size()};
+         return DERDecodeSequenceContentWithBlock(&content, takeItem, seen) == DERSuccess;
      }},
     {"openssl", [](Bytes& der, std::uint64_t* seen) { return walkOpenSSL(der.data(), der.data() + der.size(), seen); }},
     {"mbedtls", [](Bytes& der, std::uint64_t* seen) { return walkMbedTLS(der.data(), der.data() + der.size(), seen); }},
@@ -154,7 +148,7 @@ void walk(benchmark::State& state, const Contender& contender, std::uint64_t ent
 int main(int argc, char** argv) {
     for (const std::uint64_t entries : {10'000U, 100'000U, 1'000'000U})
         for (const Contender& contender : contenders) {
-            const std::string name = std::string("walk/") + contender.name + "/" + std::to_string(entries);
+            const std::string name = std::string(BENCH_FAMILY "/") + contender.name + "/" + std::to_string(entries);
             benchmark::RegisterBenchmark(name.c_str(), walk, contender, entries)->Unit(benchmark::kMillisecond);
         }
     benchmark::Initialize(&argc, argv);

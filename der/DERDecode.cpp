@@ -39,7 +39,11 @@ inline DERFault readHighTagNumber(Reader* reader, uint64_t* number) {
         return DERFaultTagForm;
     // Containers are full of tags that spell four characters, which take five digits. Read at fixed places, they let
     // the next item's place be known sooner than a loop does.
-    if (leftOf(*reader) > codeDigits && (next[0] & next[1] & next[2] & next[3] & ~next[4] & moreBit) != 0) {
+    constexpr uint32_t fourMoreBits = 0x80808080;
+    uint32_t four = 0;
+    if (leftOf(*reader) > codeDigits)
+        std::memcpy(&four, next, sizeof four);
+    if ((four & fourMoreBits) == fourMoreBits && next[4] < moreBit) {
         *number = (next[0] & 0x7FULL) << 28 | (next[1] & 0x7FU) << 21 | (next[2] & 0x7FU) << 14 |
                   (next[3] & 0x7FU) << 7 | next[4];
         reader->next += codeDigits;
@@ -334,13 +338,11 @@ DERReturn DERDecodeSequenceContentWithBlock(const DERItem* content, DERDecodeSeq
     DERSequence sequence = walkOf(*content);
     DERDecodedInfo decoded;
     bool stop = false;
-    DERReturn result = decodeNext(&sequence, &decoded);
-    while (result == DERSuccess) {
-        result = callback(&decoded, &stop, context);
-        if (result == DERSuccess && stop)
-            return DERSuccess;
+    DERReturn result = DERSuccess;
+    while (result == DERSuccess && !stop) {
+        result = decodeNext(&sequence, &decoded);
         if (result == DERSuccess)
-            result = decodeNext(&sequence, &decoded);
+            result = callback(&decoded, &stop, context);
     }
     return result == DEREndOfSequence ? DERSuccess : result;
 }
