@@ -113,18 +113,15 @@ private:
 };
 
 TEST_F(HSPipeUtilTest, theOutcomeIsDescribedInTheResponseTheErrorAndTheLog) {
-    const char* const signalled = "/usr/bin/program was terminated by signal %d\n";
     const struct {
         std::string end;
         int result;
-        std::string log; // about a signal
+        std::string log;
         const char* interpreter = "/bin/sh";
     } rows[] = {
-        {"echo out; echo err >&2; exit 0", 0, ""},
-        {"echo out; echo err >&2; exit 3", 3, ""},
-        {"echo out; echo err >&2; exit 255", 255, ""},
-        {"echo out; echo err >&2; kill -TERM $$", -1, format(signalled, SIGTERM)},
-        {"echo out; echo err >&2; kill -KILL $$", -1, format(signalled, SIGKILL)},
+        {"echo out; echo err >&2; exit 0", 0, "exit status: 0\n"},
+        {"echo out; echo err >&2; exit 255", 255, "exit status: 255\n"},
+        {"echo out; echo err >&2; kill -KILL $$", -1, "/usr/bin/program was terminated by signal 9\n"},
         // PTRACE_TRACEME: only a traced child is reported as stopped.
         {"import ctypes, os, signal\nos.write(1, b'out\\n')\nos.write(2, b'err\\n')\nctypes.CDLL(None).ptrace(0, 0, 0, "
          "0)\n"
@@ -136,33 +133,32 @@ TEST_F(HSPipeUtilTest, theOutcomeIsDescribedInTheResponseTheErrorAndTheLog) {
         for (const bool withInput : {false, true}) {
             SCOPED_TRACE(row.end);
             recordLog();
-            const bool good = row.result == 0;
-            EXPECT_EQ(withInput ? runWith(bytes("input"), {"-x", "y"}) : run({"-x"}), good ? 0 : 7);
-            const std::string description =
-                good ? ""
-                     : format("Error executing command%s, result = %d\n", withInput ? " with data" : "", row.result);
-            EXPECT_EQ(response_, Value(Value::Dictionary{{"Status", good ? 0 : 7},
-                                                         {"Output", withInput ? "out\n" : "out\nerr\n"},
-                                                         {"Error", description}}));
-            EXPECT_EQ(error_, good ? std::nullopt : std::optional(Error{"HSErrorDomain", 7, description}));
-
-            const std::string name = withInput
-                                         ? "+[HSPipeUtil HSPipeUtilExecCommandWithData:options:data:response:error:]"
-                                         : "+[HSPipeUtil HSPipeUtilExecCommand:options:response:error:]";
-            Lines lines = {"Enter " + name + " at line *\n"};
-            if (withInput)
-                lines.insert(lines.end(), {"argv[0] = /usr/bin/program\n", "argv[1] = -x\n", "argv[2] = y\n",
-                                           "entering hs_execute_command_with_input_data: /usr/bin/program (* - 5)\n"});
-            lines.insert(lines.end(), {"executing /usr/bin/program\n", "Start Reading output from shell command\n"});
-            if (withInput)
-                lines.insert(lines.end(), {"waiting for child to exit\n", "child exited\n"});
-            if (!row.log.empty() || withInput)
-                lines.push_back(row.log.empty() ? format("exit status: %d\n", row.result) : row.log);
-            if (error_)
-                lines.insert(lines.end(), {description, error_->description()});
-            lines.push_back("Exit " + name + format(" at line *, success = %d\n", good ? 0 : 7));
-            EXPECT_EQ(log(), lines);
+            const int code = row.result == 0 ? 0 : 7;
+            EXPECT_EQ(withInput ? runWith(bytes("input"), {"-x", "y"}) : run({"-x"}), code);
+            const std::string description = code == 0 ? ""
+                                                      : format("Error executing command%s, result = %d\n",
+                                                               withInput ? " with data" : "", row.result);
+            const char* output = withInput ? "out\n" : "out\nerr\n";
+            EXPECT_EQ(response_,
+                      Value(Value::Dictionary{{"Status", code}, {"Output", output}, {"Error", description}}));
+            EXPECT_EQ(error_, code == 0 ? std::nullopt : std::optional(Error{"HSErrorDomain", 7, description}));
         }
+        // Of a call without input the transcripts have the lines.
+        const std::string name = "+[HSPipeUtil HSPipeUtilExecCommandWithData:options:data:response:error:]";
+        Lines lines = {"Enter " + name + " at line *\n",
+                       "argv[0] = /usr/bin/program\n",
+                       "argv[1] = -x\n",
+                       "argv[2] = y\n",
+                       "entering hs_execute_command_with_input_data: /usr/bin/program (* - 5)\n",
+                       "executing /usr/bin/program\n",
+                       "Start Reading output from shell command\n",
+                       "waiting for child to exit\n",
+                       "child exited\n",
+                       row.log};
+        if (error_)
+            lines.insert(lines.end(), {error_->text, error_->description()});
+        lines.push_back("Exit " + name + format(" at line *, success = %d\n", error_ ? 7 : 0));
+        EXPECT_EQ(log(), lines);
     }
 }
 
@@ -174,9 +170,9 @@ TEST_F(HSPipeUtilTest, aProgramThatCannotBeStartedIsAFailureWithoutOutput) {
     for (const char* path : {"/noise", "/lost"})
         fs::permissions(root_.host(path), fs::perms::owner_all);
     root_.link("/outside", fs::canonical("/bin/sh"));
-    const std::pair<std::string, int> rows[] = {
-        {"/missing", ENOENT}, {"", ENOENT},      {"/directory", EACCES}, {"/plain", EACCES},
-        {"/noise", ENOEXEC},  {"/lost", ENOENT}, {"/outside", ENOENT},   {"/../../../../../../../bin/sh", ENOENT}};
+    const std::pair<std::string, int> rows[] = {{"/missing", ENOENT}, {"", ENOENT},        {"/directory", EACCES},
+                                                {"/plain", EACCES},   {"/noise", ENOEXEC}, {"/lost", ENOENT},
+                                                {"/outside", ENOENT}};
     for (const auto& [path, number] : rows) {
         const std::string failed = "posix_spawn " + path + " failed: " + text(number);
         recordLog();
@@ -213,8 +209,7 @@ TEST_F(HSPipeUtilTest, withoutDescriptorsForThePipesNothingIsRunAndNoneStaysOpen
         bool withInput;
         int unused;
         const std::string& line;
-    } rows[] = {{false, 0, noPipe}, {false, 1, noPipe}, {false, 2, noStart}, {true, 1, noPipe},
-                {true, 2, noPipe},  {true, 3, noPipe},  {true, 4, noStart}};
+    } rows[] = {{false, 1, noPipe}, {false, 2, noStart}, {true, 3, noPipe}, {true, 4, noStart}};
     for (const auto& row : rows) {
         inOwnProcess([&] {
             leaveDescriptors(row.unused);
@@ -270,44 +265,33 @@ TEST_F(HSPipeUtilTest, withoutAResponseNothingIsRun) {
     EXPECT_EQ(root_.read("/trace"), "(missing)");
 }
 
-TEST_F(HSPipeUtilTest, theChildGetsItsArgumentsAnEmptyEnvironmentAndNoBlockedSignal) {
-    binary("/usr/bin/env");
-    EXPECT_EQ(run(), 0);
-    EXPECT_EQ(output(), "");
-    binary("/usr/bin/printf");
-    EXPECT_EQ(run({"<%s>", "a b", "", "ü"}), 0);
-    EXPECT_EQ(output(), "<a b><><ü>");
-
-    sigset_t signals, previous;
-    sigemptyset(&signals);
-    sigaddset(&signals, SIGTERM);
-    ASSERT_EQ(::pthread_sigmask(SIG_BLOCK, &signals, &previous), 0);
-    script("grep SigBlk /proc/self/status");
-    EXPECT_EQ(run(), 0);
-    ::pthread_sigmask(SIG_SETMASK, &previous, nullptr);
-    EXPECT_EQ(output(), "SigBlk:\t0000000000000000\n");
-}
-
 // Keeps from programs what this process itself has inherited, as the pipe to the test that waits for it.
 void keepOwnDescriptors() {
     ASSERT_EQ(::close_range(3, ~0U, CLOSE_RANGE_CLOEXEC), 0);
 }
 
-TEST_F(HSPipeUtilTest, theChildHasItsDevicePathForItsNameAndNoDescriptorButTheStandardOnes) {
+TEST_F(HSPipeUtilTest, theChildHasItsDevicePathForItsNameItsArgumentsAndNothingElseOfThisProcess) {
+    binary("/usr/bin/env");
+    EXPECT_EQ(run(), 0);
+    EXPECT_EQ(output(), "");
     root_.link("/link", "/usr/bin/program");
     binary("/bin/cat");
     EXPECT_EQ(hs_execute_command({"/link", "/proc/self/cmdline"}, &response_, nullptr), 0);
     EXPECT_EQ(output(), "/link");
-    script("echo \"$0\"; exec ls /proc/self/fd");
+    script("printf '<%s>' \"$@\"; echo \"$0\"; grep SigBlk /proc/self/status; exec ls /proc/self/fd");
     inOwnProcess([&] {
         keepOwnDescriptors();
-        for (const bool withInput : {false, true}) {
-            EXPECT_EQ(withInput ? hs_execute_command_with_input_data({"/link"}, "x", 1, &response_, nullptr)
-                                : hs_execute_command({"/link"}, &response_, nullptr),
-                      0);
-            EXPECT_EQ(output(),
-                      fs::canonical(root_.host(program)).string() + "\n0\n1\n2\n3\n"); // 3 is the listing's own
-        }
+        sigset_t signals;
+        sigemptyset(&signals);
+        sigaddset(&signals, SIGTERM);
+        ASSERT_EQ(::pthread_sigmask(SIG_BLOCK, &signals, nullptr), 0);
+        const std::string expected = "<a b><><ü>" + fs::canonical(root_.host(program)).string() +
+                                     "\nSigBlk:\t0000000000000000\n0\n1\n2\n3\n"; // 3 is the listing's own
+        const std::vector<std::string> words = {"/link", "a b", "", "ü"};
+        EXPECT_EQ(hs_execute_command(words, &response_, nullptr), 0);
+        EXPECT_EQ(output(), expected);
+        EXPECT_EQ(hs_execute_command_with_input_data(words, "x", 1, &response_, nullptr), 0);
+        EXPECT_EQ(output(), expected);
     });
 }
 
@@ -402,15 +386,11 @@ TEST_F(HSPipeUtilTest, anyOutputBecomesText) {
     const std::string bad = "\uFFFD";
     const std::pair<std::string, std::string> rows[] = {
         {a(1022) + "é" + "b", a(1022) + "éb"},
-        {a(1021) + "€" + "b", a(1021) + "€b"},
-        {a(1022) + "😀", a(1022) + "😀"},
         {a(1020) + "😀" + a(1022), a(1020) + "😀" + a(1022)},
         {a(1022) + "\xC3", a(1022) + bad},
         {a(1022) + "\xE2" + "x", a(1022) + bad + "x"},
         {a(1021) + "\xE2\x82" + "\xE2\x82\xAC", a(1021) + bad + "€"},
         {a(1023) + "\x80" + a(5), a(1023) + bad + a(5)},
-        {"\xFF\xC0\xAFz", bad + bad + bad + "z"},
-        {"ab\0cd"s, "ab"},
         {a(1000) + "\0"s + a(30), a(1000) + a(8)},
         {"\xC3\0\xA9"s, bad},
         {a(1022) + "\xC3" + "\0x"s, a(1022) + bad},
@@ -426,19 +406,13 @@ TEST_F(HSPipeUtilTest, anyOutputBecomesText) {
 
 TEST_F(HSPipeUtilTest, aProcessWithoutStandardDescriptorsRunsProgramsAllTheSame) {
     script("cat");
-    int saved[3];
-    for (int number = 0; number < 3; ++number) {
-        saved[number] = ::fcntl(number, F_DUPFD_CLOEXEC, 10);
-        ::close(number);
-    }
-    const int plain = run(), fed = runWith(bytes("in"));
-    for (int number = 0; number < 3; ++number) {
-        ::dup2(saved[number], number);
-        ::close(saved[number]);
-    }
-    EXPECT_EQ(plain, 7); // without an input to inherit, cat fails and says so
-    EXPECT_EQ(fed, 0);
-    EXPECT_EQ(output(), "in");
+    inOwnProcess([&] {
+        for (int number = 0; number < 3; ++number)
+            ::close(number);
+        EXPECT_EQ(run(), 7); // without an input to inherit, cat fails and says so
+        EXPECT_EQ(runWith(bytes("in")), 0);
+        EXPECT_EQ(output(), "in");
+    });
 }
 
 } // namespace
