@@ -47,17 +47,14 @@ constexpr Initialise asUnsigned = Img4DecodeInitUnsignedManifest;
 const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
     {"payload only", asContainer, containerWith(soundPayload), DERSuccess},
     {"everything", asContainer, exampleContainer(), DERSuccess},
-    {"restore information without manifest", asContainer, container(soundPayload, {}, soundRestoreInfo), DERSuccess},
     {"trailing octet", asContainer, with(containerWith(soundPayload), {0}), DERBufferOverflow},
     {"SET for a container", asContainer, set({ia5("IMG4"), soundPayload}), DERUnexpectedTag},
     {"wrong magic", asContainer, sequence({ia5("IMG5"), soundPayload}), DERUnexpectedTag},
-    {"magic of five characters", asContainer, sequence({ia5("IMG44"), soundPayload}), DERUnexpectedTag},
     {"no payload", asContainer, sequence({ia5("IMG4")}), DERIncompleteSequence},
     {"manifest instead of payload", asContainer, sequence({ia5("IMG4"), context(0, soundManifest)}), DERUnexpectedTag},
     {"unknown entry at the end", asContainer, sequence({ia5("IMG4"), soundPayload, context(2, {})}), DERUnexpectedTag},
     {"entry after the last", asContainer,
      sequence({ia5("IMG4"), soundPayload, context(1, soundRestoreInfo), integer(1)}), DERDecodeError},
-    {"empty manifest entry", asContainer, sequence({ia5("IMG4"), soundPayload, context(0, {})}), DERDecodeError},
     {"unsigned manifest in a container", asContainer, container(soundPayload, unsignedManifest({}), {}),
      DERIncompleteSequence},
     {"wrong magic of the restore information", asContainer,
@@ -69,17 +66,13 @@ const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
      DERUnexpectedTag},
     {"payload without data", asPayload, sequence({ia5("IM4P"), ia5("sepi"), ia5("1")}), DERIncompleteSequence},
     {"octets after a bare payload", asPayload, with(soundPayload, {1, 2}), DERSuccess},
-    {"algorithm 1", asContainer, containerWith(payloadWith({compression(1, 5)})), DERSuccess},
     {"algorithm 2", asContainer, containerWith(payloadWith({compression(2, 5)})), DERParamError},
     {"size that no 32 bits hold", asPayload, payloadWith({compression(0, 0x100000000)}), DERSuccess},
     {"negative algorithm", asPayload, payloadWith({sequence({item(DERTagInteger, {0x80}), integer(1)})}),
      DERParamError},
     {"compression without size", asPayload, payloadWith({sequence({integer(1)})}), DERParamError},
-    {"empty compression", asPayload, payloadWith({emptySequence}), DERParamError},
     {"payload properties", asPayload, payloadWith({context(0, payloadProperties({}))}), DERSuccess},
     {"payload properties with a wrong magic", asPayload, payloadWith({context(0, sequence({ia5("PAYQ"), set({})}))}),
-     DERUnexpectedTag},
-    {"payload properties without a SET", asPayload, payloadWith({context(0, sequence({ia5("PAYP")}))}),
      DERUnexpectedTag},
     {"empty payload properties", asPayload, payloadWith({context(0, {})}), DERUnexpectedTag},
     {"compression is looked at before the properties", asPayload, payloadWith({compression(2, 1), context(0, {})}),
@@ -90,9 +83,7 @@ const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
     {"entry after compression and properties", asPayload,
      payloadWith({compression(1, 1), context(0, payloadProperties({})), integer(1)}), DERDecodeError},
 
-    {"bare manifest", asManifest, soundManifest, DERSuccess},
     {"manifest with a trailing octet", asManifest, with(soundManifest, {0}), DERBufferOverflow},
-    {"container for a manifest", asManifest, exampleContainer(), DERUnexpectedTag},
     {"wrong magic of the manifest", asManifest, manifestOf(integer(0), body, ia5("IM4N")), DERUnexpectedTag},
     {"version 2", asManifest, manifestOf(integer(2)), DERSuccess},
     {"version 3", asManifest, manifestOf(integer(3)), DERUnexpectedTag},
@@ -131,8 +122,7 @@ TEST(Img4Init, reportsTheFirstCheckThatFails) {
 
 TEST(Img4Init, missingArgumentsAreRefusedAndTheRecordIsZeroedAllTheSame) {
     const Img4Record zero = {};
-    for (const Initialise initialise :
-         {Img4DecodeInit, Img4DecodeInitPayload, Img4DecodeInitManifest, Img4DecodeInitUnsignedManifest}) {
+    for (const Initialise initialise : {asContainer, asPayload, asManifest, asUnsigned}) {
         Img4Record record;
         std::memset(&record, 0xA5, sizeof record);
         EXPECT_EQ(initialise(nullptr, 4, &record), DERParamError);
@@ -151,27 +141,20 @@ TEST(Img4Init, fieldsLieWhereTheyWereWritten) {
     EXPECT_EQ(bytesOf(record.manifestRaw), ticket);
     EXPECT_EQ(record.payloadRaw.data[0], 0x30);
     EXPECT_EQ(record.payloadRaw.data + record.payloadRaw.length + 4 /* header of [0] */, record.manifestRaw.data);
-    EXPECT_EQ(bytesOf(record.payload.type), Bytes({'s', 'e', 'p', 'i'}));
-    EXPECT_EQ(bytesOf(record.payload.data), filler(200, 8));
-    EXPECT_EQ(bytesOf(record.payload.keybag), filler(40, 9));
     EXPECT_EQ(bytesOf(record.manifest.version), Bytes({0}));
     EXPECT_EQ(bytesOf(record.manifest.body).front(), 0x31) << "the body is recorded with its header";
     EXPECT_EQ(bytesOf(record.manifest.signature), filler(48));
     EXPECT_EQ(bytesOf(record.restoreInfo.magic), Bytes({'I', 'M', '4', 'R'}));
-    EXPECT_EQ(record.manifest.certProperties.data, nullptr);
-    EXPECT_EQ(record.manb.data, nullptr);
 
-    Img4Record bare;
-    ASSERT_EQ(Img4DecodeInitManifest(ticket.data(), ticket.size(), &bare), DERSuccess);
-    EXPECT_EQ(bare.manifestRaw.data, ticket.data());
-    EXPECT_EQ(bare.manifestRaw.length, ticket.size());
-    EXPECT_EQ(bare.payloadRaw.data, nullptr);
+    ASSERT_EQ(Img4DecodeInitManifest(ticket.data(), ticket.size(), &record), DERSuccess);
+    EXPECT_EQ(record.manifestRaw.data, ticket.data());
+    EXPECT_EQ(record.manifestRaw.length, ticket.size());
+    EXPECT_EQ(record.payloadRaw.data, nullptr) << "nothing is left of the earlier use";
 
     const Bytes tailed = with(soundPayload, {7});
-    ASSERT_EQ(Img4DecodeInitPayload(tailed.data(), tailed.size(), &bare), DERSuccess);
-    EXPECT_EQ(bare.payloadRaw.data, tailed.data());
-    EXPECT_EQ(bare.payloadRaw.length, tailed.size()) << "the buffer as it was given";
-    EXPECT_EQ(bare.manifestRaw.data, nullptr) << "nothing is left of the earlier use";
+    ASSERT_EQ(Img4DecodeInitPayload(tailed.data(), tailed.size(), &record), DERSuccess);
+    EXPECT_EQ(record.payloadRaw.data, tailed.data());
+    EXPECT_EQ(record.payloadRaw.length, tailed.size()) << "the buffer as it was given";
 }
 
 } // namespace

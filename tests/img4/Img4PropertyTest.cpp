@@ -6,8 +6,8 @@
 #include "tools/makers/Img4Maker.h"
 
 #include <cctype>
-#include <functional>
 #include <string>
+#include <string_view>
 
 #include <gtest/gtest.h>
 
@@ -74,22 +74,8 @@ List dictionary() {
 }
 
 DERReturn statusOf(char answer) {
-    switch (std::tolower(answer)) {
-    case 's':
-        return DERSuccess;
-    case 'e':
-        return DEREndOfSequence;
-    case 'u':
-        return DERUnexpectedTag;
-    case 'i':
-        return DERIncompleteSequence;
-    case 'o':
-        return DERBufferOverflow;
-    case 'p':
-        return DERParamError;
-    default:
-        return DERDecodeError;
-    }
+    constexpr std::string_view letters = "seub?ipo"; // in the order of the statuses
+    return static_cast<DERReturn>(letters.find(static_cast<char>(std::tolower(answer))));
 }
 
 enum class OnFailure {
@@ -115,117 +101,98 @@ void check(char answer, bool isKept, const Bytes& expected, Value before, Query 
     EXPECT_EQ(query(nullptr), DERParamError);
 }
 
+// The answers that a row has for these getters, which `call` calls with the row's name behind what they look in.
 template <typename Call, typename... String>
-void checkFamily(const char* family, const Img4Record& record, OnFailure onFailure, bool isSingle, Call call,
+void checkFamily(const char* family, const Row& row, const std::string& answers, OnFailure onFailure, Call call,
                  auto getBoolean, auto getInteger, auto getInteger64, auto getData, String... getString) {
-    const auto checkRow = [&](const Row& row, const Img4Record* from) {
-        SCOPED_TRACE(std::string(family) + " " + row.name);
-        const std::string answers = isSingle && row.single != 0 ? std::string(5, row.single) : row.answers;
-        const bool keeps = onFailure == OnFailure::Keeps;
-        const auto keepsNumber = [&](char answer) {
-            return keeps || (onFailure == OnFailure::KeepsNumbersNotFound && std::islower(answer) != 0);
-        };
-        const DERItem before = itemOf(row.content);
-        check(answers[0], true, shown(row.number), row.number == 0,
-              [&](bool* out) { return call(getBoolean, from, row, out); });
-        check(answers[1], keepsNumber(answers[1]), shown(row.number), std::uint32_t{77},
-              [&](std::uint32_t* out) { return call(getInteger, from, row, out); });
-        check(answers[2], keepsNumber(answers[2]), shown(row.number), std::uint64_t{77},
-              [&](std::uint64_t* out) { return call(getInteger64, from, row, out); });
-        check(answers[3], keeps, row.octets, before, [&](DERItem* out) { return call(getData, from, row, out); });
-        (check(answers[4], keeps, row.octets, before, [&](DERItem* out) { return call(getString, from, row, out); }),
-         ...);
+    SCOPED_TRACE(std::string(family) + " " + row.name);
+    const bool keeps = onFailure == OnFailure::Keeps;
+    const auto keepsNumber = [&](char answer) {
+        return keeps || (onFailure == OnFailure::KeepsNumbersNotFound && std::islower(answer) != 0);
     };
-    for (const Row& row : rows)
-        checkRow(row, &record);
-    checkRow({"data", data, "ppppp"}, nullptr);
+    const DERItem before = itemOf(row.content);
+    check(answers[0], true, shown(row.number), row.number == 0, [&](bool* out) { return call(getBoolean, out); });
+    check(answers[1], keepsNumber(answers[1]), shown(row.number), std::uint32_t{77},
+          [&](std::uint32_t* out) { return call(getInteger, out); });
+    check(answers[2], keepsNumber(answers[2]), shown(row.number), std::uint64_t{77},
+          [&](std::uint64_t* out) { return call(getInteger64, out); });
+    check(answers[3], keeps, row.octets, before, [&](DERItem* out) { return call(getData, out); });
+    (check(answers[4], keeps, row.octets, before, [&](DERItem* out) { return call(getString, out); }), ...);
 }
 
-class Img4Properties : public testing::Test {
-protected:
-    void SetUp() override {
-        Manifest fields;
-        Payload image;
-        fields.properties = dictionary();
-        fields.objects = {object("kern", {}), object("sepi", dictionary())};
-        image.properties = payloadProperties(dictionary());
-        buffer = container(payload(image), manifest(fields), restoreInfo(dictionary()));
-        ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess);
+// The same for properties as records, with their names and tags.
+template <typename Call>
+void checkRecords(const char* family, const Row& row, const std::string& answers, bool keeps, Call call) {
+    constexpr DERTag types[] = {DERTagBoolean, DERTagInteger, DERTagInteger, DERTagOctetString, DERTagIA5String};
+    SCOPED_TRACE(std::string(family) + " " + row.name);
+    const DERTag tag = propertyTag(row.name);
+    for (std::size_t i = 0; i < std::size(types); ++i) {
+        Img4Property found = {itemOf(data), 77, itemOf(data), 77};
+        const DERReturn expected = std::isupper(answers[i]) != 0 ? DERSuccess : statusOf(answers[i]);
+        const bool isFound = expected == DERSuccess;
+        EXPECT_EQ(call(tag, types[i], &found), expected);
+        EXPECT_EQ(bytesOf(found.name), isFound ? Bytes(row.name, row.name + 4) : keeps ? data : Bytes());
+        EXPECT_EQ(found.tag, isFound ? tag : keeps ? 77 : 0);
+        EXPECT_EQ(found.valueTag, isFound ? types[i] : keeps ? 77 : 0);
+        EXPECT_EQ(call(tag, types[i], nullptr), DERParamError);
     }
+}
 
-    Bytes buffer;
+// Checks all rows in the record, and that there must be one.
+template <typename CheckRow>
+void checkRows(const Img4Record& record, CheckRow checkRow) {
+    for (const Row& row : rows)
+        checkRow(&record, row, row.answers);
+    checkRow(static_cast<const Img4Record*>(nullptr), rows[0], "ppppp");
+}
+
+TEST(Img4Properties, areFoundByEveryFamilyAlike) {
+    const Bytes buffer =
+        container(payload({.properties = payloadProperties(dictionary())}),
+                  manifest({.properties = dictionary(), .objects = {object("kern", {}), object("sepi", dictionary())}}),
+                  restoreInfo(dictionary()));
     Img4Record record;
-};
-
-TEST_F(Img4Properties, areFoundByEveryFamilyAlike) {
-    for (const std::uint32_t section : {Img4SectionManifest, Img4SectionRestoreInfo})
+    ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess);
+    checkRows(record, [](const Img4Record* from, const Row& row, const std::string& answers) {
+        const std::uint32_t name = fourCC(row.name);
         checkFamily(
-            section == Img4SectionManifest ? "manifest" : "section 1", record, OnFailure::KeepsNumbersNotFound, false,
-            [&](auto get, auto* from, const Row& row, auto* out) { return get(from, section, fourCC(row.name), out); },
+            "manifest", row, answers, OnFailure::KeepsNumbersNotFound,
+            [&](auto get, auto* out) { return get(from, Img4SectionManifest, name, out); },
             Img4DecodeGetBooleanFromSection, Img4DecodeGetIntegerFromSection, Img4DecodeGetInteger64FromSection,
             Img4DecodeGetDataFromSection);
-    checkFamily(
-        "restore information", record, OnFailure::KeepsNumbersNotFound, false,
-        [](auto get, auto* from, const Row& row, auto* out) { return get(from, fourCC(row.name), out); },
-        Img4DecodeGetRestoreInfoBoolean, Img4DecodeGetRestoreInfoInteger, Img4DecodeGetRestoreInfoInteger64,
-        Img4DecodeGetRestoreInfoData);
-    checkFamily(
-        "object", record, OnFailure::Clears, false,
-        [](auto get, auto* from, const Row& row, auto* out) { return get(from, sepi, fourCC(row.name), out); },
-        Img4DecodeGetObjectPropertyBoolean, Img4DecodeGetObjectPropertyInteger, Img4DecodeGetObjectPropertyInteger64,
-        Img4DecodeGetObjectPropertyData, Img4DecodeGetObjectPropertyString);
-    checkFamily(
-        "payload", record, OnFailure::Keeps, false,
-        [](auto get, auto* from, const Row& row, auto* out) { return get(from, propertyTag(row.name), out); },
-        Img4DecodeGetPayloadPropertiesBoolean, Img4DecodeGetPayloadPropertiesInteger,
-        Img4DecodeGetPayloadPropertiesInteger64, Img4DecodeGetPayloadPropertiesData);
-    checkFamily(
-        "single", record, OnFailure::Clears, true,
-        [](auto get, auto* from, const Row& row, auto* out) {
-            const DERItem content = itemOf(row.content);
-            return get(from != nullptr ? &content : nullptr, fourCC(row.name), out);
-        },
-        Img4DecodeGetPropertyBoolean, Img4DecodeGetPropertyInteger, Img4DecodeGetPropertyInteger64,
-        Img4DecodeGetPropertyData);
+        checkFamily(
+            "restore information", row, answers, OnFailure::KeepsNumbersNotFound,
+            [&](auto get, auto* out) { return get(from, name, out); }, Img4DecodeGetRestoreInfoBoolean,
+            Img4DecodeGetRestoreInfoInteger, Img4DecodeGetRestoreInfoInteger64, Img4DecodeGetRestoreInfoData);
+        checkFamily(
+            "object", row, answers, OnFailure::Clears, [&](auto get, auto* out) { return get(from, sepi, name, out); },
+            Img4DecodeGetObjectPropertyBoolean, Img4DecodeGetObjectPropertyInteger,
+            Img4DecodeGetObjectPropertyInteger64, Img4DecodeGetObjectPropertyData, Img4DecodeGetObjectPropertyString);
+        checkFamily(
+            "payload", row, answers, OnFailure::Keeps,
+            [&](auto get, auto* out) { return get(from, propertyTag(row.name), out); },
+            Img4DecodeGetPayloadPropertiesBoolean, Img4DecodeGetPayloadPropertiesInteger,
+            Img4DecodeGetPayloadPropertiesInteger64, Img4DecodeGetPayloadPropertiesData);
+        for (const std::uint32_t section : {Img4SectionManifest, Img4SectionRestoreInfo})
+            checkRecords("section", row, answers, false,
+                         [&](auto... a) { return Img4DecodeGetPropertyFromSection(from, section, a...); });
+        checkRecords("object", row, answers, false,
+                     [&](auto... a) { return Img4DecodeGetObjectProperty(from, sepi, a...); });
+        checkRecords("payload", row, answers, true, [&](auto... a) { return Img4DecodePayloadProperty(from, a...); });
+        const DERItem* const dictionary = from != nullptr ? &from->restoreInfo.properties : nullptr;
+        checkRecords("dictionary", row, answers, true,
+                     [&](auto... a) { return DERImg4DecodeFindProperty(dictionary, a...); });
+        const DERItem content = itemOf(row.content);
+        const DERItem* const item = from != nullptr ? &content : nullptr;
+        checkFamily(
+            "single", row, row.single != 0 ? std::string(5, row.single) : answers, OnFailure::Clears,
+            [&](auto get, auto* out) { return get(item, name, out); }, Img4DecodeGetPropertyBoolean,
+            Img4DecodeGetPropertyInteger, Img4DecodeGetPropertyInteger64, Img4DecodeGetPropertyData);
+    });
 }
 
-// Properties as records: the name, the tags and the value; what failure leaves behind.
-TEST_F(Img4Properties, areRecordsWithNameTagsAndValue) {
-    struct Family {
-        const char* name;
-        bool keeps;
-        std::function<DERReturn(const Img4Record*, DERTag, DERTag, Img4Property*)> get;
-    };
-    const Family families[] = {
-        {"manifest", false, [](auto* r, auto... a) { return Img4DecodeGetPropertyFromSection(r, 0, a...); }},
-        {"section 1", false, [](auto* r, auto... a) { return Img4DecodeGetPropertyFromSection(r, 1, a...); }},
-        {"object", false, [](auto* r, auto... a) { return Img4DecodeGetObjectProperty(r, sepi, a...); }},
-        {"payload", true, Img4DecodePayloadProperty},
-        {"dictionary", true,
-         [](auto* r, auto... a) {
-             return DERImg4DecodeFindProperty(r != nullptr ? &r->restoreInfo.properties : nullptr, a...);
-         }},
-    };
+TEST(Img4Property, isARecordByItselfToo) {
     const DERTag tag = propertyTag("data");
-    for (const Family& family : families) {
-        SCOPED_TRACE(family.name);
-        Img4Property found = {};
-        ASSERT_EQ(family.get(&record, tag, DERTagOctetString, &found), DERSuccess);
-        EXPECT_EQ(shown(found.name), Bytes({'d', 'a', 't', 'a'}));
-        EXPECT_EQ(shown(found.value), data);
-        EXPECT_EQ(found.tag, tag);
-        EXPECT_EQ(found.valueTag, DERTagOctetString);
-        const Img4Property whole = found;
-        for (const auto& [from, expected] : {std::pair(&record, DERUnexpectedTag), {nullptr, DERParamError}}) {
-            found = whole;
-            EXPECT_EQ(family.get(from, tag, DERTagSet, &found), expected);
-            EXPECT_EQ(found.name.length, family.keeps ? 4U : 0U);
-            EXPECT_EQ(found.tag, family.keeps ? tag : 0U);
-        }
-        EXPECT_EQ(family.get(&record, tag, DERTagSet, nullptr), DERParamError);
-        // The whole tag counts, not only its number.
-        EXPECT_EQ(family.get(&record, fourCC("data"), DERTagOctetString, &found), DEREndOfSequence);
-    }
     const Bytes content = named("data", octets(data));
     const DERItem view = itemOf(content);
     Img4Property single;
@@ -243,6 +210,7 @@ TEST(Img4Property, needsAPrivateTag) {
     const DERItem elements = itemOf(content);
     Img4Property found;
     EXPECT_EQ(DERImg4DecodeFindProperty(&elements, tag, DERTagInteger, &found), DERUnexpectedTag);
+    EXPECT_EQ(DERImg4DecodeFindProperty(&elements, 1, DERTagInteger, &found), DEREndOfSequence);
 }
 
 } // namespace

@@ -311,24 +311,6 @@ TEST(Img4TrustSteps, endWhereTheDictionariesOrTheObjectAreMissing) {
     }
 }
 
-TEST(Img4TrustSteps, sayWhichPropertyIsNone) {
-    const Bytes sound = property("AAAB", integer(7)), broken = item(propertyTag("AAAC"), {});
-    const std::pair<Manifest, Img4Subject> rows[] = {
-        {{.properties = {sound, broken}, .objects = {object("sepi", {})}}, Img4SubjectManifestProperties},
-        {{.objects = {object("sepi", {sound, broken})}}, Img4SubjectObjectProperties}};
-    const Img4TrustCallbacks callbacks = {judge, nullptr, nullptr};
-    for (const auto& [fields, subject] : rows) {
-        Decoded decoded(manifest(fields));
-        script = {"", {}, &decoded.record, {}};
-        EXPECT_EQ(
-            Img4DecodePerformTrustEvaluationExplained(&sepi, &decoded.record, &callbacks, &scripted, &script, &refusal),
-            DERDecodeError);
-        EXPECT_EQ(refusal.refusal.subject, subject);
-        EXPECT_EQ(refusal.refusal.encoding.fault, DERFaultHeaderCutShort);
-        EXPECT_EQ(refusal.refusal.tag, propertyTag("AAAC"));
-    }
-}
-
 TEST(Img4TrustSteps, needNoPayload) {
     const Bytes manifest = scriptedManifest();
     Img4Record record;
