@@ -74,9 +74,8 @@ void writeValue(sd_bus_message* message, const std::string& type, Input& input, 
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    static LooseBus looseBus;
     Input input(data, size);
-    const LooseBus::Message message = looseBus.message();
+    const LooseBus::Message message = LooseBus::message();
     writeValue(message.get(), "a{sv}", input, 0);
     LooseBus::finish(message);
 
@@ -86,7 +85,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     } catch (const bus::Refusal&) {
         return 0;
     }
-    const LooseBus::Message again = looseBus.message();
+    const LooseBus::Message again = LooseBus::message();
     try {
         bus::appendDictionary(again.get(), read);
     } catch (const bus::Refusal&) {

@@ -21,8 +21,8 @@ struct Incoming {
     Value expected;
 };
 
-LooseBus::Message messageWith(LooseBus& bus, const std::function<int(sd_bus_message*)>& write) {
-    LooseBus::Message message = bus.message();
+LooseBus::Message messageWith(const std::function<int(sd_bus_message*)>& write) {
+    LooseBus::Message message = LooseBus::message();
     LooseBus::require(sd_bus_message_open_container(message.get(), 'a', "{sv}"));
     LooseBus::require(write(message.get()));
     LooseBus::require(sd_bus_message_close_container(message.get()));
@@ -61,9 +61,8 @@ TEST(BusValue, everyTypeThatAHostMaySendBecomesItsValue) {
          Value::Array{Value(Value::Array{Value::Data{}, Value::Data{255}})}},
         {"dictionary", entry("a{sv}", 1, "a", "av", 0), Dictionary{{"a", Value::Array{}}}},
     };
-    LooseBus bus;
     for (const Incoming& row : rows) {
-        const LooseBus::Message message = messageWith(bus, row.write);
+        const LooseBus::Message message = messageWith(row.write);
         EXPECT_EQ(Value(bus::readDictionary(message.get())), Value(Dictionary{{"k", row.expected}})) << row.name;
     }
 }
@@ -103,9 +102,8 @@ TEST(BusValue, whatNoValueHoldsIsRefusedWithItsKey) {
         {"twice", [](sd_bus_message* m) { return sd_bus_message_append(m, "{sv}{sv}", "k", "b", 0, "k", "b", 0); },
          "\"k\" is given twice"},
     };
-    LooseBus bus;
     for (const Row& row : rows) {
-        const LooseBus::Message message = messageWith(bus, row.write);
+        const LooseBus::Message message = messageWith(row.write);
         try {
             bus::readDictionary(message.get());
             ADD_FAILURE() << row.name << " was accepted";
@@ -114,14 +112,12 @@ TEST(BusValue, whatNoValueHoldsIsRefusedWithItsKey) {
                 << row.name << ": " << refusal.what();
         }
     }
-    const LooseBus::Message message =
-        messageWith(bus, [](sd_bus_message* m) { return nested(m, bus::maximumNesting - 1); });
+    const LooseBus::Message message = messageWith([](sd_bus_message* m) { return nested(m, bus::maximumNesting - 1); });
     EXPECT_NO_THROW(bus::readDictionary(message.get()));
 }
 
 TEST(BusValue, aMessageOfVeryManyValuesIsRefused) {
-    LooseBus bus;
-    const LooseBus::Message message = messageWith(bus, [](sd_bus_message* m) {
+    const LooseBus::Message message = messageWith([](sd_bus_message* m) {
         LooseBus::require(sd_bus_message_open_container(m, 'e', "sv"));
         LooseBus::require(sd_bus_message_append_basic(m, 's', "many"));
         LooseBus::require(sd_bus_message_open_container(m, 'v', "as"));
@@ -136,8 +132,7 @@ TEST(BusValue, aMessageOfVeryManyValuesIsRefused) {
 }
 
 TEST(BusValue, aWrittenDictionaryReadsBackButForWhatDBusCannotCarry) {
-    LooseBus bus;
-    const LooseBus::Message message = bus.message();
+    const LooseBus::Message message = LooseBus::message();
     bus::appendDictionary(message.get(), {{"text", "a"},
                                           {"bad text", std::string("a\0b\xFF", 4)},
                                           {"data", Value::Data{0}},
@@ -156,7 +151,6 @@ TEST(BusValue, aWrittenDictionaryReadsBackButForWhatDBusCannotCarry) {
 }
 
 TEST(BusValue, whatABusWouldDropTheSenderOfIsNotWritten) {
-    LooseBus bus;
     const Value::Data data(bus::maximumOctets - 5);
     const struct {
         Dictionary dictionary;
@@ -167,7 +161,7 @@ TEST(BusValue, whatABusWouldDropTheSenderOfIsNotWritten) {
                 {{{"d", data}, {"t", Value::Array{Value::Data(4)}}}, false},
                 {{{"d", Value::Data(bus::maximumOctets)}}, false}};
     for (const auto& row : rows) {
-        const LooseBus::Message message = bus.message();
+        const LooseBus::Message message = LooseBus::message();
         int code = 0;
         try {
             bus::appendDictionary(message.get(), row.dictionary);

@@ -7,29 +7,16 @@
 
 #include <sys/socket.h>
 #include <systemd/sd-bus.h>
-#include <unistd.h>
 
 class LooseBus {
 public:
     using Message = std::unique_ptr<sd_bus_message, decltype(&sd_bus_message_unref)>;
 
-    LooseBus() {
-        require(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends_));
-        require(sd_bus_new(&bus_));
-        require(sd_bus_set_fd(bus_, ends_[0], ends_[0]));
-        require(sd_bus_start(bus_));
-    }
-    ~LooseBus() {
-        sd_bus_close_unref(bus_);
-        close(ends_[1]);
-    }
-    LooseBus(const LooseBus&) = delete;
-    LooseBus& operator=(const LooseBus&) = delete;
-
     // A new message to write to.
-    Message message() {
+    static Message message() {
+        static sd_bus* const bus = connect(); // never ended: messages may live as long as the process
         sd_bus_message* made = nullptr;
-        require(sd_bus_message_new_method_call(bus_, &made, "a.b", "/a", "a.b", "C"));
+        require(sd_bus_message_new_method_call(bus, &made, "a.b", "/a", "a.b", "C"));
         return {made, sd_bus_message_unref};
     }
 
@@ -45,8 +32,15 @@ public:
     }
 
 private:
-    int ends_[2] = {-1, -1};
-    sd_bus* bus_ = nullptr;
+    static sd_bus* connect() {
+        int ends[2];
+        sd_bus* bus = nullptr;
+        require(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends));
+        require(sd_bus_new(&bus));
+        require(sd_bus_set_fd(bus, ends[0], ends[0]));
+        require(sd_bus_start(bus));
+        return bus;
+    }
 };
 
 #endif
