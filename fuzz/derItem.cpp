@@ -4,7 +4,6 @@
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "fuzz/Fuzz.h"
-#include "fuzz/Views.h"
 
 namespace {
 

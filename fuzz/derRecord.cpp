@@ -9,7 +9,6 @@
 #include "der/DERDecode.h"
 #include "der/DEREncode.h"
 #include "fuzz/Fuzz.h"
-#include "fuzz/Views.h"
 
 namespace {
 
@@ -37,23 +36,21 @@ struct Case {
     std::uint16_t count() const { return static_cast<std::uint16_t>(specs.size()); }
 };
 
-bool readCase(const std::uint8_t* data, std::size_t size, Case* out) {
-    if (size < 2)
+bool readCase(fuzz::Input input, Case* out) {
+    const std::uint64_t rows = input.octet() % (mostRows + 1U);
+    out->recordItems = input.octet() % (mostRows + 1U);
+    if (input.left.size() < 2 * rows)
         return false;
-    const std::uint64_t rows = data[0] % (mostRows + 1U);
-    out->recordItems = data[1] % (mostRows + 1U);
-    const std::uint8_t* next = data + 2;
-    const std::uint8_t* const end = data + size;
-    if (static_cast<std::uint64_t>(end - next) < 2 * rows)
-        return false;
-    for (std::uint64_t row = 0; row < rows; ++row, next += 2) {
-        unsigned options = next[1] & decoderOptions;
-        options |= (next[1] & signedInteger) != 0 ? unsigned{DEROptionSignedInteger} : 0U;
-        options |= (next[1] & writeDER) != 0 ? unsigned{DEROptionWriteDER} : 0U;
-        const std::uint64_t offset = (next[1] & farAway) != 0 ? UINT64_MAX - row : row * sizeof(DERItem);
-        out->specs.push_back({offset, tags[next[0] % tags.size()], static_cast<std::uint16_t>(options)});
+    for (std::uint64_t row = 0; row < rows; ++row) {
+        const DERTag tag = tags[input.octet() % tags.size()];
+        const std::uint8_t octet = input.octet();
+        unsigned options = octet & decoderOptions;
+        options |= (octet & signedInteger) != 0 ? unsigned{DEROptionSignedInteger} : 0U;
+        options |= (octet & writeDER) != 0 ? unsigned{DEROptionWriteDER} : 0U;
+        const std::uint64_t offset = (octet & farAway) != 0 ? UINT64_MAX - row : row * sizeof(DERItem);
+        out->specs.push_back({offset, tag, static_cast<std::uint16_t>(options)});
     }
-    out->content = {next, static_cast<std::uint64_t>(end - next)};
+    out->content = fuzz::viewOf(input.left.data(), input.left.size());
     return true;
 }
 
@@ -84,20 +81,19 @@ std::vector<std::uint8_t> encode(const std::vector<DERItem>& record, const std::
     const DERReturn result =
         DERLengthOfEncodedSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(), &measured);
     std::uint64_t written = 0;
+    const auto write = [&](std::uint8_t* out, std::uint64_t capacity) {
+        return DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(), out,
+                                           capacity, &written);
+    };
     if (result != DERSuccess) {
         std::uint8_t scratch[4];
-        FUZZ_REQUIRE(result == DERBufferOverflow);
-        FUZZ_REQUIRE(DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(),
-                                                 scratch, sizeof scratch, &written) == DERBufferOverflow);
+        FUZZ_REQUIRE(result == DERBufferOverflow && write(scratch, sizeof scratch) == DERBufferOverflow);
         return {};
     }
     std::vector<std::uint8_t> encoded(measured);
-    FUZZ_REQUIRE(DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(),
-                                             encoded.data(), measured, &written) == DERSuccess);
-    FUZZ_REQUIRE(written == measured);
+    FUZZ_REQUIRE(write(encoded.data(), measured) == DERSuccess && written == measured);
     const auto shorter = std::make_unique<std::uint8_t[]>(measured - 1);
-    FUZZ_REQUIRE(DEREncodeSequenceFromObject(DERTagSequence, record.data(), recordSize, count, specs.data(),
-                                             shorter.get(), measured - 1, &written) == DERBufferOverflow);
+    FUZZ_REQUIRE(write(shorter.get(), measured - 1) == DERBufferOverflow);
     return encoded;
 }
 
@@ -136,10 +132,10 @@ void checkWrittenBack(const Case& input, const std::vector<DERItem>& record) {
 
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     Case input;
-    if (!readCase(data, size, &input))
+    if (!readCase({{data, size}}, &input))
         return 0;
     // The record has no spare capacity, so that the address sanitizer sees a write beyond it.
-    std::vector<DERItem> record(input.recordItems, DERItem{data, size + 1});
+    std::vector<DERItem> record(input.recordItems, DERItem{input.content.data, size + 1});
     const std::uint64_t recordSize = record.size() * sizeof(DERItem);
     const DERReturn result = DERParseSequenceContentToObject(&input.content, input.count(), input.specs.data(),
                                                              record.data(), recordSize, recordSize);

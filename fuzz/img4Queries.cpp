@@ -6,7 +6,6 @@
 
 #include "der/DERDecode.h"
 #include "fuzz/Fuzz.h"
-#include "fuzz/Views.h"
 #include "img4/Img4Trust.h"
 
 namespace {

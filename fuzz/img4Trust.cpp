@@ -4,7 +4,6 @@
 #include <cstring>
 
 #include "fuzz/Fuzz.h"
-#include "fuzz/Views.h"
 #include "img4/Img4Trust.h"
 
 namespace {

@@ -81,34 +81,20 @@ void checkLists(const __SysConfig3* object, const Model& expected) {
         FUZZ_REQUIRE(sysConfig3MetadataEntryGetKey(sysConfig3GetMetadataEntryForKey(object, key.c_str())) == key);
 }
 
-// Octets of the input as numbers and texts; zeros when there are no more.
-struct Script {
-    const std::uint8_t* next;
-    std::size_t left;
+std::string textOf(fuzz::Input& script) {
+    std::string taken(std::size_t{100} * (script.octet() % 4), 'x');
+    const std::size_t length = std::min<std::size_t>(script.octet() % 16, script.left.size());
+    taken.append(reinterpret_cast<const char*>(script.left.data()), length);
+    script.left = script.left.subspan(length);
+    return taken.substr(0, taken.find('\0'));
+}
 
-    std::uint8_t octet() {
-        if (left == 0)
-            return 0;
-        --left;
-        return *next++;
-    }
-
-    std::string text() {
-        std::string taken(std::size_t{100} * (octet() % 4), 'x');
-        const std::size_t length = std::min<std::size_t>(octet() % 16, left);
-        taken.append(reinterpret_cast<const char*>(next), length);
-        next += length;
-        left -= length;
-        return taken.substr(0, taken.find('\0'));
-    }
-};
-
-void changePayload(__SysConfig3* object, Model* model, Script* script) {
-    const std::uint8_t kind = script->octet() % 5;
-    std::uint32_t key = script->octet() % 8;
-    if (!model->payload.empty() && script->octet() % 2 == 0)
+void changePayload(__SysConfig3* object, Model* model, fuzz::Input& script) {
+    const std::uint8_t kind = script.octet() % 5;
+    std::uint32_t key = script.octet() % 8;
+    if (!model->payload.empty() && script.octet() % 2 == 0)
         key = model->payload[key % model->payload.size()];
-    const std::string text = script->text();
+    const std::string text = textOf(script);
     if (kind == 4) {
         FUZZ_REQUIRE(sysConfig3DeletePayloadEntryForKey(object, key));
         std::erase(model->payload, key);
@@ -131,16 +117,16 @@ void changePayload(__SysConfig3* object, Model* model, Script* script) {
     }
 }
 
-void changeMetadata(__SysConfig3* object, Model* model, Script* script) {
-    const bool deletes = script->octet() % 4 == 0;
-    const std::string key = script->text();
+void changeMetadata(__SysConfig3* object, Model* model, fuzz::Input& script) {
+    const bool deletes = script.octet() % 4 == 0;
+    const std::string key = textOf(script);
     const std::string storedKey = key.substr(0, 256);
     std::erase(model->metadata, storedKey);
     if (deletes) {
         FUZZ_REQUIRE(sysConfig3DeleteMetadataEntryForKey(object, key.c_str()));
         return;
     }
-    const MetadataEntryPtr entry(allocSysConfig3MetadataEntry(key.c_str(), nullptr, 0, script->text().c_str()));
+    const MetadataEntryPtr entry(allocSysConfig3MetadataEntry(key.c_str(), nullptr, 0, textOf(script).c_str()));
     FUZZ_REQUIRE(sysConfig3AddMetadataEntry(object, entry.get()));
     model->metadata.push_back(storedKey);
 }
@@ -165,13 +151,13 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     DERDecodedInfo blob;
     FUZZ_REQUIRE(DERDecodeItem(&input, &blob) == DERSuccess);
     const std::uint8_t* const end = blob.content.data + blob.content.length;
-    Script script = {end, static_cast<std::size_t>(data + size - end)};
+    fuzz::Input script = {{end, data + size}};
     constexpr int mostChanges = 32;
-    for (int change = 0; change < mostChanges && script.left > 0; ++change) {
+    for (int change = 0; change < mostChanges && !script.left.empty(); ++change) {
         if (script.octet() % 2 == 0)
-            changePayload(object.get(), &model, &script);
+            changePayload(object.get(), &model, script);
         else
-            changeMetadata(object.get(), &model, &script);
+            changeMetadata(object.get(), &model, script);
         checkLists(object.get(), model);
     }
     checkRoundTrip(object.get());

@@ -24,45 +24,36 @@ std::string holding(std::initializer_list<std::uint32_t> keys, std::uint32_t ver
     return {encoded.begin(), encoded.end()};
 }
 
-struct Case {
-    const char* name;
-    std::function<void(const TemporaryRoot&)> serve; // what happens at the device while the request is served
-    const char* problem;                             // empty for a result
-    const char* model = "M12x";
-    const char* note = "";
-    uid_t otherUser = 0; // how far the service's user is from the one who runs the tests
-};
-
 void makeResult(const TemporaryRoot& root, const std::string& contents) {
     root.write("/tmp/new", contents);
     std::filesystem::rename(root.host("/tmp/new"), root.host(blobResultPath));
 }
 
-std::function<void(const TemporaryRoot&)> results(const std::string& contents) {
+using Serve = std::function<void(const TemporaryRoot&)>;
+
+Serve results(const std::string& contents) {
     return [contents](const TemporaryRoot& root) { makeResult(root, contents); };
-}
-
-void emptyAfter(const TemporaryRoot& root, const std::string& input) {
-    root.write("/blob", input);
-    makeResult(root, "");
-}
-
-void replacedBy(const TemporaryRoot& root, const std::function<void(const std::filesystem::path&)>& make) {
-    std::filesystem::remove(root.host(blobResultPath));
-    make(root.host(blobResultPath));
 }
 
 const std::string whole = holding({wCh0, miGB});
 
-const Case cases[] = {
+const struct {
+    const char* name;
+    Serve serve;         // what happens at the device while the request is served
+    const char* problem; // empty for a result
+    const char* model = "M12x";
+    const char* note = "";
+    uid_t otherUser = 0; // how far the service's user is from the one who runs the tests
+    std::string input = {};
+} cases[] = {
     {"new file", results(whole), ""},
     {"model without WCh0", results(holding({miGB})), "", "Banana", "model Banana has no WCh0"},
     {"no WCh0", results(holding({miGB})), "has no WCh0 entry, and model xM11 has one", "xM11"},
     {"no MiGB", results(holding({wCh0})), "has no MiGB entry"},
     {"no blob", results("text"), "is no configuration blob."},
     {"no input", results(""), "is empty: /blob is missing on the device"},
-    {"input of text", [](auto& root) { emptyAfter(root, "text"); }, "is empty: /blob is no configuration blob"},
-    {"protected input", [](auto& root) { emptyAfter(root, holding({}, 0x30002)); }, "is empty: /blob needs a key"},
+    {"input of text", results(""), "is empty: /blob is no configuration blob", "M12x", "", 0, "text"},
+    {"protected input", results(""), "is empty: /blob needs a key", "M12x", "", 0, holding({}, 0x30002)},
     {"nothing done", [](auto&) {}, "is that of an earlier request"},
     {"removed", [](auto& root) { std::filesystem::remove(root.host(blobResultPath)); }, "is missing"},
     {"another user's", results(whole), "belongs to another user", "M12x", "", 1},
@@ -74,25 +65,30 @@ const Case cases[] = {
      "has a second name"},
     {"link",
      [](auto& root) {
-         makeResult(root, whole);
          std::filesystem::rename(root.host(blobResultPath), root.host("/tmp/other"));
          root.link(blobResultPath, "/tmp/other");
      },
      "is no regular file"},
-    {"FIFO", [](auto& root) { replacedBy(root, [](auto& path) { ::mkfifo(path.c_str(), 0600); }); },
+    {"FIFO",
+     [](auto& root) {
+         std::filesystem::remove(root.host(blobResultPath));
+         ::mkfifo(root.host(blobResultPath).c_str(), 0600);
+     },
      "is no regular file"},
 };
 
 TEST(BlobResult, isTheRequestsOwnOrAProblemThatSaysWhyNot) {
-    for (const Case& row : cases) {
+    for (const auto& row : cases) {
         SCOPED_TRACE(row.name);
         const TemporaryRoot root;
         // A folder on the way may be a link that stays on the device.
         root.makeDirectory("/private/tmp");
         root.link("/tmp", "private/tmp");
-        root.write("/etc/veltra/device.json", std::string(R"({"answers": {"HWModelStr": ")") + row.model + "\"}}");
+        root.describe(std::string(R"({"answers": {"HWModelStr": ")") + row.model + "\"}}");
         makeResult(root, whole);
         const BlobResult result;
+        if (!row.input.empty())
+            root.write("/blob", row.input);
         row.serve(root);
         const JudgedBlob judged = result.read(::geteuid() + row.otherUser, "/blob");
         EXPECT_NE(judged.problem.find(row.problem), std::string::npos) << judged.problem;

@@ -57,18 +57,6 @@ Bytes constrained(const List& constraints, Manifest fields = standardManifest())
     return signer.manifest(std::move(fields), signer.chainWith(signer.issue(signer.leaf(constraints))));
 }
 
-Bytes withProperty(const Bytes& encoding) {
-    Manifest fields = standardManifest();
-    fields.properties.push_back(encoding);
-    return constrained({}, fields);
-}
-
-Bytes withObject(const Bytes& encoding) {
-    Manifest fields = standardManifest();
-    fields.objects = {encoding};
-    return constrained({}, fields);
-}
-
 // A sound manifest that this leaf of the profile has signed.
 Bytes signedBy(const Certificate& leaf, const Img4TrustProfileEntry& profile = ec384) {
     const Signer& signer = signerOf(profile);
@@ -125,9 +113,10 @@ Bytes withDigests() {
     const Bytes image = payload({});
     Bytes digest(crypto::sha384Size);
     EXPECT_TRUE(crypto::sha384(image.data(), image.size(), digest.data()));
-    return withObject(object("sepi", {property("DGST", octets(digest)), property("ELSE", octets(filler(48))),
-                                      property("SHRT", octets({digest.begin(), digest.begin() + 20})),
-                                      property("FLAG", boolean(true))}));
+    return constrained(
+        {}, {.objects = {object("sepi", {property("DGST", octets(digest)), property("ELSE", octets(filler(48))),
+                                         property("SHRT", octets({digest.begin(), digest.begin() + 20})),
+                                         property("FLAG", boolean(true))})}});
 }
 
 std::vector<RefusalCase> refusalCases() {
@@ -180,7 +169,8 @@ std::vector<RefusalCase> refusalCases() {
         {"dictionaries", R"("MANB" has no "MANP")", withBody(set({object("MANB", {})}))},
 
         {"object", R"(The manifest has no "xyzt")", soundManifest(ec384), nullptr, "xyzt"},
-        {"object", R"(a "sepi" that is INTEGER instead of)", withObject(property("sepi", integer(1))), nullptr, "sepi"},
+        {"object", R"(a "sepi" that is INTEGER instead of)",
+         constrained({}, {.objects = {property("sepi", integer(1))}}), nullptr, "sepi"},
 
         {"constraints", "The leaf certificate carries no constraints", withLeaf(ec384, &Certificate::extensions, {})},
         {"constraints", R"(says that "ABCD" of the manifest must be INTEGER 8, and it is INTEGER 7)",
@@ -197,10 +187,11 @@ std::vector<RefusalCase> refusalCases() {
         {"constraints", R"(private "MANP" is INTEGER instead of SET)", constrained({property("MANP", integer(1))})},
 
         {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
-         withProperty(property("LIST", sequence({})))},
-        {"properties", "INTEGER of the manifest is no property", withProperty(integer(1))},
+         constrained({}, {.properties = {property("LIST", sequence({}))}})},
+        {"properties", "INTEGER of the manifest is no property", constrained({}, {.properties = {integer(1)}})},
         {"properties", R"(private "LONG" of the object has a content that holds an item behind)",
-         withObject(object("sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))})),
+         constrained({}, {.objects = {object(
+                              "sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))})}}),
          nullptr, "sepi"},
 
         {"payload", "its SHA-384 is another than \"ELSE\" of \"sepi\" demands", image, nullptr, "sepi", "ELSE"},
@@ -243,12 +234,12 @@ TEST(VerifyImg4, hostileNamesStayWithinTheLine) {
     EXPECT_EQ(verify(signedBy(leaf)).json["chain"][1]["subject"], R"(CN=a\,O=b\1B[31m\0A\"\+\\\;\<\>\ )");
     leaf.subject = sequence({integer(1), integer(2)});
     EXPECT_EQ(verify(signedBy(leaf)).json["chain"][1]["subject"], "#020101020102");
-    const Report value = verify(withProperty(property("EVIL", ia5("\x1B[2J\nresult: trusted"))));
+    const Report value = verify(constrained({}, {.properties = {property("EVIL", ia5("\x1B[2J\nresult: trusted"))}}));
     EXPECT_FALSE(value.says("\x1B") || value.says("\nresult: trusted\n"));
 }
 
 TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
-    const Report report = verify(withProperty(property("BAD!", item(DERTagBoolean, {1}))));
+    const Report report = verify(constrained({}, {.properties = {property("BAD!", item(DERTagBoolean, {1}))}}));
     EXPECT_TRUE(report.ok()) << report.problem;
     EXPECT_EQ(report.json["notes"].size(), 1U);
     EXPECT_TRUE(report.says("\n  \"BAD!\" of the manifest has a value that is not DER: a BOOLEAN is 00 or FF"));

@@ -108,19 +108,14 @@ TEST(HMAC, tellsWhichStoredValueDoesNotMatch) {
         {&__SysConfig3ManifestEntry::metadataHMAC, "Metadata HMAC does not match."},
         {&__SysConfig3ManifestEntry::fullHMAC, "Full HMAC does not match."},
     };
+    const SysConfig3Ptr object = keyedObject();
+    const Recorder recorder;
     for (const auto& [hmac, reason] : rows) {
-        const SysConfig3Ptr object = keyedObject();
         SysConfigData& stored = object->manifest->*hmac;
-        const Recorder recorder;
         stored.data[31] ^= 1;
         EXPECT_REFUSED(sysConfig3IsValidHMAC(object.get()), reason);
         stored.data[31] ^= 1;
         EXPECT_TRUE(sysConfig3IsValidHMAC(object.get()));
-        stored.length = 31;
-        EXPECT_REFUSED(sysConfig3IsValidHMAC(object.get()), reason);
-        std::free(stored.data);
-        stored = {};
-        EXPECT_REFUSED(sysConfig3IsValidHMAC(object.get()), reason);
     }
 }
 

@@ -120,7 +120,7 @@ TEST(SysConfig3, supportsNineMagicsAndThreeVersions) {
     EXPECT_EQ(versions, "nyyyn");
 }
 
-TEST(Entry, cutsStringsAtSixteenMebi) {
+TEST(Entry, cutsStringsAtSixteenMebiAndKeysAt256) {
     const std::string tooLong = std::string().append(0x1000001, 'x');
     const PayloadEntryPtr entry = payloadString(keyWCh0, tooLong.c_str(), tooLong.c_str());
     EXPECT_EQ(std::strlen(sysConfig3PayloadEntryGetComment(entry.get())), 0x1000000U);
@@ -128,6 +128,14 @@ TEST(Entry, cutsStringsAtSixteenMebi) {
     const MetadataEntryPtr metadata = metadataString(tooLong.c_str(), tooLong.c_str());
     EXPECT_EQ(std::strlen(sysConfig3MetadataEntryGetKey(metadata.get())), 256U);
     EXPECT_EQ(std::strlen(sysConfig3MetadataEntryGetString(metadata.get())), 0x1000000U);
+
+    // Of a key its first 256 characters count.
+    const SysConfig3Ptr object = newObject();
+    EXPECT_TRUE(add(object, metadata));
+    EXPECT_EQ(sysConfig3GetMetadataEntryForKey(object.get(), std::string(255, 'x').c_str()), nullptr);
+    EXPECT_NE(sysConfig3GetMetadataEntryForKey(object.get(), tooLong.c_str()), nullptr);
+    EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), tooLong.c_str()));
+    EXPECT_EQ(sysConfig3GetMetadataEntryCount(object.get()), 0U);
 }
 
 // Expects that each of the records is equal to itself and to its copy only.
@@ -180,18 +188,6 @@ TEST(List, takesItsOwnEntriesAndKeysBack) {
     const char* ownKey = sysConfig3MetadataEntryGetKey(sysConfig3GetHeadMetadataEntry(object.get()));
     EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), ownKey));
     EXPECT_EQ(metadataOf(object), "");
-}
-
-TEST(MetadataList, knowsKeysByTheirFirst256Characters) {
-    const std::string longKey(300, 'k');
-    const std::string sameStart = longKey.substr(0, 256) + "something else";
-    const SysConfig3Ptr object = newObject();
-    EXPECT_TRUE(add(object, metadataString(longKey.c_str(), "first")));
-    EXPECT_EQ(sysConfig3GetMetadataEntryForKey(object.get(), longKey.substr(0, 255).c_str()), nullptr);
-    EXPECT_EQ(sysConfig3GetMetadataEntryForKey(object.get(), sameStart.c_str()),
-              sysConfig3GetHeadMetadataEntry(object.get()));
-    EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), sameStart.c_str()));
-    EXPECT_EQ(sysConfig3GetMetadataEntryCount(object.get()), 0U);
 }
 
 TEST(Object, isEqualByBothListsInOrderAndTheManifest) {
@@ -258,6 +254,63 @@ TEST(Object, withAnUnsupportedMagicIsNotReleased) {
     deallocSysConfig3(object.get());
     EXPECT_EQ(payloadOf(object), "WCh0=data 01");
     object->magic = bCfg;
+}
+
+// The index of the lists: what keys of an adversary do to it.
+
+// The number of entries that looking up every key once would pass.
+template <typename List>
+std::uint64_t costOfAllLookups(const List& list) {
+    std::uint64_t cost = 0;
+    for (std::uint64_t bucket = 0; bucket < list.bucketCount(); ++bucket) {
+        std::uint64_t length = 0;
+        for (const auto* entry = list.buckets[bucket]; entry != nullptr; entry = entry->bucketNext)
+            cost += ++length;
+    }
+    return cost;
+}
+
+BlobParts withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint32_t)) {
+    Bytes entries;
+    for (std::uint32_t i = 0; i < count; ++i) {
+        const std::uint32_t key = keyOf(i);
+        entries.insert(entries.end(), {0x30, 0x0B, 0x02, 0x04, static_cast<std::uint8_t>(key),
+                                       static_cast<std::uint8_t>(key >> 8), static_cast<std::uint8_t>(key >> 16),
+                                       static_cast<std::uint8_t>(key >> 24), 0x16, 0x00, 0x01, 0x01, 0xFF});
+    }
+    return {.payload = item("31", entries)};
+}
+
+TEST(Index, standsAMillionKeysOfAnAdversary) {
+    constexpr std::uint32_t million = 1000000;
+    const std::tuple<const char*, std::uint32_t (*)(std::uint32_t), std::uint32_t> rows[] = {
+        {"consecutive", [](std::uint32_t i) { return i + 1; }, million},
+        {"equal in the low bits", [](std::uint32_t i) { return (i + 1) << 12; }, million},
+        {"evenly spaced", [](std::uint32_t i) { return (i + 1) * 4095; }, million},
+        {"equal in the middle", [](std::uint32_t i) { return (i & 0xFFF) | (i >> 12 | 0x100) << 22; }, million},
+        {"all equal", [](std::uint32_t) { return keyWCh0; }, 1},
+    };
+    for (const auto& [what, keyOf, count] : rows) {
+        const SysConfig3Ptr object = decodeParts(withPayloadKeys(million, keyOf));
+        ASSERT_EQ(sysConfig3GetPayloadEntryCount(object.get()), count) << what;
+        // An entry costs 1, and chance collisions add a half to that.
+        EXPECT_LT(costOfAllLookups(object->payload), 2 * count) << what;
+    }
+}
+
+TEST(Index, spreadsMetadataKeysToo) {
+    constexpr std::uint32_t count = 30000;
+    const SysConfig3Ptr object = newObject();
+    for (std::uint32_t i = 0; i < count; ++i)
+        ASSERT_TRUE(add(object, metadataString(std::to_string(i << 8).c_str(), "")));
+    EXPECT_EQ(sysConfig3GetMetadataEntryCount(object.get()), count);
+    EXPECT_LT(costOfAllLookups(object->metadata), 2 * count);
+}
+
+TEST(Index, hasASecretOfTheObjectsOwn) {
+    const SysConfig3Ptr a = newObject();
+    const SysConfig3Ptr b = newObject();
+    EXPECT_NE(sysconfig::hashOf(a->secret, keyWCh0), sysconfig::hashOf(b->secret, keyWCh0));
 }
 
 } // namespace

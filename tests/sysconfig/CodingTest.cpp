@@ -1,4 +1,4 @@
-// Blobs made by hand, decoded.
+// Blobs made by hand, decoded, and objects, encoded.
 #include <string>
 #include <tuple>
 
@@ -109,7 +109,7 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
     }
 }
 
-TEST(Decode, takesEachEntryAndManifestOnItsMerits) {
+TEST(Decode, takesEachEntryAndManifestOnItsMeritsAndThereAndBack) {
     const auto payload = [](const Bytes& entries) { return withPayload(item("31", joined({entries, miGB}))); };
     const auto metadata = [](const Bytes& entries) { return withMetadata(item("31", entries)); };
     const auto manifest = [](const char* hmacs) { return withManifest(item("30", bytes(hmacs))); };
@@ -153,8 +153,8 @@ TEST(Decode, takesEachEntryAndManifestOnItsMerits) {
         {commented("6E 6F 74 65"), "WCh0 (note)=data 01 02, MiGB=data 01 02", ""},
         {commented("00 61"), "WCh0=data 01 02, MiGB=data 01 02", ""},
         {commented("61 00 62"), "WCh0 (a)=data 01 02, MiGB=data 01 02", ""},
-        // Nobody looks at HMACs or at the version of a deleted flag.
-        {BlobParts{.version = bytes("02 00 03 00"), .payload = item("31", payloadEntry(bytes("01 01 FF")))}.whole(),
+        // Nobody looks at the version of a deleted flag.
+        {BlobParts{.version = bytes("01 00 03 00"), .payload = item("31", payloadEntry(bytes("01 01 FF")))}.whole(),
          "WCh0=deleted", ""},
 
         {metadata(metadataEntry("k", someData)), "k=data 01 02", ""},
@@ -177,10 +177,12 @@ TEST(Decode, takesEachEntryAndManifestOnItsMerits) {
     for (const auto& [blob, content, said] : rows) {
         SCOPED_TRACE(hexOf(blob));
         const Recorder recorder;
-        const SysConfig3Ptr object = decode(blob);
-        const std::string hmacs = manifestOf(object);
-        EXPECT_EQ(payloadOf(object) + metadataOf(object) + (hmacs == "00|00|00" ? "" : hmacs), content);
+        SysConfig3Ptr object = decode(blob);
         EXPECT_EQ(Recorder::said, said);
+        for (int times = 0; times < 2; ++times, object = decode(encode(object.get()))) {
+            const std::string hmacs = manifestOf(object);
+            EXPECT_EQ(payloadOf(object) + metadataOf(object) + (hmacs == "00|00|00" ? "" : hmacs), content);
+        }
     }
 }
 
@@ -191,6 +193,82 @@ TEST(DecodeCallbacks, needAnObject) {
     EXPECT_EQ(_DERDecodeSysConfig3ParseAndPopulatePayloadSequence(&entry, &stop, nullptr), DERParamError);
     EXPECT_EQ(_DERDecodeSysConfig3ParseAndPopulateMetadataSequence(&entry, &stop, nullptr), DERParamError);
     EXPECT_EQ(Recorder::said, "_DERDecodeSysConfig3ParseAndPopulateMetadataSequence: the refcon arg was NULL");
+}
+
+TEST(Encode, writesEntriesInListOrder) {
+    const SysConfig3Ptr object = newObject();
+    EXPECT_EQ(hexOf(encode(object.get())), hexOf(BlobParts().whole()));
+    add(object, payloadData(keyWCh0, {1, 2}));
+    add(object, payloadDeleted(keyMiGB, ""));
+    add(object, payloadString(0x01020304, "ab", "c"));
+    add(object, metadataString("z", ""));
+    add(object, metadataData("a", {7}));
+    const BlobParts parts = {.payload = item("31", bytes("30 0D 02 04 30 68 43 57 16 01 2E 04 02 01 02 "
+                                                         "30 0C 02 04 42 47 69 4D 16 01 2E 01 01 FF "
+                                                         "30 0D 02 04 04 03 02 01 16 01 63 16 02 61 62")),
+                             .metadata = item("31", bytes("30 05 16 01 7A 16 00 30 06 16 01 61 04 01 07"))};
+    EXPECT_EQ(hexOf(encode(object.get())), hexOf(parts.whole()));
+}
+
+// Encodes, expecting failure and an untouched result.
+void expectRefusal(const SysConfig3Ptr& object, const std::string& said) {
+    const Recorder recorder;
+    std::uint8_t octet = 9;
+    SysConfigData out = {&octet, 1};
+    EXPECT_FALSE(encodeSysConfig3(object.get(), &out));
+    EXPECT_TRUE(out.data == &octet && out.length == 1);
+    EXPECT_EQ(Recorder::said, said);
+}
+
+TEST(Encode, needsValidHMACsWhereTheVersionHasThem) {
+    const SysConfig3Ptr object = newObject(0x30002);
+    expectRefusal(object, noKeyRegistered + "\nencodeSysConfig3: Failed to validate HMAC.");
+    sysConfig3SetHMACKey(object.get(), hmacKey);
+    sysConfig3UpdateHMAC(object.get());
+    object->manifest->fullHMAC.data[31] ^= 1;
+    expectRefusal(object, "sysConfig3IsValidHMAC: Full HMAC does not match.\n"
+                          "encodeSysConfig3: Failed to validate HMAC.");
+}
+
+TEST(Encode, refusesWhatExceeds32BitsOfLengthBeforeItAllocates) {
+    const SysConfig3Ptr object = newObject();
+    for (const std::uint32_t key : {keyWCh0, keyMiGB}) {
+        add(object, payloadData(key, {1}));
+        // The length is measured, but nothing is read before the sum is known.
+        object->payload.last->dataLength = 0x90000000;
+    }
+    expectRefusal(object, "Failed to encode sequence with return: 7");
+}
+
+// Records that only a fault could make.
+
+TEST(EncodeOfABrokenRecord, raisesAnExceptionAndPrefersDataThenAString) {
+    const std::pair<sysconfig::Bytes, const char*> rows[] = {{{keyBytes, 1}, "WCh0=data 6B"}, {{}, "WCh0=string text"}};
+    for (const auto& [data, list] : rows) {
+        const SysConfig3Ptr object = newObject();
+        object->payload.appendWithoutIndex(
+            sysconfig::makeEntry(sysconfig::PayloadContent{keyWCh0, {}, data, "text", true}));
+        const Recorder recorder;
+        EXPECT_EQ(payloadOf(decode(encode(object.get()))), list);
+        EXPECT_TRUE(Recorder::said.starts_with('!') && Recorder::said.ends_with(" deleted: 255")) << Recorder::said;
+    }
+}
+
+TEST(EncodeOfABrokenRecord, refusesAnEntryWithoutExactlyOneValue) {
+    const SysConfig3Ptr payload = newObject(), both = newObject(), neither = newObject();
+    payload->payload.appendWithoutIndex(sysconfig::makeEntry(sysconfig::PayloadContent{keyWCh0, {}, {}, {}, false}));
+    both->metadata.appendWithoutIndex(sysconfig::makeEntry(sysconfig::MetadataContent{"k", {keyBytes, 1}, "text"}));
+    neither->metadata.appendWithoutIndex(sysconfig::makeEntry(sysconfig::MetadataContent{"k", {}, {}}));
+    EXPECT_TRUE(encode(payload.get()).empty()); // without a hook too
+    expectRefusal(payload, "!_createDEREncodeSysConfigPayloadEntries: sysconfig payload entry must have exactly one of "
+                           "data/string/deleted set. data: (nil) string: (nil) deleted: 0\n"
+                           "!_createDEREncodeSysConfigPayloadEntries: should not have happened!\n"
+                           "_freeDEREncodeSysConfigPayloadEntries: DERPayload is NULL");
+    expectRefusal(both, "!_createDEREncodeSysConfigMetadataEntries: sysconfig metadata entry cannot have both string "
+                        "and data fields populated!\n_freeDEREncodeSysConfigMetadataEntries: DERMetadata is NULL");
+    expectRefusal(neither,
+                  "!_createDEREncodeSysConfigMetadataEntries: sysconfig metadata entry must have EITHER string "
+                  "OR data fields populated!\n_freeDEREncodeSysConfigMetadataEntries: DERMetadata is NULL");
 }
 
 } // namespace
