@@ -24,6 +24,7 @@
 #include "tests/support/RecordedLog.h"
 #include "tests/support/ScriptedServices.h"
 #include "tests/support/TemporaryRoot.h"
+#include "tools/orloctl/Reasons.h"
 
 namespace {
 
@@ -158,12 +159,13 @@ std::string shown(std::string line, const HSMessageRequest& request) {
         {std::regex("//" VELTRA_ORLO_DATA_STORE_HOST), "//DS"},
         {std::regex(" version " VELTRA_TEST_VERSION "\\.1$"), " version #"},
         {std::regex("\n"), "\\n"},
-        {std::regex(" $"), "_"},
     };
     for (const std::string& what :
          {"Received Request : " + request.description(), "request.messageDict : " + request.messageDict.description()})
         if (line.ends_with("] " + what))
             line.replace(line.find(" : ") + 3, std::string::npos, "#");
+    if (line.ends_with(" "))
+        line.back() = '_';
     for (const auto& [pattern, mask] : masks)
         line = std::regex_replace(line, pattern, mask);
     return line;
@@ -200,6 +202,20 @@ void compareFiles(const TemporaryRoot& root, const std::map<std::string, std::st
             lines.push_back("removed " + entry.first);
 }
 
+// Marks the messages that the client shows as the reasons of a failed request.
+void markReasons(const std::string& command, Lines& lines) {
+    const auto isMessage = [](const std::string& line) { return line[0] >= '1' && line[0] <= '4'; };
+    const auto last = std::find_if(lines.rbegin(), lines.rend(), isMessage);
+    for (std::string& line : lines) {
+        std::string text = line;
+        const std::string level = takeWord(text);
+        if (text.starts_with('['))
+            takeWord(text);
+        if (isMessage(line) && isReason(command, std::stoi(level), text, &line == &*last))
+            line.insert(1, "!");
+    }
+}
+
 Lines play(const Case& played) {
     Arrangement arrangement;
     for (const std::string& line : played.arrangement)
@@ -217,6 +233,8 @@ Lines play(const Case& played) {
         request, [&](bool completed, const auto& response) { answers.push_back(shown(request, completed, response)); });
     failAllocation(0);
     Lines lines = recordedLines();
+    if (!answers.empty() && answers.front().starts_with("= -1"))
+        markReasons(command, lines);
     for (const auto& [key, value] : sessionOptions)
         lines.push_back("option " + key + " " + value.description());
     lines.insert(lines.end(), answers.begin(), answers.end());

@@ -26,6 +26,7 @@
 #include "platform/linux/system/JsonReader.h"
 #include "tools/orloctl/Interruption.h"
 #include "tools/orloctl/LogTail.h"
+#include "tools/orloctl/Reasons.h"
 
 namespace {
 
@@ -237,17 +238,6 @@ struct Message {
     std::string line() const { return messageLine(source, text); }
 };
 
-// Errors that tell of no failure.
-constexpr std::string_view harmlessErrors[] = {"updaterOptions created successfully",
-                                               "value of ticket is:", "added ticket"};
-
-bool tellsOfFailure(const Message& message) {
-    constexpr std::int32_t error = 4;
-    return message.level == error && std::ranges::none_of(harmlessErrors, [&message](std::string_view harmless) {
-               return message.text.starts_with(harmless);
-           });
-}
-
 // One request and what comes of it.
 class Conversation {
 public:
@@ -355,13 +345,13 @@ private:
                                       : "waiting for the service"));
     }
 
-    // With -v all that was told; otherwise what may be the reasons of a failure. Those of the two commands that log
-    // everything as progress are in the last line.
+    // With -v all that was told; otherwise what may be the reasons of a failure.
     nlohmann::ordered_json messages() const {
-        const bool lastCounts = !answer_->report.ok() && (command_ == "putPSD2" || command_ == "getPSD2");
+        const bool hasFailed = !answer_->report.ok();
         auto found = nlohmann::ordered_json::array();
         for (const Message& message : told_)
-            if (address_.verbose || tellsOfFailure(message) || (lastCounts && &message == &told_.back()))
+            if (address_.verbose ||
+                isReason(command_, message.level, message.text, hasFailed && &message == &told_.back()))
                 found.push_back(message.json());
         return found;
     }
