@@ -26,12 +26,6 @@ typedef struct Pair {
     DERItem count;
 } Pair;
 
-static DERReturn sumLengths(const DERDecodedInfo* decoded, bool* stop, void* context) {
-    *(uint64_t*)context += decoded->content.length;
-    *stop = decoded->tag == DERTagInteger;
-    return DERSuccess;
-}
-
 static void checkDER(void) {
     static const DERItemSpec pairItemSpecs[] = {
         {offsetof(Pair, name), DERTagIA5String, 0},
@@ -40,7 +34,7 @@ static void checkDER(void) {
     static const uint8_t expected[] = {0x30, 0x08, 0x16, 0x02, 'a', 'b', 0x02, 0x02, 0x00, 0xC8};
     const Pair pair = {{expected + 4, 2}, {expected + 9, 1}};
     uint8_t buffer[32];
-    uint64_t length = sizeof buffer, sum = 0;
+    uint64_t length = sizeof buffer;
     Pair read;
     uint32_t number = 0;
     DERRefusal why;
@@ -51,7 +45,6 @@ static void checkDER(void) {
     check(DERParseSequence(&der, 2, pairItemSpecs, &read, sizeof read) == DERSuccess &&
               DERParseInteger(&read.count, &number) == DERSuccess && number == 200,
           "parsing");
-    check(DERDecodeSequenceWithBlock(&der, sumLengths, &sum) == DERSuccess && sum == 4, "walk");
     check(DERTBSCertItemSpecs[DERNumTBSCertItemSpecs - 1].offset == offsetof(DERTBSCert, extensions), "tables");
     buffer[6] = 0x04; /* the tag of the second item */
     check(DERParseSequenceExplained(&der, 2, pairItemSpecs, &read, sizeof read, 0, &why) == DERUnexpectedTag &&
@@ -85,14 +78,10 @@ static void checkImg4(void) {
     Img4Refusal refusal;
     Img4DomainProfile made;
     Img4TrustRefusal trust;
-    bool entitled = false;
     unsigned count = 0;
     check(Img4DecodeInitExplained(manifest, sizeof manifest, &record, &kind, &refusal) == DERSuccess &&
               kind == Img4KindManifest,
           "initialisation");
-    check(Img4DecodeGetObjectPropertyBoolean(&record, sepi, Img4FourCC('e', 'k', 's', 'p'), &entitled) == DERSuccess &&
-              entitled,
-          "entitlement");
     check(Img4DecodeMakeDomainProfile(entry, entry->root, &Img4BuiltInTrustDomain, &made) == DERSuccess &&
               Img4DecodePerformTrustEvaluationExplained(&sepi, &record, &callbacks, &made.profile, &count, &trust) ==
                   Img4Failure &&
@@ -107,7 +96,7 @@ static void checkImg4(void) {
 
 /* SysConfig3 */
 
-static const char* lastFormat = "";
+static const char* lastFormat;
 
 static void keepFormat(int level, const char* format, ...) {
     (void)level;
@@ -125,24 +114,17 @@ static void checkSysConfig3(void) {
     check(sysConfig3AddPayloadEntry(object, entry) && sysConfig3AddMetadataEntry(object, metadata) &&
               encodeSysConfig3(object, &blob),
           "additions");
-    struct __SysConfig3* decoded = decodeSysConfig3(blob.data, blob.length);
-    check(sysConfig3ObjectsAreEqual(object, decoded), "decoding");
     setSysConfig3LogHandler(keepFormat);
-    check(!sysConfig3DeletePayloadEntryForKey(decoded, 0x57436830) &&
-              strcmp(lastFormat, "%s Failed to validate HMAC.") == 0,
-          "missing key");
-
     blob.data[blob.length - 1 - 32 - 2 - 32 - 2 - 32 - 2 - 1] = 0x31; /* the manifest's SEQUENCE */
     SysConfig3Refusal refusal;
     check(decodeSysConfig3Explained(blob.data, blob.length, &refusal) == NULL &&
               refusal.subject == SysConfig3SubjectManifest && refusal.status == DERUnexpectedTag &&
               refusal.place == blob.data + blob.length - 104 && refusal.encoding.fault == DERFaultTag &&
-              refusal.encoding.tag == DERTagSet,
+              refusal.encoding.tag == DERTagSet && lastFormat != NULL,
           "SysConfig3Refusal");
     free(blob.data);
     deallocSysConfig3MetadataEntry(metadata);
     deallocSysConfig3PayloadEntry(entry);
-    deallocSysConfig3(decoded);
     deallocSysConfig3(object);
 }
 

@@ -1,6 +1,5 @@
 // Where memory or a disk ends, and how much memory a request takes; what commands say and do stands in transcripts.
 #include <csignal>
-#include <limits>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -14,39 +13,21 @@
 #include "tests/support/RecordedLog.h"
 #include "tests/support/ScriptedServices.h"
 #include "tests/support/TemporaryRoot.h"
-#include "tests/sysconfig/Blob.h"
 
 namespace {
-
-constexpr const char* calibration = "/usr/local/bin/q21isp";
 
 class ZPOrloServicesTest : public testing::Test {
 protected:
     ZPOrloServicesTest() {
-        const Bytes blob = BlobParts{}.whole();
-        root_.write("/blob", std::string(blob.begin(), blob.end()));
+        std::filesystem::copy(VELTRA_EXAMPLE_DEVICE, root_.host("/"), std::filesystem::copy_options::recursive);
         root_.write("/ticket", "ticket");
         root_.write("/psd2", "record");
         root_.write("/var/mobile/Vanter.BE-Prod.fw", "patch");
-        program("echo loaded");
-        root_.write("/etc/veltra/device.json", R"({
-            "answers": {"HWModelStr": "M12x", "VanterSerialNumber": "VAN", "CoverGlassSerialNumber": "CVG",
-                        "AmbientLightSensorSerialNumber": "ALS", "MiravelSerialNumber": "MIR",
-                        "ScreenSerialNumber": "SCR", "TopModuleAuthChipID": "TMA"},
-            "registry": [{"class": "TeskAuthI2CRelayInterface",
-                          "properties": {"AccessoryCertificate": {"$data": "3000"}}}]})");
         arrangeServices();
         recordLog();
     }
 
-    // The calibration tool.
-    void program(const std::string& script) const {
-        root_.write(calibration, "#!/bin/sh\n" + script);
-        std::filesystem::permissions(root_.host(calibration), std::filesystem::perms::owner_all);
-    }
-
     static HSMessageResponse request(const char* command, const Value::Dictionary& arguments) {
-        recordLog();
         std::optional<HSMessageResponse> answer;
         ZPOrloServices().handleMessage({command, arguments}, [&](bool, const auto& response) { answer = response; });
         return answer.value();
@@ -56,16 +37,17 @@ protected:
 };
 
 TEST_F(ZPOrloServicesTest, aRequestIsCompletedOnceWhereverMemoryEnds) {
-    const Value nothingElse = Value::Dictionary{{"IsPostSwapEntitled", false}};
+    // What is answered where nothing more can be said for want of memory.
     const struct {
         const char* command;
         std::int64_t status;
         Value response = {};
-    } commands[] = {{"OrloExport", -1},   {"getTCRT", -1},
-                    {"putTCRT", -1},      {"putPSD2", -1},
-                    {"getPSD2", -1},      {"corvoSCProv", -1},
-                    {"corvoSCPair", -1},  {"checkCorvoPostSwapEntitlement", 0, nothingElse},
-                    {"setGlobalbCfg", 0}, {"unknown", 1}};
+    } commands[] = {
+        {"OrloExport", -1},   {"getTCRT", -1},
+        {"putTCRT", -1},      {"putPSD2", -1},
+        {"getPSD2", -1},      {"corvoSCProv", -1},
+        {"corvoSCPair", -1},  {"checkCorvoPostSwapEntitlement", 0, Value::Dictionary{{"IsPostSwapEntitled", false}}},
+        {"setGlobalbCfg", 0}, {"unknown", 1}};
     const Value::Dictionary arguments = {
         {"psd2DataPath", "/psd2"}, {"psd2V4DataPath", "/out"}, {"waftonUrl", "http://host"}, {"bcfgDataPath", "/psd2"}};
     for (const auto& row : commands) {
@@ -116,7 +98,7 @@ TEST_F(ZPOrloServicesTest, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlie
         EXPECT_EQ(response.response(), Value());
         EXPECT_TRUE(response.error() && !response.error()->text.empty());
         EXPECT_EQ(root_.read("/out"), "before");
-        EXPECT_EQ(request("setGlobalbCfg", {{"bcfgDataPath", "/blob"}}).statusCode(), 0);
+        EXPECT_EQ(request("setGlobalbCfg", {{"bcfgDataPath", "/blobs/every-kind.bin"}}).statusCode(), 0);
         EXPECT_EQ(root_.read("/tmp/new_bCfg"), "(missing)");
     });
 }
@@ -147,7 +129,7 @@ TEST_F(ZPOrloServicesTest, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure
 
 TEST_F(ZPOrloServicesTest, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
     constexpr long kilobytes = 16 << 10;
-    program("exec head -c 16777216 /dev/zero | tr '\\0' x");
+    root_.write("/usr/local/bin/q21isp", "#!/bin/sh\nexec head -c 16777216 /dev/zero | tr '\\0' x");
     inOwnProcess([&] {
         rusage before = {}, after = {};
         ASSERT_EQ(::getrusage(RUSAGE_SELF, &before), 0);
