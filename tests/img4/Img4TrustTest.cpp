@@ -35,21 +35,14 @@ constexpr DERReturn stepFailed = static_cast<DERReturn>(0x77);
 std::string heldBy(const Img4Record& record) {
     const Img4ManifestRecord& manifest = record.manifest;
     const bool isManifest = manifest.digest[0] == 'm', isPayload = record.payload.digest[0] == 'p';
-    const std::pair<char, bool> all[] = {
-        {'m', isManifest && record.manifestHashed == 1},
-        {'c', manifest.certProperties.data == &constraintsOctet},
-        {'b', manifest.bodyDigest[0] == 'b'},
-        {'d', record.manb.data != nullptr && record.manp.data != nullptr},
-        {'o', record.objp.data != nullptr},
-        {'p', isPayload && record.payloadHashed == 1},
-        {'x', manifest.digest[0] == 'x' || manifest.bodyDigest[0] == 'x' || record.payload.digest[0] == 'x'},
-        {'!', (record.manifestHashed == 1) != isManifest || (record.payloadHashed == 1) != isPayload},
+    const bool isFailed = manifest.digest[0] == 'x' || manifest.bodyDigest[0] == 'x' || record.payload.digest[0] == 'x';
+    const auto flagged = [](bool isDigest, std::uint8_t flag, const char* letter) {
+        return isDigest == (flag == 1) ? (isDigest ? letter : "") : "!";
     };
-    std::string text;
-    for (const auto& [letter, isHeld] : all)
-        if (isHeld)
-            text += letter;
-    return text;
+    return flagged(isManifest, record.manifestHashed, "m") +
+           std::string(manifest.certProperties.data == &constraintsOctet ? "c" : "") +
+           (manifest.bodyDigest[0] == 'b' ? "b" : "") + (record.manb.data && record.manp.data ? "d" : "") +
+           (record.objp.data ? "o" : "") + flagged(isPayload, record.payloadHashed, "p") + (isFailed ? "x" : "");
 }
 
 struct Call {
