@@ -51,59 +51,60 @@ std::string answers(const Keys& keys, Queries... queries) {
     return text.str();
 }
 
-std::string askPayload(const Img4Record* record) {
+// What all queries of a record's parts say: of the payload, of its properties, and whether there are a manifest and
+// restore information, each asked in two ways, and a third section.
+std::string ask(const Img4Record* record) {
     std::uint32_t algorithm = 77, size = 77;
     std::ostringstream compression;
     compression << Img4DecodeGetPayloadCompressionInfo(record, &algorithm, &size) << ':' << algorithm << ',' << size;
     return answers(std::tuple(record), Img4DecodePayloadExists, Img4DecodeGetPayload, Img4DecodeGetPayloadVersion,
                    Img4DecodeGetPayloadType, Img4DecodePayloadKeybagExists, Img4DecodeGetPayloadKeybag,
                    Img4DecodePayloadCompressionInfoExists) +
-           compression.str();
+           compression.str() + " | " +
+           answers(std::tuple(record), Img4DecodePayloadPropertiesExists, Img4DecodeGetPayloadProperties) +
+           answers(std::tuple(record, propertyTag("entP")), Img4DecodePayloadPropertyExistsByTag,
+                   Img4DecodeGetPayloadPropertiesInteger) +
+           "| " + answers(std::tuple(record), Img4DecodeManifestExists, Img4DecodeRestoreInfoExists) +
+           answers(std::tuple(record, Img4SectionManifest), Img4DecodeSectionExists) +
+           answers(std::tuple(record, Img4SectionRestoreInfo), Img4DecodeSectionExists) +
+           answers(std::tuple(record, 2U), Img4DecodeSectionExists);
 }
 
-TEST(Img4Payload, givesItsFieldsOrClearsWhatItIsAskedFor) {
-    const std::string nothing = "4294967295,4294967295";
+// The payload's out-values are cleared on failure, those of its properties are left alone.
+TEST(Img4Queries, sayWhatARecordHas) {
+    const std::string nothing = "4294967295,4294967295 | ";
+    const std::string plain = "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:0 1:" + nothing;
+    const std::string noPayload = "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing;
+    const std::string noProperties = "0:0 6:1 6:1 6:1 | ", noSections = "0:0 0:0 0:0 0:0 6:0 ";
     const Bytes emptyKeybag = sequence({ia5("IM4P"), ia5("sepi"), ia5("1"), octets({1}), octets({})});
-    const std::pair<Bytes, std::string> rows[] = {
-        {payload({.type = "ABCD", .keybag = {9, 8, 7}, .compression = compression(1, 0xFFFFFFFE)}),
-         "0:1 0:64 0:8 0:1094861636 0:1 0:3 0:1 0:1,4294967294"},
-        {payload({}), "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:0 1:" + nothing},
-        {emptyKeybag, "0:1 0:1 0:1 0:1936027753 0:0 0:0 0:0 1:" + nothing},
-        // A size that does not fit is refused when it is asked for; both numbers say that there is no answer.
-        {payload({.compression = compression(0, 0x100000000)}), "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:1 7:" + nothing},
-        {payload({.data = {}}), "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing},
+    const auto withProperty = [](const char* name) {
+        return payload({.properties = payloadProperties({property(name, integer(5))})});
     };
-    for (const auto& [payload, expected] : rows) {
-        const Img4Record record = recordOf(Img4DecodeInitPayload, payload);
-        EXPECT_EQ(askPayload(&record), expected);
+    const std::tuple<Initialise, Bytes, std::string> rows[] = {
+        {Img4DecodeInitPayload,
+         payload({.type = "ABCD", .keybag = {9, 8, 7}, .compression = compression(1, 0xFFFFFFFE)}),
+         "0:1 0:64 0:8 0:1094861636 0:1 0:3 0:1 0:1,4294967294 | " + noProperties + noSections},
+        {Img4DecodeInitPayload, emptyKeybag,
+         "0:1 0:1 0:1 0:1936027753 0:0 0:0 0:0 1:" + nothing + noProperties + noSections},
+        // A size that does not fit is refused when it is asked for; both numbers say that there is no answer.
+        {Img4DecodeInitPayload, payload({.compression = compression(0, 0x100000000)}),
+         "0:1 0:64 0:8 0:1936027753 0:0 0:0 0:1 7:" + nothing + noProperties + noSections},
+        {Img4DecodeInitPayload, payload({.data = {}}), noPayload + noProperties + noSections},
+        {Img4DecodeInitPayload, withProperty("entP"), plain + "0:1 0:28 0:1 0:5 | " + noSections},
+        {Img4DecodeInitPayload, withProperty("entL"), plain + "0:1 0:28 1:0 1:1 | " + noSections},
+        {Img4DecodeInit, container(payload({}), {}, {}), plain + noProperties + noSections},
+        {Img4DecodeInit, container(payload({}), {}, restoreInfo({})), plain + noProperties + "0:0 0:1 0:0 0:1 6:0 "},
+        {Img4DecodeInitManifest, exampleTicket(), noPayload + "3:1 3:1 3:1 3:1 | 0:1 0:0 0:1 0:0 6:0 "},
+    };
+    for (const auto& [initialise, octets, expected] : rows) {
+        const Img4Record record = recordOf(initialise, octets);
+        EXPECT_EQ(ask(&record), expected);
     }
+    EXPECT_EQ(ask(nullptr), "6:0 6:0 6:0 6:0 6:0 6:0 6:0 6:" + nothing + "6:1 6:1 6:1 6:1 | 6:0 6:0 6:0 6:0 6:0 ");
     const Img4Record none = {};
-    EXPECT_EQ(askPayload(&none), "0:0 1:0 1:0 1:0 1:0 1:0 1:0 1:" + nothing);
-    EXPECT_EQ(askPayload(nullptr), "6:0 6:0 6:0 6:0 6:0 6:0 6:0 6:" + nothing);
     std::uint32_t number = 77;
     EXPECT_EQ(Img4DecodeGetPayloadCompressionInfo(&none, nullptr, &number), DERParamError);
     EXPECT_EQ(number, 0xFFFFFFFF);
-}
-
-// Failure leaves things alone.
-std::string askProperties(const Img4Record* record) {
-    return answers(std::tuple(record), Img4DecodePayloadPropertiesExists, Img4DecodeGetPayloadProperties) +
-           answers(std::tuple(record, propertyTag("entP")), Img4DecodePayloadPropertyExistsByTag,
-                   Img4DecodeGetPayloadPropertiesInteger);
-}
-
-TEST(Img4PayloadProperties, areAbsentOrThere) {
-    const Bytes some = payload({.properties = payloadProperties({property("entP", integer(5))})});
-    const Bytes others = payload({.properties = payloadProperties({property("entL", integer(5))})});
-    const Bytes empty = payload({});
-    const Img4Record none = {}, withSome = recordOf(Img4DecodeInitPayload, some),
-                     withOthers = recordOf(Img4DecodeInitPayload, others),
-                     withNone = recordOf(Img4DecodeInitPayload, empty);
-    EXPECT_EQ(askProperties(&withSome), "0:1 0:28 0:1 0:5 ");
-    EXPECT_EQ(askProperties(&withOthers), "0:1 0:28 1:0 1:1 ");
-    EXPECT_EQ(askProperties(&withNone), "0:0 6:1 6:1 6:1 ");
-    EXPECT_EQ(askProperties(&none), "3:1 3:1 3:1 3:1 ");
-    EXPECT_EQ(askProperties(nullptr), "6:1 6:1 6:1 6:1 ");
 }
 
 struct FindCase {
@@ -211,33 +212,14 @@ TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
     EXPECT_TRUE(entitled);
 }
 
-// Whether there are a manifest and restore information, each asked in two ways, and what a third section is.
-std::string askSections(const Img4Record* record) {
-    return answers(std::tuple(record), Img4DecodeManifestExists, Img4DecodeRestoreInfoExists) +
-           answers(std::tuple(record, Img4SectionManifest), Img4DecodeSectionExists) +
-           answers(std::tuple(record, Img4SectionRestoreInfo), Img4DecodeSectionExists) +
-           answers(std::tuple(record, 2U), Img4DecodeSectionExists);
-}
-
 std::string askSection(const Img4Record* record, std::uint32_t section) {
     return answers(std::tuple(record, section, eksp), Img4DecodeGetBooleanFromSection, Img4DecodeGetIntegerFromSection,
                    Img4DecodeGetInteger64FromSection, Img4DecodeGetDataFromSection);
 }
 
-TEST(Img4Manifest, hasSectionsOrNot) {
-    const Bytes plain = container(payload({}), {}, {});
-    const Bytes emptyRestoreInfo = container(payload({}), {}, restoreInfo({}));
-    const Bytes full = exampleContainer();
-    const Bytes ticket = exampleTicket();
-    const Img4Record none = {}, withNone = recordOf(Img4DecodeInit, plain),
-                     withRestoreInfo = recordOf(Img4DecodeInit, emptyRestoreInfo),
-                     withBoth = recordOf(Img4DecodeInit, full), ofTicket = recordOf(Img4DecodeInitManifest, ticket);
-    EXPECT_EQ(askSections(&withNone), "0:0 0:0 0:0 0:0 6:0 ");
-    EXPECT_EQ(askSections(&withRestoreInfo), "0:0 0:1 0:0 0:1 6:0 ");
-    EXPECT_EQ(askSections(&withBoth), "0:1 0:1 0:1 0:1 6:0 ");
-    EXPECT_EQ(askSections(&ofTicket), "0:1 0:0 0:1 0:0 6:0 ");
-    EXPECT_EQ(askSections(nullptr), "6:0 6:0 6:0 6:0 6:0 ");
-    // Data is cleared, numbers are not.
+// Data is cleared, numbers are not.
+TEST(Img4Manifest, hasNothingInSectionsThatAreNotThere) {
+    const Img4Record none = {};
     EXPECT_EQ(askSection(&none, Img4SectionManifest), "1:1 1:1 1:1 1:0 ");
     EXPECT_EQ(askSection(&none, Img4SectionRestoreInfo), "1:1 1:1 1:1 1:0 ");
     EXPECT_EQ(askSection(&none, 2), "6:1 6:1 6:1 6:0 ");

@@ -328,16 +328,11 @@ TEST(Img4TrustSteps, needTheirArguments) {
     EXPECT_EQ(evaluate(sepi, record, &noJudge, &scripted, &script), DERParamError);
     EXPECT_EQ(Img4DecodePerformTrustEvaluationExplained(&sepi, record, &allCallbacks, &scripted, &script, nullptr),
               DERParamError);
-    const auto expectNeeds = [&](auto... members) {
-        const auto without = [&](auto member) {
-            Img4TrustProfile incomplete = scripted;
-            incomplete.*member = nullptr;
-            EXPECT_EQ(evaluate(sepi, record, &allCallbacks, &incomplete, &script), DERParamError);
-        };
-        (without(members), ...);
-    };
-    expectNeeds(&Img4TrustProfile::computeDigest, &Img4TrustProfile::verifyChain, &Img4TrustProfile::verifySignature,
-                &Img4TrustProfile::evaluateCertificateProperties, &Img4TrustProfile::digestInfo);
+    for (std::size_t pointer = 0; pointer < 5; ++pointer) {
+        Img4TrustProfile incomplete = scripted;
+        std::memset(reinterpret_cast<std::uint8_t*>(&incomplete) + pointer * sizeof(void*), 0, sizeof(void*));
+        EXPECT_EQ(evaluate(sepi, record, &allCallbacks, &incomplete, &script), DERParamError) << pointer;
+    }
     Img4TrustProfile longDigest = scripted;
     longDigest.digestInfo = &kQDSupportDigestInfoSha512;
     EXPECT_EQ(evaluate(sepi, record, &allCallbacks, &longDigest, &script), DERBufferOverflow);
