@@ -11,6 +11,7 @@ import dbus
 import dbus.mainloop.glib
 from gi.repository import GLib
 
+NAME = "com.tevari.VeltraOrloServices"
 PATH = "/com/tevari/VeltraOrloServices"
 INTERFACE = "com.tevari.VeltraPluginServer"
 LEVELS = {1: "default", 2: "info", 3: "debug", 4: "error"}
@@ -31,14 +32,14 @@ def request(bus, command, arguments, on_message=None):
     contents = {"messageStr": command, "messageDict": dbus.Dictionary(arguments, signature="sv")}
     if on_message:
         contents["messages"] = True
-        bus.add_signal_receiver(on_message, "Message", INTERFACE, path=PATH)
+        bus.add_signal_receiver(on_message, "Message", INTERFACE, NAME, PATH)
     loop, outcome = GLib.MainLoop(), []
 
     def end(*answer):
         outcome.extend(answer)
         loop.quit()
 
-    service = dbus.Interface(bus.get_object("com.tevari.VeltraOrloServices", PATH, introspect=False), INTERFACE)
+    service = dbus.Interface(bus.get_object(NAME, PATH, introspect=False), INTERFACE)
     service.HandleMessage(dbus.Dictionary(contents, signature="sv"), reply_handler=end, error_handler=end,
                           timeout=3600)  # pairing may take minutes
     loop.run()

@@ -70,13 +70,14 @@ protected:
 };
 
 TEST_F(RequestThreadTest, messagesAreBoundedAndComeBeforeTheEndingAndNoneBehindIt) {
-    const std::string filling(RequestThread::maximumMessageOctets - std::string("ZPOrlofirstframeworkname").size(),
+    const std::string filling(RequestThread::maximumMessageOctets - 3 * RequestThread::octetsBesideText -
+                                  std::string("ZPOrlofirstframeworkname").size(),
                               'x');
     const auto talk = [&](const std::string& name, const HSCompletion& completion) {
         thread.addMessage(2, "ZPOrlo", "first");
         std::thread([&] { thread.addMessage(4, "framework", name); }).join(); // as a callback of a service does
         thread.addMessage(2, "", filling);
-        thread.addMessage(2, "", "x");
+        thread.addMessage(2, "", "");
         completion(true, response(0));
         thread.addMessage(2, "ZPOrlo", "late");
     };

@@ -167,7 +167,10 @@ class Messages(HeldTest):
                 follower, connection = self.hold(client, "pair")
                 while "ZPOrloServices: Calling the pairing" not in follower.stdout.readline():
                     self.assertIsNone(follower.poll())
+                follower.send_signal(signal.SIGSTOP)  # a receiver that takes nothing keeps nobody waiting
                 connection.close()
+                self.service.busctl("0")
+                follower.send_signal(signal.SIGCONT)
                 output, errors = follower.communicate()
                 self.assertRegex(output, r"error\s+ZPOrloServices: Corvo SC pairing failed!!!\n\Z")
                 self.assertEqual((follower.returncode, errors != ""), (1, True))

@@ -67,11 +67,12 @@ void RequestThread::take(RequestReceiver& receiver) {
 }
 
 void RequestThread::addMessage(int level, std::string_view source, std::string_view text) noexcept try {
+    const std::size_t octets = octetsBesideText + source.size() + text.size();
     const std::lock_guard lock(mutex_);
-    if (!wantsMessages_ || source.size() + text.size() > maximumMessageOctets - messageOctets_)
+    if (!wantsMessages_ || octets > maximumMessageOctets - messageOctets_)
         return;
     messages_.push_back({level, std::string(source), std::string(text)});
-    messageOctets_ += source.size() + text.size();
+    messageOctets_ += octets;
     wake();
 } catch (const std::exception&) {
     return; // one that memory does not suffice for is left out, as in the log

@@ -49,6 +49,7 @@ public:
     // How many octets of messages one request may have. What comes beyond is left out, so that a receiver which takes
     // nothing costs no more than that.
     static constexpr std::size_t maximumMessageOctets = std::size_t{8} << 20;
+    static constexpr std::size_t octetsBesideText = 256; // what a message on its way takes beyond its text
 
     // Raises std::system_error when there can be no thread.
     explicit RequestThread(VeltraPluginServerInterface& server);
