@@ -152,6 +152,11 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.plain(count)
         self.drop()
 
+    def unasked(self, count):
+        self.plain(count)
+        self.answer(200, b"forged")
+        self.server.finished.set()
+
     def relay(self, count, port, changed_bit):
         """Passes the request on to another server, with one bit of the body changed or none."""
         body = bytearray(self.body())

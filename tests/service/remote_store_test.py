@@ -177,7 +177,7 @@ class PlainStore(RemoteTest, StoreCases):
                     "HTTPSEnable": 1, "HTTPSProxy": "127.0.0.1", "HTTPSPort": proxy.port}
         session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings})
         for options, tunnels in (({}, 0), ({"EnableProxy": True}, 1), ({"EnableProxySsl": "ForHttps"}, 0),
-                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 3)):
+                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 2)):  # and one is kept
             with self.subTest(options):
                 session.open(**options)
                 self.assertEqual(session.run("trust", TRUST_URL), (0, ""))
@@ -271,12 +271,14 @@ class Failures(HostileTest):
             with self.subTest(certificate):
                 self.server = self.serve(**certificate)
                 session = self.session()
+                session.put("plain")  # what is kept of it is not what the next description trusts
+                before = len(self.server.seen)
                 session.describe({key: value for key, value in self.describe(session.root, **changes).items() if value})
                 session.open()
                 for code, text in (session.get("plain"), session.put("plain"), session.run("export", ["psd2"], ["S1"])):
                     self.assertEqual(code, TRANSPORT)
                     self.assertRegex(text, f"^GET {MEASURE_URL}: .*({reason})")
-                self.assertEqual(self.server.seen, [])
+                self.assertEqual(self.server.seen[before:], [])
 
     def test_each_misbehaviour_is_an_error_with_its_reason(self):
         hasty, patient = self.session(HTTPTimeout=1), self.session(HTTPTimeout=60)
@@ -326,7 +328,7 @@ class Failures(HostileTest):
             ({}, "busy-1", TRANSPORT, 1),
             ({"HTTPMaxAttempts": 3}, "busy-2", 0, 3),
             ({"HTTPMaxAttempts": 3}, "broken-2", 0, 3),
-            ({"HTTPMaxAttempts": 2}, "broken-3", TRANSPORT, 2),
+            ({"HTTPMaxAttempts": 2}, "broken-3", TRANSPORT, 3),  # a kept connection that broke does not count
             ({"HTTPMaxAttempts": 3}, "status-404", NO_SUCH_RECORD, 1),
             ({"HTTPMaxAttempts": 3}, "status-403", NOT_PERMITTED, 1),
             ({"HTTPMaxAttempts": 3}, "announced", TRANSPORT, 1),
@@ -344,6 +346,8 @@ class Failures(HostileTest):
                 self.assertEqual(session.get(behaviour)[0], code)
                 seen = [line for line in self.server.seen[before:] if line[1].endswith(behaviour)]
                 self.assertEqual(len(seen), requests)
+        session.open()
+        self.assertEqual(session.put("broken-1")[0], TRANSPORT, "a put that may be carried out twice is sent once")
         session.open(HTTPMaxAttempts=4, MultiRequestMaxAttempts=3)
         for failing, code in ((2, 0), (3, TRANSPORT)):
             session.put("plain")  # fetches the trust object
@@ -374,6 +378,9 @@ class Failures(HostileTest):
         session = self.session()
         for behaviour in ("plain", "idle", "plain", "idle", "plain"):
             self.assertEqual((session.put(behaviour), session.get(behaviour)), ((0, ""), (0, "")))
+        session.get("unasked")
+        self.assertTrue(self.server.finished.wait(60))
+        self.assertEqual((session.get("plain"), session.got()), ((0, ""), TRUST_OBJECT))
 
     def test_what_came_without_tls_is_measured_by_what_came_with_it(self):
         plain = self.closing(HostileServer(None, None, b"forged"))

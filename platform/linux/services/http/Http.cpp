@@ -11,8 +11,10 @@
 #include <openssl/x509v3.h>
 #include <stdlib.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include "platform/Crypto.h"
+#include "platform/FileDescriptor.h"
 #include "platform/Format.h"
 #include "platform/Hexadecimal.h"
 #include "platform/ShownText.h"
@@ -28,6 +30,10 @@ constexpr std::size_t maximumHeaders = std::size_t{64} << 10;
 constexpr std::size_t longestTag = 256;
 
 constexpr std::string_view head = "HEAD";
+
+// How many seconds a connection may have been idle when it is used again.
+constexpr long longestIdle = 60;
+constexpr long longestIdleForOnce = 2;
 
 constexpr CURLcode transientFailures[] = {
     CURLE_COULDNT_RESOLVE_PROXY,
@@ -55,6 +61,7 @@ struct Incoming {
     std::size_t headers = 0;
     bool isTooLarge = false;
     bool isCut = false; // the rest of a refusal is of no interest
+    int sendings = 0;   // of a request that is sent once
 };
 
 // libcurl calls this through C, which no exception may cross.
@@ -85,6 +92,11 @@ std::size_t countHeader(char*, std::size_t, std::size_t count, void* context) {
     std::size_t& headers = static_cast<Incoming*>(context)->headers;
     headers += count;
     return headers > maximumHeaders ? 0 : count;
+}
+
+// libcurl calls this before it sends a request, and again before it sends the same one anew.
+int sendOnce(void* context, char*, char*, int, int) {
+    return ++static_cast<Incoming*>(context)->sendings == 1 ? CURL_PREREQFUNC_OK : CURL_PREREQFUNC_ABORT;
 }
 
 // The last header with this name of the answer that counts, without blanks around it.
@@ -156,9 +168,21 @@ std::string partOf(const std::string& url, CURLUPart which) {
     return part ? part : "";
 }
 
+using Sockets = std::vector<pollfd>;
+
 // A connection is not for programs that are started meanwhile.
-curl_socket_t openSocket(void*, curlsocktype, curl_sockaddr* address) {
-    return ::socket(address->family, address->socktype | SOCK_CLOEXEC, address->protocol);
+curl_socket_t openSocket(void* sockets, curlsocktype, curl_sockaddr* address) try {
+    FileDescriptor opened(::socket(address->family, address->socktype | SOCK_CLOEXEC, address->protocol));
+    if (opened)
+        static_cast<Sockets*>(sockets)->push_back({opened.get(), POLLIN, 0});
+    return opened.release();
+} catch (const std::bad_alloc&) {
+    return CURL_SOCKET_BAD;
+}
+
+int closeSocket(void* sockets, curl_socket_t socket) {
+    std::erase_if(*static_cast<Sockets*>(sockets), [socket](const pollfd& open) { return open.fd == socket; });
+    return ::close(socket);
 }
 
 } // namespace
@@ -203,18 +227,17 @@ std::string pathOf(const std::string& url) {
     return partOf(url, CURLUPART_PATH);
 }
 
-Client::Client() {
+Client::Client(Way way) : way_(std::move(way)) {
     prepare();
+    for (const std::string& entry : way_.connectTo)
+        append(connectTo_, entry);
     handle_.reset(curl_easy_init());
 }
 
-void Client::connectTo(const std::vector<std::string>& entries) {
-    connectTo_.reset();
-    for (const std::string& entry : entries)
-        append(connectTo_, entry);
-}
-
 Answer Client::exchange(const Request& request) {
+    // What came unasked would be taken for the next answer. Or it is the end of a connection.
+    if (::poll(sockets_.data(), sockets_.size(), 0) > 0)
+        handle_.reset(curl_easy_init());
     if (!handle_)
         throw std::bad_alloc();
     // What was set for the exchange before is forgotten; connections, host names and TLS sessions are not.
@@ -228,8 +251,14 @@ Answer Client::exchange(const Request& request) {
     set(CURLOPT_WRITEDATA, &incoming);
     set(CURLOPT_HEADERFUNCTION, countHeader);
     set(CURLOPT_HEADERDATA, &incoming);
+    if (request.isSentOnce) {
+        set(CURLOPT_PREREQFUNCTION, sendOnce);
+        set(CURLOPT_PREREQDATA, &incoming);
+    }
     if (result_ == CURLE_OK)
         result_ = curl_easy_perform(handle_.get());
+    if (incoming.sendings > 1)
+        return {failure(CURLE_GOT_NOTHING, curl_easy_strerror(CURLE_GOT_NOTHING))};
     if (incoming.isTooLarge)
         return {failure(result_, format("The answer is larger than %lu bytes", request.maximumAnswer))};
     if (incoming.headers > maximumHeaders)
@@ -273,12 +302,16 @@ void Client::configure(const Request& request) {
     set(CURLOPT_NOPROXY, "");
     set(CURLOPT_ERRORBUFFER, problem_);
     set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
+    set(CURLOPT_OPENSOCKETDATA, &sockets_);
+    set(CURLOPT_CLOSESOCKETFUNCTION, closeSocket);
+    set(CURLOPT_CLOSESOCKETDATA, &sockets_);
     set(CURLOPT_NOSIGNAL, 1L);
     set(CURLOPT_QUICK_EXIT, 1L); // a name server that is silent does not outlast the time-out
     set(CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(request.limits.connectTimeout.count()));
     set(CURLOPT_TIMEOUT_MS, static_cast<long>(request.limits.timeout.count()));
     set(CURLOPT_LOW_SPEED_LIMIT, 1L);
     set(CURLOPT_LOW_SPEED_TIME, static_cast<long>(request.limits.idleTimeout.count()));
+    set(CURLOPT_MAXAGE_CONN, request.isSentOnce ? longestIdleForOnce : longestIdle);
     if (connectTo_)
         set(CURLOPT_CONNECT_TO, connectTo_.get());
     configureTrust();
@@ -293,10 +326,10 @@ void Client::configure(const Request& request) {
 void Client::configureTrust() {
     set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
     set(CURLOPT_SSL_CTX_FUNCTION, prepareTls);
-    if (authorities_.empty())
+    if (way_.authorities.empty())
         return;
     // These take the place of libcurl's file of authorities but not of its folder, which has the same ones.
-    curl_blob blob = {authorities_.data(), authorities_.size(), CURL_BLOB_NOCOPY};
+    curl_blob blob = {way_.authorities.data(), way_.authorities.size(), CURL_BLOB_NOCOPY};
     set(CURLOPT_CAINFO_BLOB, &blob);
 }
 

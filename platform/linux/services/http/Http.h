@@ -16,6 +16,7 @@
 #include <vector>
 
 #include <curl/curl.h>
+#include <poll.h>
 
 #include "platform/Value.h"
 
@@ -63,6 +64,10 @@ struct Request {
     const Signature* signature = nullptr;
     // Refuses an answer of HTTP/1 that goes on until the connection ends: half of it would look like the whole.
     bool endMustBeMarked = false;
+    // A kept connection may end just when it is used again, and nobody knows then whether the server has got the
+    // request. It is sent anew once, over a new connection, unless it has to be sent once at most. Then it fails, and
+    // to make that rare it uses no connection that has been idle for more than two seconds.
+    bool isSentOnce = false;
 };
 
 // Aims `request` at the well-formed absolute URL `server` with `path` at the end of the URL's own, which begins with a
@@ -83,16 +88,24 @@ struct Answer {
     bool isSuccess() const { return status >= 200 && status <= 299; }
 };
 
-// Keeps the connections that it made for the exchanges after. Serves one thread at a time.
+// What a client goes by on its way to every server.
+struct Way {
+    std::string authorities = {};            // PEM certificates to trust beside those of the system
+    std::vector<std::string> connectTo = {}; // "HOST:PORT:CONNECT-TO-HOST:CONNECT-TO-PORT": where to connect instead
+
+    bool operator==(const Way&) const = default;
+};
+
+// Keeps the connections that it made, names and TLS sessions for the exchanges after, until something comes over one of
+// them unasked. Serves one thread at a time.
 class Client {
 public:
-    Client();
+    explicit Client(Way way = {});
 
-    // Trusts the authorities of these PEM certificates beside those of the system.
-    void trust(std::string pem) { authorities_ = std::move(pem); }
+    const Way& way() const { return way_; }
 
-    // Connects elsewhere: each entry is "HOST:PORT:CONNECT-TO-HOST:CONNECT-TO-PORT".
-    void connectTo(const std::vector<std::string>& entries);
+    // Whether the last exchange, if there was one, has had its answer, so that there is no doubt about the connections.
+    bool isSound() const { return handle_ && result_ == CURLE_OK; }
 
     // Raises only std::bad_alloc.
     Answer exchange(const Request& request);
@@ -112,11 +125,12 @@ private:
     void configureBody(const Request& request);
     void sign(const Request& request);
 
-    std::string authorities_;
+    Way way_;
     List connectTo_; // before the handle, which refers to it
     List headers_;
     CURLcode result_ = CURLE_OK;
     char problem_[CURL_ERROR_SIZE] = "";
+    std::vector<pollfd> sockets_; // that are open
     std::unique_ptr<CURL, Release> handle_;
 };
 

@@ -148,8 +148,7 @@ OrloRemoteSettings::ObjectStore readObjectStore(const Value& described) {
 
 OrloRemoteSettings readRemoteSettings(const Value& store) {
     OrloRemoteSettings settings;
-    settings.authorities = readAuthorities(store["caFile"]);
-    settings.connectTo = readConnectTo(store["connectTo"]);
+    settings.way = {readAuthorities(store["caFile"]), readConnectTo(store["connectTo"])};
     if (!store["s3"].isNothing())
         settings.objectStore = readObjectStore(store["s3"]);
     return settings;

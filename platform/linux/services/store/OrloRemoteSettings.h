@@ -4,7 +4,6 @@
 
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "platform/Value.h"
 #include "platform/linux/services/http/Http.h"
@@ -17,8 +16,7 @@ struct OrloRemoteSettings {
         bool isConditional; // a record is put on condition that it is still what was found before
     };
 
-    std::string authorities;            // PEM; empty for those of the system alone
-    std::vector<std::string> connectTo; // as http::Client takes them
+    http::Way way;
     std::optional<ObjectStore> objectStore;
 };
 

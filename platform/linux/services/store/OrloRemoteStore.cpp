@@ -14,6 +14,7 @@
 #include "platform/Hexadecimal.h"
 #include "platform/ReverseProxy.h"
 #include "platform/Utf8.h"
+#include "platform/linux/services/http/ClientShelf.h"
 #include "platform/linux/services/http/Http.h"
 #include "platform/linux/services/store/OrloRemoteSettings.h"
 #include "platform/linux/services/store/OrloStoreBackend.h"
@@ -190,12 +191,17 @@ std::string conditionOn(const http::Answer& found) {
     return "If-Match: " + std::string(tag);
 }
 
+// What a session's connections are left on for the next one.
+http::ClientShelf& shelf() {
+    static http::ClientShelf only(std::chrono::minutes(1), std::chrono::minutes(10));
+    return only;
+}
+
 class RemoteStore : public OrloStoreBackend {
 public:
-    explicit RemoteStore(OrloRemoteSettings settings) : settings_(std::move(settings)) {
-        client_.trust(std::move(settings_.authorities));
-        client_.connectTo(settings_.connectTo);
-    }
+    explicit RemoteStore(OrloRemoteSettings settings)
+        : settings_(std::move(settings)), loan_(shelf().take(std::move(settings_.way))) {}
+    ~RemoteStore() override { shelf().put(std::move(loan_)); }
 
     Value::Data trustObject(const OrloOptions& options, std::string_view url) override {
         measure_.reset(); // a session that begins anew is measured by what the store has now
@@ -214,7 +220,7 @@ public:
             throw OrloStoreFailure(QDOrloErrorStorage, format("A record of %lu bytes is too large", data.size()));
         const bool isConditional = settings_.objectStore && settings_.objectStore->isConditional;
         putBytes(options, recordPath(options, name), data, attemptsOfOne,
-                 isConditional ? &RemoteStore::sendIfUnchanged : &RemoteStore::sendAsItIs);
+                 isConditional ? &RemoteStore::sendIfUnchanged : &RemoteStore::sendOnce);
     }
 
     Value::Data copy(const OrloOptions& options, const OrloRecordName& name) override {
@@ -242,7 +248,13 @@ private:
     // one that the outcome is about.
     using Send = http::Answer (RemoteStore::*)(http::Request& request);
 
-    http::Answer sendAsItIs(http::Request& request) { return client_.exchange(request); }
+    http::Answer sendAsItIs(http::Request& request) { return loan_.client->exchange(request); }
+
+    // What is sent twice could be carried out a second time after a later put has been answered.
+    http::Answer sendOnce(http::Request& request) {
+        request.isSentOnce = true;
+        return loan_.client->exchange(request);
+    }
 
     // Puts on condition that the object is still what it was before. A put whose client has given up may be carried out
     // at any time after: its condition does not hold any more once a later one has been answered, unless that one put
@@ -263,7 +275,7 @@ private:
                 request.body.reset();
             request.maximumAnswer = condition.empty() ? largestRecord : largestReply;
             request.endMustBeMarked = condition.empty();
-            return client_.exchange(request);
+            return loan_.client->exchange(request);
         };
         http::Answer found = send("HEAD", "");
         for (milliseconds backoff{0};; backoff = nextBackoff(backoff)) {
@@ -398,7 +410,7 @@ private:
     }
 
     OrloRemoteSettings settings_;
-    http::Client client_;
+    http::ClientShelf::Loan loan_;
     std::optional<Value> proxies_;
     std::optional<Value::Data> measure_; // the trust object as it last came over TLS
 };
