@@ -135,6 +135,7 @@ TEST(DeviceDescription, describedValuesStandForDataAndFiles) {
     const std::pair<const char*, Value> rows[] = {
         {R"({"$data": "0bADcafe"})", Data{0x0B, 0xAD, 0xCA, 0xFE}},
         {R"({"$data": "0bA"})", {}},
+        {R"({"$data": 12})", {}},
         {R"({"$data": "00", "as": "text"})", {}},
         {R"({"$file": "/sys/uid"})", Data{0x0B, 0xAD, 0, ' ', '\n'}},
         {R"({"$file": "/sys/model", "as": "text"})", "M12\uFFFDx é"},

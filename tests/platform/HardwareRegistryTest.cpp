@@ -51,6 +51,7 @@ TEST_F(HardwareRegistryTest, theFirstServiceOfAClassIsFoundAtAnyDepth) {
 TEST_F(HardwareRegistryTest, aPropertyIsSearchedOnTheServiceAndIfAskedForBelowIt) {
     root_.write("/later", "text\n");
     EXPECT_EQ(propertyOf("Relay", "Deep", searchRecursively), Value(Value::Data{0xC0, 0xDE}));
+    EXPECT_EQ(propertyOf("Relay", "Own", searchRecursively), Value(1));
     EXPECT_EQ(propertyOf("Relay", "Deepest", searchRecursively), Value(true));
     EXPECT_EQ(propertyOf("Relay", "Later", searchRecursively), Value("text"));
     EXPECT_EQ(propertyOf("Relay", "Lost", searchRecursively), Value("found")); // the own one names a missing file

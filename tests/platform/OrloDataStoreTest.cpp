@@ -265,7 +265,7 @@ TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
     std::filesystem::create_symlink(root_.around() / "outside", root_.host("/link"));
     const std::pair<const char*, std::string> keys[] = {
         {"/open", "id\nsecret\n"},       {"/key", "id\nsecret\r\n\n"},      {"/blank", "id\nsec ret\n"},
-        {"/long", "id\nsecret\nmore\n"}, {"/huge", std::string(5000, 'x')},
+        {"/long", "id\nsecret\nmore\n"}, {"/huge", std::string(5000, 'x')}, {"/short", "id\n"},
     };
     for (const auto& [path, contents] : keys) {
         root_.write(path, contents);
@@ -292,10 +292,12 @@ TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
         {remote + R"("s3": "bucket")", "region"},
         {s3 + R"("a/b", "accessKeyFile": "/key"})", "bucket"},
         {s3 + R"("..", "accessKeyFile": "/key"})", "bucket"},
+        {s3 + R"(7, "accessKeyFile": "/key"})", "bucket"},
         {s3 + R"("b"})", "accessKeyFile"},
         {key + R"(/key", "conditional": 1})", "conditional"},
         {key + R"(/missing"})", "/missing cannot be read"},
         {key + R"(/open"})", "mode 0600"},
+        {key + R"(/short"})", "two lines"},
         {key + R"(/blank"})", "two lines"},
         {key + R"(/long"})", "two lines"},
         {key + R"(/huge"})", "cannot be read"},

@@ -77,6 +77,7 @@ TEST(Format, conversionsWriteTheirArgumentWhateverItIs) {
         {format("<%@>", error), "<D (7): text>"},
         {format("<%@>", std::optional<Error>()), "<(null)>"},
         {format("<%s>", "text"), "<text>"},
+        {format("<%s>", static_cast<const char*>(nullptr)), "<(null)>"},
         {format("<%d>", 0xFFFFFFFFU), "<-1>"},
         {format("<%d>", std::int64_t{0x180000000}), "<-2147483648>"},
         {format("<%d>", Value(true)), "<1>"},
