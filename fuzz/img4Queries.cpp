@@ -54,81 +54,77 @@ struct Inquiry {
         (askOne(keys, queries), ...);
     }
 
-    void askWhole();
-    void askAbout(std::uint32_t name);
-    void askSingles();
-    bool run(Initialise initialise);
+    void askWhole() {
+        DERItem manifest = {}, properties = {};
+        std::uint32_t length = 0, algorithm = 0, size = 0;
+        std::uint8_t digest[Img4MaxDigestLength] = {};
+        note(Img4DecodeGetManifest(&record, &manifest.data, &length));
+        manifest.length = length;
+        note(manifest);
+        note(Img4DecodeGetPayloadCompressionInfo(&record, &algorithm, &size));
+        note(algorithm);
+        note(size);
+        ask(std::tuple(&record), Img4DecodeManifestExists, Img4DecodeRestoreInfoExists, Img4DecodePayloadExists,
+            Img4DecodeGetPayload, Img4DecodeGetPayloadType, Img4DecodeGetPayloadVersion, Img4DecodePayloadKeybagExists,
+            Img4DecodeGetPayloadKeybag, Img4DecodePayloadCompressionInfoExists, Img4DecodePayloadPropertiesExists,
+            Img4DecodeGetPayloadProperties);
+        Img4DecodeGetPayloadProperties(&record, &properties);
+        for (const std::string_view name : names)
+            ask(std::tuple(&properties, codeOf(name)), Img4DecodePayloadPropertiesFindItemWithTag);
+        const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
+        note(Img4DecodeCopyPayloadPropertiesDigest(&properties, digest, sizeof digest, &profile));
+        note(Img4DecodeCopyPayloadDigest(&record, digest, sizeof digest, &profile));
+        note(Img4DecodeCopyManifestHash(&record, digest, Img4HashLength));
+        for (const std::uint8_t octet : digest)
+            note(octet);
+    }
+
+    void askAbout(std::uint32_t name) {
+        const DERTag tag = Img4PropertyTag(name);
+        ask(std::tuple(&record, tag, DERTagSet), Img4DecodePayloadProperty);
+        ask(std::tuple(&record, tag), Img4DecodeGetPayloadPropertiesBoolean, Img4DecodeGetPayloadPropertiesInteger,
+            Img4DecodeGetPayloadPropertiesInteger64, Img4DecodeGetPayloadPropertiesData,
+            Img4DecodePayloadPropertyExistsByTag);
+        for (const std::uint32_t section : {0U, 1U}) {
+            ask(std::tuple(&record, section, tag, DERTagIA5String), Img4DecodeGetPropertyFromSection);
+            ask(std::tuple(&record, section, name), Img4DecodeGetBooleanFromSection, Img4DecodeGetIntegerFromSection,
+                Img4DecodeGetInteger64FromSection, Img4DecodeGetDataFromSection);
+        }
+        for (const std::uint32_t object : {codeOf("sepi"), codeOf("o001")}) {
+            ask(std::tuple(&record, object, tag, DERTagOctetString), Img4DecodeGetObjectProperty);
+            ask(std::tuple(&record, object, name), Img4DecodeGetObjectPropertyBoolean,
+                Img4DecodeGetObjectPropertyInteger, Img4DecodeGetObjectPropertyInteger64,
+                Img4DecodeGetObjectPropertyData, Img4DecodeGetObjectPropertyString);
+        }
+    }
+
+    // The elements of a dictionary are what a caller of these holds; each is asked for by its own name.
+    void askSingles() {
+        DERSequence elements;
+        DERDecodedInfo element;
+        DERDecodeSeqContentInit(&record.restoreInfo.properties, &elements);
+        while (DERDecodeSeqNext(&elements, &element) == DERSuccess) {
+            const auto name = static_cast<std::uint32_t>(element.tag);
+            ask(std::tuple(&element.content, Img4PropertyTag(name)), DERImg4DecodeProperty,
+                Img4DecodeGetPayloadVersionPropertyString);
+            ask(std::tuple(&element.content, name), Img4DecodeGetPropertyBoolean, Img4DecodeGetPropertyInteger,
+                Img4DecodeGetPropertyInteger64, Img4DecodeGetPropertyData);
+        }
+    }
+
+    bool run(Initialise initialise) {
+        const DERReturn result = initialise(input.data, input.length, &record);
+        note(result);
+        if (result != DERSuccess)
+            return false;
+        FUZZ_REQUIRE(record.manifestRaw.data != input.data || record.manifestRaw.length == input.length);
+        askWhole();
+        for (const std::string_view name : names)
+            askAbout(codeOf(name));
+        askSingles();
+        return true;
+    }
 };
-
-void Inquiry::askWhole() {
-    DERItem manifest = {}, properties = {};
-    std::uint32_t length = 0, algorithm = 0, size = 0;
-    std::uint8_t digest[Img4MaxDigestLength] = {};
-    note(Img4DecodeGetManifest(&record, &manifest.data, &length));
-    manifest.length = length;
-    note(manifest);
-    note(Img4DecodeGetPayloadCompressionInfo(&record, &algorithm, &size));
-    note(algorithm);
-    note(size);
-    ask(std::tuple(&record), Img4DecodeManifestExists, Img4DecodeRestoreInfoExists, Img4DecodePayloadExists,
-        Img4DecodeGetPayload, Img4DecodeGetPayloadType, Img4DecodeGetPayloadVersion, Img4DecodePayloadKeybagExists,
-        Img4DecodeGetPayloadKeybag, Img4DecodePayloadCompressionInfoExists, Img4DecodePayloadPropertiesExists,
-        Img4DecodeGetPayloadProperties);
-    Img4DecodeGetPayloadProperties(&record, &properties);
-    for (const std::string_view name : names)
-        ask(std::tuple(&properties, codeOf(name)), Img4DecodePayloadPropertiesFindItemWithTag);
-    const Img4TrustProfile& profile = kImg4DecodeSecureBootRsa4kSha384;
-    note(Img4DecodeCopyPayloadPropertiesDigest(&properties, digest, sizeof digest, &profile));
-    note(Img4DecodeCopyPayloadDigest(&record, digest, sizeof digest, &profile));
-    note(Img4DecodeCopyManifestHash(&record, digest, Img4HashLength));
-    for (const std::uint8_t octet : digest)
-        note(octet);
-}
-
-void Inquiry::askAbout(std::uint32_t name) {
-    const DERTag tag = Img4PropertyTag(name);
-    ask(std::tuple(&record, tag, DERTagSet), Img4DecodePayloadProperty);
-    ask(std::tuple(&record, tag), Img4DecodeGetPayloadPropertiesBoolean, Img4DecodeGetPayloadPropertiesInteger,
-        Img4DecodeGetPayloadPropertiesInteger64, Img4DecodeGetPayloadPropertiesData,
-        Img4DecodePayloadPropertyExistsByTag);
-    for (const std::uint32_t section : {0U, 1U}) {
-        ask(std::tuple(&record, section, tag, DERTagIA5String), Img4DecodeGetPropertyFromSection);
-        ask(std::tuple(&record, section, name), Img4DecodeGetBooleanFromSection, Img4DecodeGetIntegerFromSection,
-            Img4DecodeGetInteger64FromSection, Img4DecodeGetDataFromSection);
-    }
-    for (const std::uint32_t object : {codeOf("sepi"), codeOf("o001")}) {
-        ask(std::tuple(&record, object, tag, DERTagOctetString), Img4DecodeGetObjectProperty);
-        ask(std::tuple(&record, object, name), Img4DecodeGetObjectPropertyBoolean, Img4DecodeGetObjectPropertyInteger,
-            Img4DecodeGetObjectPropertyInteger64, Img4DecodeGetObjectPropertyData, Img4DecodeGetObjectPropertyString);
-    }
-}
-
-// The elements of a dictionary are what a caller of these holds; each is asked for by its own name.
-void Inquiry::askSingles() {
-    DERSequence elements;
-    DERDecodedInfo element;
-    DERDecodeSeqContentInit(&record.restoreInfo.properties, &elements);
-    while (DERDecodeSeqNext(&elements, &element) == DERSuccess) {
-        const auto name = static_cast<std::uint32_t>(element.tag);
-        ask(std::tuple(&element.content, Img4PropertyTag(name)), DERImg4DecodeProperty,
-            Img4DecodeGetPayloadVersionPropertyString);
-        ask(std::tuple(&element.content, name), Img4DecodeGetPropertyBoolean, Img4DecodeGetPropertyInteger,
-            Img4DecodeGetPropertyInteger64, Img4DecodeGetPropertyData);
-    }
-}
-
-bool Inquiry::run(Initialise initialise) {
-    const DERReturn result = initialise(input.data, input.length, &record);
-    note(result);
-    if (result != DERSuccess)
-        return false;
-    FUZZ_REQUIRE(record.manifestRaw.data != input.data || record.manifestRaw.length == input.length);
-    askWhole();
-    for (const std::string_view name : names)
-        askAbout(codeOf(name));
-    askSingles();
-    return true;
-}
 
 // What a container holds answers alike when it is handed over bare.
 void checkContainer(const Img4Record& record) {

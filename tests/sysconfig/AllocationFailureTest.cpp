@@ -97,23 +97,16 @@ std::function<bool(const SysConfig3Ptr&)> adding(const auto& entry) {
     return [&entry](const SysConfig3Ptr& object) { return add(object, entry); };
 }
 
-std::function<bool(const SysConfig3Ptr&)> creating(bool (*create)(const __SysConfig3*, SysConfigData*)) {
-    return [create](const SysConfig3Ptr& object) {
-        SysConfigData out = {};
-        const bool success = create(object.get(), &out);
-        const sysconfig::BytesPtr owner(out.data);
-        EXPECT_TRUE((out.data != nullptr) == success && out.length == 32);
+// Calls what gives bytes, which leaves `failed` behind where it fails.
+std::function<bool(const SysConfig3Ptr&)> giving(bool (*give)(const __SysConfig3*, SysConfigData*),
+                                                 const SysConfigData& failed = {nullptr, 32}) {
+    return [give, failed](const SysConfig3Ptr& object) {
+        SysConfigData out = hmacKey;
+        const bool success = give(object.get(), &out);
+        const sysconfig::BytesPtr owner(success ? out.data : nullptr);
+        EXPECT_EQ(out.data == failed.data && out.length == failed.length, !success);
         return success;
     };
-}
-
-bool encodeInto(const SysConfig3Ptr& object) {
-    std::uint8_t octet = 9;
-    SysConfigData out = {&octet, 1};
-    const bool success = encodeSysConfig3(object.get(), &out);
-    const sysconfig::BytesPtr owner(success ? out.data : nullptr);
-    EXPECT_EQ(out.data == &octet && out.length == 1, !success);
-    return success;
 }
 
 bool registerKey(const SysConfig3Ptr& object) {
@@ -148,16 +141,16 @@ TEST(AllocationFailure, isReportedAndLeavesEverythingAsItWas) {
         {"metadata entry of a present key", 0x30003, 2, adding(presentMetadata)},
         // Three validations and two recomputations, each of which asks OpenSSL for memory.
         {"entry of a keyed object", 0x30002, 2 * 5, adding(presentPayload)},
-        {"payload HMAC", 0x30002, 2, creating(sysConfig3CreatePayloadHMAC)},
-        {"metadata HMAC", 0x30002, 2, creating(sysConfig3CreateMetadataHMAC)},
-        {"full HMAC", 0x30002, 2, creating(sysConfig3CreateFullHMAC)},
+        {"payload HMAC", 0x30002, 2, giving(sysConfig3CreatePayloadHMAC)},
+        {"metadata HMAC", 0x30002, 2, giving(sysConfig3CreateMetadataHMAC)},
+        {"full HMAC", 0x30002, 2, giving(sysConfig3CreateFullHMAC)},
         {"key", 0x30003, 1, registerKey, {"sysConfig3SetHMACKey: malloc() returned NULL."}},
         {"new object", 0x30003, 5, makeObject, {"allocSysConfig3: malloc failed."}},
         // The object, a manifest of three HMACs, the key, and the computed HMACs.
         {"new keyed object", 0x30002, 1 + 4 + 1 + 3, makeKeyedObject},
-        {"encode", 0x30003, 1, encodeInto, {"encodeSysConfig3: malloc failed."}},
+        {"encode", 0x30003, 1, giving(encodeSysConfig3, hmacKey), {"encodeSysConfig3: malloc failed."}},
         // The blob itself, and what OpenSSL takes for three validations.
-        {"encode of a keyed object", 0x30002, 1 + 2 * 3, encodeInto},
+        {"encode of a keyed object", 0x30002, 1 + 2 * 3, giving(encodeSysConfig3, hmacKey)},
     };
     for (const Row& row : rows) {
         int failures = 0;

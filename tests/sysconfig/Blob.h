@@ -58,10 +58,6 @@ inline sysconfig::SysConfig3Ptr decode(const Bytes& blob) {
     return sysconfig::SysConfig3Ptr(decodeSysConfig3(blob.data(), static_cast<std::uint32_t>(blob.size())));
 }
 
-inline sysconfig::SysConfig3Ptr decodeParts(const BlobParts& parts) {
-    return decode(parts.whole());
-}
-
 // The encoded object, empty when it cannot be encoded.
 inline Bytes encode(const __SysConfig3* object) {
     SysConfigData out = {};

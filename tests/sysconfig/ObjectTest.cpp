@@ -105,19 +105,18 @@ TEST(SysConfig3, toleratesAbsentRecordsWithoutAMessage) {
 }
 
 TEST(SysConfig3, supportsNineMagicsAndThreeVersions) {
-    std::string magics;
+    std::string supported;
     for (const std::string_view name :
          {"0Cfg", "appv", "bCfg", "dCfg", "eCfg", "fCfg", "mCfg", "seal", "tCfg", "aCfg", "gCfb"}) {
         SysConfig3Magic magic = 0;
         for (const char character : name)
             magic = magic << 8 | static_cast<unsigned char>(character);
-        magics += isSupportedSysConfig3Magic(magic) ? 'y' : 'n';
+        supported += isSupportedSysConfig3Magic(magic) ? 'y' : 'n';
     }
-    EXPECT_EQ(magics, "yyyyyyyyynn");
-    std::string versions;
     for (const SysConfig3Version version : {0x30000U, 0x30001U, 0x30002U, 0x30003U, 0x30004U})
-        versions += isSupportedSysConfig3Version(version) ? 'y' : 'n';
-    EXPECT_EQ(versions, "nyyyn");
+        supported += isSupportedSysConfig3Version(version) ? 'y' : 'n';
+    EXPECT_EQ(supported, "yyyyyyyyynn"
+                         "nyyyn");
 }
 
 TEST(Entry, cutsStringsAtSixteenMebiAndKeysAt256) {
@@ -209,7 +208,7 @@ TEST(Object, isEqualByBothListsInOrderAndTheManifest) {
         object({}, {}),
         object({}, {}, 0x6D436667),
         object({}, {}, bCfg, 0x30001),
-        decodeParts({.manifest = bytes("30 09 04 01 00 04 01 01 04 01 00")}),
+        decode(BlobParts{.manifest = bytes("30 09 04 01 00 04 01 01 04 01 00")}.whole()),
     };
     expectDistinct(objects, sysConfig3ObjectsAreEqual,
                    [](const __SysConfig3* original) { return decode(encode(original)).release(); });
@@ -270,7 +269,7 @@ std::uint64_t costOfAllLookups(const List& list) {
     return cost;
 }
 
-BlobParts withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint32_t)) {
+Bytes withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint32_t)) {
     Bytes entries;
     for (std::uint32_t i = 0; i < count; ++i) {
         const std::uint32_t key = keyOf(i);
@@ -278,7 +277,7 @@ BlobParts withPayloadKeys(std::uint32_t count, std::uint32_t (*keyOf)(std::uint3
                                        static_cast<std::uint8_t>(key >> 8), static_cast<std::uint8_t>(key >> 16),
                                        static_cast<std::uint8_t>(key >> 24), 0x16, 0x00, 0x01, 0x01, 0xFF});
     }
-    return {.payload = item("31", entries)};
+    return BlobParts{.payload = item("31", entries)}.whole();
 }
 
 TEST(Index, standsAMillionKeysOfAnAdversary) {
@@ -291,7 +290,7 @@ TEST(Index, standsAMillionKeysOfAnAdversary) {
         {"all equal", [](std::uint32_t) { return keyWCh0; }, 1},
     };
     for (const auto& [what, keyOf, count] : rows) {
-        const SysConfig3Ptr object = decodeParts(withPayloadKeys(million, keyOf));
+        const SysConfig3Ptr object = decode(withPayloadKeys(million, keyOf));
         ASSERT_EQ(sysConfig3GetPayloadEntryCount(object.get()), count) << what;
         // An entry costs 1, and chance collisions add a half to that.
         EXPECT_LT(costOfAllLookups(object->payload), 2 * count) << what;
