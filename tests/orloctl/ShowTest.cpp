@@ -194,7 +194,6 @@ const ProblemCase problemCases[] = {
     {"img4", "\"MANB\" has no \"MANP\", so that every lookup fails", manifestOf(set({property("MANB", set({}))}))},
     {"img4", "Certificate 1 of the chain is no strict DER in the item at offset ",
      manifestOf(manifestBody({}), 0, {sequence({}), {0x30, 0x05}})},
-    {"img4", "Certificate 0 of the chain is SET instead of", manifestOf(manifestBody({}), 0, {set({})})},
     {"img4", "\"INTEGER\" of the restore information is no property", inRestoreInfo(integer(1))},
     {"img4", "is named \"tset\" inside", holding(sequence({ia5("tset"), integer(1)}))},
     {"img4", "has no four-character name inside", holding(sequence({integer(1)}))},

@@ -125,7 +125,6 @@ std::vector<RefusalCase> refusalCases() {
     const Bytes digests = withDigests(), image = container(payload({}), digests, {});
     return {
         {"file", "The file is empty", Bytes{}},
-        {"file", "content is cut short", {0x30, 0x05, 0x16}},
         {"file", "has neither a signature nor a chain", unsignedManifest({})},
         {"file", "is a bare payload", payload({})},
         {"file", "The container has no manifest", container(payload({}), {}, {})},
@@ -166,11 +165,8 @@ std::vector<RefusalCase> refusalCases() {
         {"signature", "it has not the form that the algorithm demands", withSignature(ec384, filler(48))},
 
         {"dictionaries", R"(The manifest's body has no "MANB")", withBody(set({object("MANX", {})}))},
-        {"dictionaries", R"("MANB" has no "MANP")", withBody(set({object("MANB", {})}))},
 
         {"object", R"(The manifest has no "xyzt")", soundManifest(ec384), nullptr, "xyzt"},
-        {"object", R"(a "sepi" that is INTEGER instead of)",
-         constrained({}, {.objects = {property("sepi", integer(1))}}), nullptr, "sepi"},
 
         {"constraints", "The leaf certificate carries no constraints", withLeaf(ec384, &Certificate::extensions, {})},
         {"constraints", R"(says that "ABCD" of the manifest must be INTEGER 8, and it is INTEGER 7)",
@@ -188,7 +184,6 @@ std::vector<RefusalCase> refusalCases() {
 
         {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
          constrained({}, {.properties = {property("LIST", sequence({}))}})},
-        {"properties", "INTEGER of the manifest is no property", constrained({}, {.properties = {integer(1)}})},
         {"properties", R"(private "LONG" of the object has a content that holds an item behind)",
          constrained({}, {.objects = {object(
                               "sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))})}}),
@@ -197,7 +192,6 @@ std::vector<RefusalCase> refusalCases() {
         {"payload", "its SHA-384 is another than \"ELSE\" of \"sepi\" demands", image, nullptr, "sepi", "ELSE"},
         {"payload", "\"SHRT\" of \"sepi\" has 20 octets, and SHA-384 has 48", image, nullptr, "sepi", "SHRT"},
         {"payload", "no sound OCTET STRING \"FLAG\" of \"sepi\"", image, nullptr, "sepi", "FLAG"},
-        {"payload", "no sound OCTET STRING \"NONE\" of \"sepi\"", image, nullptr, "sepi", "NONE"},
         {"payload", "The file has no payload", digests, nullptr, "sepi", "DGST"},
     };
 }

@@ -188,11 +188,8 @@ class CrashLogs(Device):
         self.assertEqual((copies / "hard link").read_bytes(), b"earlier")
 
     def test_the_list_for_people(self):
-        for words, status, printed in (
-            ([], 0, "status: 45\nlogs: none\n"),
-            (["-o", "/dev/null/folder"], 2, ""),
-        ):
-            self.assertEqual(self.run_orloctl("crash-logs", *words)[:2], (status, printed))
+        self.assertEqual(self.run_orloctl("crash-logs"), (0, "status: 45\nlogs: none\n", ""))
+        self.assertEqual(self.run_orloctl("crash-logs", "-o", "/dev/null/folder")[:2], (2, ""))
         self.write(self.logs + "a\n.log", b"x" * 1000)
         os.utime(self.root / self.logs / "a\n.log", (0, 1_700_000_000))
         header = "status: 0\nlogs:\n  DATE                          SIZE  PANIC  NAME\n"

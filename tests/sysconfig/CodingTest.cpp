@@ -81,7 +81,6 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         {withPayload({}), payload, 21, DERFaultHeaderCutShort, "Unable to decode payload with error 3"},
         {withPayload(bytes("30 00")), payload, 21, DERFaultTag,
          "Tag was not the expected Payload tag 2000000000000010"},
-        {withPayload(bytes("31 05 00")), payload, 21, DERFaultContentCutShort, "Unable to decode payload with error 3"},
         {withMetadata({}), metadata, 30, DERFaultHeaderCutShort, "Unable to decode metadata with error 3"},
         {withMetadata(bytes("04 00")), metadata, 30, DERFaultTag, "Tag was not the expected metadata tag 4"},
         {withManifest({}), manifest, 39, DERFaultHeaderCutShort, "Unable to decode manifest with error 3"},
@@ -152,7 +151,6 @@ TEST(Decode, takesEachEntryAndManifestOnItsMeritsAndThereAndBack) {
         {commented(""), "WCh0=data 01 02, MiGB=data 01 02", ""},
         {commented("6E 6F 74 65"), "WCh0 (note)=data 01 02, MiGB=data 01 02", ""},
         {commented("00 61"), "WCh0=data 01 02, MiGB=data 01 02", ""},
-        {commented("61 00 62"), "WCh0 (a)=data 01 02, MiGB=data 01 02", ""},
         // Nobody looks at the version of a deleted flag.
         {BlobParts{.version = bytes("01 00 03 00"), .payload = item("31", payloadEntry(bytes("01 01 FF")))}.whole(),
          "WCh0=deleted", ""},
