@@ -1,7 +1,7 @@
 #include "tests/img4/TrustDomain.h"
 #include "tests/support/MissingArguments.h"
 
-#include <vector>
+#include <memory>
 
 #include <gtest/gtest.h>
 #include <openssl/bn.h>
@@ -93,28 +93,6 @@ struct Case {
     bool accepted = false;
 };
 
-// The blocks of that length for this digest under the algorithm with this encoded OBJECT IDENTIFIER.
-std::vector<Case> blockCases(const Bytes& digest, const Bytes& oid, std::size_t length) {
-    const Bytes algorithm = sequence({oid, null});
-    const Bytes info = sequence({algorithm, octets(digest)});
-    const Bytes sound = padded(info, length);
-    const auto with = [length](const List& digestInfo) { return padded(sequence(digestInfo), length); };
-    const auto shortened = [&](std::size_t padding) {
-        return join({padded(info, padding + 3 + info.size()), Bytes(length - padding - 3 - info.size(), 0xAA)});
-    };
-    return {
-        {"sound", sound, true},
-        {"no NULL", with({sequence({oid}), octets(digest)})},
-        {"octets behind the digest", with({algorithm, octets(digest), null})},
-        {"digest alone", padded(digest, length)},
-        {"other digest", lastChanged(sound)},
-        {"short padding and octets behind", shortened(8)},
-        {"padding of seven octets", shortened(7)},
-        {"other octet in the padding", changedAt(sound, 2, 0xFE)},
-        {"padding of encryption", changedAt(sound, 1, 0x02)},
-    };
-}
-
 const Key& rsaKey() {
     static const Key key = readKey(TEST_TRUST_DOMAIN "/keys/ROOT_CA_CERTIFICATE.pem");
     return key;
@@ -131,18 +109,40 @@ const Img4DigestInfo* const digestInfos[] = {&kQDSupportDigestInfoSha1, &kQDSupp
 
 const Bytes longExponent = {0x01, 0, 0, 0, 0, 0, 0, 0, 0x0D};
 
+// `size` is that of the modulus.
+void checkBlocks(const Key& key, const Img4DigestInfo& info, std::size_t size) {
+    const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, info);
+    const Bytes digest = digestOfMessage(profile), algorithm = sequence({oid(*info.oid), null});
+    const Bytes digestInfo = sequence({algorithm, octets(digest)}), sound = padded(digestInfo, size);
+    const auto with = [size](const List& elements) { return padded(sequence(elements), size); };
+    const auto shortened = [&](std::size_t padding) {
+        const Bytes block = padded(digestInfo, padding + 3 + digestInfo.size());
+        return join({block, Bytes(size - block.size(), 0xAA)});
+    };
+    const Case rows[] = {
+        {"sound", sound, true},
+        {"no NULL", with({sequence({oid(*info.oid)}), octets(digest)})},
+        {"octets behind the digest", with({algorithm, octets(digest), null})},
+        {"digest alone", padded(digest, size)},
+        {"other digest", lastChanged(sound)},
+        {"short padding and octets behind", shortened(8)},
+        {"padding of seven octets", shortened(7)},
+        {"other octet in the padding", changedAt(sound, 2, 0xFE)},
+        {"padding of encryption", changedAt(sound, 1, 0x02)},
+    };
+    const Bytes bits = publicKeyBits(key);
+    EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info.length, message)));
+    for (const Case& row : rows)
+        EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, row.octets)), row.accepted)
+            << info.length << " at " << size << ", " << row.name;
+}
+
 TEST(Img4RSASignature, isOverTheExactBlock) {
     // OpenSSL itself does not verify with exponents of more than 64 bits under moduli of more than 3072.
-    for (const Key& key : {rsaKey(), makeRSAKey(3080, longExponent)}) {
-        const Bytes bits = publicKeyBits(key);
-        const auto size = static_cast<std::size_t>(EVP_PKEY_get_size(key.get()));
-        for (const Img4DigestInfo* info : digestInfos) {
-            const Img4TrustProfile profile = profileWith(kImg4DecodeSecureBootRsa4kSha384, *info);
-            EXPECT_TRUE(accepts(verify_signature_rsa, profile, bits, sign(key, info->length, message)));
-            for (const Case& row : blockCases(digestOfMessage(profile), oid(*info->oid), size))
-                EXPECT_EQ(accepts(verify_signature_rsa, profile, bits, signRaw(key, row.octets)), row.accepted)
-                    << info->length << " at " << size << ", " << row.name;
-        }
+    const Key longKey = makeRSAKey(3080, longExponent);
+    for (const Img4DigestInfo* info : digestInfos) {
+        checkBlocks(rsaKey(), *info, 256);
+        checkBlocks(longKey, *info, 385);
     }
 }
 
@@ -209,11 +209,22 @@ Bytes pair(const Bytes& r, const Bytes& s) {
     return sequence({positiveInteger(r), positiveInteger(s)});
 }
 
-// The signature of the numbers r and s, both of which have their highest bit set, and others made of them.
-std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) {
-    const Bytes R = positiveInteger(r), S = positiveInteger(s), whole = pair(r, s);
-    return {
-        {"sound", whole, true},
+void checkCurve(const char* curve, const char* otherCurve, const Img4TrustProfile& usual) {
+    SCOPED_TRACE(curve);
+    const Key key = makeECKey(curve);
+    const Bytes point = publicKeyBits(key), order = parameter(key, OSSL_PKEY_PARAM_EC_ORDER);
+    const Bytes field = parameter(key, OSSL_PKEY_PARAM_EC_P);
+    const std::size_t size = usual.digestInfo->length;
+    const std::uint8_t parity = point.back() & 1;
+    Bytes whole;
+    do
+        whole = sign(key, size, message);
+    while (whole.size() != 8 + 2 * size); // until both numbers need a zero in front
+    const Bytes r(whole.end() - static_cast<long>(2 * size + 3), whole.end() - static_cast<long>(size + 3));
+    const Bytes s(whole.end() - static_cast<long>(size), whole.end());
+    const Bytes R = positiveInteger(r), S = positiveInteger(s);
+    const Case signatures[] = {
+        {"sound", sequence({R, S}), true},
         {"r = 0", pair({}, s)},
         {"s = 0", pair(r, {})},
         {"r = order", pair(order, s)},
@@ -229,42 +240,21 @@ std::vector<Case> pairCases(const Bytes& r, const Bytes& s, const Bytes& order) 
         {"r an OCTET STRING", sequence({octets(r), S})},
         {"SET", set({R, S})},
     };
-}
-
-std::vector<Case> pointCases(const Key& key) {
-    const Bytes point = publicKeyBits(key);
-    const std::size_t half = point.size() / 2;
-    const std::uint8_t parity = point.back() & 1;
-    const Bytes field = parameter(key, OSSL_PKEY_PARAM_EC_P);
-    const bool isP256 = half == 32;
-    return {
+    const Case points[] = {
         {"sound", point, true},
         {"not on the curve", lastChanged(point)},
         {"hybrid", changedAt(point, 0, 0x06 | parity)},
-        {"compressed", changedAt(Bytes(point.begin(), point.end() - static_cast<long>(half)), 0, 0x02 | parity)},
+        {"compressed", changedAt(Bytes(point.begin(), point.end() - static_cast<long>(size)), 0, 0x02 | parity)},
         {"infinity", {0x00}},
         {"coordinates of the field's size", join({Bytes{0x04}, field, field})},
         {"octet behind", join({point, Bytes{0}})},
-        {"of the other curve", publicKeyBits(makeECKey(isP256 ? "P-384" : "P-256"))},
-        {"of another key", publicKeyBits(makeECKey(isP256 ? "P-256" : "P-384"))},
+        {"of the other curve", publicKeyBits(makeECKey(otherCurve))},
+        {"of another key", publicKeyBits(makeECKey(curve))},
     };
-}
-
-void checkCurve(const char* curve, const Img4TrustProfile& usual) {
-    SCOPED_TRACE(curve);
-    const Key key = makeECKey(curve);
-    const Bytes point = publicKeyBits(key);
-    const std::size_t size = usual.digestInfo->length;
-    Bytes signature;
-    do
-        signature = sign(key, size, message);
-    while (signature.size() != 8 + 2 * size); // until both numbers need a zero in front
-    const Bytes r(signature.end() - static_cast<long>(2 * size + 3), signature.end() - static_cast<long>(size + 3));
-    const Bytes s(signature.end() - static_cast<long>(size), signature.end());
-    for (const Case& row : pairCases(r, s, parameter(key, OSSL_PKEY_PARAM_EC_ORDER)))
+    for (const Case& row : signatures)
         EXPECT_EQ(accepts(verify_signature_ecdsa, usual, point, row.octets), row.accepted) << row.name;
-    for (const Case& row : pointCases(key))
-        EXPECT_EQ(accepts(verify_signature_ecdsa, usual, row.octets, signature), row.accepted) << row.name;
+    for (const Case& row : points)
+        EXPECT_EQ(accepts(verify_signature_ecdsa, usual, row.octets, whole), row.accepted) << row.name;
     for (const Img4DigestInfo* info : digestInfos)
         EXPECT_TRUE(accepts(verify_signature_ecdsa, profileWith(kImg4DecodeSecureBootEc384Sha384, *info), point,
                             sign(key, info->length, message)))
@@ -272,8 +262,8 @@ void checkCurve(const char* curve, const Img4TrustProfile& usual) {
 }
 
 TEST(Img4ECDSASignature, isAPairOfNumbersInStrictDERUnderAnUncompressedPointWhichTellsTheCurve) {
-    checkCurve("P-256", kImg4DecodeSecureBootEc256Sha256);
-    checkCurve("P-384", kImg4DecodeSecureBootEc384Sha384);
+    checkCurve("P-256", "P-384", kImg4DecodeSecureBootEc256Sha256);
+    checkCurve("P-384", "P-256", kImg4DecodeSecureBootEc384Sha384);
 }
 
 TEST(Img4Signatures, needTheirArgumentsAndADigestOfTheProfilesLength) {
