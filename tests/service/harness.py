@@ -159,13 +159,6 @@ class Service:
         path = self.root / LOG
         return path.read_text().splitlines() if path.exists() else []
 
-    def messages_of(self, act):
-        """The messages, without time and line number, that the log gains while `act` runs. A message may end in a line
-        break; the empty line that follows is left out."""
-        before = len(self.log())
-        act()
-        return [line.split("] ", 1)[1] for line in self.log()[before:] if line]
-
     def wait_end(self, seconds=None):
         """The exit status, or the number of the signal that ended the service as a negative number; None when it still
         runs after that time."""

@@ -89,6 +89,22 @@ class Pairing(ServiceTest):
                 self.assertEqual(descriptors, ["0", "1", "2", "3"])  # the last one is the listing's own
         self.assertEqual(self.server.posts, [("/plain/pair", b"", True), ("/plain/pair/result", b"0", True)] * 2)
 
+    def test_a_ticket_arrives_byte_for_byte_or_not_at_all(self):
+        self.describe(status=3, fail="create")
+        for behaviour, ticket, code in (
+            ("plain", b"\0a\r\n\0", -1), ("plain", b"", -1), ("chunked", b"a\0b", -1), ("status-204", b"", -1),
+            ("status-404", None, 404), ("half", None, 18),
+        ):
+            with self.subTest((behaviour, ticket)):
+                self.server.trust_object = ticket
+                self.server.posts.clear()
+                answer = self.service.orloctl("-v", "pair", self.url(behaviour))[1]
+                self.assertEqual(answer["response"]["error"]["code"], code)
+                told = [f"value of ticket is:<{ticket.hex()}>"] if ticket is not None else []
+                self.assertEqual([message["text"] for message in answer["messages"] if "ticket is" in message["text"]], told)
+                results = [(f"/{behaviour}/pair/result", b"-1", False)] if told else []
+                self.assertEqual(self.server.posts, [(f"/{behaviour}/pair", b"", False), *results])
+
     def test_pairing_fails_with_the_updater_and_the_server_hears_of_it(self):
         for step, reason in (("create", "Failed to create Vanter obj::error:"),
                              ("isDone", "VanterUpdaterExecCommand failed:")):

@@ -233,9 +233,10 @@ class ObjectStore(RemoteTest, StoreCases):
         way = routes(tampering.server_port, self.store.store_port, self.store.ca_port)
         unchanged, changed = (f"relay-{self.store.values['PROXY']}-{bit}" for bit in (0, 1))
         self.describe(vanter=changed, **way)
-        lines = self.service.messages_of(lambda: self.assertEqual(self.service.put(b"x")[2]["code"], 1011))
+        self.service.write("tmp/in", b"x")
         # Releases of Swift differ in the name.
-        self.assertRegex("\n".join(lines), "HTTP status 400 (BadDigest|XAmzContentSHA256Mismatch)")
+        self.assertRegex(str(self.service.orloctl("-v", "put-psd2", "/tmp/in")),
+                         "HTTP status 400 (BadDigest|XAmzContentSHA256Mismatch)")
         self.describe(vanter=unchanged, **way)
         self.assertEqual(self.service.put(b"x"), SUCCESS)
         self.assertEqual(self.store.stored(), {f"v2/records/psd2/{unchanged}": b"x"})
@@ -357,23 +358,6 @@ class Failures(HostileTest):
             seen = self.server.seen[before:]
             self.assertEqual((len(seen), len(set(seen))), (3, 1), "each attempt is for the same export")
 
-    def test_a_pairing_ticket_arrives_byte_for_byte_or_not_at_all(self):
-        server = self.closing(HostileServer(None, None, b""))
-        session = self.session()
-        for behaviour, ticket, code in (
-            ("plain", os.urandom(5000), 0), ("plain", b"\0a\r\n\0", 0), ("plain", b"", 0), ("chunked", b"a\0b", 0),
-            ("status-204", b"", 0), ("status-404", None, 404), ("half", None, 18),
-        ):
-            with self.subTest((behaviour, ticket)):
-                server.trust_object = ticket or b""
-                server.posts.clear()
-                url = f"http://127.0.0.1:{server.server_port}/{behaviour}"
-                self.assertEqual(session.run("pair", url, "/ticket")[0], code)
-                told = [] if ticket is None else [(f"/{behaviour}/pair/result", b"0", False)]
-                self.assertEqual(server.posts, [(f"/{behaviour}/pair", b"", False), *told])
-                if ticket is not None:
-                    self.assertEqual((session.root / "ticket").read_bytes(), ticket)
-
     def test_a_connection_that_the_server_ended_is_made_again(self):
         session = self.session()
         for behaviour in ("plain", "idle", "plain", "idle", "plain"):
@@ -455,7 +439,6 @@ class Conditions(HostileTest):
         rows = (
             # name, refusal of a condition, puts of somebody else in between, outcome, requests
             ("keep", 412, 0, 0, look),
-            ("keep", 412, 0, 0, look),
             ("keep-bare", 412, 0, 0, look),
             ("keep-bare", 412, 0, 0, again),
             ("keep-bare", 412, 0, 0, look),
@@ -463,16 +446,13 @@ class Conditions(HostileTest):
             ("keep-held", 412, 1, 0, again),
             ("keep", 412, 0, 0, look),
             ("keep-held", 409, 1, 0, again),
-            ("keep", 412, 0, 0, look),
             ("keep-race", 412, 1, 0, compare),
-            ("keep-race", 409, 1, 0, compare),
             ("keep-race", 404, 1, 0, compare),
             ("keep-race", 403, 1, NOT_PERMITTED, look),
             ("keep-lost", 412, 0, 0, "HEAD PUT PUT HEAD GET"),
             ("keep-tagless", 412, 0, 0, look),
             ("keep-tagless", 412, 0, TRANSPORT, "HEAD"),
             ("status-403", 412, 0, NOT_PERMITTED, "HEAD"),
-            ("status-204", 412, 0, TRANSPORT, "HEAD"),
             ("busy-1", 412, 0, TRANSPORT, "HEAD"),
         )
         for number, (name, refusal, racing, code, requests) in enumerate(rows):

@@ -93,17 +93,14 @@ class Client(ServiceTest):
             (2, ["call", "x", "a@=/nonexistent"]),
             (2, ["call", "x", "a=1", "a=2"]),
             (2, ["call", "x", f"deep:={'[' * 30}1{']' * 30}"]),
-            (2, ["call"]),
             (2, ["no-such-verb"]),
             (3, ["--bus", "unix:path=/nonexistent", "call", "x"]),
             (4, ["call", "x"]),
             (5, ["show", "bcfg", "/dev/null"]),
             (0, ["show", "-"]),
-            (2, ["show", "bcfg"]),
             (2, ["show", self.root / "images/container.img4", "--hmac-key-file",
                  self.root / "blobs/hmac-key.bin"]),
             (2, ["show", self.root / "blobs/every-kind.bin", "--hmac-key-file", "/dev/null"]),
-            (2, ["show", self.root / "blobs/every-kind.bin", "--hmac-key-file", ""]),
             (2, ["crash-logs", "-o", "-"]),
             (2, ["put-psd2"]),
             (2, ["get-psd2", "/tmp/out", "-o", self.root / "out"]),
@@ -145,10 +142,9 @@ class Client(ServiceTest):
     def test_words_become_texts_json_values_and_file_contents(self):
         self.service.write("bytes", b"\x00\xff")
         words = ["t=a=b", 'j:={"d": {"$data": "0badcafe"}, "n": [1, true]}', f"f@={self.root}/bytes"]
-        lines = self.service.messages_of(lambda: self.service.orloctl("call", "x", *words))
-        self.assertEqual(
-            lines[2], 'request.messageDict : {"f": <00ff>, "j": {"d": <0badcafe>, "n": [1, true]}, "t": "a=b"}'
-        )
+        self.service.orloctl("call", "x", *words)
+        self.assertIn('request.messageDict : {"f": <00ff>, "j": {"d": <0badcafe>, "n": [1, true]}, "t": "a=b"}',
+                      "".join(self.service.log()))
 
     def test_a_copy_is_a_new_file_for_its_owner(self):
         copy, words = self.root / "copy", ["set-bcfg", "/blobs/every-kind.bin", "-o"]

@@ -4,7 +4,6 @@
 //   ["open", OPTIONS]  ["trust", URL]
 // with the permission for it
 //   ["put", CLASS, INSTANCE, PATH]  ["get", CLASS, INSTANCE, PATH]  ["export", [CLASS...], [INSTANCE...]]
-// and, to the pairing library, ["pair", URL, PATH], which puts the ticket into the file.
 #include <algorithm>
 #include <iostream>
 #include <optional>
@@ -13,7 +12,6 @@
 #include "platform/Files.h"
 #include "platform/Json.h"
 #include "platform/OrloDataStore.h"
-#include "platform/Pairing.h"
 #include "platform/linux/services/device/DeviceDescription.h"
 
 namespace {
@@ -42,8 +40,6 @@ public:
             done = get(word(1), word(2), word(3).description(), &error);
         else if (verb == "export")
             done = QDOrloDataMultiExport(session_, listOf(word(1)), listOf(word(2)), &error);
-        else if (verb == "pair")
-            done = pair(word(1).description(), word(2).description(), &error);
         else
             return Error{"", -1, "no such command"};
         return done || error ? error : Error{"", -1, "failed without an error"};
@@ -81,11 +77,6 @@ private:
         return record && files::replace(path, *record);
     }
 
-    static bool pair(const std::string& url, const std::string& path, std::optional<Error>* error) {
-        return BWCPairCorvoWithProxy(url, {}, error, [&](const std::uint8_t* ticket, std::size_t length) {
-            return files::replace(path, {ticket, length}) ? 0 : 1;
-        });
-    }
     __QDOrlo* session_ = nullptr;
 };
 
