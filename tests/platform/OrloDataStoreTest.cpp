@@ -318,8 +318,9 @@ TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
     EXPECT_EQ(root_.read("/file"), "this is no database, however long one reads it");
     describeStore(R"({"path": "/new/folder/my.db"})");
     EXPECT_NE(open(), nullptr);
-    describeStore(R"({"backend": "remote", "connectTo": {"a-1.example:1": "[::1]:65535"},
-                      "s3": {"region": "eu-1", "bucket": "a.b_c-d", "accessKeyFile": "/key"}})");
+    describeStore("{" + remote + R"("connectTo": {"a-1.example:1": "[::1]:65535"}, "s3": {"region": ")" +
+                  std::string(62, 'e') + R"(-", "bucket": ")" + std::string(251, 'b') +
+                  R"(.c_-", "accessKeyFile": "/key"}})");
     EXPECT_NE(open(), nullptr);
     EXPECT_EQ(root_.contents().count("/new/folder/my.db"), 1U);
 }
