@@ -9,6 +9,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <string_view>
+#include <utility>
+
+#include "platform/Memory.h"
 
 namespace sysconfig {
 
@@ -55,13 +58,53 @@ inline std::uint64_t hashOf(const HashSecret& secret, std::string_view key) {
     return hash.state;
 }
 
-// A zeroed list is empty. An Entry is a record from malloc with the members `next`, `previous` and `bucketNext`, and
-// indexKey() to know it by. The list owns its entries, of which no two in the index have one key.
+// Memory for the entries of a blob, in few blocks: what an entry costs is mostly the memory that it is the first to
+// touch. What is taken is given back as a whole. Zeroed it is empty.
+struct Blocks {
+    struct Block {
+        Block* earlier;
+    };
+    Block* last;
+    std::uint8_t* next;
+    std::size_t left;
+
+    // `size` octets, aligned, for an entry that has `octets` of the `rest` of a blob's list, in a block that has room
+    // for the rest if the others are like it. Null when memory is lacking.
+    void* take(std::size_t size, std::uint64_t octets, std::uint64_t rest) {
+        constexpr std::size_t smallest = 1024;
+        size = (size + alignof(Block) - 1) / alignof(Block) * alignof(Block);
+        if (left < size) {
+            const std::uint64_t expected = std::min<std::uint64_t>(size * rest / octets, PTRDIFF_MAX / 2);
+            const std::size_t wanted = std::max({static_cast<std::size_t>(expected), size, smallest});
+            auto* const made = static_cast<Block*>(std::malloc(sizeof(Block) + wanted));
+            if (made == nullptr)
+                return nullptr;
+            memory::willBeFilled(made, wanted);
+            *made = {last};
+            last = made;
+            next = reinterpret_cast<std::uint8_t*>(made + 1);
+            left = wanted;
+        }
+        left -= size;
+        return std::exchange(next, next + size);
+    }
+
+    void clear() {
+        while (last != nullptr)
+            std::free(std::exchange(last, last->earlier));
+        *this = {};
+    }
+};
+
+// A zeroed list is empty. An Entry is a record with the members `next`, `previous`, `bucketNext` and `isInBlock`, and
+// indexKey() to know it by. It is from malloc, or in one of the list's blocks. The list owns its entries, of which no
+// two in the index have one key.
 template <typename Entry, typename Key>
 struct EntryList {
     Entry* first;
     Entry* last;
     Entry** buckets;
+    Blocks blocks;
     std::uint32_t count;
     std::uint8_t bucketBits;
 
@@ -80,7 +123,7 @@ struct EntryList {
         if ((buckets == nullptr || count >= bucketCount()) && !makeIndex(std::uint64_t{count} + 1, secret))
             return false;
         appendWithoutIndex(entry);
-        index(entry, secret);
+        index(entry, bucketOf(secret, entry->indexKey()));
         return true;
     }
 
@@ -102,8 +145,9 @@ struct EntryList {
         while (first != nullptr) {
             Entry* const entry = first;
             first = entry->next;
-            std::free(entry);
+            release(entry);
         }
+        blocks.clear();
         std::free(buckets);
         *this = {};
     }
@@ -131,12 +175,16 @@ private:
         (entry->previous != nullptr ? entry->previous->next : first) = entry->next;
         (entry->next != nullptr ? entry->next->previous : last) = entry->previous;
         --count;
-        std::free(entry);
+        release(entry);
+    }
+
+    static void release(Entry* entry) {
+        if (!entry->isInBlock)
+            std::free(entry);
     }
 
     // Puts an entry of the list into the index, and the one with the same key out of both.
-    void index(Entry* entry, const HashSecret& secret) {
-        Entry** const bucket = bucketOf(secret, entry->indexKey());
+    void index(Entry* entry, Entry** bucket) {
         releaseAt(linkTo(entry->indexKey(), bucket));
         entry->bucketNext = *bucket;
         *bucket = entry;
@@ -150,12 +198,30 @@ private:
         auto** made = static_cast<Entry**>(std::calloc(std::size_t{1} << bits, sizeof(Entry*)));
         if (made == nullptr)
             return false;
+        memory::willBeFilled(made, sizeof(Entry*) << bits);
         std::free(buckets);
         buckets = made;
         bucketBits = bits;
-        for (Entry* entry = first; entry != nullptr; entry = entry->next)
-            index(entry, secret);
+        for (Entry* entry = first; entry != nullptr;)
+            entry = indexSome(entry, secret);
         return true;
+    }
+
+    // Puts some entries into the index, from `entry` on, and gives out the one behind them. In a long list each bucket,
+    // and each entry that one leads to, has to come from memory: those of all are asked for before any is waited for.
+    Entry* indexSome(Entry* entry, const HashSecret& secret) {
+        constexpr std::size_t most = 16;
+        Entry** found[most];
+        std::size_t number = 0;
+        for (Entry* next = entry; next != nullptr && number < most; next = next->next) {
+            found[number] = bucketOf(secret, next->indexKey());
+            __builtin_prefetch(found[number++], 1);
+        }
+        for (std::size_t i = 0; i < number; ++i)
+            __builtin_prefetch(*found[i]);
+        for (std::size_t i = 0; i < number; ++i, entry = entry->next)
+            index(entry, found[i]);
+        return entry;
     }
 };
 

@@ -58,10 +58,14 @@ DERReturn parse(const DERItem& content, const std::array<DERItemSpec, count>& ro
     return DERParseSequenceContentExplained(&content, count, rows.data(), items, sizeof *items, sizeof *items, refusal);
 }
 
-// Appends an entry, null when memory is lacking, so that it is not silently left out. The codec has no code of its own
-// for that.
-template <typename Entry, typename List>
-DERReturn append(Entry* entry, List* list) {
+// Appends an entry of the content, or says that memory is lacking, so that it is not silently left out. The codec has
+// no code of its own for that.
+template <typename Content, typename List>
+DERReturn append(const Content& content, const DERItem& encoding, const Decoding& decoding, List* list) {
+    constexpr std::uint64_t headerSize = 2; // of most entries
+    const Room room = {&list->blocks, encoding.length + headerSize,
+                       static_cast<std::uint64_t>(decoding.end - encoding.data) + headerSize};
+    auto* const entry = makeEntry(content, &room);
     if (entry == nullptr)
         return DERBufferOverflow;
     list->appendWithoutIndex(entry);
@@ -143,7 +147,7 @@ bool decodeList(const DERItem& element, const Element& expected, DERDecodeSequen
     if (!openElement(element, expected, &rest, refusal))
         return false;
     const std::uint8_t* const end = rest.data + rest.length;
-    Decoding decoding = {object, &refusal->encoding};
+    Decoding decoding = {object, &refusal->encoding, end};
     while (rest.data != end) {
         DERDecodedInfo entry;
         bool stop = false;
@@ -212,7 +216,7 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulatePayloadSequence(const DERDecodedIn
                                     textOf(items.string, maximumStringLength), deleted};
     if (!isValidContent(content))
         return _sysConfig3AddPayloadEntry(object, nullptr), DERSuccess;
-    return append(makeEntry(content), &object->payload);
+    return append(content, decoded->content, *decoding, &object->payload);
 }
 
 DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedInfo* decoded, bool*, void* context) {
@@ -231,7 +235,7 @@ DERReturn _DERDecodeSysConfig3ParseAndPopulateMetadataSequence(const DERDecodedI
                                      textOf(items.string, maximumStringLength)};
     if (!isValidContent(content))
         return _sysConfig3AddMetadataEntry(object, nullptr), DERSuccess;
-    return append(makeEntry(content), &object->metadata);
+    return append(content, decoded->content, *decoding, &object->metadata);
 }
 
 __SysConfig3* decodeSysConfig3Explained(const std::uint8_t* data, std::uint32_t length, SysConfig3Refusal* refusal) {

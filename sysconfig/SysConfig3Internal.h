@@ -16,7 +16,7 @@
 
 // Records
 //
-// An entry and its texts and bytes are one block from malloc: the record, then each text with its NUL, then the data.
+// An entry and its texts and bytes are one piece of memory: the record, then each text with its NUL, then the data.
 
 struct __SysConfig3PayloadEntry {
     __SysConfig3PayloadEntry* next;
@@ -31,6 +31,7 @@ struct __SysConfig3PayloadEntry {
     std::uint32_t key;
     // The content octet of a DER BOOLEAN: 0x00 or 0xFF.
     std::uint8_t deleted;
+    bool isInBlock;
 
     std::uint32_t indexKey() const { return key; }
 };
@@ -42,6 +43,7 @@ struct __SysConfig3MetadataEntry {
     std::uint32_t leadLength; // of the key
     std::uint32_t stringLength;
     std::uint32_t dataLength;
+    bool isInBlock;
 
     std::string_view indexKey() const { return {reinterpret_cast<const char*>(this + 1), leadLength}; }
 };
@@ -172,22 +174,34 @@ inline Bytes viewOf(const std::uint8_t* data, std::uint32_t length) {
 bool isValidContent(const PayloadContent& content);
 bool isValidContent(const MetadataContent& content);
 
-// Makes an entry of the content. Null, after reporting it, when memory is lacking.
-__SysConfig3PayloadEntry* makeEntry(const PayloadContent& content);
-__SysConfig3MetadataEntry* makeEntry(const MetadataContent& content);
+// Where an entry of a blob gets its memory. It has `octets` of the `rest` of the blob's list.
+struct Room {
+    Blocks* blocks;
+    std::uint64_t octets;
+    std::uint64_t rest;
+};
+
+// Makes an entry of the content, from malloc unless there is a room. Null, after reporting it, when memory is lacking.
+__SysConfig3PayloadEntry* makeEntry(const PayloadContent& content, const Room* room = nullptr);
+__SysConfig3MetadataEntry* makeEntry(const MetadataContent& content, const Room* room = nullptr);
 
 // Allocates a zeroed entry with the given parts behind it and their lengths set. Null, after reporting it for
 // `operation`, when memory is lacking.
 template <typename Entry>
-Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, const char* operation) {
+Entry* allocEntry(std::string_view lead, std::string_view string, Bytes data, const Room* room, const char* operation) {
     const bool hasString = string.data() != nullptr;
     const std::uint64_t size =
         std::uint64_t{sizeof(Entry)} + lead.size() + 1 + (hasString ? string.size() + 1 : 0) + data.length;
-    auto* const entry =
-        size <= PTRDIFF_MAX ? static_cast<Entry*>(std::malloc(static_cast<std::size_t>(size))) : nullptr;
-    if (entry == nullptr)
+    void* memory = nullptr;
+    if (size <= PTRDIFF_MAX && room != nullptr)
+        memory = room->blocks->take(static_cast<std::size_t>(size), room->octets, room->rest);
+    else if (size <= PTRDIFF_MAX)
+        memory = std::malloc(static_cast<std::size_t>(size));
+    if (memory == nullptr)
         return logHook()(messageLevel, "%s malloc failed.", operation), nullptr;
+    auto* const entry = static_cast<Entry*>(memory);
     *entry = {};
+    entry->isInBlock = room != nullptr;
     entry->leadLength = static_cast<std::uint32_t>(lead.size());
     auto* out = reinterpret_cast<char*>(entry + 1);
     out = std::copy(lead.begin(), lead.end(), out);
@@ -268,7 +282,8 @@ namespace sysconfig {
 // What a walk over a SET of entries fills: the context of its callbacks.
 struct Decoding {
     __SysConfig3* object;
-    DERRefusal* refusal; // why an entry's items were refused
+    DERRefusal* refusal;     // why an entry's items were refused
+    const std::uint8_t* end; // of the SET's content
 };
 
 } // namespace sysconfig

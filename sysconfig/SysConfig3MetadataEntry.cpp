@@ -28,8 +28,8 @@ bool sysconfig::isValidContent(const MetadataContent& content) {
     return false;
 }
 
-__SysConfig3MetadataEntry* sysconfig::makeEntry(const MetadataContent& content) {
-    return allocEntry<__SysConfig3MetadataEntry>(content.key, content.string, content.data, allocation);
+__SysConfig3MetadataEntry* sysconfig::makeEntry(const MetadataContent& content, const Room* room) {
+    return allocEntry<__SysConfig3MetadataEntry>(content.key, content.string, content.data, room, allocation);
 }
 
 __SysConfig3MetadataEntry* allocSysConfig3MetadataEntry(const char* key, const std::uint8_t* data,

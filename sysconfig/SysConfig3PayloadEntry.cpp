@@ -31,9 +31,9 @@ bool sysconfig::isValidContent(const PayloadContent& content) {
     return false;
 }
 
-__SysConfig3PayloadEntry* sysconfig::makeEntry(const PayloadContent& content) {
+__SysConfig3PayloadEntry* sysconfig::makeEntry(const PayloadContent& content, const Room* room) {
     const std::string_view comment = content.comment.empty() ? "." : content.comment;
-    auto* const entry = allocEntry<__SysConfig3PayloadEntry>(comment, content.string, content.data, allocation);
+    auto* const entry = allocEntry<__SysConfig3PayloadEntry>(comment, content.string, content.data, room, allocation);
     if (entry != nullptr) {
         entry->key = content.key;
         entry->deleted = content.deleted ? trueOctet : falseOctet;

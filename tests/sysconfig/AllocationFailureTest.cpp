@@ -133,8 +133,8 @@ TEST(AllocationFailure, isReportedAndLeavesEverythingAsItWas) {
     const std::vector<std::string> ofAdd = {"_allocSysConfig3PayloadEntryInternal: malloc failed.",
                                             "_sysConfig3AddPayloadEntry: malloc failed."};
     const Row rows[] = {
-        // The object, two manifests of three HMACs, sixteen entries and two indexes.
-        {"decode", 0x30003, 1 + 2 * 4 + 16 + 2, decodeWhole},
+        // The object, two manifests of three HMACs, two blocks of entries and two indexes.
+        {"decode", 0x30003, 1 + 2 * 4 + 2 + 2, decodeWhole},
         {"new payload entry", 0x30003, 2, adding(payload), ofAdd},
         {"payload entry of a present key", 0x30003, 2, adding(presentPayload), ofAdd},
         {"new metadata entry", 0x30003, 2, adding(metadata)},
