@@ -40,13 +40,17 @@ std::string_view textOf(Octets octets) {
     return {reinterpret_cast<const char*>(octets.data()), octets.size()};
 }
 
+Value::Data dataOf(Octets octets) {
+    return {octets.begin(), octets.end()};
+}
+
+DERItem itemOf(Octets octets) {
+    return {octets.data(), octets.size()};
+}
+
 const TemporaryRoot& root() {
     static const TemporaryRoot shared;
     return shared;
-}
-
-void readPropertyList(Octets octets) {
-    (void)propertyListToValue({octets.begin(), octets.end()});
 }
 
 // As a device description, whose faults are said too.
@@ -57,8 +61,10 @@ void readJson(Octets octets) {
     FUZZ_REQUIRE(!value || descriptionFaults(*value).size() <= 21);
 }
 
-void readJsonMember(Octets octets) {
-    (void)jsonTextMember(textOf(octets), "os_version");
+void readURL(Octets octets) {
+    (void)isWellFormedURL(textOf(octets)); // which need not agree with libcurl
+    http::Request request{.method = "GET"};
+    (void)http::aim(request, std::string(textOf(octets)), "/records", {});
 }
 
 // What is accepted comes back from an encoding of its own. (It need not be this one: the bits of the last character
@@ -66,12 +72,6 @@ void readJsonMember(Octets octets) {
 void readBase64(Octets octets) {
     const std::optional<Value::Data> data = base64Decode(textOf(octets));
     FUZZ_REQUIRE(!data || (data->size() <= octets.size() / 4 * 3 && base64Decode(base64Encode(*data)) == data));
-}
-
-void readURL(Octets octets) {
-    (void)isWellFormedURL(textOf(octets)); // which need not agree with libcurl
-    http::Request request{.method = "GET"};
-    (void)http::aim(request, std::string(textOf(octets)), "/records", {});
 }
 
 // The store's settings, with the octets as one of its files.
@@ -85,13 +85,7 @@ void readStoreFile(Octets octets, const char* store) {
     ::unlink(root().host("/file").c_str());
 }
 
-void readAuthorities(Octets octets) {
-    readStoreFile(octets, R"({"caFile": "/file"})");
-}
-
-void readAccessKey(Octets octets) {
-    readStoreFile(octets, R"({"s3": {"region": "r", "bucket": "b", "accessKeyFile": "/file"}})");
-}
+constexpr char accessKeyStore[] = R"({"s3": {"region": "r", "bucket": "b", "accessKeyFile": "/file"}})";
 
 // A folder with one crash log: its name is the first line, its contents are the rest.
 void readCrashLogs(Octets octets) {
@@ -156,7 +150,7 @@ void readHttpAnswer(Octets octets) {
 void readKeyedArchive(Octets octets) {
     Value object;
     try {
-        if (const auto decoder = ArchiveDecoder::create({octets.begin(), octets.end()}, nullptr))
+        if (const auto decoder = ArchiveDecoder::create(dataOf(octets), nullptr))
             object = decoder->decode("k");
     } catch (const ArchiveFailure&) {
     }
@@ -172,7 +166,7 @@ void readKeyedArchive(Octets octets) {
 // and has none that an INTEGER does not need (X.690 8.3.2).
 void readCertificates(Octets octets) {
     const auto single = CertificateService::createCertificateWithBytes(octets.data(), octets.size());
-    auto list = CertificateService::copyCertificatesFromCertsOnlyMessage({octets.begin(), octets.end()});
+    auto list = CertificateService::copyCertificatesFromCertsOnlyMessage(dataOf(octets));
     FUZZ_REQUIRE(!list || !single);
     if (single)
         list = {single};
@@ -198,31 +192,28 @@ void checkReport(const Report& report, Octets octets) {
     writeText(out, report);
 }
 
-void readBlob(Octets octets) {
-    checkReport(showBcfg({octets.begin(), octets.end()}, {}), octets);
-}
-
-void readDer(Octets octets) {
-    checkReport(showDer({octets.data(), octets.size()}), octets);
-}
-
-void readImg4(Octets octets) {
-    checkReport(showImg4({octets.data(), octets.size()}), octets);
-}
-
 constexpr std::size_t kibibyte = 1024, mebibyte = 1024 * kibibyte;
 
 // What a reader may hold beside what its input needs, and for each octet.
 constexpr struct Reader {
-    void (*read)(Octets);
     std::size_t base;
     std::size_t perOctet;
+    void (*read)(Octets);
 } readers[] = {
-    {readPropertyList, 64 * kibibyte, 256}, {readJson, 16 * kibibyte, 256},      {readJsonMember, 16 * kibibyte, 16},
-    {readBase64, 16 * kibibyte, 16},        {readURL, 16 * kibibyte, 64},        {readAuthorities, 256 * kibibyte, 64},
-    {readAccessKey, 64 * kibibyte, 32},     {readCrashLogs, 256 * kibibyte, 64}, {readHttpAnswer, 512 * kibibyte, 64},
-    {readKeyedArchive, mebibyte, 1024},     {readCertificates, mebibyte, 512},   {readBlob, 4 * mebibyte, 100},
-    {readDer, 4 * mebibyte, 100},           {readImg4, 4 * mebibyte, 100},
+    {64 * kibibyte, 256, [](Octets octets) { (void)propertyListToValue(dataOf(octets)); }},
+    {16 * kibibyte, 256, readJson},
+    {16 * kibibyte, 16, [](Octets octets) { (void)jsonTextMember(textOf(octets), "os_version"); }},
+    {16 * kibibyte, 16, readBase64},
+    {16 * kibibyte, 64, readURL},
+    {256 * kibibyte, 64, [](Octets octets) { readStoreFile(octets, R"({"caFile": "/file"})"); }},
+    {64 * kibibyte, 32, [](Octets octets) { readStoreFile(octets, accessKeyStore); }},
+    {256 * kibibyte, 64, readCrashLogs},
+    {512 * kibibyte, 64, readHttpAnswer},
+    {mebibyte, 1024, readKeyedArchive},
+    {mebibyte, 512, readCertificates},
+    {4 * mebibyte, 100, [](Octets octets) { checkReport(showBcfg(dataOf(octets), {}), octets); }},
+    {4 * mebibyte, 100, [](Octets octets) { checkReport(showDer(itemOf(octets)), octets); }},
+    {4 * mebibyte, 100, [](Octets octets) { checkReport(showImg4(itemOf(octets)), octets); }},
 };
 
 // Reads the octets and requires that the heap never held more than the reader may on top of what it held before. Only

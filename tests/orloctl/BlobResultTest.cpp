@@ -6,22 +6,22 @@
 
 #include <unistd.h>
 
-#include "tests/orloctl/Blob.h"
 #include "tests/support/TemporaryRoot.h"
+#include "tests/sysconfig/Blob.h"
 
 #include <gtest/gtest.h>
 
 namespace {
 
-constexpr std::uint32_t wCh0 = 0x57436830;
-constexpr std::uint32_t miGB = 0x4D694742;
+std::string textOf(const Bytes& blob) {
+    return {blob.begin(), blob.end()};
+}
 
-std::string holding(std::initializer_list<std::uint32_t> keys, std::uint32_t version = 0x30003) {
-    img4maker::List entries;
+std::string holding(std::initializer_list<std::uint32_t> keys) {
+    const sysconfig::SysConfig3Ptr object = newObject();
     for (const std::uint32_t key : keys)
-        entries.push_back(img4maker::sequence({number(key), img4maker::ia5(""), img4maker::octets({1})}));
-    const auto encoded = blob(entries, {}, 0x62436667, version);
-    return {encoded.begin(), encoded.end()};
+        add(object, payloadData(key, {1}));
+    return textOf(encode(object.get()));
 }
 
 void makeResult(const TemporaryRoot& root, const std::string& contents) {
@@ -35,7 +35,7 @@ Serve results(const std::string& contents) {
     return [contents](const TemporaryRoot& root) { makeResult(root, contents); };
 }
 
-const std::string whole = holding({wCh0, miGB});
+const std::string whole = holding({keyWCh0, keyMiGB});
 
 const struct {
     const char* name;
@@ -47,13 +47,14 @@ const struct {
     std::string input = {};
 } cases[] = {
     {"new file", results(whole), ""},
-    {"model without WCh0", results(holding({miGB})), "", "Banana", "model Banana has no WCh0"},
-    {"no WCh0", results(holding({miGB})), "has no WCh0 entry, and model xM11 has one", "xM11"},
-    {"no MiGB", results(holding({wCh0})), "has no MiGB entry"},
+    {"model without WCh0", results(holding({keyMiGB})), "", "Banana", "model Banana has no WCh0"},
+    {"no WCh0", results(holding({keyMiGB})), "has no WCh0 entry, and model xM11 has one", "xM11"},
+    {"no MiGB", results(holding({keyWCh0})), "has no MiGB entry"},
     {"no blob", results("text"), "is no configuration blob."},
     {"no input", results(""), "is empty: /blob is missing on the device"},
     {"input of text", results(""), "is empty: /blob is no configuration blob", "M12x", "", 0, "text"},
-    {"protected input", results(""), "is empty: /blob needs a key", "M12x", "", 0, holding({}, 0x30002)},
+    {"protected input", results(""), "is empty: /blob needs a key", "M12x", "", 0,
+     textOf(BlobParts{.version = bytes("02 00 03 00")}.whole())},
     {"nothing done", [](auto&) {}, "is that of an earlier request"},
     {"removed", [](auto& root) { std::filesystem::remove(root.host(blobResultPath)); }, "is missing"},
     {"another user's", results(whole), "belongs to another user", "M12x", "", 1},

@@ -4,9 +4,9 @@
 #include <cstdio>
 #include <sstream>
 
-#include "tests/orloctl/Blob.h"
 #include "tests/orloctl/PrintedReport.h"
 #include "tests/support/OpenSSLTool.h"
+#include "tests/sysconfig/Blob.h"
 #include "tools/makers/Img4Maker.h"
 #include "tools/orloctl/LocalFiles.h"
 
@@ -22,6 +22,15 @@ const std::string examples = TEST_EXAMPLES "/blobs/", printed = TEST_PRINTED "/"
 
 PrintedReport show(const Bytes& file, const char* format = "", const Key& key = std::nullopt) {
     return showFile(file, format, key);
+}
+
+// A small number of a configuration blob.
+Bytes number(std::uint32_t value) {
+    return item(DERTagInteger, {static_cast<std::uint8_t>(value), static_cast<std::uint8_t>(value >> 8), 0, 0});
+}
+
+Bytes blob(const List& payload, const List& metadata = {}) {
+    return BlobParts{.payload = set(payload), .metadata = set(metadata)}.whole();
 }
 
 Bytes manifestOf(const Bytes& body, std::uint64_t version = 0, const List& chain = {}) {
@@ -210,7 +219,7 @@ const ProblemCase problemCases[] = {
     {"bcfg", "The file is empty, at offset 0.", {}},
     {"bcfg", "The blob ends before its magic, at offset 2.", sequence({})},
     {"bcfg", "The blob has IA5String instead of INTEGER as its version", sequence({number(1), ia5("x")})},
-    {"bcfg", "Sysconfig magic 0x1 is not valid, at offset 4.", blob({}, {}, 1)},
+    {"bcfg", "Sysconfig magic 0x1 is not valid, at offset 4.", BlobParts{.magic = bytes("01 00 00 00")}.whole()},
     {"bcfg", "The payload entry is no strict DER in the item at offset 23: the header", blob({{0x30}})},
     {"bcfg", "The payload entry ends before its comment, at offset 23.", blob({sequence({number(1)})})},
     {"bcfg", "The payload entry has a deleted flag that is no DER BOOLEAN, at offset 23.",
