@@ -16,20 +16,10 @@ using Initialise = DERReturn (*)(const std::uint8_t*, std::uint64_t, Img4Record*
 
 const Bytes soundPayload = payload({});
 const Bytes soundManifest = manifest({});
-const Bytes soundRestoreInfo = restoreInfo({property("nonV", integer(1))});
 const Bytes emptySequence = sequence({});
-
-Bytes with(Bytes encoding, const Bytes& tail) {
-    encoding.insert(encoding.end(), tail.begin(), tail.end());
-    return encoding;
-}
 
 Bytes payloadWith(const List& tail) {
     return sequence({ia5("IM4P"), ia5("sepi"), ia5("1"), octets(filler(8)), join(tail)});
-}
-
-Bytes containerWith(const Bytes& oddPayload) {
-    return container(oddPayload, {}, {});
 }
 
 const Bytes body = manifestBody({});
@@ -45,13 +35,13 @@ constexpr Initialise asManifest = Img4DecodeInitManifest;
 constexpr Initialise asUnsigned = Img4DecodeInitUnsignedManifest;
 
 const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
-    {"trailing octet", asContainer, with(containerWith(soundPayload), {0}), DERBufferOverflow},
+    {"trailing octet", asContainer, join({container(soundPayload, {}, {}), {0}}), DERBufferOverflow},
     {"SET for a container", asContainer, set({ia5("IMG4"), soundPayload}), DERUnexpectedTag},
     {"wrong magic", asContainer, sequence({ia5("IMG5"), soundPayload}), DERUnexpectedTag},
     {"no payload", asContainer, sequence({ia5("IMG4")}), DERIncompleteSequence},
     {"unknown entry at the end", asContainer, sequence({ia5("IMG4"), soundPayload, context(2, {})}), DERUnexpectedTag},
     {"entry after the last", asContainer,
-     sequence({ia5("IMG4"), soundPayload, context(1, soundRestoreInfo), integer(1)}), DERDecodeError},
+     sequence({ia5("IMG4"), soundPayload, context(1, restoreInfo({})), integer(1)}), DERDecodeError},
     {"unsigned manifest in a container", asContainer, container(soundPayload, unsignedManifest({}), {}),
      DERIncompleteSequence},
     {"wrong magic of the restore information", asContainer,
@@ -62,7 +52,7 @@ const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
     {"wrong magic of the payload", asPayload, sequence({ia5("IM4Q"), ia5("sepi"), ia5("1"), octets({1})}),
      DERUnexpectedTag},
     {"payload without data", asPayload, sequence({ia5("IM4P"), ia5("sepi"), ia5("1")}), DERIncompleteSequence},
-    {"algorithm 2", asContainer, containerWith(payloadWith({compression(2, 5)})), DERParamError},
+    {"algorithm 2", asContainer, container(payloadWith({compression(2, 5)}), {}, {}), DERParamError},
     {"compression without size", asPayload, payloadWith({sequence({integer(1)})}), DERParamError},
     {"payload properties with a wrong magic", asPayload, payloadWith({context(0, sequence({ia5("PAYQ"), set({})}))}),
      DERUnexpectedTag},
@@ -74,7 +64,7 @@ const std::tuple<const char*, Initialise, Bytes, DERReturn> cases[] = {
     {"entry after compression and properties", asPayload,
      payloadWith({compression(1, 1), context(0, payloadProperties({})), integer(1)}), DERDecodeError},
 
-    {"manifest with a trailing octet", asManifest, with(soundManifest, {0}), DERBufferOverflow},
+    {"manifest with a trailing octet", asManifest, join({soundManifest, {0}}), DERBufferOverflow},
     {"wrong magic of the manifest", asManifest, manifestOf(integer(0), body, ia5("IM4N")), DERUnexpectedTag},
     {"version 2", asManifest, manifestOf(integer(2)), DERSuccess},
     {"version 3", asManifest, manifestOf(integer(3)), DERUnexpectedTag},
@@ -128,7 +118,7 @@ TEST(Img4Init, fieldsLieWhereTheyWereWritten) {
     EXPECT_EQ(record.manifestRaw.length, ticket.size());
     EXPECT_EQ(record.payloadRaw.data, nullptr) << "nothing is left of the earlier use";
 
-    const Bytes tailed = with(soundPayload, {7});
+    const Bytes tailed = join({soundPayload, {7}});
     ASSERT_EQ(Img4DecodeInitPayload(tailed.data(), tailed.size(), &record), DERSuccess);
     EXPECT_EQ(record.payloadRaw.data, tailed.data());
     EXPECT_EQ(record.payloadRaw.length, tailed.size()) << "the buffer as it was given";

@@ -205,11 +205,6 @@ TEST(Img4Manifest, lookupsNeedTheBodyTheyRunThrough) {
         EXPECT_EQ(Img4DecodeGetIntegerFromSection(&record, Img4SectionManifest, brdI, &board), ofSection) << name;
         EXPECT_EQ(board, ofSection == DERSuccess ? 12U : 0U) << name;
     }
-    const Bytes bare = unsignedManifest({.objects = {sep}});
-    const Img4Record record = recordOf(Img4DecodeInitUnsignedManifest, bare);
-    bool entitled = false;
-    EXPECT_EQ(Img4DecodeGetObjectPropertyBoolean(&record, sepi, eksp, &entitled), DERSuccess);
-    EXPECT_TRUE(entitled);
 }
 
 std::string askSection(const Img4Record* record, std::uint32_t section) {
