@@ -248,7 +248,6 @@ TEST(VerifyImg4, judgesThePayloadAsFarAsItIsAskedTo) {
         const char* says;
     } rows[] = {
         {"", "", "not judged", "\n  No object was named"},
-        {"sepi", "", "not judged", "\n  Whether the payload is this object's was not judged"},
         {"sepi", "DGST", "the object's", "\nnotes: none"},
     };
     for (const auto& row : rows) {
