@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstring>
 #include <filesystem>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -47,23 +48,13 @@ std::string text(int number) {
     return std::string(std::strerror(number)) + "\n";
 }
 
-// `line` with a star in place of the hexadecimal or decimal number behind the first `mark`.
-std::string starred(std::string line, std::string_view mark) {
-    const std::size_t start = line.find(mark);
-    if (start == std::string::npos)
-        return line;
-    const std::size_t number = start + mark.size();
-    return line.replace(number, line.find_first_not_of("0123456789abcdefx", number) - number, "*");
-}
-
-// The recorded lines of HSPipeUtil, without what differs from run to run. Those of level 2 come without their
-// beginning.
+// The recorded lines of HSPipeUtil, with a star in place of what differs from run to run. Those of level 2 come without
+// their beginning.
 Lines log() {
-    constexpr std::string_view info = "2 [HSPipeUtil] ";
+    static const std::regex beginning(R"(^2 \[HSPipeUtil\] )"), number(R"((at line |program \()[0-9a-fx]+)");
     Lines lines;
     for (const std::string& line : recordedLog())
-        lines.push_back(
-            starred(starred(line.substr(line.starts_with(info) ? info.size() : 0), "at line "), "program ("));
+        lines.push_back(std::regex_replace(std::regex_replace(line, beginning, ""), number, "$1*"));
     return lines;
 }
 

@@ -1,8 +1,8 @@
 // What no command of the plug-in reaches, and where memory ends; the rest stands in tests/plugin/transcripts.
 #include "orlo/ZPOrlo.h"
 
-#include <functional>
 #include <new>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -24,34 +24,7 @@ protected:
     Orlo() {
         arrangeServices();
         root_.write("/ticket", "ticket");
-        root_.write("/etc/veltra/device.json", R"({"answers": {
-            "ScreenSerialNumber": "a number that no small string holds", "TopModuleAuthChipID": "TMA",
-            "CoverGlassSerialNumber": "another number that no small string holds",
-            "AmbientLightSensorSerialNumber": "ALS"}})");
         recordLog();
-    }
-
-    // Lets each allocation of `act` fail in turn, and collects what it says; nothing where memory ran out elsewhere.
-    static std::set<std::string> whereMemoryEnds(const std::function<std::string()>& act) {
-        std::set<std::string> met;
-        bool hasFailed = true;
-        for (int count = 1; hasFailed; ++count) {
-            recordLog();
-            failAllocation(count);
-            std::string said;
-            try {
-                said = act();
-            } catch (const std::bad_alloc&) {
-                said.clear();
-            }
-            hasFailed = allocationHasFailed();
-            failAllocation(0);
-            EXPECT_EQ(liveSessions, 0) << count;
-            const Lines lines = recordedLog();
-            if (!said.empty())
-                met.insert(said + (!lines.empty() && lines.back().starts_with('4') ? lines.back() : ""));
-        }
-        return met;
     }
 
     TemporaryRoot root_;
@@ -101,28 +74,30 @@ TEST_F(Orlo, anExportWithoutDictionaryAsksNobody) {
 
 TEST_F(Orlo, anExportThatMemoryDoesNotSufficeForHasAnErrorOfTheTableAndLeavesNoSession) {
     const Value instances = Value::Dictionary{{"CtCl", "CVG"}, {"pfcl", "MIR"}, {"tcrt", "SCR-TMA"}};
-    const std::set<std::string> met = whereMemoryEnds([&] {
-        const std::optional<Error> error = ZPOrloExport::orloExportCommandWithResponse(instances, {}, nullptr);
-        return error ? std::to_string(error->code) + error->text : "";
-    });
+    std::set<std::string> met; // nothing where memory ran out elsewhere
+    bool hasFailed = true;
+    for (int count = 1; hasFailed; ++count) {
+        recordLog();
+        std::optional<Error> error;
+        failAllocation(count);
+        try {
+            error = ZPOrloExport::orloExportCommandWithResponse(instances, {}, nullptr);
+        } catch (const std::bad_alloc&) {
+            error.reset();
+        }
+        hasFailed = allocationHasFailed();
+        failAllocation(0);
+        EXPECT_EQ(liveSessions, 0) << count;
+        const Lines lines = recordedLog();
+        if (error)
+            met.insert(std::to_string(error->code) + error->text + (lines.back().starts_with('4') ? lines.back() : ""));
+    }
     for (const char* expected :
          {"2002Orlo Export Failed due to - DataClass allocation failure4 [ZPOrloExport] DataClass allocation failure",
           "2003Orlo Export Failed due to - Data Instance is NULL4 [ZPOrloExport] Data Instance is NULL",
           "2004Orlo Export Failed due to - Permissions allocation error",
           "2009Orlo Export Failed due to - Trust Object Digest Create failed4 [ZPOrloExport] KVDataCreate failed"})
         EXPECT_TRUE(met.contains(expected)) << expected;
-}
-
-TEST_F(Orlo, anInstanceThatMemoryDoesNotSufficeForStops) {
-    for (const auto& [dataClass, message] :
-         {std::pair("tcrt", "Error Reading gpCl SN"), std::pair("AlsH", "Error Reading Ambient Light SN")}) {
-        const Value::Array list = {dataClass};
-        const std::set<std::string> met = whereMemoryEnds([&] {
-            Value error;
-            return ZPOrloExport::getDataInstances(list, &error).isNothing() && error.text() ? *error.text() : "";
-        });
-        EXPECT_TRUE(met.contains(message + ("4 [ZPOrloExport] " + std::string(message)))) << dataClass;
-    }
 }
 
 } // namespace

@@ -1,4 +1,4 @@
-// Where memory or a disk ends, and how much memory a request takes; what commands say and do stands in transcripts.
+// Where memory or a disk ends; what commands say and do stands in transcripts.
 #include <csignal>
 #include <string>
 #include <string_view>
@@ -102,44 +102,5 @@ TEST_F(ZPOrloServicesTest, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlie
         EXPECT_EQ(root_.read("/tmp/new_bCfg"), "(missing)");
     });
 }
-
-#ifdef VELTRA_MEMORY_CAN_BE_LIMITED
-TEST_F(ZPOrloServicesTest, theTicketIsCopiedOnceAndALackOfMemoryForItIsNoFailure) {
-    constexpr std::size_t size = std::size_t{64} << 20;
-    outcomes["BWCPairCorvoWithProxy"].output = Value::Array{std::string(size, 't')};
-    outcomes["VanterUpdaterIsDone"].result = true;
-    const struct {
-        std::size_t memory;
-        bool created;
-    } rows[] = {{size * 5 / 2, true}, {size * 3 / 2, false}}; // the scripted library takes a copy of its own
-    for (const auto& row : rows) {
-        inOwnProcess([&] {
-            limitMemory(row.memory);
-            EXPECT_EQ(request("corvoSCPair", {{"waftonUrl", "http://host"}}).statusCode(), 0);
-            bool created = false, loaded = false;
-            for (const std::string& call : recordedBehind("> ")) {
-                created = created || call.starts_with("VanterUpdaterCreate");
-                loaded = loaded || call == "the patch load returned 0";
-            }
-            EXPECT_EQ(created, row.created);
-            EXPECT_TRUE(loaded);
-        });
-    }
-}
-
-TEST_F(ZPOrloServicesTest, muchOutputOfTheCalibrationLoadTakesTwiceItsMemory) {
-    constexpr long kilobytes = 16 << 10;
-    root_.write("/usr/local/bin/q21isp", "#!/bin/sh\nexec head -c 16777216 /dev/zero | tr '\\0' x");
-    inOwnProcess([&] {
-        rusage before = {}, after = {};
-        ASSERT_EQ(::getrusage(RUSAGE_SELF, &before), 0);
-        ZPOrloServices::q21isp_loadDAT();
-        ASSERT_EQ(::getrusage(RUSAGE_SELF, &after), 0);
-        EXPECT_LT(after.ru_maxrss - before.ru_maxrss, 2 * kilobytes + kilobytes / 4);
-        EXPECT_GT(after.ru_maxrss - before.ru_maxrss, kilobytes);
-        EXPECT_TRUE(recordedLog().back().ends_with("x... (16777216 bytes)"));
-    });
-}
-#endif
 
 } // namespace

@@ -138,6 +138,12 @@ class StoreCases:
         self.assertEqual(self.store.stored(), {f"v1/records/psd2/{name}": name.encode() for name in names})
         connections = {line[4] for line in self.store.requests()[before:] if "/records/" in line[1]}
         self.assertEqual(len(connections), 1, "a session makes one connection")
+        process = pathlib.Path(f"/proc/{session.process.pid}")
+        inodes = (process / "net/tcp").read_text().split()
+        for link in (process / "fd").iterdir():
+            if link.readlink().name[len("socket:["):-1] in inodes:
+                flags = (process / "fdinfo" / link.name).read_text().split()[3]
+                self.assertTrue(int(flags, 8) & os.O_CLOEXEC, "a program that is started inherits the connection")
 
 
 NAMES = ["S1", "a b", "100%", "a+b=c", "~-._", "...", "a%2Fb", "a:b", "?x=1&y", "#f", "é-日本", "a\\..\\b", "'\"<>"]
