@@ -98,8 +98,7 @@ class Client(ServiceTest):
             (4, ["call", "x"]),
             (5, ["show", "bcfg", "/dev/null"]),
             (0, ["show", "-"]),
-            (2, ["show", self.root / "images/container.img4", "--hmac-key-file",
-                 self.root / "blobs/hmac-key.bin"]),
+            (2, ["show", self.root / "images/container.img4", "--hmac-key-file", self.root / "blobs/hmac-key.bin"]),
             (2, ["show", self.root / "blobs/every-kind.bin", "--hmac-key-file", "/dev/null"]),
             (2, ["crash-logs", "-o", "-"]),
             (2, ["put-psd2"]),
@@ -125,8 +124,6 @@ class Client(ServiceTest):
     def test_what_is_printed_neither_works_the_terminal_nor_tells_a_password(self):
         hostile = "x\x1b[2J\x7f\u0085\u009b\u200f\u202e\u2066"
         url = f"http://user:secret@a b{hostile}\n"
-        says = {"call": f'The plug-in does not know the command "{hostile}".',
-                "provision": f"Wafton URL not a valid URL:http://...@a b{hostile}\n"}
         for words in (["call", hostile], ["provision", url], ["set-bcfg", hostile], ["show", "der", hostile]):
             for form in ([], ["--json"]):
                 with self.subTest(words, form=form):
@@ -134,10 +131,7 @@ class Client(ServiceTest):
                     self.assertRegex(done.stdout, r"\A[\n -~]+\Z")
                     self.assertNotIn("secret", done.stdout)
                     self.assertIn(r"\u001b[2J\u007f\u0085\u009b\u200f\u202e\u2066", done.stdout)
-                    if form and words[0] in says:
-                        answer = json.loads(done.stdout)
-                        error = answer.get("response", {}).get("error", {})
-                        self.assertEqual(error.get("description", answer.get("problem")), says[words[0]])
+        self.assertIn(hostile, self.service.orloctl("call", hostile)[1]["problem"])
 
     def test_words_become_texts_json_values_and_file_contents(self):
         self.service.write("bytes", b"\x00\xff")
