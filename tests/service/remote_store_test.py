@@ -177,20 +177,18 @@ class PlainStore(RemoteTest, StoreCases):
         self.assertEqual(self.store.stored(), {})
 
     def test_the_session_says_which_requests_pass_through_the_devices_proxy(self):
-        proxy = self.closing(ForwardProxy(self.store.folder))
         session = self.session()
-        settings = {"HTTPEnable": 1, "HTTPProxy": "127.0.0.1", "HTTPPort": proxy.port,
-                    "HTTPSEnable": 1, "HTTPSProxy": "127.0.0.1", "HTTPSPort": proxy.port}
-        session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings})
         for options, tunnels in (({}, 0), ({"EnableProxy": True}, 1), ({"EnableProxySsl": "ForHttps"}, 0),
-                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 2)):  # and one is kept
+                                 ({"EnableProxy": True, "EnableProxySsl": "ForHttps"}, 3)):
             with self.subTest(options):
+                proxy = self.closing(ForwardProxy(self.store.folder))
+                settings = {"HTTPEnable": 1, "HTTPProxy": "127.0.0.1", "HTTPPort": proxy.port,
+                            "HTTPSEnable": 1, "HTTPSProxy": "127.0.0.1", "HTTPSPort": proxy.port}
+                session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings})
                 session.open(**options)
                 self.assertEqual(session.run("trust", TRUST_URL), (0, ""))
                 self.assertEqual(session.put("S1"), (0, ""))
-                self.assertEqual(proxy.tunnels(), tunnels)
-        proxy.close()
-        session.open(EnableProxy=True)
+                self.assertEqual(proxy.close(), tunnels)
         self.assertEqual(session.run("trust", TRUST_URL)[0], TRANSPORT)
         session.describe(self.store.describe(session.root), reverseProxy={"proxy": settings | {"HTTPProxy": ""}})
         session.open(EnableProxy=True)
