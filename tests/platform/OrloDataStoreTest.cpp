@@ -11,7 +11,6 @@
 #include <gtest/gtest.h>
 #include <sqlite3.h>
 #include <sys/resource.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -261,7 +260,6 @@ TEST_F(OrloDataStore, aSessionHasATicketAndADataVersionOf32Bits) {
 TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
     root_.makeDirectory("/folder");
     root_.write("/file", "this is no database, however long one reads it");
-    ASSERT_EQ(::mkfifo(root_.host("/fifo").c_str(), 0600), 0);
     std::filesystem::create_symlink(root_.around() / "outside", root_.host("/link"));
     const std::pair<const char*, std::string> keys[] = {
         {"/open", "id\nsecret\n"},       {"/key", "id\nsecret\r\n\n"},      {"/blank", "id\nsec ret\n"},
@@ -281,9 +279,7 @@ TEST_F(OrloDataStore, makesNoSessionOnAStoreThatCannotBeUsedAndSaysWhy) {
         {R"("path": "/folder/")", "path /folder/ names no file"},
         {R"("path": "/file")", "cannot be used"},
         {R"("path": "/file/store")", "folder cannot be opened"},
-        {R"("path": "/fifo")", "no regular file"},
         {R"("path": "/link")", "no regular file"},
-        {R"("path": "/link/store")", "folder cannot be opened"},
         {remote + R"("caFile": 7)", "caFile 7 cannot be read"},
         {remote + R"("caFile": "/missing")", "caFile /missing cannot be read"},
         {remote + R"("caFile": "/text")", "caFile /text holds no PEM certificate"},
