@@ -17,7 +17,7 @@ TEST(URL, theSyntaxOfRFC3986Decides) {
     std::istringstream malformed(
         "1http://a :a a_b:c http://a/% http://a/%4 http://a/%4g http://[::1 http://[::1]x http://[::1]:x "
         "http://[12345::] http://[v.a] http://[v1.] http://[v1.%41] http://a:8x http://a@b@c http://a/[b] "
-        "http://a?b#c#d http://a/\" http://a\\b http://ä/");
+        "http://a?b#c#d http://a/\" http://a?\" http://a\\b http://ä/");
     for (std::string text; wellFormed >> text;)
         EXPECT_TRUE(isWellFormedURL(text)) << text;
     for (std::string text; malformed >> text;)
