@@ -70,8 +70,9 @@ class Buffer:
         view = memoryview(data)
         if not view.c_contiguous:
             raise BufferError("the buffer is not contiguous")
-        self.start: Any = ffi.from_buffer("const uint8_t[]", view)
         self.view = (view.cast("B") if view.nbytes else memoryview(b"")).toreadonly()
+        # The view alone keeps the octets: Python's garbage collector crashes when it clears a view that cffi holds.
+        self.start: Any = ffi.cast("const uint8_t *", ffi.from_buffer(self.view))
         self.address = int(ffi.cast("uintptr_t", self.start))
 
     def item(self, start: int = 0, end: int | None = None) -> Any:

@@ -1,4 +1,5 @@
 """veltra.der beside pyasn1 and cryptography."""
+import gc
 import pathlib
 import unittest
 
@@ -61,6 +62,10 @@ class Der(unittest.TestCase):
         self.assertRaises(BufferError, data.clear)
         del walk, found
         data.clear()
+        cycle = [der.Buffer(data)]
+        cycle += [cycle[0].start, cycle]
+        del cycle
+        gc.collect()
 
     def test_misuse_is_an_exception(self):
         rows = [Row("n", der.INTEGER)]
