@@ -2,7 +2,8 @@
 SysConfig3 configuration blobs (`veltra.sysconfig3`).
 
 Data goes in as any object with a contiguous buffer and is not copied: what is made of it keeps the buffer, and views that are
-given out are slices of it. An object that is given may be used from any number of threads.
+given out are slices of it. Octets that change meanwhile, a bytearray's for instance, are harmless to the program, but what was
+found out about them no longer holds. Any number of threads may use an object; only iterators are for one at a time.
 """
 from __future__ import annotations
 
@@ -51,7 +52,7 @@ def code(characters: str) -> int:
     >>> hex(code("bCfg")), name(0x62436667)
     ('0x62436667', 'bCfg')
     """
-    octets = characters.encode("latin-1")
+    octets = str.encode(characters, "latin-1")
     if len(octets) != 4:
         raise ValueError(f"{characters!r} has not four characters")
     return int.from_bytes(octets, "big")

@@ -263,8 +263,12 @@ def encode(tag: int, content: ReadableBuffer) -> bytearray:
 def encode_sequence(
     table: Sequence[Row], values: Mapping[str, ReadableBuffer | None], tag: int = SEQUENCE
 ) -> bytearray:
-    """The SEQUENCE, or what the tag says, of the contents that a table's rows name."""
+    """The SEQUENCE, or what the tag says, of the contents that a table's rows name; an optional one may be missing. A row whose
+    value is a whole encoding, as `fill` gives out one with Option.SAVE_DER, needs Option.WRITE_DER."""
     given = [values.get(row.name) for row in table]
+    for place, row in enumerate(table):
+        if given[place] is None and not row.options & Option.OPTIONAL:
+            raise DerError("encoding", "Missing", Status.INCOMPLETE_SEQUENCE, None, row=place, expected=row.tag)
     buffers = [Buffer(b"" if value is None else value) for value in given]
     record = ffi.new("DERItem[]", [(buffer.start, len(buffer.view)) for buffer in buffers])
     arguments = (tag, record, ffi.sizeof(record), len(table), _specs(table))

@@ -38,7 +38,7 @@ PROFILES = tuple(_ENTRIES)  # the names of the trust profiles
 
 # BOOLEAN, INTEGER, IA5String, OCTET STRING, SET of properties, and anything else.
 Value = Union[bool, int, str, memoryview, "Properties", der.Item]
-# Judges a property by its name and value; the third argument says whether it is the object's. False refuses it.
+# Judges a property by its name and value; the third argument says whether it is the object's. False, or 0, refuses it.
 Judge = Callable[[str, Value, bool], Union[bool, None]]
 
 
@@ -398,8 +398,8 @@ class Image:
         def run(tag: int, value: Any, selector: int) -> int:
             start = self._buffer.offset(value.content.data) or 0
             item = der.Item(self._buffer, value.tag, start, start, start + value.content.length)
-            agreed = judge is None or judge(name(tag & 0xFFFFFFFF), _value(item), selector == lib.Img4SelectorObject)
-            return Status.FAILURE if agreed is False else Status.SUCCESS
+            agreed = None if judge is None else judge(name(tag & 0xFFFFFFFF), _value(item), selector == lib.Img4SelectorObject)
+            return Status.SUCCESS if agreed is None or agreed else Status.FAILURE
 
         state = _State(run)
         handle = ffi.new_handle(state)

@@ -78,6 +78,7 @@ class Der(unittest.TestCase):
             (der.DerError, lambda: der.fill(b"\x30\0", rows)),
             (OverflowError, lambda: der.fill(b"\x30\0", rows * 65536)),
             (TypeError, lambda: der.encode_sequence(rows, {"n": 5})),
+            (der.DerError, lambda: der.encode_sequence(rows, {"N": b""})),
             (IndexError, lambda: der.Item(der.Buffer(b""), der.INTEGER, 0, 0, 1 << 62).integer()),
         ):
             with self.subTest(line=call.__code__.co_firstlineno), self.assertRaises(error):

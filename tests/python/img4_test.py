@@ -120,7 +120,7 @@ class Img4(unittest.TestCase):
         manifest = Image(DATA).manifest
         for expected, arguments, broken in (
             (("Object", "Absent", "Sound", "Sound"), {"object": "none"}, None),
-            (("ManifestProperties", "Other", "Sound", "Sound"), {"judge": lambda name, *_: name != "TEXT"}, None),
+            (("ManifestProperties", "Other", "Sound", "Sound"), {"judge": lambda name, *_: int(name != "TEXT")}, None),
             (("Signature", "Other", "Sound", "Mismatch"), {"trusted_digest": bytes(48)}, manifest.signature),
             (("Chain", "Other", "Signature", "Mismatch"), {"domain": None}, None),
         ):
