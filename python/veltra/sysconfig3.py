@@ -19,7 +19,8 @@ Blobs of version 0x30002 carry HMACs, which a key makes and without which they a
 (True, True, False)
 
 What the library reports goes to the logger "veltra.sysconfig3". A handler must not use the blob that reports, which
-raises RuntimeError. Payload keys are four-character codes; texts are UTF-8, with what is none as lone surrogates.
+raises RuntimeError, nor one that another thread uses, which may be waiting for the handler. Payload keys are four-character
+codes; texts are UTF-8, with what is none as lone surrogates, and cut to 2**24 octets.
 """
 from __future__ import annotations
 
@@ -28,7 +29,7 @@ import contextlib
 import logging
 import threading
 from collections.abc import Iterator, MutableMapping
-from typing import TYPE_CHECKING, Any, Callable, NamedTuple, TypeVar
+from typing import TYPE_CHECKING, Any, Callable, NamedTuple, NoReturn, TypeVar
 
 from . import CodecError, Status, code, name, names
 from ._codecs import ffi, lib
@@ -44,7 +45,8 @@ _Result = TypeVar("_Result")
 
 
 class BlobError(CodecError):
-    """What the library refuses; `message` is what it reported last, if anything."""
+    """What the library refuses; `message` is what it reported last, if anything. The fault Unsupported is that of a magic or
+    version that no blob has."""
 
     message: str = ""
 
@@ -68,8 +70,11 @@ def _keep(_: Any, raised: BaseException, __: Any) -> None:
 
 @ffi.def_extern(onerror=_keep)  # type: ignore[misc]
 def veltraTakeMessage(text: Any, length: int) -> None:
-    _reports.last = ffi.unpack(text, length).decode("utf-8", "replace")
-    _log.warning("%s", _reports.last)
+    message = ffi.unpack(text, length).decode("utf-8", "replace")
+    try:
+        _log.warning("%s", message)
+    finally:
+        _reports.last = message  # after handlers that called the library too
 
 
 lib.veltraTakeMessages(True)
@@ -78,13 +83,25 @@ atexit.register(lib.veltraTakeMessages, False)
 
 def _call(operation: Callable[..., _Result], *arguments: Any) -> _Result:
     """Calls the library, and raises afterwards what a handler of messages raised meanwhile."""
+    outer = _reports.raised
     _reports.last = ""
     _reports.raised = None
-    result = operation(*arguments)
-    if _reports.raised is not None:
-        raised, _reports.raised = _reports.raised, None
-        raise raised
-    return result
+    try:
+        result = operation(*arguments)
+        if _reports.raised is not None:
+            raise _reports.raised
+        return result
+    finally:
+        _reports.raised = outer
+
+
+def _make(create: Any, release: Any, *arguments: Any) -> Any:
+    """Calls an operation that makes an object, which is released even when a handler of messages raises."""
+
+    def owned() -> Any:
+        return ffi.gc(create(*arguments), release)
+
+    return _call(owned)
 
 
 def _error(operation: str) -> BlobError:
@@ -96,7 +113,7 @@ def _text(pointer: Any) -> str | None:
 
 
 def _octets(text: str) -> bytes:
-    octets = text.encode("utf-8", "surrogateescape")
+    octets = str.encode(text, "utf-8", "surrogateescape")
     if b"\0" in octets:
         raise ValueError("a text of a blob holds no NUL")
     return octets
@@ -124,10 +141,10 @@ class Blob:
 
     def __init__(self, magic: str = "bCfg", version: int = 0x30001, key: ReadableBuffer | None = None) -> None:
         if key is None:
-            made = _call(lib.allocSysConfig3, code(magic), version)
+            made = _make(lib.allocSysConfig3, lib.deallocSysConfig3, code(magic), version)
         else:
             buffer, view = _view(key)
-            made = _call(lib.allocSysConfig3WithHMACKey, code(magic), version, view[0])
+            made = _make(lib.allocSysConfig3WithHMACKey, lib.deallocSysConfig3, code(magic), version, view[0])
         if not made:
             raise _error("new blob")
         self._own(made)
@@ -137,35 +154,44 @@ class Blob:
         """Decodes the blob at the start of the data, which is not needed afterwards."""
         buffer = Buffer(data)
         refusal = ffi.new("SysConfig3Refusal *")
-        made = _call(lib.decodeSysConfig3Explained, buffer.start, len(buffer.view), refusal)
+        made = _make(lib.decodeSysConfig3Explained, lib.deallocSysConfig3, buffer.start, len(buffer.view), refusal)
         if not made:
             encoding = refusal.encoding
             place = buffer.offset(encoding.place if encoding.fault else refusal.place)
-            raise BlobError(_SUBJECTS[refusal.subject], _FAULTS[encoding.fault] if encoding.fault else "", refusal.status,
-                            place, message=_reports.last)
+            fault = _FAULTS[encoding.fault] if encoding.fault else "" if refusal.status else "Unsupported"
+            raise BlobError(_SUBJECTS[refusal.subject], fault, refusal.status or Status.FAILURE, place, message=_reports.last)
         blob = cls.__new__(cls)
         blob._own(made)
         return blob
 
     def _own(self, made: Any) -> None:
-        self._object: Any = ffi.gc(made, lib.deallocSysConfig3)
-        self._lock = threading.Lock()
-        self._user: int | None = None
-        self.payload = Payload(self)
-        self.metadata = Metadata(self)
+        self._object: Any = made
+        self._lock = threading.RLock()
+        self._is_used = False
+
+    @property
+    def payload(self) -> Payload:
+        return Payload(self)
+
+    @property
+    def metadata(self) -> Metadata:
+        return Metadata(self)
+
+    def __reduce__(self) -> NoReturn:
+        raise TypeError("a blob is not copied or pickled; its encoding can be")
 
     def _use(self, operation: Callable[..., _Result], *arguments: Any) -> _Result:
         """Calls the operation with the library's object and the arguments; no one else uses the object meanwhile."""
-        if self._user == threading.get_ident():
-            raise RuntimeError("the blob is in use by the same thread")
         with self._lock:
+            if self._is_used:  # by a handler of messages or of signals, or a finalizer
+                raise RuntimeError("the blob is in use by the same thread")
             if self._object is None:
                 raise ValueError("the blob is closed")
-            self._user = threading.get_ident()
+            self._is_used = True
             try:
                 return _call(operation, self._object, *arguments)
             finally:
-                self._user = None
+                self._is_used = False
 
     def _change(self, operation: Callable[..., bool], *arguments: Any) -> None:
         if not self._use(operation, *arguments):
@@ -297,10 +323,15 @@ class _Entries(MutableMapping[str, _Value]):
 
         self._blob._change(delete, self._key(key))
 
-    def _add(self, add: Any, made: Any, release: Any) -> None:
+    def clear(self) -> None:
+        for key in self:
+            with contextlib.suppress(KeyError):
+                del self[key]
+
+    def _add(self, add: Any, made: Any) -> None:
         if not made:
             raise _error("entry")
-        self._blob._change(add, ffi.gc(made, release))
+        self._blob._change(add, made)
 
 
 class Payload(_Entries[PayloadEntry]):
@@ -325,19 +356,19 @@ class Payload(_Entries[PayloadEntry]):
 
     def __setitem__(self, key: str, value: PayloadEntry | str | ReadableBuffer | None) -> None:
         entry = value if isinstance(value, PayloadEntry) else PayloadEntry(value)  # type: ignore[arg-type]
-        number, comment = code(key), _octets(entry.comment)
+        number, comment, release = code(key), _octets(entry.comment), lib.deallocSysConfig3PayloadEntry
         if entry.value is None:
-            made = _call(lib.allocSysConfig3PayloadEntryDeleted, number, comment)
+            made = _make(lib.allocSysConfig3PayloadEntryDeleted, release, number, comment)
         elif isinstance(entry.value, str):
-            made = _call(lib.allocSysConfig3PayloadEntryWithString, number, comment, _octets(entry.value))
+            made = _make(lib.allocSysConfig3PayloadEntryWithString, release, number, comment, _octets(entry.value))
         else:
             buffer = Buffer(entry.value)
-            made = _call(lib.allocSysConfig3PayloadEntryWithData, number, comment, buffer.start, len(buffer.view))
-        self._add(lib.sysConfig3AddPayloadEntry, made, lib.deallocSysConfig3PayloadEntry)
+            made = _make(lib.allocSysConfig3PayloadEntryWithData, release, number, comment, buffer.start, len(buffer.view))
+        self._add(lib.sysConfig3AddPayloadEntry, made)
 
 
 class Metadata(_Entries["str | bytes"]):
-    """The metadata entries of a blob. Of a key the first 256 characters count."""
+    """The metadata entries of a blob. Of a key the first 256 octets of UTF-8 count."""
 
     _count = lib.sysConfig3GetMetadataEntryCount
     _head = lib.sysConfig3GetHeadMetadataEntry
@@ -356,9 +387,10 @@ class Metadata(_Entries["str | bytes"]):
         return text if text is not None else _data(lib.sysConfig3MetadataEntryGetData, entry) or b""
 
     def __setitem__(self, key: str, value: str | ReadableBuffer) -> None:
+        create, release = lib.allocSysConfig3MetadataEntry, lib.deallocSysConfig3MetadataEntry
         if isinstance(value, str):
-            made = _call(lib.allocSysConfig3MetadataEntry, _octets(key), ffi.NULL, 0, _octets(value))
+            made = _make(create, release, _octets(key), ffi.NULL, 0, _octets(value))
         else:
             buffer = Buffer(value)
-            made = _call(lib.allocSysConfig3MetadataEntry, _octets(key), buffer.start, len(buffer.view), ffi.NULL)
-        self._add(lib.sysConfig3AddMetadataEntry, made, lib.deallocSysConfig3MetadataEntry)
+            made = _make(create, release, _octets(key), buffer.start, len(buffer.view), ffi.NULL)
+        self._add(lib.sysConfig3AddMetadataEntry, made)

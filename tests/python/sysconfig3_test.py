@@ -1,9 +1,13 @@
 """veltra.sysconfig3 beside dictionaries and the HMACs of Python."""
+import contextlib
+import copy
 import hmac
 import logging
+import sys
 import threading
 import unittest
 import unittest.mock
+import weakref
 
 import budget  # noqa: F401
 from hypothesis import given, strategies
@@ -36,18 +40,32 @@ class SysConfig3(unittest.TestCase):
                             for key, entry in payload.items()),
                    b"".join(octets(key) + octets(value) for key, value in metadata.items())]
         self.assertEqual(again.hmacs, tuple(hmac.digest(KEY, stream, "sha256") for stream in [*streams, b"".join(streams)]))
+        blob.metadata.clear()
+        self.assertEqual((list(blob.metadata), len(blob.payload)), ([], len(payload)))
 
     def test_messages_reach_handlers_and_what_these_raise_the_caller(self):
         blob = Blob.decode(Blob("bCfg", 0x30002, KEY).encode())
-        log, handler = logging.getLogger("veltra.sysconfig3"), logging.Handler()
-        with self.assertLogs(log) as messages, self.assertRaises(BlobError) as raised:
-            blob.payload["WCh0"] = "text"
-        self.assertEqual(raised.exception.message, messages.records[-1].getMessage())
+        log, handler, messages = logging.getLogger("veltra.sysconfig3"), logging.Handler(), []
         log.addHandler(handler)
         self.addCleanup(log.removeHandler, handler)
-        for error, emit in ((RuntimeError, blob.close), (KeyboardInterrupt, unittest.mock.Mock(side_effect=KeyboardInterrupt))):
-            handler.emit = lambda _, emit=emit: emit()
+        handler.emit = lambda record: messages.append((Blob().magic, record.getMessage()))
+        with self.assertRaises(BlobError) as raised:
+            blob.payload["WCh0"] = "text"
+        self.assertEqual(("bCfg", raised.exception.message), messages[-1])
+        interrupt = unittest.mock.Mock(side_effect=[KeyboardInterrupt, None, None])
+        for error, emit in ((RuntimeError, blob.close), (KeyboardInterrupt, interrupt)):
+            handler.emit = lambda _, emit=emit: emit() or Blob()
             self.assertRaises(error, blob.hmac_is_valid)
+
+    def test_what_interrupts_a_use_may_ask_the_blob(self):
+        def interrupt(*_):
+            with contextlib.suppress(RuntimeError):
+                len(blob.payload)
+
+        blob = Blob()
+        sys.setprofile(interrupt)
+        self.assertEqual(blob.magic, "bCfg")
+        sys.setprofile(None)
 
     def test_threads_take_turns_until_one_closes_the_blob(self):
         blob, endings = Blob(), []
@@ -76,6 +94,7 @@ class SysConfig3(unittest.TestCase):
         closed.payload["OldK"] = None
         encoding = closed.encode()
         closed.close()
+        self.assertIsNone(weakref.ref(Blob())())
         self.assertIsNone(Blob.decode(encoding).payload["OldK"].value)  # the encoding belongs to the view
         for error, call in (
             (ValueError, lambda: closed.payload["WCh0"]),
@@ -88,6 +107,7 @@ class SysConfig3(unittest.TestCase):
             (BlobError, lambda: Blob(key=KEY)),
             (OverflowError, lambda: Blob("bCfg", 1 << 32)),
             (TypeError, lambda: blob.payload.__setitem__("WCh0", 5)),
+            (TypeError, lambda: copy.copy(blob)),
             (BlobError, lambda: Blob.decode(encoding[:-1])),
         ):
             with self.subTest(line=call.__code__.co_firstlineno), self.assertRaises(error) as raised:
