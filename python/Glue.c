@@ -7,17 +7,27 @@
 // The other half is Python's.
 void veltraTakeMessage(const char* text, uint64_t length);
 
-DERReturn veltraDecodeItems(const uint8_t* buffer, uint64_t start, uint64_t end, uint16_t most, ItemPlace* places,
-                            uint16_t* count, DERRefusal* refusal) {
-    for (*count = 0; *count < most && start < end; ++*count) {
-        const DERItem rest = {buffer + start, end - start};
+DERReturn veltraWalkItems(const uint8_t* buffer, ItemWalk* walk, bool isDeep, uint16_t most, uint64_t* rows,
+                          uint16_t* count, DERRefusal* refusal) {
+    const DERTag constructed = UINT64_C(1) << 61;
+    for (*count = 0; *count < most; ++*count) {
+        while (walk->depth != 0 && walk->next == walk->ends[walk->depth])
+            --walk->depth;
+        const DERItem rest = {buffer + walk->next, walk->ends[walk->depth] - walk->next};
+        if (rest.length == 0)
+            return DERSuccess;
         DERDecodedInfo item;
         const DERReturn status = DERDecodeItemExplained(&rest, &item, refusal);
         if (status != DERSuccess)
             return status;
-        const uint64_t content = (uint64_t)(item.content.data - buffer);
-        places[*count] = (ItemPlace){item.tag, start, content, content + item.content.length};
-        start = content + item.content.length;
+        const uint64_t content = (uint64_t)(item.content.data - buffer), end = content + item.content.length;
+        const uint64_t known[ItemRows] = {walk->depth, item.tag, walk->next, content, end};
+        for (int row = 0; row < ItemRows; ++row)
+            rows[row * most + *count] = known[row];
+        const bool isEntered = isDeep && (item.tag & constructed) != 0;
+        walk->next = isEntered ? content : end;
+        if (isEntered)
+            walk->ends[++walk->depth] = end;
     }
     return DERSuccess;
 }

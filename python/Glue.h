@@ -6,18 +6,29 @@
 #include "img4/Img4DomainFolder.h"
 #include "sysconfig/SysConfig3.h"
 
-// Where an item lies in a buffer: its first octet, its content's first octet, and one past its end.
-typedef struct ItemPlace {
-    DERTag tag;
-    uint64_t start;
-    uint64_t content;
-    uint64_t end;
-} ItemPlace;
+// A walk over the items of a buffer. `next` is the offset of the item to come, `ends` has an offset for each item that
+// is open, the last that of `depth`: its end, and first the end of the walk.
+typedef struct ItemWalk {
+    uint64_t next;
+    uint64_t depth;
+    uint64_t* ends;
+} ItemWalk;
 
-// Decodes up to `most` items from offset `start` to offset `end` of `buffer` into `places`, and their number into
-// *count. Whatever follows the last of them has not been looked at, unless the result is a refusal.
-DERReturn veltraDecodeItems(const uint8_t* buffer, uint64_t start, uint64_t end, uint16_t most, ItemPlace* places,
-                            uint16_t* count, DERRefusal* refusal);
+// What is known of an item: five rows of the `most` numbers that veltraWalkItems gives out.
+enum {
+    ItemDepth,
+    ItemTag,
+    ItemStart,
+    ItemContent,
+    ItemEnd,
+    ItemRows
+};
+
+// Decodes up to `most` items into `rows`, and their number into *count; those in a constructed one behind it, if the
+// walk is deep, for which `ends` has room for `most` more. Whatever follows the last of them has not been looked at,
+// unless the result is a refusal.
+DERReturn veltraWalkItems(const uint8_t* buffer, ItemWalk* walk, bool isDeep, uint16_t most, uint64_t* rows,
+                          uint16_t* count, DERRefusal* refusal);
 
 // Has the library's messages, formatted, given to veltraTakeMessage, or no longer.
 void veltraTakeMessages(bool areTaken);

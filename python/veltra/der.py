@@ -26,6 +26,7 @@ from __future__ import annotations
 
 from collections.abc import Iterator, Mapping, Sequence
 from enum import IntFlag
+from itertools import repeat
 from typing import TYPE_CHECKING, Any, NamedTuple
 
 from . import CodecError, Status, names
@@ -164,21 +165,33 @@ class Item:
         return out
 
 
-def decode_range(buffer: Buffer, start: int, end: int) -> Iterator[Item]:
-    """The items from one offset of a buffer to another."""
+def _known(buffer: Buffer, start: int, end: int, is_deep: bool) -> Iterator[list[list[int]]]:
+    """Of some items at a time what is known of them, a list for each row of Glue.h."""
     buffer.item(start, end)
     most = 4
     count = ffi.new("uint16_t *")
     refusal = ffi.new("DERRefusal *")
-    while start < end:
-        places = ffi.new("ItemPlace[]", most)
-        status = lib.veltraDecodeItems(buffer.start, start, end, most, places, count, refusal)
-        numbers = iter(ffi.unpack(ffi.cast("uint64_t *", places), 4 * count[0]))
-        for tag, offset, content, start in zip(numbers, numbers, numbers, numbers):
-            yield Item(buffer, tag, offset, content, start)
+    ends = ffi.new("uint64_t[]", [end])
+    walk = ffi.new("ItemWalk *", (start, 0, ends))
+    while True:
+        if is_deep and len(ends) <= walk.depth + most:
+            wider = ffi.new("uint64_t[]", 2 * len(ends) + most)
+            ffi.memmove(wider, ends, ffi.sizeof(ends))
+            ends = walk.ends = wider
+        rows = ffi.new("uint64_t[]", lib.ItemRows * most)
+        status = lib.veltraWalkItems(buffer.start, walk, is_deep, most, rows, count, refusal)
+        yield [ffi.unpack(rows + row * most, count[0]) for row in range(lib.ItemRows)]
         if status:
             raise buffer.error("item", status, refusal)
+        if count[0] < most:
+            return
         most = min(4 * most, 256)
+
+
+def decode_range(buffer: Buffer, start: int, end: int) -> Iterator[Item]:
+    """The items from one offset of a buffer to another."""
+    for _, *known in _known(buffer, start, end, False):
+        yield from map(Item, repeat(buffer), *known)
 
 
 def decode(data: ReadableBuffer) -> Item:
@@ -205,15 +218,9 @@ def walk(data: ReadableBuffer) -> Iterator[tuple[int, Item]]:
     >>> [(depth, item.offset) for depth, item in walk(bytes.fromhex("3005 3003 020105"))]
     [(0, 0), (1, 2), (2, 4)]
     """
-    open_items = [items(data)]
-    while open_items:
-        item = next(open_items[-1], None)
-        if item is None:
-            open_items.pop()
-            continue
-        yield len(open_items) - 1, item
-        if item.constructed:
-            open_items.append(iter(item))
+    buffer = Buffer(data)
+    for depths, *known in _known(buffer, 0, len(buffer.view), True):
+        yield from zip(depths, map(Item, repeat(buffer), *known))
 
 
 class Option(IntFlag):

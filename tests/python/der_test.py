@@ -51,6 +51,13 @@ class Der(unittest.TestCase):
             found = int.from_bytes(der.fill(tbs, der.TBS_CERTIFICATE)["serialNumber"], "big")
             self.assertEqual((tbs, found), (theirs.tbs_certificate_bytes, serial))
 
+    def test_a_walk_goes_to_any_depth_and_out_again(self):
+        nested = b""
+        for _ in range(1000):
+            nested = der.encode(der.SEQUENCE, nested)
+        depths = [depth for depth, _ in der.walk(nested + b"\2\1\5")]
+        self.assertEqual(depths, [*range(1000), 0])
+
     def test_items_before_a_broken_one_come_first_and_keep_the_buffer(self):
         data = bytearray(b"\2\1\5" * 300 + b"\2\0\x1f\x1e\0")
         walk = der.items(memoryview(data))
