@@ -2,24 +2,19 @@
 // behind the blob say and checks lists, index and HMACs against a plain model.
 #include <algorithm>
 #include <cstdarg>
-#include <cstring>
 #include <string>
 #include <vector>
 
 #include "der/DERDecode.h"
 #include "fuzz/Fuzz.h"
-#include "sysconfig/SysConfig3Ptr.h"
+#include "tests/sysconfig/Blob.h"
 
 namespace {
 
-using sysconfig::BytesPtr;
-using sysconfig::MetadataEntryPtr;
-using sysconfig::PayloadEntryPtr;
 using sysconfig::SysConfig3Ptr;
 
 constexpr SysConfig3Version hmacVersion = 0x30002;
 constexpr SysConfig3Version deletedFlagVersion = 0x30003;
-std::uint8_t keyBytes[] = {'k', 'e', 'y'};
 
 // Formats every message, so that the sanitizer sees what its arguments refer to.
 SYSCONFIG3_PRINTF(2, 3) void formatMessage(int level, const char* format, ...) {
@@ -36,23 +31,17 @@ SYSCONFIG3_PRINTF(1, 2) void refuseException(const char*, ...) {
 
 void registerKey(__SysConfig3* object) {
     if (sysConfig3GetVersion(object) == hmacVersion)
-        FUZZ_REQUIRE(sysConfig3SetHMACKey(object, {keyBytes, sizeof keyBytes}));
+        FUZZ_REQUIRE(sysConfig3SetHMACKey(object, hmacKey));
 }
 
 void checkRoundTrip(const __SysConfig3* object) {
-    SysConfigData blob = {};
-    FUZZ_REQUIRE(encodeSysConfig3(object, &blob));
-    const BytesPtr blobOwner(blob.data);
-    const SysConfig3Ptr decoded(decodeSysConfig3(blob.data, blob.length));
+    const Bytes blob = encode(object);
+    const SysConfig3Ptr decoded = decode(blob);
     FUZZ_REQUIRE(decoded != nullptr);
     // An object with an absent HMAC may be equal to none, itself included.
     FUZZ_REQUIRE(sysConfig3ObjectsAreEqual(object, decoded.get()) == sysConfig3ObjectsAreEqual(object, object));
-
     registerKey(decoded.get());
-    SysConfigData again = {};
-    FUZZ_REQUIRE(encodeSysConfig3(decoded.get(), &again));
-    const BytesPtr againOwner(again.data);
-    FUZZ_REQUIRE(again.length == blob.length && std::memcmp(again.data, blob.data, blob.length) == 0);
+    FUZZ_REQUIRE(encode(decoded.get()) == blob);
 }
 
 // The keys of both lists in order, kept in the plainest way.
@@ -100,14 +89,9 @@ void changePayload(__SysConfig3* object, Model* model, fuzz::Input& script) {
         std::erase(model->payload, key);
         return;
     }
-    PayloadEntryPtr entry;
-    if (kind == 0)
-        entry.reset(allocSysConfig3PayloadEntryDeleted(key, text.c_str()));
-    else if (kind == 1)
-        entry.reset(allocSysConfig3PayloadEntryWithString(key, nullptr, text.c_str()));
-    else
-        entry.reset(allocSysConfig3PayloadEntryWithData(key, "note", reinterpret_cast<const std::uint8_t*>(text.data()),
-                                                        static_cast<std::uint32_t>(text.size())));
+    const auto entry = kind == 0   ? payloadDeleted(key, text.c_str())
+                       : kind == 1 ? payloadString(key, text.c_str())
+                                   : payloadData(key, {text.begin(), text.end()}, "note");
     FUZZ_REQUIRE((entry == nullptr) == (key == 0 || (kind > 1 && text.empty())));
     const bool allowed = entry != nullptr && (kind != 0 || sysConfig3GetVersion(object) >= deletedFlagVersion);
     FUZZ_REQUIRE(sysConfig3AddPayloadEntry(object, entry.get()) == allowed);
@@ -126,7 +110,7 @@ void changeMetadata(__SysConfig3* object, Model* model, fuzz::Input& script) {
         FUZZ_REQUIRE(sysConfig3DeleteMetadataEntryForKey(object, key.c_str()));
         return;
     }
-    const MetadataEntryPtr entry(allocSysConfig3MetadataEntry(key.c_str(), nullptr, 0, textOf(script).c_str()));
+    const auto entry = metadataString(key.c_str(), textOf(script).c_str());
     FUZZ_REQUIRE(sysConfig3AddMetadataEntry(object, entry.get()));
     model->metadata.push_back(storedKey);
 }
