@@ -260,15 +260,8 @@ class _State:
     raised: BaseException | None = None
     contents: der.Buffer | None = None
 
-    def __init__(self, function: Callable[..., Any]) -> None:
+    def __init__(self, function: Callable[..., int]) -> None:
         self.function = function
-
-    def run(self, *arguments: Any) -> int:
-        try:
-            return int(self.function(*arguments))
-        except BaseException as raised:
-            self.raised = raised
-            return Status.FAILURE
 
     def check(self) -> None:
         if self.raised is not None:
@@ -278,17 +271,22 @@ class _State:
                 self.raised = None
 
 
-@ffi.def_extern(error=Status.FAILURE)  # type: ignore[misc]
+def _keep(_: Any, raised: BaseException, traceback: Any) -> None:
+    """Keeps what a callback raised, an interrupt before its first line included."""
+    ffi.from_handle(traceback.tb_frame.f_locals["context"]).raised = raised
+
+
+@ffi.def_extern(error=Status.FAILURE, onerror=_keep)  # type: ignore[misc]
 def veltraReadDomainFile(file: Any, may_be_missing: bool, contents: Any, context: Any) -> int:
-    return ffi.from_handle(context).run(file, may_be_missing, contents)  # type: ignore[no-any-return]
+    return ffi.from_handle(context).function(file, may_be_missing, contents)  # type: ignore[no-any-return]
 
 
-@ffi.def_extern(error=Status.FAILURE)  # type: ignore[misc]
+@ffi.def_extern(error=Status.FAILURE, onerror=_keep)  # type: ignore[misc]
 def veltraJudge(tag: int, value: Any, selector: int, context: Any) -> int:
-    return ffi.from_handle(context).run(tag, value, selector)  # type: ignore[no-any-return]
+    return ffi.from_handle(context).function(tag, value, selector)  # type: ignore[no-any-return]
 
 
-@ffi.def_extern(error=ffi.NULL)  # type: ignore[misc]
+@ffi.def_extern(error=ffi.NULL, onerror=_keep)  # type: ignore[misc]
 def veltraTrustedDigest(_: Any, context: Any) -> Any:
     return ffi.from_handle(context).contents.start
 
