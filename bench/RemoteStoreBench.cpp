@@ -1,71 +1,61 @@
-// What the remote store costs on top of HTTPS: puts and gets of records in one session of the data-store library,
-// beside the curl command line with as many requests on one connection, both to the same nginx on loopback. Either
-// makes its connection anew for each run, and the session fetches the trust object and its measure first.
+// What a record of 4 KiB costs through the service on a remote store: requests that put and get it, beside the curl
+// command line with as many requests for the same object on one connection. The store is an nginx on loopback, or the
+// S3 gateway of Ceph where the argument "ceph" says so, for which it has to be installed. For each request the service
+// fetches the trust object twice besides and, on the object store, asks for the record's tag before it puts.
 #include <cstdint>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iostream>
+#include <iterator>
+#include <memory>
+#include <span>
+#include <sstream>
 #include <string>
+#include <string_view>
+#include <utility>
 #include <vector>
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
+#include "bench/ServiceOnBus.h"
+#include "platform/Crypto.h"
+#include "platform/Hexadecimal.h"
 #include "platform/Json.h"
-#include "platform/OrloDataStore.h"
 
 namespace {
 
-constexpr int requests = 500;
-constexpr const char* host = "https://orlo-ds.tevari.example:8443";
+constexpr int requests = 200;
+constexpr std::size_t recordSize = 4096;
+constexpr const char* host = "orlo-ds.tevari.example:8443";
+constexpr std::string_view trustObject = "the trust object of the lab\n";
 
-void require(bool holds, const char* what) {
-    if (holds)
-        return;
-    std::cerr << "bench-remote-store: " << what << '\n';
-    std::exit(EXIT_FAILURE);
+std::string readFile(const std::filesystem::path& path) {
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
 }
 
-// Starts a program with the ends of pipes, or -1, as its standard input and output.
-pid_t start(std::vector<std::string> words, int input, int output) {
-    std::vector<char*> arguments;
-    arguments.reserve(words.size() + 1);
-    for (std::string& word : words)
-        arguments.push_back(word.data());
-    arguments.push_back(nullptr);
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    if (input >= 0)
-        posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
-    if (output >= 0)
-        posix_spawn_file_actions_adddup2(&actions, output, STDOUT_FILENO);
-    pid_t pid = -1;
-    require(posix_spawnp(&pid, arguments[0], &actions, nullptr, arguments.data(), environ) == 0, "cannot start");
-    posix_spawn_file_actions_destroy(&actions);
-    return pid;
+std::string digestOf(std::string_view text) {
+    std::uint8_t digest[crypto::sha256Size];
+    require(crypto::sha256(reinterpret_cast<const std::uint8_t*>(text.data()), text.size(), digest), "no digest");
+    return hexadecimal(digest);
 }
 
-int exitStatusOf(pid_t pid) {
-    int status = -1;
-    return waitpid(pid, &status, 0) == pid && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+std::string percentEncoded(std::string_view text) {
+    std::string encoded;
+    for (const char c : text)
+        (encoded += '%') += hexadecimal(std::span(reinterpret_cast<const std::uint8_t*>(&c), 1));
+    return encoded;
 }
 
-// The folder of this run, which is the device root too.
-std::filesystem::path folder;
-
-// nginx as the store; it ends with this object, which closes its standard input.
-class Server {
+// A store of the lab and the service that uses it; both end with this object.
+class Store {
 public:
-    Server() {
-        std::filesystem::create_directories(folder / "etc/veltra");
-        std::ofstream(folder / "etc/veltra/device.json") << "{}";
+    Store(const std::string& kind, const std::string& service) {
         int input[2], output[2];
         require(pipe2(input, O_CLOEXEC) == 0 && pipe2(output, O_CLOEXEC) == 0, "no pipes");
-        process_ = start({"examples/remote-store/lab.py", "nginx", folder}, input[0], output[1]);
+        lab_ = start({"examples/remote-store/lab.py", kind, device_.root}, input[0], output[1]);
         close(input[0]);
         close(output[1]);
         input_ = input[1];
@@ -73,78 +63,77 @@ public:
         for (char c = 0; read(output[0], &c, 1) == 1 && c != '\n';)
             announcement += c;
         close(output[0]);
-        description_ = jsonToValue(announcement).value_or(Value());
-        require(description_.dictionary(), "no server");
+        store_ = jsonToValue(announcement).value_or(Value());
+        require(store_.dictionary(), "no server");
+        std::ofstream(record(), std::ios::binary) << std::string(recordSize, 'r');
+        service_ = std::make_unique<Server>(std::vector{service});
+        bus_ = openBus();
     }
-    ~Server() {
+    ~Store() {
+        sd_bus_flush_close_unref(bus_);
+        service_.reset();
         close(input_);
-        exitStatusOf(process_);
+        exitStatusOf(lab_);
     }
-    Server(const Server&) = delete;
-    Server& operator=(const Server&) = delete;
+    Store(const Store&) = delete;
+    Store& operator=(const Store&) = delete;
 
-    // What leads curl to the server.
-    std::vector<std::string> curlOptions() const {
-        std::vector<std::string> options = {"--cacert", folder / "store-ca.pem"};
-        for (const auto& [from, to] : *description_["connectTo"].dictionary())
-            options.insert(options.end(), {"--connect-to", from + ":" + *to.text()});
-        return options;
+    void put() {
+        answer({{"messageStr", "putPSD2"}, {"messageDict", Value::Dictionary{{"psd2DataPath", "/tmp/record"}}}});
     }
+
+    void get() {
+        answer({{"messageStr", "getPSD2"}, {"messageDict", Value::Dictionary{{"psd2V4DataPath", "/tmp/got"}}}});
+        require(readFile(device_.root / "tmp/got").size() == recordSize, "the record has changed");
+    }
+
+    // What curl has to be told for the same object, as many times as a run has requests.
+    std::vector<std::string> curl() const {
+        std::vector<std::string> words = {"curl",
+                                          "--silent",
+                                          "--fail",
+                                          "--output",
+                                          "/dev/null",
+                                          "--cacert",
+                                          device_.root / "store-ca.pem",
+                                          "--header",
+                                          "Orlo-Trust-Object-Digest: " + digestOf(trustObject)};
+        for (const auto& [from, to] : *store_["connectTo"].dictionary())
+            words.insert(words.end(), {"--connect-to", from + ":" + *to.text()});
+        std::string user, bucket;
+        if (const Value& s3 = store_["s3"]; s3.dictionary()) {
+            std::istringstream keys(readFile(device_.root / "store-key"));
+            std::string key, secret;
+            keys >> key >> secret;
+            user = percentEncoded(key) + ":" + percentEncoded(secret) + "@";
+            bucket = "/" + *s3["bucket"].text();
+            words.insert(words.end(), {"--aws-sigv4", "aws:amz:" + *s3["region"].text() + ":s3", "--header",
+                                       "x-amz-content-sha256: UNSIGNED-PAYLOAD"});
+        }
+        // What follows the hash is not sent.
+        words.push_back("https://" + user + host + bucket + "/v2/records/psd2/VAN0001#[1-" + std::to_string(requests) +
+                        "]");
+        return words;
+    }
+
+    std::filesystem::path record() const { return device_.root / "tmp/record"; }
 
 private:
-    pid_t process_;
+    void answer(const Value::Dictionary& request) {
+        sd_bus_message* const reply = call(bus_, serviceName, servicePath, request);
+        int completed = 0;
+        check(sd_bus_message_read_basic(reply, SD_BUS_TYPE_BOOLEAN, &completed));
+        const Value response = bus::readDictionary(reply);
+        require(response["statusCode"] == Value(0), "the service answered " + response.description());
+        sd_bus_message_unref(reply);
+    }
+
+    Device device_;
+    pid_t lab_;
     int input_;
-    Value description_;
-};
-
-std::string instance(int number) {
-    return "B" + std::to_string(number);
-}
-
-class Session {
-public:
-    Session() : session_(QDOrloCreateWithOptions(options())) {
-        Value::Data object;
-        require(
-            QDOrloDataCopyTrustObject(session_, "http://orlo-ca.tevari.example:8080/orlotrustobject", &object, nullptr),
-            "no trust object");
-        digest_.resize(32);
-        QDSupportDigestSha256(object.data(), static_cast<std::uint32_t>(object.size()), digest_.data());
-        QDOrloSetOption(session_, "TrustObjectDigest", digest_);
-    }
-    ~Session() { QDSupportSafeRelease(session_); }
-    Session(const Session&) = delete;
-    Session& operator=(const Session&) = delete;
-
-    std::string digest() const { return *QDOrloCreateInstanceString(digest_).text(); }
-
-    void put(int number, const Value::Data& record) {
-        permit(OrloActionPut, number);
-        require(QDOrloDataPut(session_, "psd2", instance(number), record, nullptr), "put");
-    }
-
-    Value::Data get(int number) {
-        permit(OrloActionGet, number);
-        auto record = QDOrloDataCopy(session_, "psd2", instance(number), nullptr);
-        require(record.has_value(), "get");
-        return std::move(*record);
-    }
-
-private:
-    static Value options() {
-        return Value::Dictionary{{"APTicket", Value::Data{1}},
-                                 {"DataVersion", 1},
-                                 {"DSURL", host},
-                                 {"CAURL", "https://orlo-ca.tevari.example:8443"}};
-    }
-
-    void permit(OrloAction action, int number) {
-        QDOrloSetOption(session_, "Permissions",
-                        QDOrloDataCreatePermissionsString(session_, action, "psd2", instance(number)));
-    }
-
-    __QDOrlo* session_;
-    Value::Data digest_;
+    Value store_;
+    std::unique_ptr<Server> service_;
+    sd_bus* bus_ = nullptr;
 };
 
 void countRequests(benchmark::State& state) {
@@ -152,79 +141,37 @@ void countRequests(benchmark::State& state) {
                                                        benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
 }
 
-Value::Data recordOf(const benchmark::State& state) {
-    return Value::Data(static_cast<std::size_t>(state.range(0)), 0xA5);
-}
-
-void putAll(const Value::Data& record) {
-    Session session;
-    for (int number = 1; number <= requests; ++number)
-        session.put(number, record);
-}
-
-void putWithSession(benchmark::State& state) {
-    for (auto step : state)
-        putAll(recordOf(state));
-    countRequests(state);
-}
-
-void getWithSession(benchmark::State& state) {
-    const Value::Data record = recordOf(state);
-    putAll(record);
-    for (auto step : state) {
-        Session session;
-        for (int number = 1; number <= requests; ++number)
-            require(session.get(number) == record, "a record has changed");
-    }
-    countRequests(state);
-}
-
-// Runs curl with `options` on the URLs of all records.
-void runCurl(benchmark::State& state, const Server& server, const std::vector<std::string>& options) {
-    const Value::Data record = recordOf(state);
-    std::ofstream(folder / "record", std::ios::binary)
-        .write(reinterpret_cast<const char*>(record.data()), std::ssize(record));
-    putAll(record);
-    std::vector<std::string> command = {"curl",
-                                        "--silent",
-                                        "--fail",
-                                        "--output",
-                                        "/dev/null",
-                                        "--header",
-                                        "Orlo-Trust-Object-Digest: " + Session().digest(),
-                                        "--header",
-                                        "Orlo-Permissions: 1:psd2:B"};
-    const std::string urls = std::string(host) + "/v1/records/psd2/B[1-" + std::to_string(requests) + "]";
-    for (const auto& more : {server.curlOptions(), options, {urls}})
-        command.insert(command.end(), more.begin(), more.end());
-    for (auto step : state)
-        require(exitStatusOf(start(command, -1, -1)) == 0, "curl");
-    countRequests(state);
-}
-
 } // namespace
 
 int main(int count, char** arguments) {
     benchmark::Initialize(&count, arguments);
-    char name[] = "/tmp/veltra-bench-XXXXXX";
-    require(mkdtemp(name), "no temporary folder");
-    folder = name;
-    setenv("VELTRA_DEVICE_ROOT", folder.c_str(), 1);
-    {
-        const Server server;
-        benchmark::RegisterBenchmark("remote-put/veltra", putWithSession)->Arg(4096)->UseRealTime();
-        benchmark::RegisterBenchmark("remote-put/curl",
-                                     [&](benchmark::State& state) {
-                                         runCurl(state, server, {"--upload-file", folder / "record"});
+    Store store(count > 1 ? arguments[1] : "nginx", beside(arguments[0], "VeltraOrloServices"));
+    store.put();
+    const auto add = [](const std::string& name, auto run) {
+        benchmark::RegisterBenchmark(name.c_str(),
+                                     [run](benchmark::State& state) {
+                                         for (auto step : state)
+                                             run();
+                                         countRequests(state);
                                      })
-            ->Arg(4096)
+            ->Arg(recordSize)
             ->UseRealTime();
-        benchmark::RegisterBenchmark("remote-get/veltra", getWithSession)->Arg(4096)->UseRealTime();
-        benchmark::RegisterBenchmark("remote-get/curl", [&](benchmark::State& state) { runCurl(state, server, {}); })
-            ->Arg(4096)
-            ->UseRealTime();
-        benchmark::RunSpecifiedBenchmarks();
-    }
-    std::filesystem::remove_all(folder);
+    };
+    const auto service = [&](void (Store::*request)()) {
+        return [&store, request] {
+            for (int number = 0; number < requests; ++number)
+                (store.*request)();
+        };
+    };
+    const auto curl = [&](const std::vector<std::string>& more) {
+        std::vector<std::string> words = store.curl();
+        words.insert(words.end() - 1, more.begin(), more.end());
+        return [words] { require(exitStatusOf(start(words, -1, -1)) == 0, "curl failed"); };
+    };
+    add("remote-put/veltra", service(&Store::put));
+    add("remote-put/curl", curl({"--upload-file", store.record()}));
+    add("remote-get/veltra", service(&Store::get));
+    add("remote-get/curl", curl({}));
+    benchmark::RunSpecifiedBenchmarks();
     return 0;
 }
