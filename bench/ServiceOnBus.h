@@ -122,8 +122,8 @@ inline std::string beside(const char* program, const char* name) {
 class Device {
 public:
     Device() {
-        char name[] = "/tmp/veltra-bench-XXXXXX";
-        require(mkdtemp(name), "no temporary folder");
+        std::string name = std::filesystem::temp_directory_path() / "veltra-bench-XXXXXX";
+        require(mkdtemp(name.data()), "no temporary folder");
         root = name;
         std::filesystem::copy("examples/device", root, std::filesystem::copy_options::recursive);
         std::filesystem::create_directories(root / "private/var/log");
