@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <charconv>
 #include <cstring>
+#include <mutex>
 #include <string_view>
 
 #include <fcntl.h>
@@ -70,15 +71,24 @@ std::vector<std::string> readConnectTo(const Value& described) {
     return entries;
 }
 
-// Whether there are certificates and all of them can be read.
+// Whether there are certificates and all of them can be read. That takes longer than all the rest of a session's
+// beginning, so what was found good last is known again.
 bool hasCertificates(const Value::Data& pem) {
+    static std::mutex mutex;                       // guards what follows
+    static auto* const lastGood = new Value::Data; // never destroyed: threads may ask until the process is gone
+    const std::lock_guard lock(mutex);
+    if (pem == *lastGood && !pem.empty())
+        return true;
     const openssl::QuietErrors quiet;
     const openssl::Owner<BIO, BIO_free_all> bytes(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
     bool hasOne = false;
     while (bytes && openssl::Owner<X509, X509_free>(PEM_read_bio_X509(bytes.get(), nullptr, nullptr, nullptr)))
         hasOne = true;
     // The end of the file, and not a certificate that cannot be read.
-    return hasOne && ERR_GET_REASON(ERR_peek_last_error()) == PEM_R_NO_START_LINE;
+    if (!hasOne || ERR_GET_REASON(ERR_peek_last_error()) != PEM_R_NO_START_LINE)
+        return false;
+    *lastGood = pem;
+    return true;
 }
 
 std::string readAuthorities(const Value& path) {
