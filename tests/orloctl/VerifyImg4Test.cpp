@@ -236,6 +236,7 @@ TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
     const Report report = verify(constrained({}, {.properties = {property("BAD!", item(DERTagBoolean, {1}))}}));
     EXPECT_TRUE(report.ok()) << report.problem;
     EXPECT_EQ(report.json["notes"].size(), 1U);
+    EXPECT_FALSE(report.json["notes"][0].get<std::string>().ends_with('.'));
     EXPECT_TRUE(report.says("\n  \"BAD!\" of the manifest has a value that is not DER: a BOOLEAN is 00 or FF"));
 }
 
