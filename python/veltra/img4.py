@@ -86,8 +86,8 @@ def _value(item: der.Item) -> Value:
 
 
 class Properties(Mapping[str, Value]):
-    """A dictionary of properties by their four-character codes, in order. Each is decoded when it is looked up; of those
-    with the same name the first counts."""
+    """A dictionary of properties by their four-character codes, in order. Each is decoded when it is looked up, which raises
+    DerError for a BOOLEAN or INTEGER that is none, or not in 64 bits; of those with the same name the first counts."""
 
     def __init__(self, buffer: der.Buffer, start: int, end: int) -> None:
         self._buffer = buffer
@@ -106,6 +106,9 @@ class Properties(Mapping[str, Value]):
             if number not in found:
                 found.add(number)
                 yield name(number)
+
+    def __contains__(self, key: object) -> bool:
+        return any(key == found for found in self)
 
     def __len__(self) -> int:
         return sum(1 for _ in self)
@@ -132,6 +135,9 @@ class Objects(Mapping[str, Properties]):
 
     def __iter__(self) -> Iterator[str]:
         return (key for key in self._everything if key != "MANP")
+
+    def __contains__(self, key: object) -> bool:
+        return any(key == found for found in self)
 
     def __len__(self) -> int:
         return sum(1 for _ in self)
@@ -383,8 +389,9 @@ class Image:
     ) -> Trust:
         """Whether the manifest, and with it the object of that name, is to be trusted under a profile of the domain. It is
         when its chain ends in the profile's root, its signature verifies, the leaf's constraints are met, and `judge` refuses
-        no property; otherwise TrustError is raised, or what `judge` raised. A manifest with the trusted digest needs
-        neither chain nor signature. Whether the payload is the object's is the caller's to compare."""
+        no property; otherwise TrustError is raised, what `judge` raised, or DerError for a value that it cannot be given. A
+        manifest with the trusted digest needs neither chain nor signature. Whether the payload is the object's is the caller's
+        to compare."""
         if domain is None:
             domain = TrustDomain(profile=profile)  # which keeps what is known
         known = domain._profiles.get(profile)

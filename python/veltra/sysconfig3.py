@@ -137,7 +137,8 @@ class PayloadEntry(NamedTuple):
 
 
 class Blob:
-    """A blob. Any number of threads may use it, of which one is served at a time; once closed it raises ValueError."""
+    """A blob. Any number of threads may use it, of which one is served at a time; once closed it raises ValueError. In a
+    process that forked while another thread used it, it stays in use."""
 
     def __init__(self, magic: str = "bCfg", version: int = 0x30001, key: ReadableBuffer | None = None) -> None:
         if key is None:

@@ -58,6 +58,7 @@ class Img4(unittest.TestCase):
         self.assertEqual((image.payload.keybag, image.payload.compression, image.manifest), (b"keys", (1, 16), None))
         for found in (image.payload.properties, image.restore_info):
             self.assertEqual((list(found), len(found)), (["numb", "dict", "less"], 3))
+            self.assertTrue("less" in found and "longer" not in found)
             self.assertEqual((found["numb"], dict(found["dict"])), (16, {"flag": True}))
             self.assertRaises(der.DerError, found.__getitem__, "less")
         with self.assertRaises(Img4Error) as raised:
