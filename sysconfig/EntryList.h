@@ -210,7 +210,7 @@ private:
     // Puts some entries into the index, from `entry` on, and gives out the one behind them. In a long list each bucket,
     // and each entry that one leads to, has to come from memory: those of all are asked for before any is waited for.
     Entry* indexSome(Entry* entry, const HashSecret& secret) {
-        constexpr std::size_t most = 16;
+        constexpr std::size_t most = 64;
         Entry** found[most];
         std::size_t number = 0;
         for (Entry* next = entry; next != nullptr && number < most; next = next->next) {
