@@ -26,18 +26,4 @@ void expectNeedsAll(Result expected, Result (*function)(Parameters...), std::typ
     (std::index_sequence_for<Parameters...>());
 }
 
-// What a query of the form (keys..., answer) with these parameters answers.
-template <typename Keys, typename... Parameters>
-using AnswerTo = std::remove_pointer_t<std::tuple_element_t<std::tuple_size_v<Keys>, std::tuple<Parameters...>>>;
-
-// Expects the same of queries of that form.
-template <typename Result, typename Keys, typename... Queries>
-void expectNeed(Result expected, const Keys& keys, Queries... queries) {
-    const auto need = [&]<typename... Parameters>(Result (*query)(Parameters...)) {
-        AnswerTo<Keys, Parameters...> answer = {};
-        std::apply([&](auto... key) { expectNeedsAll(expected, query, key..., &answer); }, keys);
-    };
-    (need(queries), ...);
-}
-
 #endif
