@@ -17,8 +17,6 @@ const char* const ofNothing = "5D5D139563C95B5967B9BD9A8C9B233A9DEDB45072794CD23
 const char* const ofWCh0 = "13E84F77C9BE42878526FB27C04762114F5638B117374283426185604A95267B";
 // 30 68 43 57 2E 01 02, 42 47 69 4D "note" "text"
 const char* const ofBoth = "6E9C73294E467068510AABCFD17C7FA414232E977E9ACA2DB5CFA2BA2CF37F5A";
-// 42 47 69 4D "note" "text", 30 68 43 57 2E 01 02
-const char* const ofBothReversed = "5956B2BFB9CB3A2E67B98E6AD0492F0995E68C21B38F30A07FBDA880296808CE";
 // "name" "value", "blob" 07 08
 const char* const ofMetadata = "3366491A800376F26A132D1C915300ABF7FBD8E2135305C47231BE5EE4C2C3EB";
 // The stream of ofBoth, then that of ofMetadata.
@@ -48,6 +46,9 @@ TEST(HMAC, coversTheEntriesInOrder) {
         EXPECT_EQ(created, manifestOf(object));
     };
     expect(ofNothing, ofNothing, ofNothing);
+    EXPECT_TRUE(_sysConfig3AddPayloadEntry(object.get(), payloadDeleted(keyWCh0).get()));
+    EXPECT_TRUE(sysConfig3UpdateHMAC(object.get()));
+    expect(ofDeleted, ofNothing, ofDeleted);
     EXPECT_TRUE(add(object, payloadData(keyWCh0, {1, 2})));
     expect(ofWCh0, ofNothing, ofWCh0);
     EXPECT_TRUE(add(object, payloadString(keyMiGB, "text", "note")));
@@ -55,16 +56,6 @@ TEST(HMAC, coversTheEntriesInOrder) {
     EXPECT_TRUE(add(object, metadataString("name", "value")));
     EXPECT_TRUE(add(object, metadataData("blob", {7, 8})));
     expect(ofBoth, ofMetadata, ofAll);
-
-    EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), "name"));
-    EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), "blob"));
-    EXPECT_TRUE(add(object, payloadData(keyWCh0, {1, 2})));
-    expect(ofBothReversed, ofNothing, ofBothReversed);
-    EXPECT_TRUE(sysConfig3DeletePayloadEntryForKey(object.get(), keyMiGB));
-    expect(ofWCh0, ofNothing, ofWCh0);
-    EXPECT_TRUE(_sysConfig3AddPayloadEntry(object.get(), payloadDeleted(keyWCh0).get()));
-    EXPECT_TRUE(sysConfig3UpdateHMAC(object.get()));
-    expect(ofDeleted, ofNothing, ofDeleted);
     EXPECT_EQ(Recorder::said, "");
 }
 
@@ -102,18 +93,12 @@ TEST(HMACKey, makesAnObjectThatIsNewStaleOrValid) {
     expectChanges(noMatch);
 }
 
-TEST(HMAC, tellsWhichStoredValueDoesNotMatch) {
-    const std::pair<SysConfigData __SysConfig3ManifestEntry::*, const char*> rows[] = {
-        {&__SysConfig3ManifestEntry::payloadHMAC, "Payload HMAC does not match."},
-        {&__SysConfig3ManifestEntry::metadataHMAC, "Metadata HMAC does not match."},
-        {&__SysConfig3ManifestEntry::fullHMAC, "Full HMAC does not match."},
-    };
+TEST(HMAC, isInvalidWhenOneStoredValueDoesNotMatch) {
     const SysConfig3Ptr object = keyedObject();
-    const Recorder recorder;
-    for (const auto& [hmac, reason] : rows) {
-        SysConfigData& stored = object->manifest->*hmac;
+    __SysConfig3ManifestEntry& manifest = *object->manifest;
+    for (const SysConfigData& stored : {manifest.payloadHMAC, manifest.metadataHMAC, manifest.fullHMAC}) {
         stored.data[31] ^= 1;
-        EXPECT_REFUSED(sysConfig3IsValidHMAC(object.get()), reason);
+        EXPECT_FALSE(sysConfig3IsValidHMAC(object.get()));
         stored.data[31] ^= 1;
         EXPECT_TRUE(sysConfig3IsValidHMAC(object.get()));
     }

@@ -127,14 +127,6 @@ TEST(Entry, cutsStringsAtSixteenMebiAndKeysAt256) {
     const MetadataEntryPtr metadata = metadataString(tooLong.c_str(), tooLong.c_str());
     EXPECT_EQ(std::strlen(sysConfig3MetadataEntryGetKey(metadata.get())), 256U);
     EXPECT_EQ(std::strlen(sysConfig3MetadataEntryGetString(metadata.get())), 0x1000000U);
-
-    // Of a key its first 256 characters count.
-    const SysConfig3Ptr object = newObject();
-    EXPECT_TRUE(add(object, metadata));
-    EXPECT_EQ(sysConfig3GetMetadataEntryForKey(object.get(), std::string(255, 'x').c_str()), nullptr);
-    EXPECT_NE(sysConfig3GetMetadataEntryForKey(object.get(), tooLong.c_str()), nullptr);
-    EXPECT_TRUE(sysConfig3DeleteMetadataEntryForKey(object.get(), tooLong.c_str()));
-    EXPECT_EQ(sysConfig3GetMetadataEntryCount(object.get()), 0U);
 }
 
 // Expects that each of the records is equal to itself and to its copy only.
@@ -220,12 +212,10 @@ TEST(Manifest, comparesHMACsByVersion) {
     std::uint8_t other[] = {1, 3};
     const SysConfigData absent = {}, present = {one, 2}, shorter = {one, 1}, different = {other, 2};
     const std::tuple<SysConfig3Version, const SysConfigData*, const SysConfigData*, bool> rows[] = {
-        {0x30001, &absent, &absent, true},      {0x30001, &absent, &present, false},
-        {0x30001, &present, &absent, false},    {0x30001, &present, &present, true},
-        {0x30002, &absent, &absent, false},     {0x30003, &absent, &absent, false},
-        {0x30002, &present, &absent, false},    {0x30003, &present, &present, true},
-        {0x30003, &present, nullptr, false},    {0x30003, &present, &shorter, false},
-        {0x30003, &present, &different, false},
+        {0x30001, &absent, &absent, true},    {0x30001, &absent, &present, false},
+        {0x30001, &present, &absent, false},  {0x30003, &absent, &absent, false},
+        {0x30003, &present, &present, true},  {0x30003, &present, nullptr, false},
+        {0x30003, &present, &shorter, false}, {0x30003, &present, &different, false},
     };
     for (const auto& [version, a, b, areEqual] : rows)
         EXPECT_EQ(_sysConfig3HMACsAreEqual(version, a, b), areEqual) << version << a << b;
@@ -244,15 +234,6 @@ TEST(Manifest, isEqualByItsVersionAndEachHMAC) {
         ManifestPtr(allocSysConfig3Manifest(0x30003, &same, &same, &other)),
     };
     expectDistinct(manifests, sysConfig3ManifestsAreEqual, copySysConfig3Manifest);
-}
-
-TEST(Object, withAnUnsupportedMagicIsNotReleased) {
-    const SysConfig3Ptr object = newObject();
-    add(object, payloadData(keyWCh0, {1}));
-    object->magic = 0x12345678;
-    deallocSysConfig3(object.get());
-    EXPECT_EQ(payloadOf(object), "WCh0=data 01");
-    object->magic = bCfg;
 }
 
 // The index of the lists: what keys of an adversary do to it.
