@@ -83,29 +83,11 @@ Bytes withChain(const Img4TrustProfileEntry& profile, const List& chain) {
     return signerOf(profile).manifest(standardManifest(), chain);
 }
 
-Bytes withoutAuthority() {
-    const Signer& signer = signerOf(rsa1k);
-    Certificate middle = signer.leaf({});
-    middle.issuer = subjectOf(readFile(std::string(TEST_TRUST_DOMAIN) + "/ROOT_CA_CERTIFICATE.der"));
-    middle.publicKeyInfo = publicKeyInfo(signer.issuerKey());
-    middle.subject = distinguishedName("Somebody");
-    Certificate leaf = signer.leaf({});
-    leaf.issuer = middle.subject;
-    return withChain(rsa1k, {issue(middle, signer.rootKey()), signer.issue(leaf)});
-}
-
 Bytes withSignature(const Img4TrustProfileEntry& profile, const Bytes& signature) {
     Manifest fields = standardManifest();
     fields.certChain = join(signerOf(profile).standardChain());
     fields.signature = signature;
     return manifest(fields);
-}
-
-// A manifest with any body, signed.
-Bytes withBody(const Bytes& body) {
-    const Signer& signer = signerOf(ec384);
-    return sequence(
-        {ia5("IM4M"), integer(0), body, octets(sign(signer.leafKey(), 48, body)), sequence(signer.standardChain())});
 }
 
 // A manifest whose object has digests that are and are not that of a payload.
@@ -134,8 +116,6 @@ std::vector<RefusalCase> refusalCases() {
         {"chain", "Certificate 1 is no certificate", withChain(ec384, {sequence({integer(1)})})},
         {"chain", "Certificate 1 is no strict DER: the length is indefinite", withChain(ec384, {{0x30, 0x80}})},
         {"chain", "Certificate 1 is longer than 131071 octets", withChain(ec384, {sequence({octets(filler(131071))})})},
-        {"chain", "has the key RSA 4096 bits, and the profile demands EC on P-256 or P-384", soundManifest(rsa4k),
-         &ec384},
         {"chain", "has the key EC P-384, and the profile demands RSA without parameters", soundManifest(ec384), &rsa4k},
         {"chain", R"(CA,O=Tevari", and the one before it is the root ("CN=Tevari RSA 3072)", soundManifest(rsa4k),
          &rsa3k},
@@ -156,7 +136,6 @@ std::vector<RefusalCase> refusalCases() {
          R"(key of the root ("CN=Tevari Local P-384 Root CA,O=Tevari"): the certificate was changed)",
          changedAt(soundManifest(ec384), "Tevari Manifest Signing")},
         {"chain", "is no BIT STRING of whole octets", signedBy(unusedBits)},
-        {"chain", R"(PrintableString: "Tevari Secure Boot Certification Authority", at offset)", withoutAuthority()},
         {"chain", "empty list of extensions", withLeaf(ec384, &Certificate::extensions, extensions({}))},
 
         {"signature", R"(Signing,O=Tevari"): the manifest's body was changed)",
@@ -164,15 +143,11 @@ std::vector<RefusalCase> refusalCases() {
         {"signature", "it has 511 octets, and those of the key have 512", withSignature(rsa4k, filler(511))},
         {"signature", "it has not the form that the algorithm demands", withSignature(ec384, filler(48))},
 
-        {"dictionaries", R"(The manifest's body has no "MANB")", withBody(set({object("MANX", {})}))},
-
         {"object", R"(The manifest has no "xyzt")", soundManifest(ec384), nullptr, "xyzt"},
 
         {"constraints", "The leaf certificate carries no constraints", withLeaf(ec384, &Certificate::extensions, {})},
         {"constraints", R"(says that "ABCD" of the manifest must be INTEGER 8, and it is INTEGER 7)",
          constrained({object("MANP", {property("ABCD", integer(8))})})},
-        {"constraints", R"(says that "NONE" of the manifest must be OCTET STRING 07, and there is none)",
-         constrained({object("MANP", {property("NONE", octets({7}))})})},
         {"constraints", R"(says that "NONE" of the object must be there, and there is none)",
          constrained({object("OBJP", {mustBePresent("NONE")})}), nullptr, "sepi"},
         {"constraints", R"(says that "ABCD" of the manifest must not be there, and it is INTEGER 7)",
@@ -184,10 +159,6 @@ std::vector<RefusalCase> refusalCases() {
 
         {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
          constrained({}, {.properties = {property("LIST", sequence({}))}})},
-        {"properties", R"(private "LONG" of the object has a content that holds an item behind)",
-         constrained({}, {.objects = {object(
-                              "sepi", {item(propertyTag("LONG"), sequence({ia5("LONG"), integer(1), integer(2)}))})}}),
-         nullptr, "sepi"},
 
         {"payload", "its SHA-384 is another than \"ELSE\" of \"sepi\" demands", image, nullptr, "sepi", "ELSE"},
         {"payload", "\"SHRT\" of \"sepi\" has 20 octets, and SHA-384 has 48", image, nullptr, "sepi", "SHRT"},
@@ -240,24 +211,11 @@ TEST(VerifyImg4, notesAMalformedValueThatTheChainVouchesFor) {
     EXPECT_TRUE(report.says("\n  \"BAD!\" of the manifest has a value that is not DER: a BOOLEAN is 00 or FF"));
 }
 
-TEST(VerifyImg4, judgesThePayloadAsFarAsItIsAskedTo) {
-    const Bytes image = container(payload({}), withDigests(), {});
-    const struct {
-        const char* object;
-        const char* digest;
-        const char* payload;
-        const char* says;
-    } rows[] = {
-        {"", "", "not judged", "\n  No object was named"},
-        {"sepi", "DGST", "the object's", "\nnotes: none"},
-    };
-    for (const auto& row : rows) {
-        const Report report = verify(image, testDomain(), row.object, row.digest);
-        EXPECT_EQ(report.json["payload"], row.payload);
-        EXPECT_EQ(report.json["trusted"], true) << report.problem;
-        EXPECT_TRUE(report.says(row.says)) << report.text;
-        EXPECT_EQ(report.json.contains("object"), *row.object != '\0');
-    }
+TEST(VerifyImg4, judgesThePayloadWhenItIsAskedTo) {
+    const Report report = verify(container(payload({}), withDigests(), {}), testDomain(), "sepi", "DGST");
+    EXPECT_EQ(report.json["payload"], "the object's");
+    EXPECT_EQ(report.json["trusted"], true) << report.problem;
+    EXPECT_TRUE(report.json.contains("object") && report.says("\nnotes: none")) << report.text;
 }
 
 TEST(VerifyImg4, boundsWhatItShows) {

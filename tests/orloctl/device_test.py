@@ -102,9 +102,8 @@ class Description(Device):
                 file.write_text(json.dumps(whole | changes))
                 found = self.json("check-device", file)
                 self.assertEqual((found.get("faults", []), found["exitStatus"]), (faults, 5 if faults else 0))
-        for text, fault in (("[]", "it is no object"), ('{\n"a"}', "a syntax error in line 2 at byte 4")):
-            file.write_text(text)
-            self.assertEqual(self.json("check-device", file)["faults"], ["It is malformed: " + fault])
+        file.write_text('{\n"a"}')
+        self.assertEqual(self.json("check-device", file)["faults"], ["It is malformed: a syntax error in line 2 at byte 4"])
         (self.root / DESCRIPTION).unlink()
         self.assertEqual(self.json("check-device")["exitStatus"], 2)
 
