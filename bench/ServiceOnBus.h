@@ -13,6 +13,7 @@
 
 #include <spawn.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <systemd/sd-bus.h>
@@ -91,6 +92,8 @@ public:
         sockaddr_un address = {AF_UNIX, {}};
         socklen_t length = sizeof(sa_family_t); // an abstract name that the kernel chooses
         auto* const where = reinterpret_cast<sockaddr*>(&address);
+        const timeval patience = {.tv_sec = 60, .tv_usec = 0}; // one that ends first tells nobody
+        require(setsockopt(manager.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience) == 0, "no socket");
         require(bind(manager.get(), where, length) == 0, "no socket");
         length = sizeof address;
         require(getsockname(manager.get(), where, &length) == 0, "no socket");
@@ -99,7 +102,7 @@ public:
         pid_ = start(command);
         char message[256];
         const ssize_t size = recv(manager.get(), message, sizeof message, 0);
-        require(std::string_view(message, static_cast<std::size_t>(size)).starts_with("READY=1"),
+        require(size > 0 && std::string_view(message, static_cast<std::size_t>(size)).starts_with("READY=1"),
                 command[0] + " is not ready");
     }
     ~Server() {
