@@ -1,12 +1,15 @@
 // What no command of the plug-in reaches; the rest stands in tests/plugin/transcripts.
 #include "device/ZPDevice.h"
 
+#include <optional>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
 
+#include "orlo/ZPOrlo.h"
+#include "orlo/ZPOrloExport.h"
 #include "platform/DeviceAnswers.h"
 #include "tests/support/RecordedLog.h"
 #include "tests/support/ScriptedServices.h"
@@ -22,6 +25,7 @@ class ZPDeviceTest : public testing::Test {
 protected:
     ZPDeviceTest() {
         arrangeServices();
+        root_.write("/ticket", "ticket");
         describe("{}");
     }
 
@@ -34,56 +38,6 @@ protected:
     TemporaryRoot root_;
     ZPDevice& device_ = ZPDevice::sharedSingleton();
 };
-
-TEST_F(ZPDeviceTest, answersAreHandedBackAsTheyAreOrInTheStoresTextForm) {
-    enum Kind {
-        AsAnswered,
-        Converted,
-        ConvertedSilently
-    };
-    const struct {
-        Value (ZPDevice::*get)() const;
-        std::string key;
-        Kind kind;
-    } getters[] = {
-        {&ZPDevice::getMiravelSerialNumber, "MiravelSerialNumber", AsAnswered},
-        {&ZPDevice::miravelSerialNumber, "MiravelSerialNumber", AsAnswered},
-        {&ZPDevice::getCoverGlassSerialNumber, "CoverGlassSerialNumber", AsAnswered},
-        {&ZPDevice::coverGlassSerialNumber, "CoverGlassSerialNumber", AsAnswered},
-        {&ZPDevice::getAmbientLightSensorSerialNumber, "AmbientLightSensorSerialNumber", AsAnswered},
-        {&ZPDevice::ambientLightSensorSerialNumber, "AmbientLightSensorSerialNumber", AsAnswered},
-        {&ZPDevice::getFCAMModuleSerialNumber, "FrontCameraModuleSerialNumber", AsAnswered},
-        {&ZPDevice::frontFacingCameraModuleSerialNumber, "FrontCameraModuleSerialNumber", AsAnswered},
-        {&ZPDevice::getProxSerialNumber, "ProxSerialNumber", AsAnswered},
-        {&ZPDevice::getBackglassCompassSerialNumber, "BackglassCompassSerialNumber", AsAnswered},
-        {&ZPDevice::getScreenSerialNumber, "ScreenSerialNumber", AsAnswered},
-        {&ZPDevice::getVanterSerialNumber, "VanterSerialNumber", Converted},
-        {&ZPDevice::getVanterChipId, "VanterChipID", Converted},
-        {&ZPDevice::getVanterUID, "VanterUID", Converted},
-        {&ZPDevice::getLoddenChipID, "LoddenChipID", Converted},
-        {&ZPDevice::getLoddenUID, "LoddenUID", Converted},
-        {&ZPDevice::getTopModuleChipID, "TopModuleAuthChipID", ConvertedSilently},
-        {&ZPDevice::getHardwareModel, "HWModelStr", AsAnswered},
-    };
-    const struct {
-        std::string json;
-        Value answer;
-        Value text;
-    } rows[] = {{R"({"$data": "0bad"})", Value::Data{0x0B, 0xAD}, "0bad"},
-                {"4660", 4660, "4660"},
-                {"true", true, {}},
-                {R"("")", "", {}}};
-    for (const auto& getter : getters) {
-        for (const auto& row : rows) {
-            const bool isTansu = getter.key.starts_with("Prox") || getter.key.starts_with("Backglass");
-            describe("{\"" + std::string(isTansu ? "tansu" : "answers") + "\": {\"" + getter.key + "\": " + row.json +
-                     "}}");
-            const Value expected = getter.kind == AsAnswered ? row.answer : row.text;
-            EXPECT_EQ((device_.*getter.get)(), expected) << getter.key;
-            EXPECT_EQ(recordedLog().size(), expected.isNothing() && getter.kind == Converted ? 1U : 0U) << getter.key;
-        }
-    }
-}
 
 TEST_F(ZPDeviceTest, theDevicesOwnIdentityStopsAtTheFirstThingThatIsMissing) {
     const struct {
@@ -101,20 +55,6 @@ TEST_F(ZPDeviceTest, theDevicesOwnIdentityStopsAtTheFirstThingThatIsMissing) {
         EXPECT_EQ(ZPDevice::getUniqueChipId(), row.expected);
         EXPECT_EQ(recordedLog(), row.log);
     }
-}
-
-TEST_F(ZPDeviceTest, theInstanceIsSharedAndItsDictionaryIsReadAndWrittenWhole) {
-    std::vector<std::thread> threads;
-    std::vector<ZPDevice*> seen(8);
-    for (ZPDevice*& place : seen)
-        threads.emplace_back([&place] {
-            place = &ZPDevice::sharedSingleton();
-            place->setSyscfgDict(Value::Dictionary{{"a", 1}, {"b", 2}});
-            EXPECT_EQ(place->syscfgDict(), Value(Value::Dictionary{{"a", 1}, {"b", 2}}));
-        });
-    for (std::thread& thread : threads)
-        thread.join();
-    EXPECT_EQ(seen, std::vector<ZPDevice*>(8, &device_));
 }
 
 TEST_F(ZPDeviceTest, whatIsNotFoundLeavesTheOutValuesAsTheyWere) {
@@ -162,6 +102,48 @@ TEST_F(ZPDeviceTest, availabilityThatComesWhileTheCallEndsCountsOrDoesNot) {
         EXPECT_EQ(recordedLog().back(),
                   isAvailable ? "2 [ZPDevice] Getting proxy info" : "2 [ZPDevice] Failed to get proxy info");
     }
+}
+
+using ZPOrloTest = ZPDeviceTest;
+
+TEST_F(ZPOrloTest, theOptionsThatAreGivenStandInPlaceOfEqualDefaultsOrBesideThem) {
+    const Value::Dictionary first = ZPOrlo::createDefaultOrloOptions(true, false);
+    const struct {
+        Value given;
+        Value::Dictionary differences;
+    } rows[] = {
+        {Value::Dictionary{{"orlo2Data", 1}}, {{"DataVersion", 7}, {"UseSikDataInstance", true}, {"orlo2Data", 1}}},
+        {Value::Dictionary{{"orlo2Data", false}}, {{"orlo2Data", false}}},
+        {Value::Dictionary{{"HTTPTimeout", 60}, {"Mine", "x"}}, {{"HTTPTimeout", 60}, {"Mine", "x"}}},
+        {Value::Dictionary{{"orlo2Data", true}, {"DataVersion", 3}},
+         {{"DataVersion", 3}, {"UseSikDataInstance", true}, {"orlo2Data", true}}},
+    };
+    for (const auto& row : rows) {
+        const ZPOrlo orlo = ZPOrlo::initWithOptions(row.given);
+        Value::Dictionary expected = first;
+        for (const auto& [key, value] : row.differences)
+            expected[key] = value;
+        EXPECT_EQ(Value(sessionOptions), Value(expected)) << row.given.description();
+    }
+    Value::Dictionary local = first;
+    local["DataStore"] = "Local";
+    EXPECT_EQ(Value(ZPOrlo::createDefaultOrloOptions(false, false)), Value(local));
+}
+
+TEST_F(ZPOrloTest, eachPutGrantsAndTrustsAnew) {
+    ZPOrlo orlo = ZPOrlo::init();
+    const auto put = [&orlo] {
+        recordLog();
+        EXPECT_EQ(orlo.orloPut("tcrt", "S1", {'d'}, nullptr), std::nullopt);
+        return recordedLines();
+    };
+    EXPECT_EQ(put(), put());
+}
+
+TEST_F(ZPOrloTest, anExportWithoutDictionaryAsksNobody) {
+    EXPECT_EQ(ZPOrloExport::orloExportCommandWithResponse({}, {}, nullptr),
+              (Error{"OrloExport", 2002, "Orlo Export Failed Not being able to get data instances due to (null)"}));
+    EXPECT_EQ(recordedLines(), Lines{"4 [ZPOrloExport] Could not generate data instances"});
 }
 
 } // namespace

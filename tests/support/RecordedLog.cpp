@@ -75,14 +75,6 @@ std::vector<std::string> recordedLines() {
     return lines;
 }
 
-std::vector<std::string> recordedBehind(std::string_view mark) {
-    std::vector<std::string> wanted;
-    for (const std::string& line : recordedLines())
-        if (line.starts_with(mark))
-            wanted.push_back(line.substr(mark.size()));
-    return wanted;
-}
-
 std::vector<std::string> recordedLog() {
     std::vector<std::string> log = recordedLines();
     std::erase_if(log, [](const std::string& line) { return line.starts_with("console: ") || line.starts_with("> "); });

@@ -18,9 +18,6 @@ void recordCall(std::string_view call);
 // "> ".
 std::vector<std::string> recordedLines();
 
-// Those behind `mark`, without it.
-std::vector<std::string> recordedBehind(std::string_view mark);
-
 // The lines since recordLog, as "<level> [<file>] <message>", without time and line number; those that were written to
 // the framework's handle of the system log as "<level> <message>". What went to neither handle is marked.
 std::vector<std::string> recordedLog();
