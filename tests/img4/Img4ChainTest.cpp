@@ -27,20 +27,6 @@ Bytes attribute(std::string_view commonName) {
         {item(DERTagObjectIdentifier, {0x55, 0x04, 0x03}), item(0x13, Bytes(commonName.begin(), commonName.end()))});
 }
 
-Bytes leafOfSize(const Signer& signer, std::size_t size) {
-    Certificate leaf = signer.leaf();
-    std::size_t filling = size - 600;
-    Bytes issued;
-    // ECDSA signatures vary by an octet or two.
-    for (int tries = 0; tries < 200 && issued.size() != size; ++tries) {
-        leaf.extensions = extensions({sequence({otherOid, octets(Bytes(filling))})});
-        issued = signer.issue(leaf);
-        filling += size - issued.size();
-    }
-    EXPECT_EQ(issued.size(), size);
-    return issued;
-}
-
 struct ChainCase {
     const char* name;
     Img4ChainFault fault;
@@ -67,26 +53,22 @@ Cases leafCases(const Img4TrustProfileEntry& entry) {
     const Bytes algorithmOid = oid(*entry.profile->signatureAlgorithmOid);
     const Bytes otherAlgorithm = algorithm(lastChanged(algorithmOid), isEC(entry) ? Bytes{} : null);
     const Bytes bits = publicKeyBits(signer.leafKey());
-    Certificate otherDigest = sound, noBitString = sound;
-    otherDigest.digestLength = 64;
+    Certificate noBitString = sound;
     noBitString.unusedBits = 8;
     Cases rows = {
         {"no extensions", Img4ChainSound, withExtensions({}), 0, false},
         {"other extensions in front", Img4ChainSound, withExtensions(extensions({otherExtension, none})), 0},
         {"empty list of extensions", Img4ChainExtensions, withExtensions(extensions({}))},
         {"extensions that are no list", Img4ChainExtensions, withExtensions(context(3, set({none})))},
-        {"octets behind the list", Img4ChainExtensions, withExtensions(context(3, join({sequence({none}), null})))},
         {"no value", Img4ChainExtensions, withExtensions(extensions({none, sequence({otherOid})}))},
         {"constraints twice", Img4ChainExtensions, withExtensions(extensions({none, none}))},
         {"constraints in a SEQUENCE", Img4ChainExtensions, withExtensions(extensions({constraints(sequence({}))}))},
         {"octets behind the constraints", Img4ChainExtensions,
          withExtensions(extensions({constraints(join({set({}), null}))}))},
         {"issuer that differs in an octet", Img4ChainIssuer, with(&Certificate::issuer, lastChanged(sound.issuer))},
-        {"issuer cut short", Img4ChainIssuer, with(&Certificate::issuer, sequence({}))},
         {"other signature algorithm", Img4ChainSignatureAlgorithm, withAlgorithm(otherAlgorithm)},
         {"the same inside, which nobody asks for", Img4ChainSound, with(&Certificate::innerAlgorithm, otherAlgorithm),
          0},
-        {"other algorithm's digest", Img4ChainSignature, join(signer.chainWith(signer.issue(otherDigest)))},
         {"signature that is no BIT STRING", Img4ChainSignature, join(signer.chainWith(signer.issue(noBitString)))},
         {"key of another algorithm", Img4ChainKey, withKey(keyInfo(algorithm(otherOid), bits))},
     };
@@ -99,9 +81,7 @@ Cases leafCases(const Img4TrustProfileEntry& entry) {
             return withKey(keyInfo(algorithm(ecPublicKey, curve), point));
         };
         add({
-            {"algorithm with NULL", Img4ChainSound, withAlgorithm(algorithm(algorithmOid, null)), 0},
             {"algorithm with parameters", Img4ChainSound, withAlgorithm(algorithm(algorithmOid, octets({}))), 0},
-            {"another algorithm's key with a curve", Img4ChainKey, withKey(keyInfo(algorithm(otherOid, curve), bits))},
             {"key without a curve", Img4ChainKey, withKey(keyInfo(algorithm(ecPublicKey), bits))},
             {"key on another curve", Img4ChainSound, withKey(publicKeyInfo(other)), 0},
             {"point of another curve's length", Img4ChainKey, withPoint(publicKeyBits(other))},
@@ -135,13 +115,10 @@ Cases chainCases(const Img4TrustProfileEntry& entry) {
         {"one certificate too few", Img4ChainLength, join(List(standard.begin(), standard.end() - 1))},
         {"octets behind the chain", Img4ChainEncoding, join({chain, Bytes{0x00}}), 0},
         {"leaf cut short", Img4ChainEncoding, Bytes(chain.begin(), chain.end() - 1)},
-        {"fourth element", Img4ChainEncoding, with(sequence({Bytes(leaf.begin() + 4, leaf.end()), null}))},
-        {"leaf that is no certificate", Img4ChainEncoding, with(sequence({integer(1), null}))},
         {"leaf signed with its own key", Img4ChainSignature, with(issue(s.leaf(), s.leafKey()))},
         {"octet of the to-be-signed part changed", Img4ChainSignature, with(changed)},
-        {"octet of the signature changed", Img4ChainSignature, with(lastChanged(leaf))},
-        {"largest certificate", Img4ChainSound, with(leafOfSize(s, largestCertificate)), 0, false},
-        {"too large a certificate", Img4ChainCertificateSize, with(leafOfSize(s, largestCertificate + 1))},
+        {"largest item, which is no certificate", Img4ChainEncoding, with(octets(Bytes(largestCertificate - 5)))},
+        {"too large a certificate", Img4ChainCertificateSize, with(octets(Bytes(largestCertificate - 4)))},
     };
 }
 
@@ -168,7 +145,6 @@ Cases middleCases(const Img4TrustProfileEntry& entry) {
         {"unsound key", Img4ChainSignature, with(sound, signer.rootKey(), 1)},
         {"name that differs in a letter", other, named(distinguishedName("Tevari Secure Boot Certification authority")),
          2},
-        {"name with a character more", other, named(distinguishedName(std::string(authority) + " ")), 2},
         {"name in UTF-8", other, named(distinguishedName(authority, 0x0C)), 2},
         {"first of two names", Img4ChainSound, named(sequence({set({attribute(authority)}), set({another})})), 0},
         {"second of two names", other, named(sequence({set({another}), set({attribute(authority)})})), 2},

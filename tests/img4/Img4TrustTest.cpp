@@ -3,6 +3,7 @@
 #include "tests/support/MissingArguments.h"
 
 #include <numeric>
+#include <tuple>
 
 #include <gtest/gtest.h>
 
@@ -274,15 +275,6 @@ TEST(Img4TrustSteps, endWhereTheDictionariesOrTheObjectAreMissing) {
     }
 }
 
-TEST(Img4TrustSteps, needNoPayload) {
-    const Bytes manifest = scriptedManifest();
-    Img4Record record;
-    ASSERT_EQ(Img4DecodeInitManifest(manifest.data(), manifest.size(), &record), DERSuccess);
-    script = {"", {}, &record, {}};
-    EXPECT_EQ(evaluatePlainly(sepi, &record), DERSuccess);
-    EXPECT_EQ(heldBy(record), "mcbdo");
-}
-
 TEST(Img4TrustSteps, needTheirArguments) {
     const Img4TrustCallbacks noJudge = {nullptr, lookUp, findObject};
     Decoded decoded(scriptedManifest());
@@ -307,6 +299,111 @@ TEST(Img4TrustSteps, needTheirArguments) {
     longDigest.digestInfo = &kQDSupportDigestInfoSha512;
     EXPECT_EQ(evaluate(sepi, record, &allCallbacks, &longDigest, &script), DERBufferOverflow);
     EXPECT_EQ(script.text(), "");
+}
+
+// The walk over a dictionary's properties
+
+const Bytes good = property("GOOD", integer(1));
+
+DERReturn count(DERTag tag, const Img4PropertyValue* value, std::uint32_t selector, void* context) {
+    EXPECT_EQ(tag, propertyTag("GOOD"));
+    EXPECT_EQ(bytesOf(value->content), Bytes{1});
+    EXPECT_EQ(selector, 9U);
+    ++*static_cast<unsigned*>(context);
+    return DERSuccess;
+}
+
+TEST(Img4PropertyWalk, judgesEveryPropertyOrSaysWhichIsNone) {
+    const Bytes content = sequence({ia5("ABCD"), integer(1)});
+    const std::tuple<const char*, Bytes, DERReturn, unsigned> rows[] = {
+        {"the same property twice", join({good, good}), DERSuccess, 2},
+        {"value that is a SET", join({good, property("ABCD", set({}))}), DERUnexpectedTag, 1},
+        {"property in an application tag", item(0x6000000000000000 + fourCC("ABCD"), content), DERUnexpectedTag, 0},
+        {"element cut short", join({good, Bytes{0xFF}}), DERDecodeError, 1},
+    };
+    for (const auto& [name, dictionary, expected, expectedSeen] : rows) {
+        const DERItem view = itemOf(dictionary);
+        unsigned seen = 0;
+        EXPECT_EQ(Img4DecodeEvaluateDictionaryProperties(&view, 9, count, &seen), expected) << name;
+        EXPECT_EQ(seen, expectedSeen) << name;
+    }
+    const DERItem view = itemOf(good);
+    const Img4Record record = {};
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateDictionaryProperties, &view, 9, count, nullptr);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateManifestProperties, &record, count, nullptr);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateObjectProperties, &record, count, nullptr);
+}
+
+// The constraints that a leaf certificate carries, of manifest or object alone
+Bytes onManifest(const List& elements) {
+    return set({object("MANP", elements)});
+}
+
+Bytes onObject(const List& elements) {
+    return set({object("OBJP", elements)});
+}
+
+const std::tuple<const char*, Bytes, DERReturn> constraintCases[] = {
+    {"none", set({}), DERSuccess},
+    {"BOOLEAN met", onManifest({property("FLAG", boolean(true))}), DERSuccess},
+    {"BOOLEAN broken", onManifest({property("FLAG", boolean(false))}), Img4Failure},
+    {"INTEGER met", onManifest({property("NUMB", integer(0x1234))}), DERSuccess},
+    {"INTEGER of another length", onManifest({property("NUMB", integer(0x12))}), Img4Failure},
+    {"value of a missing property", onManifest({property("NONE", integer(1))}), DEREndOfSequence},
+    {"presence met", onManifest({mustBePresent("TEXT")}), DERSuccess},
+    {"presence broken", onManifest({mustBePresent("NONE")}), DEREndOfSequence},
+    {"absence met", onManifest({mustBeAbsent("NONE")}), DERSuccess},
+    {"absence broken", onManifest({mustBeAbsent("TEXT")}), DERUnexpectedTag},
+    {"text, which constrains nothing", onManifest({property("TEXT", ia5("text"))}), DERUnexpectedTag},
+    {"constraint with another name", onManifest({item(propertyTag("FLAG"), sequence({ia5("NUMB"), boolean(true)}))}),
+     DERUnexpectedTag},
+    {"constraint that is no property", onManifest({integer(1)}), DERDecodeError},
+    {"the second broken", onManifest({property("FLAG", boolean(true)), mustBePresent("NONE")}), DEREndOfSequence},
+    {"object's met", onObject({property("SIZE", integer(5)), mustBeAbsent("FLAG")}), DERSuccess},
+    {"both, the object's broken",
+     set({object("MANP", {mustBePresent("TEXT")}), object("OBJP", {mustBeAbsent("SIZE")})}), DERUnexpectedTag},
+    {"measurement's that is nothing at all", set({item(propertyTag("manx"), {})}), DERSuccess},
+    {"another kind", set({object("KIND", {})}), DERUnexpectedTag},
+    {"manifest's in a SEQUENCE", set({property("MANP", sequence({}))}), DERUnexpectedTag},
+    {"SEQUENCE", sequence({}), DERUnexpectedTag},
+    {"no DER", {0x31}, DERDecodeError},
+};
+
+// With a listener the check goes on behind a failure, and comes to the same.
+void passOver(const Img4Constraint*, void*) {}
+
+TEST(Img4Constraints, bindManifestAndObject) {
+    const Bytes manp =
+        join({property("FLAG", boolean(true)), property("NUMB", integer(0x1234)), property("TEXT", ia5("text"))});
+    const Bytes objp = property("SIZE", integer(5));
+    for (const auto& [name, certProperties, expected] : constraintCases) {
+        SCOPED_TRACE(name);
+        Img4Record record = {};
+        record.manp = itemOf(manp);
+        record.objp = itemOf(objp);
+        record.manifest.certProperties = itemOf(certProperties);
+        EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), expected);
+        EXPECT_EQ(Img4DecodeEvaluateCertificatePropertiesExplained(&record, passOver, nullptr), expected);
+    }
+}
+
+TEST(Img4Constraints, needPropertiesToBind) {
+    const Bytes ofObject = onObject({mustBePresent("SIZE")});
+    const Bytes ofManifest = onManifest({mustBeAbsent("FLAG")});
+    const Bytes broken = {0xFF};
+    Img4Record record = {};
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERDecodeError);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateCertificateProperties, &record);
+    expectNeedsAll(DERParamError, Img4DecodeEvaluateCertificatePropertiesExplained, &record, passOver, nullptr);
+
+    record.manifest.certProperties = itemOf(ofObject);
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "no object was evaluated";
+    record.objp = {broken.data(), 0};
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERSuccess) << "an object without properties";
+
+    record.manifest.certProperties = itemOf(ofManifest);
+    record.manp = itemOf(broken);
+    EXPECT_EQ(Img4DecodeEvaluateCertificateProperties(&record), DERDecodeError) << "a search that fails finds nothing";
 }
 
 // Manifests that are signed in earnest
