@@ -138,13 +138,6 @@ class Img4(unittest.TestCase):
                 self.assertIsNone(trust.body_digest)
         self.assertEqual((error.offset, error.certificate), (DATA.index(manifest.chain[-1]), 1))
 
-    def test_a_file_of_a_domain_that_is_no_certificate_is_named(self):
-        with tempfile.TemporaryDirectory() as folder:
-            for path in FOLDER.glob("*.der"):
-                pathlib.Path(folder, path.name).write_bytes(b"\x30\0" if path.stem == "ROOT_CA_CERTIFICATE" else path.read_bytes())
-            self.assertRaisesRegex(Img4Error, "/ROOT_CA_CERTIFICATE.der .*certificate", TrustDomain, folder)
-            self.assertEqual(TrustDomain(folder, PROFILE).profiles, (PROFILE,))
-
     def test_misuse_is_an_exception(self):
         image, data = Image(DATA), bytearray(DATA)
         view = Image(data).payload.data

@@ -120,8 +120,6 @@ class Handler(http.server.BaseHTTPRequestHandler):
         self.send_response(200)
         if seeming == "coding":
             self.send_header("Transfer-Encoding", "identity")
-        if seeming == "length":
-            self.send_header("Content-Length", "9" * 30)
         self.end_headers()
         self.wfile.write(b"half")
         self.close_notify()
@@ -136,16 +134,6 @@ class Handler(http.server.BaseHTTPRequestHandler):
     def encoded(self, count):
         self.body()
         self.answer(200, b"\x1f\x8b", Content_Encoding="gzip")
-
-    def mid(self, count):
-        """Closes while the body of the request is under way."""
-        self.rfile.read(100000)
-        self.drop()
-
-    def noise(self, count):
-        self.body()
-        self.wfile.write(b"\x00\xff no HTTP at all\r\n\r\n")
-        self.drop()
 
     def idle(self, count):
         """Answers and ends the connection without a word about it."""

