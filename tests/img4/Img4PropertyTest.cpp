@@ -130,14 +130,6 @@ void checkRecords(const char* family, const Row& row, const std::string& answers
     }
 }
 
-// Checks all rows in the record, and that there must be one.
-template <typename CheckRow>
-void checkRows(const Img4Record& record, CheckRow checkRow) {
-    for (const Row& row : rows)
-        checkRow(&record, row, row.answers);
-    checkRow(static_cast<const Img4Record*>(nullptr), rows[0], "ppppp");
-}
-
 TEST(Img4Properties, areFoundByEveryFamilyAlike) {
     const Bytes buffer =
         container(payload({.properties = payloadProperties(dictionary())}),
@@ -145,7 +137,7 @@ TEST(Img4Properties, areFoundByEveryFamilyAlike) {
                   restoreInfo(dictionary()));
     Img4Record record;
     ASSERT_EQ(Img4DecodeInit(buffer.data(), buffer.size(), &record), DERSuccess);
-    checkRows(record, [](const Img4Record* from, const Row& row, const std::string& answers) {
+    const auto checkRow = [](const Img4Record* from, const Row& row, const std::string& answers) {
         const std::uint32_t name = fourCC(row.name);
         checkFamily(
             "manifest", row, answers, OnFailure::KeepsNumbersNotFound,
@@ -180,7 +172,10 @@ TEST(Img4Properties, areFoundByEveryFamilyAlike) {
             "single", row, row.single != 0 ? std::string(5, row.single) : answers, OnFailure::Clears,
             [&](auto get, auto* out) { return get(item, name, out); }, Img4DecodeGetPropertyBoolean,
             Img4DecodeGetPropertyInteger, Img4DecodeGetPropertyInteger64, Img4DecodeGetPropertyData);
-    });
+    };
+    for (const Row& row : rows)
+        checkRow(&record, row, row.answers);
+    checkRow(nullptr, rows[0], "ppppp");
 }
 
 // An element with a tag that no four-character code makes is never a property, whatever its name.
