@@ -17,7 +17,6 @@ using nlohmann::ordered_json;
 using Report = PrintedReport;
 
 const Img4TrustProfileEntry& ec384 = entryOf(kImg4DecodeSecureBootEc384Sha384);
-const Img4TrustProfileEntry& rsa1k = entryOf(kImg4DecodeSecureBootRsa1kSha1);
 const Img4TrustProfileEntry& rsa3k = entryOf(kImg4DecodeSecureBootRsa3kSha384);
 const Img4TrustProfileEntry& rsa4k = entryOf(kImg4DecodeSecureBootRsa4kSha384);
 const Img4TrustProfileEntry& localPolicy = entryOf(kImg4DecodeLocalPolicyEc384Sha384);
