@@ -133,6 +133,7 @@ TEST(Decode, takesEachEntryAndManifestOnItsMeritsAndThereAndBack) {
          "WCh0=data 02, MiGB=data 01 02", ""},
         {payload(payloadEntry(someData, "30 68 43 57", {})), "WCh0=data 01 02, MiGB=data 01 02", ""},
         {payload(payloadEntry(someData, "30 68 43 57", text("note"))), "WCh0 (note)=data 01 02, MiGB=data 01 02", ""},
+        {payload(payloadEntry(someData, "30 68 43 57", bytes("00 61"))), "WCh0=data 01 02, MiGB=data 01 02", ""},
         // Nobody looks at the version of a deleted flag.
         {BlobParts{.version = bytes("01 00 03 00"), .payload = item("31", payloadEntry(bytes("01 01 FF")))}.whole(),
          "WCh0=deleted", ""},
