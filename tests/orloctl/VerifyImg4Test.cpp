@@ -158,6 +158,8 @@ std::vector<RefusalCase> refusalCases() {
 
         {"properties", R"(private "LIST" of the manifest is SEQUENCE, and only BOOLEAN,)",
          constrained({}, {.properties = {property("LIST", sequence({}))}})},
+        {"properties", R"(private "LIST" of the object is SEQUENCE)",
+         constrained({}, {.objects = {object("sepi", {property("LIST", sequence({}))})}}), nullptr, "sepi"},
 
         {"payload", "its SHA-384 is another than \"ELSE\" of \"sepi\" demands", image, nullptr, "sepi", "ELSE"},
         {"payload", "\"SHRT\" of \"sepi\" has 20 octets, and SHA-384 has 48", image, nullptr, "sepi", "SHRT"},

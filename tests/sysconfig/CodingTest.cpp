@@ -77,11 +77,8 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
          "allocSysConfig3: invalid version provided 0x00030004\nUnable to allocate sysconfig3vX object. Likely due to "
          "an unsupported magic: 0x62436667 or version: 0x30004"},
         {withPayload({}), payload, 21, DERFaultHeaderCutShort, "Unable to decode payload with error 3"},
-        {withPayload(bytes("30 00")), payload, 21, DERFaultTag,
-         "Tag was not the expected Payload tag 2000000000000010"},
         {withMetadata(bytes("04 00")), metadata, 30, DERFaultTag, "Tag was not the expected metadata tag 4"},
-        {withManifest(bytes("31 00")), manifest, 39, DERFaultTag,
-         "Tag was not the expected manifest tag 2000000000000011"},
+        {withManifest({}), manifest, 39, DERFaultHeaderCutShort, "Unable to decode manifest with error 3"},
         {payloadOf(payloadEntry(joined({someData, item("05", {})}))), payloadItem, 23, DERFaultExcess,
          "Decode sequence error: 2"},
         {payloadOf(payloadEntry(bytes("01 01 01"))), payloadItem, 23, DERFaultNone, "Decode sequence error: 3"},

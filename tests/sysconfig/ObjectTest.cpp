@@ -54,8 +54,6 @@ TEST(SysConfig3, saysThatAnArgumentIsMissing) {
     EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", sysConfig3GetPayloadEntryForKey, object, 1);
     EXPECT_NEEDS("invalid arguments. Either entry or data was NULL", sysConfig3PayloadEntryGetData, payload, &out);
     EXPECT_NEEDS("invalid arguments. entry and data cannot be null", sysConfig3ManifestGetPayloadHMAC, manifest, &out);
-    EXPECT_NEEDS("invalid arguments. entry and data cannot be null", sysConfig3ManifestGetMetadataHMAC, manifest, &out);
-    EXPECT_NEEDS("invalid arguments. entry and data cannot be null", sysConfig3ManifestGetFullHMAC, manifest, &out);
 }
 
 TEST(SysConfig3, namesTheReportingOperationByItsPrototypeToAHookThatMayBeAbsent) {
