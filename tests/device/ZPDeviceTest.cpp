@@ -61,23 +61,18 @@ TEST_F(ZPDeviceTest, whatIsNotFoundLeavesTheOutValuesAsTheyWere) {
     describe(R"({"answers": {"HWModelStr": "a", "ChipID": 1}, "registry": [{"class": "TeskAuthI2CRelayInterface"}]})");
     EXPECT_EQ(ZPDevice::kaGetAnswerString("HWModelStr"), Value("a"));
     EXPECT_TRUE(ZPDevice::kaGetAnswerString("ChipID").isNothing());
-    EXPECT_TRUE(ZPDevice::kaGetAnswerString("missing").isNothing());
     std::uint32_t handle = 99;
     EXPECT_EQ(device_.getService("", &handle), (Error{"TcrtErrorDomain", 400, "can't create matching dict"}));
-    EXPECT_EQ(device_.getService("Other", &handle), (Error{"TcrtErrorDomain", 400, "cannot get service"}));
     EXPECT_EQ(handle, 99U);
-    EXPECT_EQ(recordedLog(), (Lines{"4 [ZPDevice] can't create matching dict", "4 [ZPDevice] cannot get service"}));
+    EXPECT_EQ(recordedLog(), Lines{"4 [ZPDevice] can't create matching dict"});
     Value certificate = "before";
     EXPECT_TRUE(device_.getTcrtCertificate(&certificate));
     EXPECT_EQ(certificate, Value("before"));
     EXPECT_TRUE(device_.getCertificateSerialNumber({}).isNothing());
 }
 
-TEST_F(ZPDeviceTest, aChallengeHas32BytesAndIsNeverTheSame) {
-    const Value first = device_.createChallenge();
-    ASSERT_TRUE(first.data());
-    EXPECT_EQ(first.data()->size(), 32U);
-    EXPECT_NE(device_.createChallenge(), first);
+TEST_F(ZPDeviceTest, aChallengeIsNeverTheSame) {
+    EXPECT_NE(device_.createChallenge(), device_.createChallenge());
 }
 
 TEST_F(ZPDeviceTest, anAnswerOfTheDisplayThatComesTooLateIsTakenForNoOther) {

@@ -16,8 +16,8 @@
 #include "platform/DeviceAnswers.h"
 #include "platform/Format.h"
 #include "platform/HardwareRegistry.h"
+#include "platform/Hexadecimal.h"
 #include "platform/Json.h"
-#include "platform/OrloDataStore.h"
 #include "platform/linux/system/DescribedValue.h"
 #include "plugin/ZPOrloServices.h"
 #include "tests/support/FailingAllocation.h"
@@ -74,14 +74,10 @@ Value json(const std::string& text) {
     return value ? resolveDescribed(*value) : throw std::runtime_error("no JSON: " + text);
 }
 
-std::string unescaped(const std::string& text) {
-    return std::regex_replace(text, std::regex(R"(\\n)"), "\n");
-}
-
 // File contents: data as <hex>, anything else as the text that it is.
 std::string contentsOf(const std::string& text) {
     if (!text.starts_with('<'))
-        return unescaped(text);
+        return std::regex_replace(text, std::regex(R"(\\n)"), "\n");
     const Value data = json(R"({"$data": ")" + text.substr(1, text.size() - 2) + R"("})");
     return data.data() ? std::string(data.data()->begin(), data.data()->end())
                        : throw std::runtime_error("no octets: " + text);
@@ -187,16 +183,15 @@ bool isText(const std::string& contents) {
     return std::ranges::all_of(contents, [](unsigned char c) { return c == '\n' || (c >= ' ' && c < 0x7F); });
 }
 
-std::string hexadecimal(const std::string& contents) {
-    return *QDOrloCreateInstanceString(Value::Data(contents.begin(), contents.end())).text();
-}
-
 // What the request made of the device's files.
 void compareFiles(const TemporaryRoot& root, const std::map<std::string, std::string>& before, Lines& lines) {
     const std::map<std::string, std::string> after = root.contents();
     for (const auto& [path, contents] : after)
         if (!before.contains(path) || before.at(path) != contents)
-            lines.push_back("wrote " + path + " " + (isText(contents) ? contents : hexadecimal(contents)));
+            lines.push_back("wrote " + path + " " +
+                            (isText(contents) ? contents
+                                              : hexadecimal({reinterpret_cast<const std::uint8_t*>(contents.data()),
+                                                             contents.size()})));
     for (const auto& entry : before)
         if (!after.contains(entry.first))
             lines.push_back("removed " + entry.first);
