@@ -184,7 +184,10 @@ const struct Flow {
     {"with callbacks",
      [](auto record) {
          Img4TrustRefusal refusal;
-         return Img4DecodePerformTrustEvaluationExplained(&none, record, &allCallbacks, &scripted, &script, &refusal);
+         const DERReturn result =
+             Img4DecodePerformTrustEvaluationExplained(&none, record, &allCallbacks, &scripted, &script, &refusal);
+         EXPECT_EQ(refusal.signature.fault == Img4SignatureOther, script.failing == "signature");
+         return result;
      },
      lookedUp + verified + "object: mcbd; " + checked},
     {"trusted",
