@@ -202,9 +202,10 @@ TEST_F(HSPipeUtilTest, withoutDescriptorsForThePipesNothingIsRunAndNoneStaysOpen
         inOwnProcess([&] {
             leaveDescriptors(row.unused);
             EXPECT_EQ(row.withInput ? runWith(bytes("in")) : run(), 7);
-            EXPECT_EQ(timesLogged(row.line + text(EMFILE)), 1) << row.unused;
             EXPECT_EQ(output(), "");
             EXPECT_EQ(unusedDescriptors(), row.unused);
+            ::close_range(48, 63, 0); // the sanitizer needs some for what comes
+            EXPECT_EQ(timesLogged(row.line + text(EMFILE)), 1) << row.unused;
         });
     }
 }

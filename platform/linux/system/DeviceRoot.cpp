@@ -4,6 +4,7 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <cstdint>
 #include <cstdlib>
 #include <memory>
 #include <new>
@@ -36,6 +37,15 @@ bool isSame(const struct stat& one, const struct stat& other) {
     return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
+// Opens what `path` names in `directory` when no link lies on the way and the way does not leave the directory, looked
+// up by the kernel in one call. None for every other path, and where the kernel or a filter has no such call.
+FileDescriptor openBeneath(const FileDescriptor& directory, const std::string& path, int flags) {
+    open_how how = {};
+    how.flags = static_cast<std::uint64_t>(flags);
+    how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
+    return FileDescriptor(static_cast<int>(::syscall(SYS_openat2, directory.get(), path.c_str(), &how, sizeof how)));
+}
+
 // Opens the regular file or directory that was found under `name` in `directory`, that very one; nothing else is
 // opened, since opening alone can arm a device or wake who waits at a FIFO.
 FileDescriptor openFound(const FileDescriptor& found, const struct stat& status, const FileDescriptor& directory,
@@ -50,18 +60,11 @@ FileDescriptor openFound(const FileDescriptor& found, const struct stat& status,
     if (file || errno != ENOENT)
         return file;
     // Without /proc only the name is left, and what it names may have changed since.
-    file = FileDescriptor(::openat(directory.get(), name.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY));
+    flags |= O_NOFOLLOW | O_NONBLOCK | O_NOCTTY;
+    file = name.find('/') == std::string::npos ? FileDescriptor(::openat(directory.get(), name.c_str(), flags))
+                                               : openBeneath(directory, name, flags);
     struct stat opened;
     return file && ::fstat(file.get(), &opened) == 0 && isSame(opened, status) ? std::move(file) : none(EAGAIN);
-}
-
-// What `path` names in `directory` when no link lies on the way and the way does not leave the directory, looked up by
-// the kernel in one call. None for every other path, and where the kernel or a filter has no such call.
-FileDescriptor findBeneath(const FileDescriptor& directory, const std::string& path) {
-    open_how how = {};
-    how.flags = O_PATH | O_CLOEXEC;
-    how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
-    return FileDescriptor(static_cast<int>(::syscall(SYS_openat2, directory.get(), path.c_str(), &how, sizeof how)));
 }
 
 // The way from the device root to what a path names, one name at a time. No name is looked up but in a directory that
@@ -78,7 +81,7 @@ public:
             return {};
         if (path.size() <= deepest) { // most paths are short and lead through no link
             name_ = path.substr(std::min(path.find_first_not_of('/'), path.size()));
-            FileDescriptor found = findBeneath(passed_.back(), name_);
+            FileDescriptor found = openBeneath(passed_.back(), name_, O_PATH | O_CLOEXEC);
             if (found && ::fstat(found.get(), &status_) == 0)
                 return found;
         }

@@ -94,9 +94,16 @@ std::size_t countHeader(char*, std::size_t, std::size_t count, void* context) {
     return headers > maximumHeaders ? 0 : count;
 }
 
-// libcurl calls this before it sends a request, and again before it sends the same one anew.
+// libcurl calls this before it sends a request, and again before it sends the same one anew: when it has had no answer,
+// or one that refuses to wait for the body.
 int sendOnce(void* context, char*, char*, int, int) {
-    return ++static_cast<Incoming*>(context)->sendings == 1 ? CURL_PREREQFUNC_OK : CURL_PREREQFUNC_ABORT;
+    constexpr long expectationFailed = 417;
+    auto& incoming = *static_cast<Incoming*>(context);
+    long status = 0;
+    curl_easy_getinfo(incoming.handle, CURLINFO_RESPONSE_CODE, &status);
+    if (status != expectationFailed)
+        ++incoming.sendings;
+    return incoming.sendings <= 1 ? CURL_PREREQFUNC_OK : CURL_PREREQFUNC_ABORT;
 }
 
 // The last header with this name of the answer that counts, without blanks around it.
@@ -236,8 +243,13 @@ Client::Client(Way way) : way_(std::move(way)) {
 
 Answer Client::exchange(const Request& request) {
     // What came unasked would be taken for the next answer. Or it is the end of a connection.
-    if (::poll(sockets_.data(), sockets_.size(), 0) > 0)
+    // The socket of an attempt that another one was faster than has been closed without a word.
+    ::poll(sockets_.data(), sockets_.size(), 0);
+    std::erase_if(sockets_, [](const pollfd& socket) { return (socket.revents & POLLNVAL) != 0; });
+    if (std::ranges::any_of(sockets_, [](const pollfd& socket) { return socket.revents != 0; })) {
         handle_.reset(curl_easy_init());
+        sockets_.clear();
+    }
     if (!handle_)
         throw std::bad_alloc();
     // What was set for the exchange before is forgotten; connections, host names and TLS sessions are not.
