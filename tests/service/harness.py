@@ -140,7 +140,7 @@ class Service:
 
     def call(self, interface, method, *arguments):
         """What busctl prints of a call."""
-        return self.run("busctl", "--user", "call", NAME, PATH, interface, method, *arguments,
+        return self.run("busctl", "--user", "--timeout=300", "call", NAME, PATH, interface, method, *arguments,
                         stderr=subprocess.STDOUT).stdout.strip()
 
     def busctl(self, *body):
