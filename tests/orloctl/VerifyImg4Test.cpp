@@ -5,6 +5,7 @@
 #include "tests/orloctl/PrintedReport.h"
 
 #include <algorithm>
+#include <regex>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -169,12 +170,16 @@ std::vector<RefusalCase> refusalCases() {
 }
 
 TEST(VerifyImg4, saysWhyItRefusesAndWhere) {
+    const std::regex certificate("[Cc]ertificate (\\d)");
     for (const RefusalCase& row : refusalCases()) {
         const auto profile = row.profile != nullptr ? std::optional<std::string>(row.profile->name) : std::nullopt;
         const Report report = verify(row.bytes, testDomain(profile), row.object, row.payloadDigest);
         EXPECT_FALSE(report.ok()) << row.problem;
         EXPECT_NE(report.problem.find(row.problem), std::string::npos) << row.problem << "\n" << report.problem;
         EXPECT_EQ(report.json["failedStep"], row.step) << row.problem;
+        std::smatch named;
+        const bool namesOne = row.step == std::string("chain") && std::regex_search(report.problem, named, certificate);
+        EXPECT_EQ(report.json.value("failedCertificate", 0), namesOne ? std::stoi(named[1]) : 0) << row.problem;
         EXPECT_LE(report.json["problemOffset"], row.bytes.size()) << row.problem;
         EXPECT_EQ(report.json["trusted"], false);
         EXPECT_EQ(report.json.value("payload", ""), *row.payloadDigest != '\0' ? "not the object's" : "");

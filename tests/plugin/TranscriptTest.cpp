@@ -101,6 +101,8 @@ public:
             changeDevice(nlohmann::json::json_pointer(name), line);
         else if (verb == "script")
             script(outcomes[name], json(line));
+        else if (verb == "memoryEnds") // behind that many lines
+            whenRecorded(std::stoul(name), [] { failAllocation(1); });
         else if (verb == "remove")
             fs::remove_all(root_.host(name));
         else if (verb == "folder")
@@ -227,6 +229,7 @@ Lines play(const Case& played) {
     ZPOrloServices().handleMessage(
         request, [&](bool completed, const auto& response) { answers.push_back(shown(request, completed, response)); });
     failAllocation(0);
+    whenRecorded(0, nullptr);
     Lines lines = recordedLines();
     if (!answers.empty() && answers.front().starts_with("= -1"))
         markReasons(command, lines);

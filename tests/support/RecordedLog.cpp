@@ -14,6 +14,8 @@ namespace {
 SystemLog pluginLog, frameworkLog, defaultLog;
 std::mutex mutex;
 std::vector<std::string> lines; // of every destination, in order
+std::size_t awaited = 0;
+void (*whenAwaited)() = nullptr;
 
 // "<time>-[<file>:<number>] <message>\n" as "[<file>] <message>".
 std::string withoutTimeAndNumber(std::string_view line) {
@@ -26,6 +28,8 @@ std::string withoutTimeAndNumber(std::string_view line) {
 void append(std::string line) {
     const std::lock_guard lock(mutex);
     lines.push_back(std::move(line));
+    if (lines.size() == awaited)
+        whenAwaited();
 }
 
 } // namespace
@@ -64,6 +68,11 @@ void recordLog() {
     logInit(nullptr);
     const std::lock_guard lock(mutex);
     lines.clear();
+}
+
+void whenRecorded(std::size_t count, void (*then)()) {
+    awaited = count;
+    whenAwaited = then;
 }
 
 void recordCall(std::string_view call) {

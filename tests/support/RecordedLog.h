@@ -3,12 +3,16 @@
 #ifndef VELTRA_TESTS_RECORDED_LOG_H
 #define VELTRA_TESTS_RECORDED_LOG_H
 
+#include <cstddef>
 #include <string>
 #include <string_view>
 #include <vector>
 
 // Starts recording; earlier lines are forgotten.
 void recordLog();
+
+// Calls `then` once, when that many lines have been recorded.
+void whenRecorded(std::size_t count, void (*then)());
 
 // Keeps a call of a service that stands in for the device's, in its place among the lines.
 void recordCall(std::string_view call);

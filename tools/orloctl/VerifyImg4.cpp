@@ -106,9 +106,9 @@ private:
     void refuseRoot() {
         const auto first = readCertificate(certificates_.front());
         refuse("chain", certificates_.front().data,
-               "No known root has signed this chain: its first certificate (" +
-                   quotedText(nameText(first->tbs.subject)) + ") names the issuer " +
-                   quotedText(nameText(first->tbs.issuer)) + ", and no root of the trust domain has that name");
+               "No known root has signed this chain: certificate 1 (" + quotedText(nameText(first->tbs.subject)) +
+                   ") names the issuer " + quotedText(nameText(first->tbs.issuer)) +
+                   ", and no root of the trust domain has that name");
         report_.json["failedCertificate"] = 1;
         addChain(nullptr);
     }
