@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
 #include <iterator>
 #include <map>
 #include <string>
@@ -138,6 +139,11 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
                                          : "Panic Version and System Version does not match. Skipping"));
     }
     EXPECT_FALSE(check_panic_version("/missing"));
+
+    root_.write(logs + "hole.ips", good + "\n");
+    fs::resize_file(root_.host(logs + "hole.ips"), std::size_t{1} << 43); // nobody would live to see it read
+    std::ofstream(root_.host(logs + "hole.ips"), std::ios::app) << "x";
+    EXPECT_TRUE(check_panic_version(logs + "hole.ips"));
 }
 
 TEST_F(CrashLogs, whatIsNoReadableFileNeitherHangsNorBreaksTheCollection) {
