@@ -55,9 +55,9 @@ protected:
         return entries;
     }
 
-    static Lines missed() {
+    static Lines missed(void (*found)(const CrashLog&) = [](const CrashLog&) {}) {
         Lines paths;
-        visitCrashLogs({[](const CrashLog&) {},
+        visitCrashLogs({found,
                         [&](std::string_view path, std::string_view reason) {
                             EXPECT_FALSE(reason.empty());
                             paths.emplace_back(path);
@@ -160,6 +160,8 @@ TEST_F(CrashLogs, whatIsNoReadableFileNeitherHangsNorBreaksTheCollection) {
     for (const char* name : {"fifo.log", "out.log", "dots.log", "in.log", "loop.log"})
         EXPECT_TRUE(logged("Failed to load " + logs + name + ": ")) << name;
     EXPECT_TRUE(logged("Panic Version and System Version does not match. Skipping"));
+    const Lines withoutMemory = missed([](const CrashLog&) { throw std::bad_alloc(); });
+    EXPECT_EQ(std::ranges::count(withoutMemory, logs + "good.log"), 1);
 }
 
 // Users may write to the folders, and a link in place of one would lead to files that only the collector may read.
