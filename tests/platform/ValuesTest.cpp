@@ -54,10 +54,13 @@ TEST(Value, descriptionsAreBoundedAndSayWhatTheyLeftOut) {
     EXPECT_LT((Error{"d", 1, std::string(1 << 20, 'x')}.description().size()), 2048u);
     EXPECT_EQ(Value(Array{std::string(255, 'a') + "é"}).description(),
               std::string("[\"").append(255, 'a') + "\"... (257 bytes)]");
-    Value nested = "core";
-    for (int level = 0; level < 33; ++level)
-        nested = Array{std::move(nested)};
-    EXPECT_EQ(nested.description(), std::string(33, '[') + "... (1 more)" + std::string(33, ']'));
+    Value nested = Dictionary{{"k", 1}};
+    std::string shown = "{... (1 more)}";
+    for (int level = 0; level < 32; ++level) {
+        nested = level % 2 == 0 ? Value(Array{nested}) : Dictionary{{"k", nested}};
+        shown = level % 2 == 0 ? "[" + shown + "]" : "{\"k\": " + shown + "}";
+    }
+    EXPECT_EQ(nested.description(), shown);
 
     Dictionary wide;
     for (int i = 0; i < 100; ++i)

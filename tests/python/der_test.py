@@ -75,7 +75,8 @@ class Der(unittest.TestCase):
         gc.collect()
 
     def test_misuse_is_an_exception(self):
-        rows = [Row("n", der.INTEGER)]
+        rows, whole = [Row("n", der.INTEGER)], [Row("n", der.INTEGER, der.Option.SAVE_DER)]
+        self.assertEqual(der.fill(b"\x30\3\2\1\5", whole)["n"], b"\2\1\5")
         for error, call in (
             (TypeError, lambda: der.decode("text")),
             (BufferError, lambda: der.decode(memoryview(b"\2\1\5\0\0\0")[::2])),

@@ -52,6 +52,7 @@ class SysConfig3(unittest.TestCase):
         with self.assertRaises(BlobError) as raised:
             blob.payload["WCh0"] = "text"
         self.assertEqual(("bCfg", raised.exception.message), messages[-1])
+        self.assertIn(raised.exception.message, str(raised.exception))
         interrupt = unittest.mock.Mock(side_effect=[KeyboardInterrupt, None, None])
         for error, emit in ((RuntimeError, blob.close), (KeyboardInterrupt, interrupt)):
             handler.emit = lambda _, emit=emit: emit() or Blob()

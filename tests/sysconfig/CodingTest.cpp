@@ -68,6 +68,8 @@ TEST(Decode, refusesABlobThatIsNotWellFormed) {
         {item("30", joined({content, bytes("05 00")})), whole, 50, DERFaultExcess, ""},
         {item("31", content), whole, 0, DERFaultNoSequence, ""},
         {firstOctets(0), magic, 2, DERFaultMissing, ""},
+        {firstOctets(12), payload, 14, DERFaultMissing, ""},
+        {firstOctets(21), metadata, 23, DERFaultMissing, ""},
         {firstOctets(30), manifest, 32, DERFaultMissing, ""},
         {item("30", bytes("02 01 00 04 00")), version, 5, DERFaultTag, ""},
         {withMagic("67 66 43 00"), magic, 4, DERFaultNone, "Sysconfig magic 0x436667 is not valid"},
