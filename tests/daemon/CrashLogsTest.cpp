@@ -57,8 +57,7 @@ protected:
 
     static Lines missed(void (*found)(const CrashLog&) = [](const CrashLog&) {}) {
         Lines paths;
-        visitCrashLogs({found,
-                        [&](std::string_view path, std::string_view reason) {
+        visitCrashLogs({found, [&](std::string_view path, std::string_view reason) {
                             EXPECT_FALSE(reason.empty());
                             paths.emplace_back(path);
                         }});

@@ -220,6 +220,13 @@ TEST(EncodeOfABrokenRecord, refusesAnEntryWithoutExactlyOneValue) {
     expectRefusal(neither,
                   "!_createDEREncodeSysConfigMetadataEntries: sysconfig metadata entry must have EITHER string "
                   "OR data fields populated!\n_freeDEREncodeSysConfigMetadataEntries: DERMetadata is NULL");
+
+    const SysConfig3Ptr twoKinds = newObject();
+    twoKinds->payload.appendWithoutIndex(
+        sysconfig::makeEntry(sysconfig::PayloadContent{keyWCh0, {}, {keyBytes, 1}, {}, true}));
+    const Recorder recorder;
+    EXPECT_FALSE(encode(twoKinds.get()).empty());
+    EXPECT_TRUE(Recorder::said.ends_with(" string: (nil) deleted: 255")) << Recorder::said;
 }
 
 } // namespace

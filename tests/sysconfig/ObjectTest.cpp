@@ -32,6 +32,19 @@ TEST(SysConfig3, saysWhatIsWrongWithItsArguments) {
     EXPECT_REFUSED(sysConfig3AddPayloadEntry(keyed.get(), payloadDeleted(keyWCh0).get()),
                    "Payloads with the deleted flag are only supported on version 0x00030003 or higher.");
     EXPECT_EQ(payloadOf(keyed), "");
+    EXPECT_REFUSED(_sysConfig3SetManifest(keyed.get(), sysConfig3GetManifest(newObject().get())),
+                   "sysconfig version (0X00030002) did not match manifest version (0X00030003");
+    EXPECT_REFUSED(_sysConfig3SetManifest(nullptr, nullptr),
+                   "sysconfig (0x(nil)) or manifest (0x(nil)) argument was null");
+    EXPECT_REFUSED(_sysConfig3HMACsAreEqual(0x30004, nullptr, nullptr), "Unsupported sysconfig version: 0x30004");
+    EXPECT_REFUSED(_allocAndCopyData(&octet, 0), "data was zero length");
+    const SysConfigData empty = {};
+    SysConfigData copied = {nullptr, 7};
+    EXPECT_REFUSED(_copySysConfigData(&empty, &copied), "sourceData was 0 length");
+    EXPECT_EQ(copied.length, 0U);
+    EXPECT_EQ(_DERDecodeSysConfig3ParseAndPopulatePayloadSequence(nullptr, nullptr, nullptr), DERParamError);
+    EXPECT_EQ(_DERDecodeSysConfig3ParseAndPopulateMetadataSequence(nullptr, nullptr, nullptr), DERParamError);
+    EXPECT_EQ(Recorder::take(), "_DERDecodeSysConfig3ParseAndPopulateMetadataSequence: the refcon arg was NULL");
     EXPECT_REFUSED(encodeSysConfig3(nullptr, nullptr), "Invalid arguments. sysconfig = (nil), sData = (nil)");
     EXPECT_FALSE(encodeSysConfig3(keyed.get(), nullptr));
 }
@@ -49,6 +62,12 @@ TEST(SysConfig3, saysThatAnArgumentIsMissing) {
     EXPECT_NEEDS("invalid argument. sysconfig and entry cannot be NULL", sysConfig3AddPayloadEntry, object, payload);
     EXPECT_NEEDS("invalid argument. sysconfig and entry cannot be NULL", sysConfig3AddMetadataEntry, object, metadata);
     EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", sysConfig3DeletePayloadEntryForKey, object, 1);
+    EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", _sysConfig3DeletePayloadEntryForKey, object, 1);
+    EXPECT_NEEDS("invalid argument. sysconfig and key cannot be NULL", _sysConfig3DeleteMetadataEntryForKey, object,
+                 "k");
+    EXPECT_NEEDS("sourceData or destData was NULL", _copySysConfigData, &out, &out);
+    EXPECT_FALSE(_sysConfig3SetManifest(object, nullptr) || _sysConfig3SetManifest(nullptr, manifest));
+    Recorder::take();
     EXPECT_NEEDS("invalid argument. sysconfig and key cannot be NULL", sysConfig3DeleteMetadataEntryForKey, object,
                  "k");
     EXPECT_NEEDS("invalid argument. sysconfig cannot be NULL", sysConfig3GetPayloadEntryForKey, object, 1);
@@ -59,7 +78,7 @@ TEST(SysConfig3, saysThatAnArgumentIsMissing) {
 TEST(SysConfig3, namesTheReportingOperationByItsPrototypeToAHookThatMayBeAbsent) {
     EXPECT_EQ(allocSysConfig3(0, 0), nullptr);
     const Recorder recorder;
-    EXPECT_NE(getSysConfig3LogHandler(), nullptr);
+    EXPECT_TRUE(getSysConfig3LogHandler() && getSysConfig3ExceptionHandler());
     EXPECT_EQ(allocSysConfig3(0, 0), nullptr);
     EXPECT_EQ(Recorder::prototype, "struct __SysConfig3 *__singleallocSysConfig3(SysConfig3Magic, SysConfig3Version)");
 }
@@ -195,6 +214,9 @@ TEST(Manifest, isEqualByItsVersionAndEachHMAC) {
     };
     expectDistinct(manifests, sysConfig3ManifestsAreEqual, copySysConfig3Manifest);
     EXPECT_EQ(sysConfig3ManifestGetVersion(manifests[1].get()), 0x30001U);
+    const SysConfig3Ptr object = newObject();
+    EXPECT_TRUE(_sysConfig3SetManifest(object.get(), manifests[2].get()));
+    EXPECT_TRUE(sysConfig3ManifestsAreEqual(sysConfig3GetManifest(object.get()), manifests[2].get()));
     // An absent HMAC is equal to an absent one in the first version only.
     const ManifestPtr lacking = make(0x30003, same, absent, same);
     EXPECT_FALSE(sysConfig3ManifestsAreEqual(lacking.get(), lacking.get()));

@@ -111,10 +111,8 @@ public:
                     return {};
             } else if (isLast) {
                 return next;
-            } else if (!S_ISDIR(status_.st_mode) || passed_.size() > deepest) {
-                return none(S_ISDIR(status_.st_mode) ? ENAMETOOLONG : ENOTDIR);
             } else {
-                passed_.push_back(std::move(next));
+                return none(passed_.size() > deepest ? ENAMETOOLONG : ENOTDIR);
             }
         }
         FileDescriptor directory = std::move(passed_.back());
