@@ -17,8 +17,10 @@
 
 #include "platform/CertificateService.h"
 #include "platform/ComponentAuth.h"
+#include "platform/DeviceAnswers.h"
 #include "platform/Format.h"
 #include "platform/HardwareRegistry.h"
+#include "platform/OrloDataStore.h"
 #include "platform/ReverseProxy.h"
 #include "platform/Semaphore.h"
 #include "platform/VanterUpdater.h"
@@ -39,6 +41,14 @@ protected:
 
     TemporaryRoot root_;
 };
+
+TEST_F(DeviceServices, namesTheAnswerOrKindThatItDoesNotHave) {
+    std::optional<Error> error;
+    EXPECT_TRUE(KACopyAnswerWithError("Unknown", {}, &error).isNothing());
+    EXPECT_EQ(error, (Error{"DeviceAnswerErrorDomain", 1, "The device has no answer for Unknown"}));
+    EXPECT_TRUE(KelvoDataAccessor::sharedDataAccessor().copyPathForPersonalizedData(7, &error).isNothing());
+    EXPECT_EQ(error, (Error{"KelvoErrorDomain", 1, "The device keeps no personalised data of kind 7"}));
+}
 
 CertificateRef parse(const Bytes& bytes) {
     return createCertificateWithBytes(bytes.data(), bytes.size());
@@ -339,11 +349,19 @@ bool isDone() {
     return VanterUpdaterIsDone(nullptr, nullptr);
 }
 
+// What the updater has said last.
+std::string said;
+
 // With an updater of its own.
-bool install(const Value& options, std::optional<Error>* error = nullptr) {
+bool run(const char* step, const Value& options, Value* output = nullptr, std::optional<Error>* error = nullptr) {
+    const auto log = [](const std::string& context, const std::string& message) { said = context + ": " + message; };
     const std::unique_ptr<VanterUpdater, decltype(&VanterUpdaterRelease)> updater(
-        VanterUpdaterCreate({}, nullptr, "Vanter", nullptr), VanterUpdaterRelease);
-    return VanterUpdaterExecCommand(updater.get(), "performNextStage", options, nullptr, error);
+        VanterUpdaterCreate({}, log, "Vanter", error), VanterUpdaterRelease);
+    return updater && VanterUpdaterExecCommand(updater.get(), step, options, output, error);
+}
+
+bool install(const Value& options, Value* output = nullptr) {
+    return run("performNextStage", options, output);
 }
 
 const Value patch = Value::Dictionary{{"FirmwareData", Value::Data{'p', 'a', 't', 'c', 'h'}}};
@@ -361,8 +379,14 @@ protected:
 
 TEST_F(VanterUpdaterTest, aChipIsDoneForAsLongAsItHasWhatWasInstalled) {
     EXPECT_FALSE(isDone());
-    EXPECT_TRUE(install(patch));
+    Value output;
+    EXPECT_TRUE(install(patch, &output));
+    EXPECT_EQ(output, Value(Value::Dictionary{{"InstalledSize", 5}}));
+    EXPECT_EQ(said, "Vanter: installed a firmware of 5 bytes");
     EXPECT_TRUE(isDone());
+    EXPECT_TRUE(run("queryInfo", {}, &output));
+    EXPECT_EQ(output["Digest"].data()->size(), 48U);
+    EXPECT_EQ(said, "Vanter: a firmware is installed");
     const std::pair<const char*, std::function<void()>> rows[] = {
         {"another part", [&] { root_.write(installedPath, "other"); }},
         {"a part without firmware", [&] { std::filesystem::remove(root_.host(installedPath)); }},
@@ -381,17 +405,34 @@ TEST_F(VanterUpdaterTest, aChipIsDoneForAsLongAsItHasWhatWasInstalled) {
     EXPECT_FALSE(isDone());
     describe(R"("done": true)");
     EXPECT_TRUE(isDone());
+    EXPECT_TRUE(run("queryInfo", {}, &output));
+    EXPECT_EQ(output, Value(Value::Dictionary{}));
+    EXPECT_EQ(said, "Vanter: no firmware is installed");
 }
 
-TEST_F(VanterUpdaterTest, whatCouldNotBeInstalledLeavesTheChipAsItWas) {
-    std::optional<Error> error;
-    EXPECT_FALSE(install({}, &error));
-    EXPECT_EQ(error->domain, "VanterUpdaterErrorDomain");
-    for (const char* chip : {R"("firmware": "/missing/directory/firmware.bin")",
-                             R"("firmware": "/var/lib/vanter/firmware.bin", "fail": "performNextStage")"}) {
-        describe(chip);
-        EXPECT_FALSE(install(patch)) << chip;
-        EXPECT_FALSE(isDone()) << chip;
+TEST_F(VanterUpdaterTest, whatCannotBeDoneIsSaidAndLeavesTheChipAsItWas) {
+    const struct {
+        const char* chip;
+        const char* step;
+        Value options;
+        int code;
+        std::string text;
+    } rows[] = {
+        {"null", "queryInfo", {}, 1, "The device has no Vanter chip"},
+        {R"({"fail": "create"})", "queryInfo", {}, 2, "The Vanter chip fails at the step create"},
+        {R"({"firmware": "/var/lib/vanter/firmware.bin", "fail": "performNextStage"})", "performNextStage", patch, 2,
+         "The Vanter chip fails at the step performNextStage"},
+        {"{}", "other", patch, 3, "The updater knows no step other"},
+        {"{}", "performNextStage", {}, 4, "There is no firmware to install"},
+        {R"({"firmware": "/missing/firmware.bin"})", "performNextStage", patch, 5,
+         "The firmware cannot be written to /missing/firmware.bin"},
+    };
+    for (const auto& row : rows) {
+        root_.describe(std::string("{\"vanter\": ") + row.chip + "}");
+        std::optional<Error> error;
+        EXPECT_FALSE(run(row.step, row.options, nullptr, &error)) << row.text;
+        EXPECT_EQ(error, (Error{"VanterUpdaterErrorDomain", row.code, row.text}));
+        EXPECT_FALSE(isDone()) << row.text;
     }
     EXPECT_EQ(root_.read(installedPath), "as delivered");
 }
