@@ -191,10 +191,16 @@ const ProblemCase problemCases[] = {
     {"img4", "The container holds INTEGER behind its last field", sequence({ia5("IMG4"), payload({}), integer(1)})},
     {"img4", "The uncompressed size does not fit 32 bits", payloadOf({compression(1, 0x100000000)})},
     {"img4", "The magic is \"PAYQ\" instead of", payloadOf({context(0, sequence({ia5("PAYQ"), set({})}))})},
+    {"img4", "The manifest version is no non-negative INTEGER in its shortest form, at offset 10.",
+     sequence({ia5("IM4M"), item(DERTagInteger, {0x80}), manifestBody({}), octets({}), sequence({})})},
     {"img4", "The manifest version is 3, and 2 is the last, at offset 10.", manifestOf(manifestBody({}), 3)},
     {"img4", "The manifest has SEQUENCE instead of SET as its body, at offset 11.", manifestOf(sequence({}))},
     {"img4", "The manifest's body has a \"MANB\" that is SET instead of SEQUENCE, so", manifestOf(manifestBody({}), 2)},
     {"img4", "\"MANB\" has no \"MANP\", so that every lookup fails", manifestOf(set({property("MANB", set({}))}))},
+    {"img4", "\"MANB\" has an element that is no strict DER: the header",
+     manifestOf(set({property("MANB", set({{0x30}}))}))},
+    {"img4", "Certificate 0 of the chain is INTEGER instead of SEQUENCE",
+     manifestOf(manifestBody({}), 0, {integer(1)})},
     {"img4", "Certificate 1 of the chain is no strict DER in the item at offset ",
      manifestOf(manifestBody({}), 0, {sequence({}), {0x30, 0x05}})},
     {"img4", "\"INTEGER\" of the restore information is no property", inRestoreInfo(integer(1))},
@@ -240,6 +246,7 @@ TEST(Show, showsWhatStandsAroundAFault) {
     const PrintedReport behind = show(join({payload({}), {1, 2, 3}}));
     EXPECT_TRUE(behind.ok());
     EXPECT_TRUE(behind.says("followed by octets that belong to nothing, 3 of them, at offset "));
+    EXPECT_TRUE(show(payload({.data = {}})).says("data is empty, so that the payload counts as absent"));
     const PrintedReport twice = show(inRestoreInfo(join({property("test", integer(1)), property("test", integer(2))})));
     EXPECT_TRUE(twice.ok());
     EXPECT_TRUE(twice.says("\n    test  INTEGER 1\n    test  INTEGER 2  hidden behind an earlier one"));

@@ -110,6 +110,13 @@ class Verify(unittest.TestCase):
                     self.assertEqual(status, 2)
                     self.assertIn(f"{folder}/{broken}", found["problem"])
 
+    def test_another_authority_than_the_chain_names_is_refused(self):
+        folder = self.domain("ROOT_CA_CERTIFICATE.der", *NAMES)
+        (folder / NAMES[0]).write_bytes(b"\x13\x06Nobody")
+        status, found = verify(self.folder / "kImg4DecodeSecureBootRsa1kSha1.im4m", "--trust-dir", folder)
+        self.assertEqual((status, found["failedStep"], found["failedCertificate"]), (5, "chain", 1))
+        self.assertIn('common name of the secure-boot authority as a PrintableString: "Nobody"', found["problem"])
+
     def test_people_get_lines_and_the_reason_on_standard_error(self):
         file = self.folder / "kImg4DecodeSecureBootRsa4kSha384.img4"
         done = run(BIN / "orloctl", "verify", file, "--object", "sepi", "--trust-dir", DOMAIN)
