@@ -60,10 +60,22 @@ class Help(unittest.TestCase):
             with self.subTest(line):
                 self.assertEqual(offered(*line.split(" ")), words)
 
-    def test_an_unknown_verb_is_named_with_the_nearest(self):
-        for word, says in (("shw", "; is show meant?"), ("getTCRt", "; is getTCRT meant?"), ("xyzzy", "")):
-            done = subprocess.run([ORLOCTL, word], stderr=subprocess.PIPE, text=True)
-            self.assertEqual(done.stderr, f'orloctl: There is no verb "{word}"{says} (orloctl --help says more)\n')
+    def test_wrong_usage_is_said(self):
+        verb = 'There is no verb "{}"{} (orloctl --help says more)'
+        for line, says in (
+            ("shw", verb.format("shw", "; is show meant?")),
+            ("getTCRt", verb.format("getTCRt", "; is getTCRT meant?")),
+            ("xyzzy", verb.format("xyzzy", "")),
+            ("call getTCRT :=1", '":=1" has no key'),
+            ("call getTCRT x", '"x" is none of KEY=TEXT, KEY:=JSON and KEY@=FILE'),
+            ("call getTCRT x=1 x=2", 'The key "x" is given twice'),
+            ("crash-logs -o -", "Logs are copied into a directory, not to standard output"),
+            ("show bcfg - --hmac-key-file -", "The file and the key cannot both come from standard input"),
+            ("log --lines 1x", '"1x" is no number of lines'),
+        ):
+            with self.subTest(line):
+                done = subprocess.run([ORLOCTL, *line.split()], stderr=subprocess.PIPE, text=True)
+                self.assertEqual((done.returncode, done.stderr), (2, f"orloctl: {says}\n"))
 
 
 if __name__ == "__main__":
