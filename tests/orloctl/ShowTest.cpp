@@ -191,6 +191,8 @@ const ProblemCase problemCases[] = {
     {"img4", "The container holds INTEGER behind its last field", sequence({ia5("IMG4"), payload({}), integer(1)})},
     {"img4", "The uncompressed size does not fit 32 bits", payloadOf({compression(1, 0x100000000)})},
     {"img4", "The magic is \"PAYQ\" instead of", payloadOf({context(0, sequence({ia5("PAYQ"), set({})}))})},
+    {"img4", "The magic is \"IM4X\" instead of \"IM4R\"",
+     sequence({ia5("IMG4"), payload({}), context(1, sequence({ia5("IM4X"), set({})}))})},
     {"img4", "The manifest version is no non-negative INTEGER in its shortest form, at offset 10.",
      sequence({ia5("IM4M"), item(DERTagInteger, {0x80}), manifestBody({}), octets({}), sequence({})})},
     {"img4", "The manifest version is 3, and 2 is the last, at offset 10.", manifestOf(manifestBody({}), 3)},
