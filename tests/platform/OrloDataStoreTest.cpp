@@ -194,6 +194,9 @@ TEST_F(OrloDataStore, refusesWhatTheSessionHasNoGrantForOrDoesNotTrust) {
     EXPECT_EQ(put({nullptr, QDSupportSafeRelease}, "psd2", "S1", {'x'}), 1);
     EXPECT_EQ(put(before, "psd2", "S\n1", {'x'}), 1);
     EXPECT_EQ(logged().back(), "Put: The session has no grant for action 1 on psd2 of S\\n1");
+    QDOrloSetOption(before.get(), "APTicket", {});
+    EXPECT_EQ(put(before, "psd2", "S1", {'x'}), 1);
+    EXPECT_EQ(logged().back(), "Put: There is no AP ticket");
     QDOrloSetOption(nullptr, "Permissions", "");
 }
 

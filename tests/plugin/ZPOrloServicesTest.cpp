@@ -84,6 +84,20 @@ TEST_F(ZPOrloServicesTest, aRequestIsCompletedOnceWhereverMemoryEnds) {
     }
 }
 
+TEST_F(ZPOrloServicesTest, anAnswerThatMemoryDoesNotSufficeForIsReplacedByTheFailureOnce) {
+    std::vector<std::int64_t> statuses;
+    const HSCompletion tooLarge = [&](bool, const std::optional<HSMessageResponse>& answer) {
+        statuses.push_back(answer ? answer->statusCode() : 1);
+        if (statuses.size() != 2)
+            throw std::bad_alloc();
+    };
+    ZPOrloServices server;
+    server.handleMessage({"getTCRT", {}}, tooLarge);
+    EXPECT_EQ(statuses, (std::vector<std::int64_t>{0, -1}));
+    EXPECT_THROW(server.handleMessage({"unknown", {}}, tooLarge), std::bad_alloc);
+    EXPECT_EQ(statuses.size(), 3U);
+}
+
 TEST_F(ZPOrloServicesTest, aFileThatCannotBeWrittenIsNamedInTheAnswerAndNoEarlierBlobIsTakenForTheResult) {
     inOwnProcess([this] {
         root_.write("/tmp/new_bCfg", "earlier");
