@@ -421,6 +421,20 @@ TEST_F(OrloDataStore, reportsAWriteThatFailsAndTakesTheNextOne) {
     });
 }
 
+TEST_F(OrloDataStore, waitsForWhoeverWritesToANewStoreBeforeItChangesTheJournal) {
+    static sqlite3* writer = nullptr;
+    static const auto end = [](sqlite3_vfs*, int) { return sqlite3_exec(writer, "COMMIT", nullptr, nullptr, nullptr); };
+    EXPECT_NE(open(), nullptr); // from now on SQLite itself waits with another sleep than the store
+    root_.write("/new.db", "");
+    describeStore(R"({"path": "/new.db"})");
+    ASSERT_EQ(sqlite3_open(root_.host("/new.db").c_str(), &writer), SQLITE_OK);
+    ASSERT_EQ(sqlite3_exec(writer, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
+    const auto sleep = std::exchange(sqlite3_vfs_find(nullptr)->xSleep, end);
+    EXPECT_NE(open(), nullptr);
+    sqlite3_vfs_find(nullptr)->xSleep = sleep;
+    sqlite3_close(writer);
+}
+
 TEST_F(OrloDataStore, servesSeveralProcessesThatBeginWithANewStoreAtOnce) {
     inProcessesAtOnce([](int process) {
         for (int i = 0; i < 20; ++i) {

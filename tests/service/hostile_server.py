@@ -103,6 +103,11 @@ class Handler(http.server.BaseHTTPRequestHandler):
         while True:
             self.wfile.write(b"X-Filler: " + b"x" * 1000 + b"\r\n")
 
+    def exact(self, count):
+        """As large as an answer to a put may be."""
+        self.body()
+        self.answer(200, bytes(1 << 20))
+
     def announced(self, count):
         self.answer(200, b"a beginning", Content_Length=(64 << 20) + 1)
         self.stall(count)

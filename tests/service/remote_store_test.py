@@ -308,6 +308,7 @@ class Failures(HostileTest):
         self.assertEqual({path for _, path in self.server.seen if path.endswith("plain")}, set(), "was redirected")
         self.assertEqual([session.get(name) for session in (hasty, patient) for name in ("plain", "chunked")],
                          [(0, "")] * 4)
+        self.assertEqual(patient.put("exact", b"record"), (0, ""))
         self.assertLess(kilobytes("VmHWM", patient.process.pid), 200 << 10)
 
     def test_only_what_may_pass_is_tried_again_and_only_so_often(self):
