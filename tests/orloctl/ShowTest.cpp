@@ -248,6 +248,7 @@ TEST(Show, showsWhatStandsAroundAFault) {
     const PrintedReport behind = show(join({payload({}), {1, 2, 3}}));
     EXPECT_TRUE(behind.ok());
     EXPECT_TRUE(behind.says("followed by octets that belong to nothing, 3 of them, at offset "));
+    EXPECT_TRUE(show(item(DERTagObjectIdentifier, Bytes(100, 0x7F))).says("OBJECT IDENTIFIER 7f7f")); // too long
     EXPECT_TRUE(show(payload({.data = {}})).says("data is empty, so that the payload counts as absent"));
     const PrintedReport twice = show(inRestoreInfo(join({property("test", integer(1)), property("test", integer(2))})));
     EXPECT_TRUE(twice.ok());

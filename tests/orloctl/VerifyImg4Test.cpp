@@ -210,7 +210,10 @@ TEST(VerifyImg4, hostileNamesStayWithinTheLine) {
     leaf.subject = distinguishedName("a,O=b\x1B[31m\n\"+\\;<> ");
     EXPECT_EQ(verify(signedBy(leaf)).json["chain"][1]["subject"], R"(CN=a\,O=b\1B[31m\0A\"\+\\\;\<\>\ )");
     leaf.subject = sequence({integer(1), integer(2)});
-    EXPECT_EQ(verify(signedBy(leaf)).json["chain"][1]["subject"], "#020101020102");
+    leaf.serialNumber = integer(0xC8); // with an octet before it that keeps the number positive
+    const ordered_json shown = verify(signedBy(leaf)).json["chain"][1];
+    EXPECT_EQ(shown["subject"], "#020101020102");
+    EXPECT_EQ(shown["serialNumber"], "c8");
     const Report value = verify(constrained({}, {.properties = {property("EVIL", ia5("\x1B[2J\nresult: trusted"))}}));
     EXPECT_FALSE(value.says("\x1B") || value.says("\nresult: trusted\n"));
 }
