@@ -175,6 +175,7 @@ const ProblemCase problemCases[] = {
     {"der", "the count of unused bits is 1, at offset 2.", {0x03, 0x01, 0x01}},
     {"der", "the unused bits are not zero, at offset 3.", {0x03, 0x02, 0x03, 0xF9}},
     {"der", "a component is not in its shortest form, at offset 3.", {0x06, 0x03, 0x2A, 0x80, 0x01}},
+    {"der", "a component is not in its shortest form, at offset 2.", {0x06, 0x02, 0x80, 0x01}},
     {"der", "the last component is cut short, at offset 3.", {0x06, 0x02, 0xAA, 0x80}},
     {"der", "DER has OCTET STRING in primitive form only", {0x24, 0x02, 0x04, 0x00}},
     {"der", "DER has SEQUENCE in constructed form only", {0x10, 0x00}},
