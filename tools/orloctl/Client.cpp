@@ -256,7 +256,6 @@ public:
             call(arguments, false);
             wait();
         }
-        line_.clear();
         answer_->reasons = whereReasonsAre(address_.bus, logSizeBefore);
         if (answer_->report.outcome == Outcome::Failure)
             answer_->report.problem += ' ' + answer_->reasons;
