@@ -140,7 +140,7 @@ TEST_F(CrashLogs, panicReportsAreCollectedWhenTheRunningBuildWroteThem) {
     EXPECT_FALSE(check_panic_version("/missing"));
 
     root_.write(logs + "hole.ips", good + "\n");
-    fs::resize_file(root_.host(logs + "hole.ips"), std::size_t{1} << 43); // nobody would live to see it read
+    fs::resize_file(root_.host(logs + "hole.ips"), std::size_t{1} << 42); // nobody would live to see it read
     std::ofstream(root_.host(logs + "hole.ips"), std::ios::app) << "x";
     EXPECT_TRUE(check_panic_version(logs + "hole.ips"));
 }

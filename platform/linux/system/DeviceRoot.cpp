@@ -112,7 +112,7 @@ public:
             } else if (isLast) {
                 return next;
             } else {
-                return none(passed_.size() > deepest ? ENAMETOOLONG : ENOTDIR);
+                return none(S_ISDIR(status_.st_mode) ? ENAMETOOLONG : ENOTDIR);
             }
         }
         FileDescriptor directory = std::move(passed_.back());
