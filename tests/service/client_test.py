@@ -33,11 +33,11 @@ class Waiting(HeldTest):
         self.slow, self.connection = self.hold("orloctl", "provision", stdout=subprocess.DEVNULL, stderr=slave)
         os.close(slave)
 
-    def seen(self, pattern):
-        """What the terminal of the slow request shows, once it has this."""
+    def seen(self, pattern, terminal=None):
+        """What the terminal, that of the slow request or another one, shows once it has this."""
         shown = ""
         while not re.search(pattern, shown):
-            shown += os.read(self.terminal, 65536).decode()
+            shown += os.read(terminal or self.terminal, 65536).decode()
         return shown
 
     def test_a_terminal_shows_what_the_service_does_and_what_a_request_waits_for(self):
@@ -49,7 +49,11 @@ class Waiting(HeldTest):
         self.assertEqual((state["requestInHand"]["command"], state["requestsWaiting"]), ("corvoSCProv", 0), state)
         self.assertGreaterEqual(state["requestInHand"]["seconds"], 1)
         self.seen(r"\A\d s  ZPOrloServices: Calling the provisioning\r\x1b\[K")
+        terminal, slave = pty.openpty()
+        self.popen(BIN / "orloctl", "-v", "check-entitlement", stdout=subprocess.DEVNULL, stderr=slave)
+        self.seen("waiting for another request", terminal)
         self.connection.close()
+        self.seen(r"\r\x1b\[KZPOrloServices: Plugin", terminal)
         self.seen(r"\r\x1b\[Korloctl: The plug-in answered")
         self.assertEqual(self.service.orloctl("call", "x")[0], 4)
         self.assertNotIn("getTCRT", "".join(self.service.log()))

@@ -145,6 +145,7 @@ class Messages(HeldTest):
         lines = output.splitlines()
         framework = [line for line in lines if " framework: " in line]
         self.assertEqual(len(framework), 4, output)
+        self.assertEqual([line.split()[0] for line in framework], ["info", "error", "error", "error"])
         logged = [line.split("[", 1)[1] for line in self.service.log()[before:]]
         self.assertEqual([line[8:] for line in lines if line not in framework],
                          [line.split(":")[0] + ": " + line.split("] ", 1)[1] for line in logged])
