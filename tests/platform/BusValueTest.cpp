@@ -106,6 +106,17 @@ TEST(BusValue, aMessageOfVeryManyValuesIsRefused) {
     }
 }
 
+TEST(BusValue, nothingIsWrittenThatNestsDeeperThanABusLetsThrough) {
+    Value allowed = Value::Array{}, tooDeep = Value::Array{true};
+    for (int level = 1; level < 31; ++level) {
+        allowed = Value::Array{allowed};
+        tooDeep = Value::Array{tooDeep};
+    }
+    const LooseBus::Message message = LooseBus::message();
+    EXPECT_NO_THROW(bus::appendDictionary(message.get(), {{"k", allowed}}));
+    EXPECT_THROW(bus::appendDictionary(message.get(), {{"k", tooDeep}}), bus::Refusal);
+}
+
 TEST(BusValue, aWrittenDictionaryReadsBackButForWhatDBusCannotCarry) {
     const LooseBus::Message message = LooseBus::message();
     const Dictionary kept = {{"text", "a"}, {"data", Value::Data{0}}, {"integer", -1}, {"boolean", true}};
