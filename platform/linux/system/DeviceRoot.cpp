@@ -111,8 +111,10 @@ public:
                     return {};
             } else if (isLast) {
                 return next;
-            } else {
+            } else if (!S_ISDIR(status_.st_mode) || passed_.size() > deepest) {
                 return none(S_ISDIR(status_.st_mode) ? ENAMETOOLONG : ENOTDIR);
+            } else { // it was put there since the look before
+                passed_.push_back(std::move(next));
             }
         }
         FileDescriptor directory = std::move(passed_.back());
