@@ -28,10 +28,15 @@ class Reasons(ServiceTest):
 class Waiting(HeldTest):
     def setUp(self):
         super().setUp()
-        self.terminal, slave = pty.openpty()
-        self.addCleanup(os.close, self.terminal)
-        self.slow, self.connection = self.hold("orloctl", "provision", stdout=subprocess.DEVNULL, stderr=slave)
+        self.terminal, (self.slow, self.connection) = self.on_terminal(self.hold, "orloctl", "provision")
+
+    def on_terminal(self, start, *words):
+        """A terminal for the standard error of what is started, and what `start` gives."""
+        terminal, slave = pty.openpty()
+        self.addCleanup(os.close, terminal)
+        started = start(*words, stdout=subprocess.DEVNULL, stderr=slave)
         os.close(slave)
+        return terminal, started
 
     def seen(self, pattern, terminal=None):
         """What the terminal, that of the slow request or another one, shows once it has this."""
@@ -49,8 +54,7 @@ class Waiting(HeldTest):
         self.assertEqual((state["requestInHand"]["command"], state["requestsWaiting"]), ("corvoSCProv", 0), state)
         self.assertGreaterEqual(state["requestInHand"]["seconds"], 1)
         self.seen(r"\A\d s  ZPOrloServices: Calling the provisioning\r\x1b\[K")
-        terminal, slave = pty.openpty()
-        self.popen(BIN / "orloctl", "-v", "check-entitlement", stdout=subprocess.DEVNULL, stderr=slave)
+        terminal, _ = self.on_terminal(self.popen, BIN / "orloctl", "-v", "check-entitlement")
         self.seen("waiting for another request", terminal)
         self.connection.close()
         self.seen(r"\r\x1b\[KZPOrloServices: Plugin", terminal)

@@ -71,6 +71,7 @@ void recordLog() {
 }
 
 void whenRecorded(std::size_t count, void (*then)()) {
+    const std::lock_guard lock(mutex);
     awaited = count;
     whenAwaited = then;
 }
